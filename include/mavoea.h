@@ -1,0 +1,339 @@
+/* libmavoea.so.5: Mac and SMB metadata kept in step with files.
+ *
+ * For the path of a file or directory (the object) the library decides where its metadata lives,
+ * reads and writes it there, and carries it along when the object is copied, moved, renamed or
+ * removed:
+ *
+ *   "@eaDir/<name>@MavoEAStream"   the EA stream: named attributes, resource fork, Finder info
+ *   "@eaDir/<name>@MavoResource"   the resource file: Finder info, resource fork, netatalk record
+ *   "._<name>"                     one AppleDouble file for all of it, on AppleDouble volumes
+ *   real extended attributes       on volumes that keep them
+ *
+ * Results. Unless a function says otherwise it returns 0, a count or a size on success and -1 on
+ * failure. A failure records exactly one code (MAVOEA_ERR_...) with the unit and line that decided
+ * it on the calling thread's error stack, where MLIBCErrGet() of libmavocore finds it. Where a
+ * function sets `errno`, its comment says so; elsewhere a failure leaves the `errno` of the system
+ * call that failed.
+ *
+ * Ownership. The caller owns every descriptor, handle, buffer and string list that it passes in or
+ * gets back. The library closes only descriptors that it opened.
+ *
+ * Threads. Path derivation and the name tests are safe in any thread. The other functions share
+ * process-wide state (the effective user id among it), so calls must not overlap.
+ *
+ * Strings are NUL-terminated bytes; no character set is assumed. On disk every multi-byte field is
+ * big-endian.
+ */
+#ifndef MAVOEA_H_
+#define MAVOEA_H_
+
+#include <stdint.h>
+
+#ifdef __cplusplus
+extern "C" {
+#endif
+
+#if defined(__GNUC__)
+#define MAVOEA_API __attribute__((visibility("default")))
+#else
+#define MAVOEA_API
+#endif
+
+struct flock64;
+typedef struct MLIBCSzList MLIBCSzList; /* the platform's string list, see mavocore.h */
+
+/* ---- Constants ------------------------------------------------------------------------------ */
+
+/* `form`: how metadata files are named inside the EA directory. */
+enum {
+    EA_FORM_FOLDER = 0, /* legacy: "@eaDir/<name>/<kind>" */
+    EA_FORM_FILE = 1    /* current: "@eaDir/<name>@<kind>" */
+};
+
+/* `place`: where an object's metadata file lies. */
+enum {
+    EA_PLACE_EADIR = 0,      /* in "@eaDir" beside the object */
+    EA_PLACE_APPLEDOUBLE = 1 /* the file "._<name>" beside the object */
+};
+
+/* Kinds of metadata files. */
+#define MAVOEA_KIND_STREAM "MavoEAStream"
+#define MAVOEA_KIND_RESOURCE "MavoResource"
+#define MAVOEA_KIND_LEGACY_RESOURCE "MAVO:Resource"
+
+/* `flags` of MAVOEASWrite(), a bit mask. */
+enum {
+    EAS_WRITE_OVERWRITE = 0x1, /* an attribute that exists may be written */
+    EAS_WRITE_MUST_EXIST = 0x2 /* the attribute must exist */
+};
+
+/* Codes on the error stack. */
+enum {
+    MAVOEA_ERR_BUFFER_MEMORY = 0x100,    /* out of memory; a buffer too small or not enlargeable */
+    MAVOEA_ERR_MEMORY = 0x200,           /* out of memory */
+    MAVOEA_ERR_NOT_PERMITTED = 0x300,    /* the handle's lock does not allow the operation */
+    MAVOEA_ERR_LOCK = 0x400,             /* the advisory lock could not be set */
+    MAVOEA_ERR_NOTHING_THERE = 0x700,    /* path missing, a directory, or an empty resource fork */
+    MAVOEA_ERR_OPEN = 0x900,             /* a metadata file or directory could not be opened */
+    MAVOEA_ERR_READ = 0xA00,             /* read or seek failed, or what was read is invalid */
+    MAVOEA_ERR_WRITE = 0xB00,            /* write failed, or an attribute could not be set */
+    MAVOEA_ERR_BAD_ARGUMENT = 0xD00,     /* invalid argument */
+    MAVOEA_ERR_NO_ATTRIBUTE = 0x2000,    /* attribute not found in an EA stream */
+    MAVOEA_ERR_STAT = 0x2700,            /* stat failed for a cause other than ENOENT */
+    MAVOEA_ERR_RENAME = 0x2800,          /* rename failed */
+    MAVOEA_ERR_SYSTEM_CALL = 0x2A00,     /* another system call failed */
+    MAVOEA_ERR_REMOVE = 0x3900,          /* unlink, remove or rmdir failed */
+    MAVOEA_ERR_MAKE_DIRECTORY = 0x3C00,  /* mkdir failed, or the switch to the superuser */
+    MAVOEA_ERR_BAD_APPLEDOUBLE = 0x4000, /* an AppleDouble header is not acceptable */
+    MAVOEA_ERR_BASE_NAME = 0x9A00,       /* the base name of a path could not be taken */
+    MAVOEA_ERR_RANGE = 0xBF00,           /* the caller's buffer is too small (errno ERANGE) */
+    MAVOEA_ERR_NAME_TOO_LONG = 0xC300    /* a derived path would be too long (ENAMETOOLONG) */
+};
+
+/* ---- Types ---------------------------------------------------------------------------------- */
+
+/* Which search indexes remove and rename notify; a NULL pointer means both. */
+typedef struct EAIndexFlags {
+    int fileIndex; /* 1: the platform's file index */
+    int index;     /* 1: the search index, see MAVOIndex() */
+} EAIndexFlags;
+
+/* One attribute of an open EA stream. */
+typedef struct EASEntry {
+    uint32_t offset;    /* of the value's first byte, from the start of the file */
+    uint32_t length;    /* of the value, in bytes */
+    uint16_t flags;     /* carried through unchanged */
+    uint8_t nameLength; /* of the name in bytes, its NUL included */
+    char* name;         /* heap copy owned by the record; NULL in unused records */
+} EASEntry;
+
+/* An open EA stream, from MAVOEASOpen(). */
+typedef struct EASHandle {
+    unsigned char header[120]; /* the file's first 120 bytes, as on disk */
+    EASEntry* entries;         /* attribute table, owned by the handle */
+    int32_t fd;                /* owned by the caller */
+    int32_t capacity;          /* records allocated in `entries` */
+    int32_t lockType;          /* F_RDLCK, F_WRLCK or F_UNLCK */
+} EASHandle;
+
+/* One entry of a netatalk metadata record; absent when its offset is 0. */
+typedef struct EAAdoubleEntry {
+    int64_t offset;  /* into the record's data */
+    uint32_t length; /* in bytes */
+} EAAdoubleEntry;
+
+/* A netatalk metadata record in memory. */
+typedef struct EAAdouble {
+    uint32_t magic;   /* host order */
+    uint32_t version; /* host order */
+    uint8_t filler[16];
+    EAAdoubleEntry entries[20];
+    uint8_t data[1024]; /* the block as on disk */
+} EAAdouble;
+
+/* ---- Paths ---------------------------------------------------------------------------------- */
+/* Pure string operations: nothing is looked up, opened or created. One trailing '/' of szPath is
+ * ignored. In EA_FORM_FILE a name of more than 242 bytes is shortened to 242, ending in a check
+ * character and its extension, so that "<name>@MavoEAStream" fits the 255 bytes of a file name.
+ *
+ * Buffers. MAVOEADirPath() and, in other forms than EA_FORM_FILE, MAVOEAPathNoADFS() take cbBuf as
+ * the number of characters that fit, not counting the terminating NUL: szBuf must have room for
+ * cbBuf + 1 bytes. Callers keep buffers of MAVOEA_PATH_SIZE + 1 bytes. szBuf may be szPath.
+ *
+ * All return 0 or -1. Codes: 0xD00 NULL argument, or an empty szPath (but for MAVOEAADPath(), which
+ * gives "._"); 0x200 out of memory (only for paths of more than 4094 bytes); 0xC300 the result
+ * would be too long. */
+
+#define MAVOEA_PATH_SIZE 4096
+
+/* The EA directory of szPath's object: "<parent>/@eaDir"; in EA_FORM_FOLDER the object's legacy
+ * folder "<parent>/@eaDir/<name>". errno: ENOENT with 0xD00, ENAMETOOLONG with 0xC300. */
+MAVOEA_API int MAVOEADirPath(int form, const char* szPath, char* szBuf, int cbBuf);
+
+/* The metadata file of kind szName in the EA directory: "<parent>/@eaDir/<name>@<szName>" in
+ * EA_FORM_FILE, "<parent>/@eaDir/<name>/<szName>" in EA_FORM_FOLDER, and "<parent>/@eaDir/<szName>"
+ * for any other form. errno: ENAMETOOLONG with 0xC300. */
+MAVOEA_API int MAVOEAPathNoADFS(int form, const char* szPath, const char* szName, char* szBuf,
+                                int cbBuf);
+
+/* The AppleDouble file "<parent>/._<name>". A result longer than cbBuf - 1 bytes is cut short, as
+ * snprintf does, and still returns 0; a name of more than 253 bytes gives 0xC300. errno is left
+ * alone. */
+MAVOEA_API int MAVOEAADPath(const char* szPath, char* szBuf, int cbBuf);
+
+/* MAVOEAPathNoADFS() for EA_PLACE_EADIR, MAVOEAADPath() for EA_PLACE_APPLEDOUBLE (szName must not
+ * be NULL there either); any other place gives 0xD00. */
+MAVOEA_API int MAVOEAPath(int form, const char* szPath, const char* szName, char* szBuf, int cbBuf,
+                          int place);
+
+/* ---- EA directories and metadata files ------------------------------------------------------ */
+
+/* Creates the EA directory szEADirPath (with blParentFirst, the directory that holds it first) as
+ * the superuser: mode 0777, the platform's EA-directory ACL and, on volumes of type 7, a Finder
+ * info that hides it. A directory that exists is left exactly as it is. Returns 0 when it exists
+ * afterwards.
+ *
+ * Codes: 0xD00 NULL, or no '/' in szEADirPath with blParentFirst; 0x3C00 mkdir or seteuid(0)
+ * failed; 0x2A00 the mode or the Finder info could not be set (the directory stays); 0x100 out of
+ * memory. The effective uid is changed for the duration, for the whole process. */
+MAVOEA_API int MAVOEAMKDir(int blParentFirst, const char* szEADirPath);
+
+/* Opens the metadata file of kind szName of szPath's object with the open(2) flags oflag, and mode
+ * 0777 where it creates. With O_CREAT the EA directory is made as well. Returns a descriptor, which
+ * the caller closes, or -1: a failed open(2) records no code and leaves its errno; 0xD00 NULL
+ * argument (errno ENOENT) or unknown place; otherwise the codes of the path functions and of
+ * MAVOEAMKDir(). */
+MAVOEA_API int MAVOEAOpen(int form, const char* szPath, const char* szName, int oflag, int place);
+
+/* MAVOEAOpen() for EA_PLACE_EADIR. */
+MAVOEA_API int MAVOEAOpenNoADFS(int form, const char* szPath, const char* szName, int oflag);
+
+/* ---- Names and marks ------------------------------------------------------------------------ */
+/* The tests return 1 or 0, and 0 for NULL unless they say otherwise. Callers pass bare names. */
+
+/* 1 for a name with a ':' in it, the separator of legacy metadata names. */
+MAVOEA_API int MAVOEAIsHiddenName(const char* szName);
+
+/* 1 for "@eaDir", "@tmp" and "@sharebin", whatever their case; a path that begins with '/' is
+ * reduced to its last component first. -1 on NULL (no code) and on failure: 0x200 out of memory,
+ * 0x9A00 no base name. */
+MAVOEA_API int MAVOEAIsHiddenDir(const char* szPath);
+
+/* MAVOEAIsHiddenDir() for a bare name, decided by its first byte where that is enough. -1 on
+ * NULL. */
+MAVOEA_API int MAVOEAIsHiddenDirName(const char* szName);
+
+/* Appends the three hidden directory names to *ppList. 0, or -1 on NULL (0xD00) or when the list
+ * takes no more (names appended before stay). */
+MAVOEA_API int MAVOEAHiddenDirGet(MLIBCSzList** ppList);
+
+/* 1 for hidden directory names, ".", ".." and names that begin with ".MAVOGALDB". */
+MAVOEA_API int MAVOEAIsVetoFile(const char* szName);
+
+/* 1 for veto files, ".DS_Store" and names that begin with "._". */
+MAVOEA_API int MAVOEAIsHiddenFile(const char* szName);
+
+/* Tells the platform's search index of a change; returns what the index returns. */
+MAVOEA_API int MAVOIndex(const char* szPath, const char* szOldPath, int op);
+
+/* Sets the SMB archive bit of szPath. 0, or -1 with errno (no code). */
+MAVOEA_API int EASetSmbArchive(const char* szPath);
+
+/* ---- EA streams: handle --------------------------------------------------------------------- */
+/* A stream is an AppleDouble file with Finder info, an attribute area as Mac OS X writes it, and
+ * the resource fork; docs/formats.md has the layout. */
+
+/* Reads the stream on fd (an empty file is a new stream, and stays empty until it is written) under
+ * a non-blocking advisory lock on the whole file: F_RDLCK to read, F_WRLCK to write, F_UNLCK for
+ * none, which allows searching and enumerating only. fd must be open for reading, and for writing
+ * with F_WRLCK; it stays the caller's, to be closed after MAVOEASClose(). Beware: closing any other
+ * descriptor of the same file drops the process's locks on it.
+ *
+ * Returns a handle for MAVOEASClose(), or NULL: 0xD00 fd below 0, or more than 13 entry
+ * descriptors; 0x200 out of memory; 0x400 another process holds a conflicting lock; 0xA00 the file
+ * ends before what its header declares. */
+MAVOEA_API EASHandle* MAVOEASOpen(int fd, int lockType);
+
+/* Frees h and releases its lock; the descriptor stays open. -1 when the lock could not be released
+ * (0x400; h is freed all the same) or h is NULL (0xD00). */
+MAVOEA_API int MAVOEASClose(EASHandle* h);
+
+/* Asks the kernel whether *lock could be placed (F_GETLK), and fills it in. 0xD00, 0x2A00. */
+MAVOEA_API int MAVOEASLockGet(EASHandle* h, struct flock64* lock);
+
+/* Changes the handle's lock without waiting. 0xD00; 0x400 when another process is in the way, the
+ * lock then stays as it was. */
+MAVOEA_API int MAVOEASLockSet(EASHandle* h, int lockType);
+
+/* fsync(2). 0xD00, 0x2A00. */
+MAVOEA_API int MAVOEASFlush(EASHandle* h);
+
+/* ---- EA streams: attributes ----------------------------------------------------------------- */
+/* Names are compared byte by byte and have at most 254 bytes; a stream holds at most 65,535
+ * attributes and at most 4 GiB. What would pass a limit is refused with 0xD00, before anything has
+ * changed. A stream whose offsets, lengths and counts do not fit together is refused with 0xA00 by
+ * whatever would rewrite it, before anything on disk has changed.
+ *
+ * A failed MAVOEASWrite, MAVOEASRemove or MAVOEASTruncate may leave memory ahead of the file:
+ * close the handle and open the stream again. */
+
+/* The index of attribute `name` (of the last one, should there be two), or -1: 0xD00; 0x2000 no
+ * such attribute. */
+MAVOEA_API int MAVOEASSearch(EASHandle* h, const char* name);
+
+/* Appends all attribute names to *ppList, in table order, and returns their number; -1: 0xD00, or
+ * a name that could not be appended, which empties the list. */
+MAVOEA_API int MAVOEASEnum(EASHandle* h, MLIBCSzList** ppList);
+
+/* Copies up to `size` bytes of the value, from `offset` on, into buf (never NULL) and returns their
+ * number, 0 behind the end. With size 0 returns the value's length. -1: 0xD00; 0x300 no lock;
+ * 0x2000; 0xA00. */
+MAVOEA_API int MAVOEASRead(EASHandle* h, const char* name, void* buf, unsigned size,
+                           unsigned offset);
+
+/* Writes `size` bytes at `offset` of the value, creating the attribute unless flags has
+ * EAS_WRITE_MUST_EXIST, and syncs the file. A value never shrinks: bytes outside the range stay,
+ * a gap before `offset` reads as zeros. The attribute becomes the last of the table. Returns size.
+ *
+ * errno alone, with no code: ENOENT (-1) the attribute is missing with EAS_WRITE_MUST_EXIST; EEXIST
+ * it exists without EAS_WRITE_OVERWRITE: -1, but 0 when size is 0. -1 with a code: 0xD00; 0x200;
+ * 0x300 no write lock; 0xA00; 0xB00; 0x2A00 fsync failed. A failure to move the resource fork
+ * records none; the log has its cause. */
+MAVOEA_API int MAVOEASWrite(EASHandle* h, const char* name, const void* data, unsigned size,
+                            unsigned offset, int flags);
+
+/* Removes an attribute, cuts the file at the end of the resource fork and syncs it. -1: 0xD00;
+ * 0x200; 0x300; 0x2000; 0xA00; 0xB00; 0x2A00. */
+MAVOEA_API int MAVOEASRemove(EASHandle* h, const char* name);
+
+/* Sets a value's length, filling with zeros where it grows, and syncs the file. The attribute
+ * becomes the last of the table. The resource fork's offset follows while its bytes do not move:
+ * for streams without a fork, or whose fork the caller writes afterwards. -1: 0xD00; 0x200; 0x300;
+ * 0x2000; 0xA00; 0xB00; 0x2A00 (recorded twice: by the flush, and here). */
+MAVOEA_API int MAVOEASTruncate(EASHandle* h, const char* name, unsigned length);
+
+/* Enlarges the attribute table by `count` records, 5 when count is 0. -1: 0xD00; 0x200, the table
+ * then stays as it was. */
+MAVOEA_API int MAVOEASAllocEntry(EASHandle* h, int count);
+
+/* Writes header and table at the start of the file, and leaves the file position at the start of
+ * the data area. -1: 0xD00; 0x200; 0xA00; 0xB00. */
+MAVOEA_API int MAVOEASWriteHeader(EASHandle* h);
+
+/* Makes record `index` the last one in memory and gathers the data area in buf: with that value at
+ * its end or, with `remove`, without it, the record then being dropped. bufSize is at least the
+ * size of what is gathered. The file is only read. -1: 0xD00; 0x100 bufSize too small; 0xA00, and
+ * then nothing has changed. */
+MAVOEA_API int MAVOEASUpdateEntry(EASHandle* h, unsigned index, unsigned char* buf,
+                                  unsigned bufSize, int remove);
+
+/* ---- Named attributes ----------------------------------------------------------------------- */
+/* The object's own extended attributes, by their full names ("user.comment"); symbolic links are
+ * followed. "com.apple.ResourceFork" is the file "rsrc" beneath the object, on filesystems that
+ * offer it; an empty fork counts as absent. While a fork is used, a file without the owner-execute
+ * bit gets it, as the superuser, and loses it again. Failures of the attribute calls themselves
+ * record no code and leave errno. NULL and negative arguments: a log line and 0xD00. */
+
+/* Appends all attribute names to *ppList; empties it when there are none. 0, or -1: 0xD00; 0x2A00;
+ * 0x100; or the list takes no more. */
+MAVOEA_API int MAVOEAXattrEnum(const char* szPath, MLIBCSzList** ppList);
+
+/* Reads a value into szValue and returns its length; with cbValue 0 only the length. -1: 0xD00;
+ * for the fork also 0x700 missing, a directory or empty (errno ENODATA), 0x2700, 0xBF00 it does
+ * not fit (errno ERANGE). */
+MAVOEA_API int MAVOEAXattrGet(const char* szPath, const char* szName, void* szValue, int cbValue);
+
+/* Sets a value; flags as setxattr(2): 1 create only, 2 replace only. szValue must not be NULL, even
+ * for cbValue 0. -1: 0xD00; for the fork of a directory 0x700, and errno EEXIST or ENODATA by
+ * flags. A fork is written with sync(2) behind it. */
+MAVOEA_API int MAVOEAXattrSet(const char* szPath, const char* szName, const void* szValue,
+                              int cbValue, int flags);
+
+/* Removes an attribute; a fork is emptied. -1: 0xD00; for the fork of a directory 0x700. */
+MAVOEA_API int MAVOEAXattrRemove(const char* szPath, const char* szName);
+
+#ifdef __cplusplus
+}
+#endif
+
+#endif /* MAVOEA_H_ */

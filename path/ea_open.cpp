@@ -1,0 +1,64 @@
+// Opens metadata files, and makes the EA directory where one is to be created.
+
+#include <errno.h>
+
+#include "include/mavoea.h"
+#include "util/path_text.h"
+#include "util/unit.h"
+
+namespace mavoea {
+namespace {
+
+constexpr Unit unit("ea_open");
+
+constexpr mode_t kMode = 0777;
+
+int OpenAppleDouble(int form, const char* szPath, const char* szName, int oflag) {
+    if (szPath == nullptr || szName == nullptr) {
+        errno = ENOENT;
+        return unit.Fail(Err::kBadArgument);
+    }
+    char path[kPathBufferSize];
+    if (MAVOEAPath(form, szPath, szName, path, MAVOEA_PATH_SIZE, EA_PLACE_APPLEDOUBLE) != 0) {
+        return -1;
+    }
+    const int fd = kernel::Open(path, oflag & ~O_CREAT, kMode);
+    if (fd >= 0 || errno != ENOENT) return fd;
+    return kernel::Open(path, oflag, kMode);
+}
+
+}  // namespace
+}  // namespace mavoea
+
+using namespace mavoea;
+
+int MAVOEAOpenNoADFS(int form, const char* szPath, const char* szName, int oflag) {
+    if (szPath == nullptr || szName == nullptr) {
+        errno = ENOENT;
+        return unit.Fail(Err::kBadArgument);
+    }
+    char path[kPathBufferSize];
+    if (MAVOEAPath(form, szPath, szName, path, MAVOEA_PATH_SIZE, EA_PLACE_EADIR) != 0) return -1;
+
+    if ((oflag & O_CREAT) != 0) {
+        char dir[kPathBufferSize];
+        if (MAVOEADirPath(form, szPath, dir, MAVOEA_PATH_SIZE) != 0) return -1;
+        if (MAVOEAMKDir(form == EA_FORM_FOLDER, dir) != 0) return -1;
+    }
+    if (form == EA_FORM_FOLDER) return kernel::Open(path, oflag, kMode);
+
+    const int fd = kernel::Open(path, oflag & ~O_CREAT, kMode);
+    if (fd >= 0 || errno != ENOENT) return fd;
+    return kernel::Open(path, oflag, kMode);
+}
+
+int MAVOEAOpen(int form, const char* szPath, const char* szName, int oflag, int place) {
+    switch (place) {
+        case EA_PLACE_EADIR:
+            return MAVOEAOpenNoADFS(form, szPath, szName, oflag);
+        case EA_PLACE_APPLEDOUBLE:
+            return OpenAppleDouble(form, szPath, szName, oflag);
+        default:
+            return unit.Fail(Err::kBadArgument);
+    }
+}

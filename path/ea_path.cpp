@@ -1,0 +1,100 @@
+// Metadata files in the EA directory, "<parent>/@eaDir/<name>@<kind>", and the choice between them
+// and the "._" file.
+
+#include <errno.h>
+
+#include <cstdint>
+#include <cstring>
+
+#include "include/mavoea.h"
+#include "path/ea_dir_path.h"
+#include "util/path_text.h"
+#include "util/unit.h"
+
+namespace mavoea {
+namespace {
+
+constexpr Unit unit("ea_path");
+
+constexpr std::int64_t kLongest = MAVOEA_PATH_SIZE;
+
+// "<name>@MavoEAStream" fits the 255 bytes of a file name.
+constexpr std::size_t kNameMax = 255 - 1 - std::string_view(MAVOEA_KIND_STREAM).size();
+static_assert(kNameMax == 242);
+
+// An extension survives shortening when it has at most this many bytes, its '.' included.
+constexpr std::size_t kExtensionMax = 6;
+
+// The character that stands for what shortening drops; the last one is a space.
+constexpr std::string_view kCheckCharacters =
+    "1234567890abcdefghijklmnopqrstuvwxyz-_=+';[]{}~`.!@#$%^&*() ";
+static_assert(kCheckCharacters.size() == 60);
+
+char CheckCharacter(std::string_view dropped) {
+    std::uint32_t sum = 0;
+    for (const char c : dropped) sum += static_cast<unsigned char>(c);
+    return kCheckCharacters[sum % kCheckCharacters.size()];
+}
+
+// Shortens a name of more than kNameMax bytes in place, to exactly kNameMax.
+void Shorten(char* name, std::size_t size) {
+    const std::string_view text(name, size);
+    // It stands for all from the last byte that has room on.
+    const char check = CheckCharacter({name + kNameMax - 1, size - (kNameMax - 1)});
+    const std::size_t dot = text.rfind('.');
+    const bool kept = dot != text.npos && size - dot <= kExtensionMax;
+    const std::size_t extension = kept ? size - dot : 0;
+    // The extension may overlap the place where it goes.
+    std::memmove(name + kNameMax - extension, name + size - extension, extension);
+    name[kNameMax - extension - 1] = check;
+}
+
+}  // namespace
+}  // namespace mavoea
+
+using namespace mavoea;
+
+int MAVOEAPathNoADFS(int form, const char* szPath, const char* szName, char* szBuf, int cbBuf) {
+    if (szPath == nullptr || szName == nullptr) return unit.Fail(Err::kBadArgument);
+    if (*szPath == '\0') return unit.Fail(Err::kBadArgument);
+
+    WorkingPath copy(szPath);
+    if (!copy.ok()) return unit.Fail(Err::kMemory);
+    std::string_view path = WithoutTrailingSlash(copy.text());
+
+    // Made on the name as it is; only the file form counts the NUL.
+    const std::string_view kind(szName);
+    const auto need =
+        static_cast<std::int64_t>(path.size() + kind.size()) + (form == EA_FORM_FILE ? 9 : 8);
+    if (need > cbBuf || need > kLongest) {
+        errno = ENAMETOOLONG;
+        return unit.Fail(Err::kNameTooLong);
+    }
+
+    const std::size_t parent_size = SplitObject(path).parent.size();
+    if (form == EA_FORM_FILE && path.size() - parent_size > kNameMax) {
+        Shorten(copy.data() + parent_size, path.size() - parent_size);
+        path = path.substr(0, parent_size + kNameMax);
+    }
+
+    char* const dir_end = DeriveDirPath(form, path, szBuf, cbBuf);
+    if (dir_end == nullptr) return -1;
+    PathWriter out(dir_end);
+    out.Add("/");
+    if (form == EA_FORM_FILE) out.Add(SplitObject(path).name).Add("@");
+    out.Add(kind).Finish();
+    return 0;
+}
+
+int MAVOEAPath(int form, const char* szPath, const char* szName, char* szBuf, int cbBuf,
+               int place) {
+    if (szPath == nullptr || szName == nullptr) return unit.Fail(Err::kBadArgument);
+    switch (place) {
+        case EA_PLACE_EADIR:
+            return MAVOEAPathNoADFS(form, szPath, szName, szBuf, cbBuf) == 0 ? 0 : -1;
+        case EA_PLACE_APPLEDOUBLE:
+            return MAVOEAADPath(szPath, szBuf, cbBuf) == 0 ? 0 : -1;
+        default:
+            return unit.Fail(Err::kBadArgument);
+    }
+}

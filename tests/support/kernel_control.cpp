@@ -1,0 +1,424 @@
+// The kernel seam that tests link.
+
+#include "tests/support/kernel_control.h"
+
+#include <errno.h>
+#include <fcntl.h>
+#include <stdlib.h>
+#include <sys/uio.h>
+#include <sys/xattr.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <optional>
+#include <utility>
+
+#include "platform/kernel.h"
+#include "platform/marks.h"
+
+namespace mavoea::test {
+namespace {
+
+struct Fault {
+    std::string name;  // empty: any call
+    int nth = 1;       // 0: every call
+    int error = 0;     // 0: a short transfer
+    size_t bytes = 0;
+    bool once = false;
+    int seen = 0;
+    bool fired = false;
+    std::string fired_name{};
+};
+
+struct State {
+    std::optional<Fault> fault;
+    std::vector<std::string> names;
+    std::vector<std::string> calls;
+    Allocations allocations;
+    KernelHooks hooks;
+};
+
+// Never destroyed: allocations go on while the process exits.
+State& TheState() {
+    static State& state = *new State;
+    return state;
+}
+
+void Arm(Fault fault) {
+    if (TheState().fault) abort();  // One at a time.
+    TheState().fault = std::move(fault);
+}
+
+void Disarm() { TheState().fault.reset(); }
+
+// True when this call is to fail; errno is then set.
+bool Fails(const std::string& name) {
+    auto& fault = TheState().fault;
+    if (!fault || fault->error == 0) return false;
+    if (!fault->name.empty() && fault->name != name) return false;
+    ++fault->seen;
+    if (fault->nth != 0 && fault->seen != fault->nth) return false;
+    fault->fired = true;
+    fault->fired_name = name;
+    errno = fault->error;
+    return true;
+}
+
+// How much of `size` this transfer may move.
+size_t Granted(const std::string& name, size_t size) {
+    auto& fault = TheState().fault;
+    if (!fault || fault->error != 0 || fault->name != name) return size;
+    ++fault->seen;
+    if (fault->seen < fault->nth) return size;
+    if (fault->seen > fault->nth) return fault->once ? size : 0;
+    fault->fired = true;
+    return std::min(size, fault->bytes);
+}
+
+void Note(const std::string& name, const std::string& call) {
+    const int saved = errno;
+    State& state = TheState();
+    if (state.hooks.before) state.hooks.before(name);
+    state.names.push_back(name);
+    state.calls.push_back(call);
+    errno = saved;
+}
+
+template <class Result, class Real>
+Result Call(const std::string& name, const std::string& arguments, Result failure, Real real) {
+    Note(name, name + "(" + arguments + ")");
+    if (Fails(name)) return failure;
+    return real();
+}
+
+std::string Text(const char* text) { return text == nullptr ? "NULL" : text; }
+std::string Number(long long value) { return std::to_string(value); }
+
+std::string WholePath(int dir, const char* path) {
+    if (dir == AT_FDCWD) return path;
+    const std::string link = "/proc/self/fd/" + std::to_string(dir);
+    return std::filesystem::read_symlink(link).string() + "/" + path;
+}
+
+std::string Octal(unsigned value) {
+    std::string text;
+    do {
+        text.insert(text.begin(), static_cast<char>('0' + value % 8));
+        value /= 8;
+    } while (value != 0);
+    return "0" + text;
+}
+
+std::string Flags(int flags) {
+    std::string text = (flags & O_ACCMODE) == O_RDWR     ? "O_RDWR"
+                       : (flags & O_ACCMODE) == O_WRONLY ? "O_WRONLY"
+                                                         : "O_RDONLY";
+    constexpr std::pair<int, const char*> kNames[] = {
+        {O_CREAT, "O_CREAT"},         {O_EXCL, "O_EXCL"},       {O_TRUNC, "O_TRUNC"},
+        {O_NONBLOCK, "O_NONBLOCK"},   {O_CLOEXEC, "O_CLOEXEC"}, {O_NOFOLLOW, "O_NOFOLLOW"},
+        {O_DIRECTORY, "O_DIRECTORY"},
+    };
+    for (const auto& [bit, name] : kNames) {
+        if ((flags & bit) != 0) text += std::string("|") + name;
+    }
+    return text;
+}
+
+size_t SizeOf(const iovec* parts, int count) {
+    size_t size = 0;
+    for (int i = 0; i < count; ++i) size += parts[i].iov_len;
+    return size;
+}
+
+// The first `size` bytes of `parts`.
+std::vector<iovec> Cut(const iovec* parts, int count, size_t size) {
+    std::vector<iovec> cut(parts, parts + count);
+    for (iovec& part : cut) {
+        part.iov_len = std::min(part.iov_len, size);
+        size -= part.iov_len;
+    }
+    return cut;
+}
+
+// Each block carries its size in front, so that what is live can be told.
+constexpr size_t kBlockHead = 16;
+
+void* Adopt(void* head, unsigned long long size) {
+    if (head == nullptr) return nullptr;
+    *static_cast<unsigned long long*>(head) = size;
+    return static_cast<char*>(head) + kBlockHead;
+}
+
+void* HeadOf(void* block) {
+    return block == nullptr ? nullptr : static_cast<char*>(block) - kBlockHead;
+}
+
+bool AllocationFails(unsigned long long size) {
+    Allocations& allocations = TheState().allocations;
+    allocations.largest = std::max(allocations.largest, size);
+    allocations.total += size;
+    if (Fails("malloc")) return true;
+    if (size > SIZE_MAX - kBlockHead) {
+        errno = ENOMEM;
+        return true;
+    }
+    return false;
+}
+
+}  // namespace
+
+FailNthCall::FailNthCall(int nth, int error) { Arm({.name = "", .nth = nth, .error = error}); }
+FailNthCall::~FailNthCall() { Disarm(); }
+bool FailNthCall::fired() const { return TheState().fault->fired; }
+std::string FailNthCall::name() const { return TheState().fault->fired_name; }
+
+FailCall::FailCall(std::string name, int error, int nth) {
+    Arm({.name = std::move(name), .nth = nth, .error = error});
+}
+FailCall::~FailCall() { Disarm(); }
+bool FailCall::fired() const { return TheState().fault->fired; }
+
+ShortCall::ShortCall(std::string name, int nth, size_t bytes, bool once) {
+    Arm({.name = std::move(name), .nth = nth, .error = 0, .bytes = bytes, .once = once});
+}
+ShortCall::~ShortCall() { Disarm(); }
+bool ShortCall::fired() const { return TheState().fault->fired; }
+
+std::vector<std::string> TakeCallNames() {
+    TheState().calls.clear();
+    return std::exchange(TheState().names, {});
+}
+
+std::vector<std::string> TakeCalls() {
+    TheState().names.clear();
+    return std::exchange(TheState().calls, {});
+}
+
+Allocations TakeAllocations() {
+    Allocations& now = TheState().allocations;
+    return std::exchange(now, Allocations{.live = now.live});
+}
+
+KernelHooks& Hooks() { return TheState().hooks; }
+
+void ResetKernel() {
+    State& state = TheState();
+    state.hooks = {};
+    state.names.clear();
+    state.calls.clear();
+    TakeAllocations();
+}
+
+}  // namespace mavoea::test
+
+namespace mavoea::kernel {
+
+using namespace mavoea::test;
+
+int Open(const char* path, int flags, mode_t mode) {
+    return Call("open", Text(path) + ", " + Flags(flags) + ", " + Octal(mode), -1,
+                [&] { return ::open(path, flags, mode); });
+}
+
+// Calls that take a directory are logged, and stood in for, under the whole path.
+int OpenAt(int dir, const char* path, int flags, mode_t mode) {
+    return Open(WholePath(dir, path).c_str(), flags, mode);
+}
+
+int Close(int fd) {
+    Note("close", "close()");
+    return ::close(fd);
+}
+
+ssize_t Pread(int fd, void* buffer, size_t size, off_t offset) {
+    return Call("pread", Number(static_cast<long long>(size)) + ", " + Number(offset), ssize_t{-1},
+                [&] { return ::pread(fd, buffer, Granted("pread", size), offset); });
+}
+
+ssize_t Preadv(int fd, const iovec* parts, int count, off_t offset) {
+    const size_t size = SizeOf(parts, count);
+    return Call("preadv", Number(static_cast<long long>(size)) + ", " + Number(offset), ssize_t{-1},
+                [&] {
+                    const auto cut = Cut(parts, count, Granted("preadv", size));
+                    return ::preadv(fd, cut.data(), count, offset);
+                });
+}
+
+ssize_t Pwrite(int fd, const void* bytes, size_t size, off_t offset) {
+    return Call("pwrite", Number(static_cast<long long>(size)) + ", " + Number(offset), ssize_t{-1},
+                [&] { return ::pwrite(fd, bytes, Granted("pwrite", size), offset); });
+}
+
+ssize_t Pwritev(int fd, const iovec* parts, int count, off_t offset) {
+    const size_t size = SizeOf(parts, count);
+    return Call("pwritev", Number(static_cast<long long>(size)) + ", " + Number(offset),
+                ssize_t{-1}, [&] {
+                    const auto cut = Cut(parts, count, Granted("pwritev", size));
+                    return ::pwritev(fd, cut.data(), count, offset);
+                });
+}
+
+off_t Lseek(int fd, off_t offset, int whence) {
+    return Call("lseek", Number(offset) + ", " + Number(whence), off_t{-1},
+                [&] { return ::lseek(fd, offset, whence); });
+}
+
+int Ftruncate(int fd, off_t size) {
+    return Call("ftruncate", Number(size), -1, [&] { return ::ftruncate(fd, size); });
+}
+
+int Fsync(int fd) {
+    return Call("fsync", "", -1, [&] { return Hooks().fsync ? Hooks().fsync(fd) : ::fsync(fd); });
+}
+
+void Sync() {
+    Note("sync", "sync()");
+    if (Hooks().sync) {
+        Hooks().sync();
+    } else {
+        ::sync();
+    }
+}
+
+int Fstat(int fd, struct stat* info) {
+    return Call("fstat", "", -1, [&] { return ::fstat(fd, info); });
+}
+
+int Stat(const char* path, struct stat* info) {
+    return Call("stat", Text(path), -1,
+                [&] { return Hooks().stat ? Hooks().stat(path, info) : ::stat(path, info); });
+}
+
+int Lstat(const char* path, struct stat* info) {
+    return Call("lstat", Text(path), -1,
+                [&] { return Hooks().lstat ? Hooks().lstat(path, info) : ::lstat(path, info); });
+}
+
+int SetLock(int fd, const struct flock64* lock) {
+    return Call("setlock", Number(lock->l_type), -1, [&] { return ::fcntl(fd, F_SETLK64, lock); });
+}
+
+int GetLock(int fd, struct flock64* lock) {
+    return Call("getlock", Number(lock->l_type), -1, [&] { return ::fcntl(fd, F_GETLK64, lock); });
+}
+
+int MkdirAt(int dir, const char* path, mode_t mode) {
+    const std::string whole = WholePath(dir, path);
+    return Call("mkdir", whole + ", " + Octal(mode), -1, [&] {
+        return Hooks().mkdir ? Hooks().mkdir(whole.c_str(), mode) : ::mkdirat(dir, path, mode);
+    });
+}
+
+int Chmod(const char* path, mode_t mode) {
+    return Call("chmod", Text(path) + ", " + Octal(mode), -1,
+                [&] { return Hooks().chmod ? Hooks().chmod(path, mode) : ::chmod(path, mode); });
+}
+
+int Fchmod(int fd, mode_t mode) {
+    return Call("fchmod", Octal(mode), -1, [&] { return ::fchmod(fd, mode); });
+}
+
+uid_t Geteuid() {
+    Note("geteuid", "geteuid()");
+    return Hooks().geteuid ? Hooks().geteuid() : ::geteuid();
+}
+
+int Seteuid(uid_t uid) {
+    return Call("seteuid", Number(uid), -1,
+                [&] { return Hooks().seteuid ? Hooks().seteuid(uid) : ::seteuid(uid); });
+}
+
+pid_t Getpid() {
+    Note("getpid", "getpid()");
+    return ::getpid();
+}
+
+ssize_t Listxattr(const char* path, char* names, size_t size) {
+    return Call("listxattr", Text(path) + ", " + Number(static_cast<long long>(size)), ssize_t{-1},
+                [&] {
+                    return Hooks().listxattr ? Hooks().listxattr(path, names, size)
+                                             : ::listxattr(path, names, size);
+                });
+}
+
+ssize_t Getxattr(const char* path, const char* name, void* value, size_t size) {
+    return Call("getxattr",
+                Text(path) + ", " + Text(name) + ", " + Number(static_cast<long long>(size)),
+                ssize_t{-1}, [&] {
+                    return Hooks().getxattr ? Hooks().getxattr(path, name, value, size)
+                                            : ::getxattr(path, name, value, size);
+                });
+}
+
+int Setxattr(const char* path, const char* name, const void* value, size_t size, int flags) {
+    return Call("setxattr",
+                Text(path) + ", " + Text(name) + ", " + Number(static_cast<long long>(size)) +
+                    ", " + Number(flags),
+                -1, [&] {
+                    return Hooks().setxattr ? Hooks().setxattr(path, name, value, size, flags)
+                                            : ::setxattr(path, name, value, size, flags);
+                });
+}
+
+int Removexattr(const char* path, const char* name) {
+    return Call("removexattr", Text(path) + ", " + Text(name), -1, [&] {
+        return Hooks().removexattr ? Hooks().removexattr(path, name) : ::removexattr(path, name);
+    });
+}
+
+FILE* Fopen(const char* path, const char* mode) {
+    return Call("fopen", Text(path) + ", " + mode, static_cast<FILE*>(nullptr),
+                [&] { return Hooks().fopen ? Hooks().fopen(path, mode) : ::fopen(path, mode); });
+}
+
+size_t Fread(void* buffer, size_t size, FILE* stream) {
+    return Call("fread", Number(static_cast<long long>(size)), size_t{0},
+                [&] { return ::fread(buffer, 1, Granted("fread", size), stream); });
+}
+
+size_t Fwrite(const void* bytes, size_t size, FILE* stream) {
+    return Call("fwrite", Number(static_cast<long long>(size)), size_t{0},
+                [&] { return ::fwrite(bytes, 1, Granted("fwrite", size), stream); });
+}
+
+// A close that is made to fail closes all the same, as the C library's does.
+int Fclose(FILE* stream) {
+    Note("fclose", "fclose()");
+    const int result = ::fclose(stream);
+    return Fails("fclose") ? EOF : result;
+}
+
+int SetArchiveBit(int fd) {
+    return Call("archive", "", -1,
+                [&] { return Hooks().archive ? Hooks().archive(fd) : marks::SetArchiveBit(fd); });
+}
+
+void* Allocate(unsigned long long size) {
+    if (AllocationFails(size)) return nullptr;
+    void* const head = ::malloc(static_cast<size_t>(size) + kBlockHead);
+    if (head != nullptr) ++TheState().allocations.live;
+    return Adopt(head, size);
+}
+
+void* AllocateZeroed(unsigned long long size) {
+    if (AllocationFails(size)) return nullptr;
+    void* const head = ::calloc(1, static_cast<size_t>(size) + kBlockHead);
+    if (head != nullptr) ++TheState().allocations.live;
+    return Adopt(head, size);
+}
+
+void* Reallocate(void* block, unsigned long long size) {
+    if (AllocationFails(size)) return nullptr;
+    void* const head = ::realloc(HeadOf(block), static_cast<size_t>(size) + kBlockHead);
+    if (head != nullptr && block == nullptr) ++TheState().allocations.live;
+    return Adopt(head, size);
+}
+
+void Free(void* block) {
+    if (block == nullptr) return;
+    --TheState().allocations.live;
+    ::free(HeadOf(block));
+}
+
+}  // namespace mavoea::kernel

@@ -1,0 +1,92 @@
+// The process around a test: other users, other programs, open descriptors.
+#ifndef MAVOEA_TESTS_SUPPORT_PROCESS_H_
+#define MAVOEA_TESTS_SUPPORT_PROCESS_H_
+
+#include <errno.h>
+#include <grp.h>
+#include <gtest/gtest.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <string.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <functional>
+#include <iterator>
+#include <string>
+
+namespace mavoea::test {
+
+inline bool RunsAsRoot() { return ::geteuid() == 0; }
+
+// Whether the child of AsUser() can go back to uid 0.
+enum class Root { kSaved, kGivenUp };
+
+// Runs `body` in a child process whose real and effective uid and gid are `id`. Expectations that
+// fail in it are printed there and fail the test here. For tests that run as root.
+inline void AsUser(uid_t id, Root root, const std::function<void()>& body) {
+    fflush(nullptr);
+    const pid_t child = fork();
+    ASSERT_LE(0, child) << strerror(errno);
+    if (child == 0) {
+        const uid_t saved = root == Root::kSaved ? 0 : id;
+        if (setgroups(0, nullptr) != 0 || setresgid(id, id, id) != 0 ||
+            setresuid(id, id, saved) != 0) {
+            fprintf(stderr, "cannot become user %u: %s\n", id, strerror(errno));
+            _exit(2);
+        }
+        body();
+        fflush(nullptr);
+        _exit(::testing::Test::HasFailure() ? 1 : 0);
+    }
+    int status = 0;
+    ASSERT_EQ(child, waitpid(child, &status, 0)) << strerror(errno);
+    EXPECT_EQ(0, status) << "wait status of the child that was user " << id;
+}
+
+inline long OpenDescriptors() {
+    const std::filesystem::directory_iterator all("/proc/self/fd");
+    return std::distance(begin(all), end(all));
+}
+
+// Sets the umask until the end of its scope.
+class Umask {
+ public:
+    explicit Umask(mode_t mask) : former_(::umask(mask)) {}
+    ~Umask() { ::umask(former_); }
+    Umask(const Umask&) = delete;
+    Umask& operator=(const Umask&) = delete;
+
+ private:
+    mode_t former_;
+};
+
+// Runs a shell command; returns what it wrote to standard output, and its exit status (-1 when
+// there is none).
+struct ProgramResult {
+    std::string output;
+    int status = -1;
+};
+
+inline ProgramResult RunProgram(const std::string& command) {
+    ProgramResult result;
+    FILE* const pipe = popen(command.c_str(), "r");
+    if (pipe == nullptr) return result;
+    char part[4096];
+    for (size_t size = 0; (size = fread(part, 1, sizeof part, pipe)) > 0;) {
+        result.output.append(part, size);
+    }
+    const int status = pclose(pipe);
+    if (WIFEXITED(status)) result.status = WEXITSTATUS(status);
+    return result;
+}
+
+inline bool HasProgram(const std::string& name) {
+    return RunProgram("command -v " + name + " 2>/dev/null").status == 0;
+}
+
+}  // namespace mavoea::test
+
+#endif  // MAVOEA_TESTS_SUPPORT_PROCESS_H_

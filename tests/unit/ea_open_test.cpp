@@ -1,0 +1,665 @@
+// Opening metadata files in both places, and the EA directory that comes with creating one.
+
+#include <errno.h>
+#include <fcntl.h>
+#include <stdio.h>
+#include <string.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <string>
+#include <vector>
+
+#include "include/mavoea.h"
+#include "tests/support/fake_platform.h"
+#include "tests/support/kernel_control.h"
+#include "tests/support/process.h"
+#include "tests/support/temp_dir.h"
+
+namespace mavoea::test {
+namespace {
+
+using ::testing::Contains;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using ::testing::Not;
+
+constexpr char kStream[] = "MavoEAStream";
+constexpr char kResource[] = "MavoResource";
+constexpr char kUnit[] = "ea_open";
+constexpr uid_t kUser = 1000;
+
+class EaOpenTest : public ::testing::Test {
+ protected:
+    void SetUp() override {
+        ResetKernel();
+        ResetPlatform();
+        WriteFile(object_, Ascii("data"));
+        BeUser(0);
+        live_blocks_ = TakeAllocations().live;
+        descriptors_ = OpenDescriptors();
+    }
+
+    void TearDown() override {
+        EXPECT_EQ(live_blocks_, TakeAllocations().live);
+        EXPECT_EQ(descriptors_, OpenDescriptors());
+        ResetKernel();
+        ResetPlatform();
+    }
+
+    void BeUser(uid_t uid) {
+        uid_ = uid;
+        Hooks().geteuid = [this] { return uid_; };
+        Hooks().seteuid = [this](uid_t to) {
+            uid_ = to;
+            return 0;
+        };
+    }
+
+    static void BeWhoWeAre() {
+        Hooks().geteuid = nullptr;
+        Hooks().seteuid = nullptr;
+    }
+
+    static void ExpectNothingReported() {
+        EXPECT_THAT(TakeRecords(), IsEmpty());
+        EXPECT_THAT(TakeLog(), IsEmpty());
+    }
+
+    static void ExpectOnly(int code, const std::string& unit) {
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(code, unit)));
+    }
+
+    // The open calls made for `path`, without the path: "O_RDWR|O_CREAT, 0777".
+    static std::vector<std::string> OpensOf(const std::string& path) {
+        const std::string start = "open(" + path + ", ";
+        std::vector<std::string> opens;
+        for (const std::string& call : TakeCalls()) {
+            if (call.starts_with(start)) {
+                opens.push_back(call.substr(start.size(), call.size() - start.size() - 1));
+            }
+        }
+        return opens;
+    }
+
+    static void ExpectFailed(int error, int fd) {
+        const int found = errno;
+        EXPECT_EQ(-1, fd);
+        EXPECT_EQ(error, found) << strerror(found);
+        ExpectNothingReported();
+    }
+
+    void MakeEaDir() const { ASSERT_EQ(0, ::mkdir(ea_dir_.c_str(), 0777)); }
+
+    TempDir dir_;
+    const std::string object_ = dir_ / "a.txt";
+    const std::string ea_dir_ = dir_ / "@eaDir";
+    const std::string stream_ = ea_dir_ + "/a.txt@MavoEAStream";
+    const std::string resource_ = ea_dir_ + "/a.txt@MavoResource";
+    const std::string folder_ = ea_dir_ + "/a.txt";
+    const std::string legacy_ = folder_ + "/MAVO:Resource";
+    const std::string sidecar_ = dir_ / "._a.txt";
+    uid_t uid_ = 0;
+    int live_blocks_ = 0;
+    long descriptors_ = 0;
+};
+
+// A descriptor that is closed at the end of its scope.
+class Fd {
+ public:
+    explicit Fd(int fd) : fd_(fd) {}
+    ~Fd() {
+        if (fd_ >= 0) ::close(fd_);
+    }
+    Fd(const Fd&) = delete;
+    Fd& operator=(const Fd&) = delete;
+
+    bool ok() const { return fd_ >= 0; }
+    bool Write(const std::string& text) const {
+        return ::write(fd_, text.data(), text.size()) == static_cast<ssize_t>(text.size());
+    }
+    std::string Read() const {
+        char text[64];
+        const ssize_t size = ::read(fd_, text, sizeof text);
+        return size < 0 ? "(not readable)" : std::string(text, static_cast<size_t>(size));
+    }
+
+ private:
+    int fd_;
+};
+
+// ---- In the EA directory --------------------------------------------------------------------
+
+// MAVOEAOpen() for place 0 and MAVOEAOpenNoADFS() are the same.
+class EaOpenInEaDirTest : public EaOpenTest, public ::testing::WithParamInterface<bool> {
+ protected:
+    static int Open(int form, const char* path, const char* name, int oflag) {
+        return GetParam() ? MAVOEAOpen(form, path, name, oflag, EA_PLACE_EADIR)
+                          : MAVOEAOpenNoADFS(form, path, name, oflag);
+    }
+    int OpenStream(int oflag) const { return Open(1, object_.c_str(), kStream, oflag); }
+};
+
+INSTANTIATE_TEST_SUITE_P(With, EaOpenInEaDirTest, ::testing::Bool(), [](const auto& through) {
+    return through.param ? "MAVOEAOpen" : "MAVOEAOpenNoADFS";
+});
+
+TEST_P(EaOpenInEaDirTest, CreatingMakesTheEaDirectoryAndAnEmptyFile) {
+    TakeCalls();
+    const Fd fd(OpenStream(O_RDWR | O_CREAT));
+    ASSERT_TRUE(fd.ok());
+    // Looked for first, so that whatever is there already is found before anything is created.
+    EXPECT_THAT(OpensOf(stream_), ElementsAre("O_RDWR, 0777", "O_RDWR|O_CREAT, 0777"));
+    EXPECT_EQ(0777, ModeOf(ea_dir_));
+    EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("a.txt@MavoEAStream"));
+    EXPECT_EQ(Bytes(), ReadFile(stream_));
+    EXPECT_THAT(TakePlatformCalls(), Contains("MAVOACLSetEADirACL(" + ea_dir_ + ")"));
+    EXPECT_TRUE(fd.Write("stream"));
+    EXPECT_EQ(Ascii("stream"), ReadFile(stream_));
+    ExpectNothingReported();
+}
+
+TEST_P(EaOpenInEaDirTest, TheUmaskNarrowsTheFileButNotTheDirectory) {
+    const Umask umask(027);
+    const Fd fd(OpenStream(O_RDWR | O_CREAT));
+    ASSERT_TRUE(fd.ok());
+    EXPECT_EQ(0750, ModeOf(stream_));
+    EXPECT_EQ(0777, ModeOf(ea_dir_));
+}
+
+TEST_P(EaOpenInEaDirTest, AFileThatExistsIsOpenedWithoutCreating) {
+    MakeEaDir();
+    WriteFile(stream_, Ascii("stream"));
+    TakeCalls();
+    const Fd fd(OpenStream(O_RDWR | O_CREAT));
+    ASSERT_TRUE(fd.ok());
+    EXPECT_THAT(OpensOf(stream_), ElementsAre("O_RDWR, 0777"));
+    EXPECT_EQ("stream", fd.Read());
+    ExpectNothingReported();
+}
+
+TEST_P(EaOpenInEaDirTest, AnEaDirectoryThatExistsKeepsItsMode) {
+    ASSERT_EQ(0, ::mkdir(ea_dir_.c_str(), 0700));
+    const Fd fd(OpenStream(O_RDWR | O_CREAT));
+    EXPECT_TRUE(fd.ok());
+    EXPECT_EQ(0700, ModeOf(ea_dir_));
+    EXPECT_THAT(TakePlatformCalls(), Not(Contains("MAVOACLSetEADirACL(" + ea_dir_ + ")")));
+}
+
+TEST_P(EaOpenInEaDirTest, ReadOnlyIsReadOnly) {
+    MakeEaDir();
+    WriteFile(stream_, Ascii("stream"));
+    TakeCalls();
+    const Fd fd(OpenStream(0));
+    ASSERT_TRUE(fd.ok());
+    EXPECT_THAT(OpensOf(stream_), ElementsAre("O_RDONLY, 0777"));
+    EXPECT_EQ("stream", fd.Read());
+    EXPECT_FALSE(fd.Write("x"));
+    ExpectNothingReported();
+}
+
+TEST_P(EaOpenInEaDirTest, TruncatingEmptiesAFileThatExists) {
+    MakeEaDir();
+    WriteFile(resource_, Ascii("resource"));
+    TakeCalls();
+    const Fd fd(Open(1, object_.c_str(), kResource, O_RDWR | O_CREAT | O_TRUNC));
+    ASSERT_TRUE(fd.ok());
+    EXPECT_THAT(OpensOf(resource_), ElementsAre("O_RDWR|O_TRUNC, 0777"));
+    EXPECT_EQ(Bytes(), ReadFile(resource_));
+    ExpectNothingReported();
+}
+
+TEST_P(EaOpenInEaDirTest, TruncatingCreatesAFileThatIsMissing) {
+    TakeCalls();
+    const Fd fd(Open(1, object_.c_str(), kResource, O_RDWR | O_CREAT | O_TRUNC));
+    ASSERT_TRUE(fd.ok());
+    EXPECT_THAT(OpensOf(resource_),
+                ElementsAre("O_RDWR|O_TRUNC, 0777", "O_RDWR|O_CREAT|O_TRUNC, 0777"));
+    EXPECT_EQ(Bytes(), ReadFile(resource_));
+    ExpectNothingReported();
+}
+
+TEST_P(EaOpenInEaDirTest, AMissingFileFailsWithEnoentAfterASecondLookAndMakesNoEaDirectory) {
+    for (const int oflag : {0, O_RDWR, O_RDWR | O_TRUNC}) {
+        SCOPED_TRACE(oflag);
+        TakeCalls();
+        errno = 0;
+        ExpectFailed(ENOENT, OpenStream(oflag));
+        const auto opens = OpensOf(stream_);
+        ASSERT_EQ(2u, opens.size());
+        EXPECT_EQ(opens[0], opens[1]);
+        EXPECT_THAT(NamesIn(dir_.path()), ElementsAre("a.txt"));
+    }
+    ExpectFailed(ENOENT, Open(0, object_.c_str(), "MAVO:Resource", 0));
+    ExpectFailed(ENOENT, Open(2, object_.c_str(), kStream, 0));
+    EXPECT_THAT(NamesIn(dir_.path()), ElementsAre("a.txt"));
+    EXPECT_THAT(TakeCallNames(), Not(Contains("mkdir")));
+}
+
+TEST_P(EaOpenInEaDirTest, AFileThatAppearsBetweenTheTwoLooksIsOpened) {
+    MakeEaDir();
+    int opens = 0;
+    Hooks().before = [&](const std::string& name) {
+        if (name == "open" && ++opens == 2) WriteFile(stream_, Ascii("just made"));
+    };
+    const Fd fd(OpenStream(0));
+    ASSERT_TRUE(fd.ok());
+    EXPECT_EQ("just made", fd.Read());
+    ExpectNothingReported();
+}
+
+TEST_P(EaOpenInEaDirTest, AnyOtherFailureOfTheFirstOpenIsFinal) {
+    MakeEaDir();
+    for (const int error : {EACCES, EMFILE, EISDIR, ENOTDIR, EEXIST, EIO}) {
+        SCOPED_TRACE(strerror(error));
+        TakeCalls();
+        const FailCall fault("open", error);
+        ExpectFailed(error, OpenStream(O_RDWR | O_CREAT));
+        EXPECT_THAT(OpensOf(stream_), ElementsAre("O_RDWR, 0777"));
+    }
+    EXPECT_FALSE(Exists(stream_));
+}
+
+TEST_P(EaOpenInEaDirTest, AFailureOfTheSecondOpenIsFinal) {
+    MakeEaDir();
+    const FailCall fault("open", ENOSPC, 2);
+    ExpectFailed(ENOSPC, OpenStream(O_RDWR | O_CREAT));
+}
+
+TEST_P(EaOpenInEaDirTest, ADirectoryInPlaceOfTheFileFailsWithEisdir) {
+    MakeEaDir();
+    ASSERT_EQ(0, ::mkdir(stream_.c_str(), 0777));
+    TakeCalls();
+    ExpectFailed(EISDIR, OpenStream(O_RDWR | O_CREAT));
+    EXPECT_THAT(OpensOf(stream_), ElementsAre("O_RDWR, 0777"));
+}
+
+TEST_P(EaOpenInEaDirTest, AFileInPlaceOfTheEaDirectoryFailsWithEnotdir) {
+    WriteFile(ea_dir_, Ascii("in the way"));
+    ExpectFailed(ENOTDIR, OpenStream(O_RDWR | O_CREAT));
+    ExpectFailed(ENOTDIR, OpenStream(0));
+    EXPECT_EQ(Ascii("in the way"), ReadFile(ea_dir_));
+}
+
+TEST_P(EaOpenInEaDirTest, AnEaDirectoryThatCannotBeMadeFailsWithItsCodeAndOpensNothing) {
+    const std::string object = dir_ / "none/a.txt";
+    TakeCalls();
+    errno = 0;
+    EXPECT_EQ(-1, Open(1, object.c_str(), kStream, O_RDWR | O_CREAT));
+    EXPECT_EQ(ENOENT, errno);
+    ExpectOnly(0x3C00, "ea_mkdir.c");
+    EXPECT_THAT(OpensOf(dir_ / "none/@eaDir/a.txt@MavoEAStream"), IsEmpty());
+}
+
+TEST_P(EaOpenInEaDirTest, ATrailingSlashOfTheObjectIsIgnored) {
+    const Fd fd(Open(1, (object_ + "/").c_str(), kStream, O_RDWR | O_CREAT));
+    EXPECT_TRUE(fd.ok());
+    EXPECT_TRUE(Exists(stream_));
+}
+
+TEST_P(EaOpenInEaDirTest, TheObjectItselfNeedNotExist) {
+    const Fd fd(Open(1, (dir_ / "b").c_str(), kStream, O_RDWR | O_CREAT));
+    EXPECT_TRUE(fd.ok());
+    EXPECT_TRUE(Exists(ea_dir_ + "/b@MavoEAStream"));
+    EXPECT_FALSE(Exists(dir_ / "b"));
+}
+
+TEST_P(EaOpenInEaDirTest, TheFolderFormMakesTheEaDirectoryAndTheFolderAndOpensOnce) {
+    TakeCalls();
+    const Fd fd(Open(0, object_.c_str(), "MAVO:Resource", O_RDWR | O_CREAT));
+    ASSERT_TRUE(fd.ok());
+    EXPECT_THAT(OpensOf(legacy_), ElementsAre("O_RDWR|O_CREAT, 0777"));
+    EXPECT_EQ(0777, ModeOf(ea_dir_));
+    EXPECT_EQ(0777, ModeOf(folder_));
+    EXPECT_THAT(NamesIn(folder_), ElementsAre("MAVO:Resource"));
+    EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("a.txt"));
+    ExpectNothingReported();
+}
+
+TEST_P(EaOpenInEaDirTest, TheFolderFormWithoutCreatingOpensOnceAndMakesNothing) {
+    TakeCalls();
+    ExpectFailed(ENOENT, Open(0, object_.c_str(), "MAVO:Resource", O_RDWR));
+    EXPECT_THAT(OpensOf(legacy_), ElementsAre("O_RDWR, 0777"));
+    EXPECT_FALSE(Exists(ea_dir_));
+}
+
+TEST_P(EaOpenInEaDirTest, TheFolderFormOpensWhatIsThere) {
+    MakeEaDir();
+    ASSERT_EQ(0, ::mkdir(folder_.c_str(), 0777));
+    WriteFile(legacy_, Ascii("legacy"));
+    TakeCalls();
+    {
+        const Fd fd(Open(0, object_.c_str(), "MAVO:Resource", 0));
+        ASSERT_TRUE(fd.ok());
+        EXPECT_EQ("legacy", fd.Read());
+    }
+    EXPECT_THAT(OpensOf(legacy_), ElementsAre("O_RDONLY, 0777"));
+    {
+        const Fd fd(Open(0, object_.c_str(), "MAVO:Resource", O_RDWR | O_CREAT | O_TRUNC));
+        ASSERT_TRUE(fd.ok());
+    }
+    EXPECT_THAT(OpensOf(legacy_), ElementsAre("O_RDWR|O_CREAT|O_TRUNC, 0777"));
+    EXPECT_EQ(Bytes(), ReadFile(legacy_));
+    ExpectNothingReported();
+}
+
+TEST_P(EaOpenInEaDirTest, AnyOtherFormNamesTheFileAfterTheKindAloneAndLooksTwice) {
+    for (const int form : {2, -1}) {
+        SCOPED_TRACE(form);
+        const std::string kind = "kind" + std::to_string(form);
+        TakeCalls();
+        const Fd fd(Open(form, object_.c_str(), kind.c_str(), O_RDWR | O_CREAT));
+        EXPECT_TRUE(fd.ok());
+        EXPECT_THAT(OpensOf(ea_dir_ + "/" + kind),
+                    ElementsAre("O_RDWR, 0777", "O_RDWR|O_CREAT, 0777"));
+    }
+    EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("kind-1", "kind2"));
+    ExpectNothingReported();
+}
+
+TEST_P(EaOpenInEaDirTest, NullArgumentsFailWith0xD00AndEnoent) {
+    TakeCallNames();
+    for (const int oflag : {0, O_RDWR | O_CREAT}) {
+        errno = 0;
+        EXPECT_EQ(-1, Open(1, nullptr, kStream, oflag));
+        EXPECT_EQ(ENOENT, errno);
+        ExpectOnly(0xD00, kUnit);
+        errno = 0;
+        EXPECT_EQ(-1, Open(1, object_.c_str(), nullptr, oflag));
+        EXPECT_EQ(ENOENT, errno);
+        ExpectOnly(0xD00, kUnit);
+    }
+    EXPECT_THAT(TakeCallNames(), IsEmpty());
+    EXPECT_THAT(TakeLog(), IsEmpty());
+}
+
+TEST_P(EaOpenInEaDirTest, ErrorsOfThePathStandAsTheyWereRecorded) {
+    TakeCallNames();
+    EXPECT_EQ(-1, Open(1, "", kStream, O_RDWR | O_CREAT));
+    ExpectOnly(0xD00, "ea_path");
+
+    const std::string endless = "/" + std::string(5000, 'a');
+    errno = 0;
+    EXPECT_EQ(-1, Open(1, endless.c_str(), kStream, O_RDWR | O_CREAT));
+    EXPECT_EQ(ENAMETOOLONG, errno);
+    ExpectOnly(0xC300, "ea_path");
+    EXPECT_THAT(TakeCallNames(), IsEmpty());
+    EXPECT_THAT(TakeLog(), IsEmpty());
+}
+
+// A form-1 path needs its length, that of the kind, and 9 bytes more, of which 4096 may be used.
+TEST_P(EaOpenInEaDirTest, ThePathMayFillTheBufferOf4096Bytes) {
+    const std::string longest = "/" + std::string(4096 - 9 - strlen(kStream) - 1, 'a');
+    errno = 0;
+    EXPECT_EQ(-1, Open(1, longest.c_str(), kStream, 0));
+    EXPECT_EQ(ENOENT, errno);  // "/@eaDir/aa...": shortened, and not there
+    ExpectNothingReported();
+    EXPECT_EQ(-1, Open(1, (longest + "a").c_str(), kStream, 0));
+    ExpectOnly(0xC300, "ea_path");
+}
+
+TEST_P(EaOpenInEaDirTest, EveryFailingCallIsReportedOnceAndLeavesNothingOpen) {
+    for (const int form : {1, 0}) {
+        for (int nth = 1;; ++nth) {
+            SCOPED_TRACE(std::to_string(form) + " " + std::to_string(nth));
+            ASSERT_LT(nth, 100);
+            const TempDir parent;
+            const std::string object = parent / "a.txt";
+            const std::string file =
+                parent / (form == 1 ? "@eaDir/a.txt@MavoEAStream" : "@eaDir/a.txt/MavoEAStream");
+            BeUser(kUser);
+            TakeCalls();
+            errno = 0;
+            const FailNthCall fault(nth, EIO);
+            const int fd = Open(form, object.c_str(), kStream, O_RDWR | O_CREAT);
+            const int error = errno;
+            std::vector<std::string> calls = TakeCalls();
+            const bool metadata_opened =
+                !calls.empty() && calls.back().starts_with("open(" + file + ", ");
+            if (!fault.fired()) {
+                EXPECT_LE(0, fd);
+                ::close(fd);
+                ExpectNothingReported();
+                EXPECT_EQ(kUser, uid_);
+                break;
+            }
+            if (fault.name() == "seteuid" && fd >= 0) {  // back again: not looked at
+                ::close(fd);
+                EXPECT_EQ(0u, uid_);
+                ExpectNothingReported();
+                continue;
+            }
+            EXPECT_EQ(-1, fd);
+            EXPECT_EQ(EIO, error);
+            EXPECT_EQ(kUser, uid_);
+            if (metadata_opened) {
+                ExpectNothingReported();
+            } else {
+                EXPECT_EQ(1u, TakeRecords().size());
+                EXPECT_FALSE(Exists(file));
+            }
+            EXPECT_EQ(descriptors_, OpenDescriptors());
+            EXPECT_EQ(live_blocks_, TakeAllocations().live);
+        }
+    }
+}
+
+// ---- As another user ------------------------------------------------------------------------
+
+TEST_P(EaOpenInEaDirTest, TheDirectoryIsMadeByTheSuperuserAndTheFileByTheUser) {
+    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    BeWhoWeAre();
+    ASSERT_EQ(0, chmod(dir_.path().c_str(), 0755));  // the user may not write here
+    AsUser(kUser, Root::kSaved, [this] {
+        const Fd fd(OpenStream(O_RDWR | O_CREAT));
+        EXPECT_TRUE(fd.ok()) << strerror(errno);
+        EXPECT_EQ(kUser, ::geteuid());
+    });
+    struct stat info;
+    ASSERT_EQ(0, stat(ea_dir_.c_str(), &info));
+    EXPECT_EQ(0u, info.st_uid);
+    ASSERT_EQ(0, stat(stream_.c_str(), &info));
+    EXPECT_EQ(kUser, info.st_uid);
+}
+
+TEST_P(EaOpenInEaDirTest, AFileThatTheUserMayNotOpenFailsWithEaccesOnce) {
+    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    BeWhoWeAre();
+    MakeEaDir();
+    WriteFile(stream_, Ascii("stream"));
+    ASSERT_EQ(0, chmod(stream_.c_str(), 0600));
+    AsUser(65534, Root::kGivenUp, [this] {
+        TakeCalls();
+        ExpectFailed(EACCES, OpenStream(0));
+        EXPECT_THAT(OpensOf(stream_), ElementsAre("O_RDONLY, 0777"));
+    });
+    AsUser(kUser, Root::kSaved, [this] {
+        TakeCalls();
+        ExpectFailed(EACCES, OpenStream(O_RDWR | O_CREAT));
+        EXPECT_THAT(OpensOf(stream_), ElementsAre("O_RDWR, 0777"));
+    });
+}
+
+TEST_P(EaOpenInEaDirTest, WhoCannotBecomeTheSuperuserCannotCreateEvenWhereTheDirectoryExists) {
+    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    BeWhoWeAre();
+    MakeEaDir();
+    ASSERT_EQ(0, chmod(ea_dir_.c_str(), 0777));
+    WriteFile(stream_, Ascii("stream"));
+    AsUser(65534, Root::kGivenUp, [this] {
+        EXPECT_EQ(-1, OpenStream(O_RDWR | O_CREAT));
+        EXPECT_EQ(EPERM, errno);
+        ExpectOnly(0x3C00, "ea_mkdir.c");
+        const Fd fd(OpenStream(0));
+        EXPECT_EQ("stream", fd.Read());
+    });
+}
+
+// ---- Beside the object ----------------------------------------------------------------------
+
+class EaOpenAppleDoubleTest : public EaOpenTest {
+ protected:
+    int Open(int oflag) const { return MAVOEAOpen(1, object_.c_str(), kStream, oflag, 1); }
+};
+
+TEST_F(EaOpenAppleDoubleTest, CreatingMakesTheFileBesideTheObjectAndNoEaDirectory) {
+    TakeCalls();
+    {
+        const Fd fd(Open(O_RDWR | O_CREAT));
+        ASSERT_TRUE(fd.ok());
+        EXPECT_TRUE(fd.Write("double"));
+    }
+    EXPECT_THAT(OpensOf(sidecar_), ElementsAre("O_RDWR, 0777", "O_RDWR|O_CREAT, 0777"));
+    EXPECT_THAT(NamesIn(dir_.path()), ElementsAre("._a.txt", "a.txt"));
+    EXPECT_EQ(Ascii("double"), ReadFile(sidecar_));
+    EXPECT_THAT(TakePlatformCalls(), IsEmpty());
+    ExpectNothingReported();
+}
+
+TEST_F(EaOpenAppleDoubleTest, NothingButTheTwoOpensIsCalled) {
+    TakeCallNames();
+    ExpectFailed(ENOENT, Open(0));
+    EXPECT_THAT(TakeCallNames(), ElementsAre("open", "open"));
+}
+
+TEST_F(EaOpenAppleDoubleTest, TheUmaskNarrowsTheFile) {
+    const Umask umask(022);
+    const Fd fd(Open(O_RDWR | O_CREAT));
+    EXPECT_TRUE(fd.ok());
+    EXPECT_EQ(0755, ModeOf(sidecar_));
+}
+
+TEST_F(EaOpenAppleDoubleTest, AFileThatExistsIsOpenedOnce) {
+    WriteFile(sidecar_, Ascii("double"));
+    TakeCalls();
+    {
+        const Fd fd(Open(O_RDWR | O_CREAT));
+        EXPECT_EQ("double", fd.Read());
+    }
+    EXPECT_THAT(OpensOf(sidecar_), ElementsAre("O_RDWR, 0777"));
+    {
+        const Fd fd(Open(0));
+        EXPECT_EQ("double", fd.Read());
+        EXPECT_FALSE(fd.Write("x"));
+    }
+    EXPECT_THAT(OpensOf(sidecar_), ElementsAre("O_RDONLY, 0777"));
+    {
+        const Fd fd(Open(O_RDWR | O_CREAT | O_TRUNC));
+        EXPECT_EQ("", fd.Read());
+    }
+    EXPECT_THAT(OpensOf(sidecar_), ElementsAre("O_RDWR|O_TRUNC, 0777"));
+    EXPECT_EQ(Bytes(), ReadFile(sidecar_));
+    ExpectNothingReported();
+}
+
+TEST_F(EaOpenAppleDoubleTest, TruncatingCreatesAFileThatIsMissing) {
+    TakeCalls();
+    const Fd fd(Open(O_RDWR | O_CREAT | O_TRUNC));
+    EXPECT_TRUE(fd.ok());
+    EXPECT_THAT(OpensOf(sidecar_),
+                ElementsAre("O_RDWR|O_TRUNC, 0777", "O_RDWR|O_CREAT|O_TRUNC, 0777"));
+}
+
+TEST_F(EaOpenAppleDoubleTest, FormAndKindAreNotUsed) {
+    WriteFile(sidecar_, Ascii("double"));
+    for (const int form : {0, 1, 2, -1}) {
+        SCOPED_TRACE(form);
+        const Fd fd(MAVOEAOpen(form, object_.c_str(), "whatever", O_RDWR | O_CREAT, 1));
+        EXPECT_EQ("double", fd.Read());
+    }
+    EXPECT_THAT(NamesIn(dir_.path()), ElementsAre("._a.txt", "a.txt"));
+}
+
+TEST_F(EaOpenAppleDoubleTest, AMissingFileFailsWithEnoentAfterASecondLook) {
+    TakeCalls();
+    ExpectFailed(ENOENT, Open(0));
+    EXPECT_THAT(OpensOf(sidecar_), ElementsAre("O_RDONLY, 0777", "O_RDONLY, 0777"));
+    EXPECT_THAT(NamesIn(dir_.path()), ElementsAre("a.txt"));
+}
+
+TEST_F(EaOpenAppleDoubleTest, AnyOtherFailureOfTheFirstOpenIsFinal) {
+    for (const int error : {EACCES, EMFILE, EISDIR, EIO}) {
+        SCOPED_TRACE(strerror(error));
+        TakeCalls();
+        const FailCall fault("open", error);
+        ExpectFailed(error, Open(O_RDWR | O_CREAT));
+        EXPECT_THAT(OpensOf(sidecar_), ElementsAre("O_RDWR, 0777"));
+    }
+    EXPECT_FALSE(Exists(sidecar_));
+}
+
+TEST_F(EaOpenAppleDoubleTest, AFailureOfTheSecondOpenIsFinal) {
+    const FailCall fault("open", ENOSPC, 2);
+    ExpectFailed(ENOSPC, Open(O_RDWR | O_CREAT));
+}
+
+TEST_F(EaOpenAppleDoubleTest, ADirectoryInPlaceOfTheFileFailsWithEisdir) {
+    ASSERT_EQ(0, ::mkdir(sidecar_.c_str(), 0777));
+    ExpectFailed(EISDIR, Open(O_RDWR));
+}
+
+TEST_F(EaOpenAppleDoubleTest, AFileThatTheUserMayNotOpenFailsWithEacces) {
+    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    BeWhoWeAre();
+    WriteFile(sidecar_, Ascii("double"));
+    ASSERT_EQ(0, chmod(sidecar_.c_str(), 0600));
+    AsUser(65534, Root::kGivenUp, [this] { ExpectFailed(EACCES, Open(O_RDWR | O_CREAT)); });
+}
+
+TEST_F(EaOpenAppleDoubleTest, WhoCannotBecomeTheSuperuserCreatesIt) {
+    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    BeWhoWeAre();
+    AsUser(65534, Root::kGivenUp, [this] {
+        const Fd fd(Open(O_RDWR | O_CREAT));
+        EXPECT_TRUE(fd.ok()) << strerror(errno);
+        ExpectNothingReported();
+    });
+    EXPECT_TRUE(Exists(sidecar_));
+}
+
+TEST_F(EaOpenAppleDoubleTest, NullArgumentsFailWith0xD00AndEnoent) {
+    TakeCallNames();
+    errno = 0;
+    EXPECT_EQ(-1, MAVOEAOpen(1, nullptr, kStream, O_RDWR | O_CREAT, 1));
+    EXPECT_EQ(ENOENT, errno);
+    ExpectOnly(0xD00, kUnit);
+    errno = 0;
+    EXPECT_EQ(-1, MAVOEAOpen(1, object_.c_str(), nullptr, O_RDWR | O_CREAT, 1));
+    EXPECT_EQ(ENOENT, errno);
+    ExpectOnly(0xD00, kUnit);
+    EXPECT_THAT(TakeCallNames(), IsEmpty());
+    EXPECT_THAT(TakeLog(), IsEmpty());
+}
+
+TEST_F(EaOpenAppleDoubleTest, ANameThatIsTooLongForTheFileFailsWith0xC300AndKeepsErrno) {
+    const std::string longest = dir_ / std::string(253, 'a');
+    {
+        const Fd fd(MAVOEAOpen(1, longest.c_str(), kStream, O_RDWR | O_CREAT, 1));
+        EXPECT_TRUE(fd.ok());
+    }
+    TakeCallNames();
+    errno = EXDEV;
+    EXPECT_EQ(-1, MAVOEAOpen(1, (longest + "a").c_str(), kStream, O_RDWR | O_CREAT, 1));
+    EXPECT_EQ(EXDEV, errno);
+    ExpectOnly(0xC300, "ea_adpath");
+    EXPECT_THAT(TakeCallNames(), IsEmpty());
+}
+
+// ---- Any other place ------------------------------------------------------------------------
+
+TEST_F(EaOpenTest, AnyOtherPlaceFailsWith0xD00) {
+    TakeCallNames();
+    for (const int place : {-1, 2, 3, 7, 256}) {
+        SCOPED_TRACE(place);
+        EXPECT_EQ(-1, MAVOEAOpen(1, object_.c_str(), kStream, O_RDWR | O_CREAT, place));
+        ExpectOnly(0xD00, kUnit);
+        EXPECT_EQ(-1, MAVOEAOpen(1, nullptr, nullptr, 0, place));
+        ExpectOnly(0xD00, kUnit);
+    }
+    EXPECT_THAT(TakeCallNames(), IsEmpty());
+    EXPECT_THAT(TakeLog(), IsEmpty());
+    EXPECT_THAT(NamesIn(dir_.path()), ElementsAre("a.txt"));
+}
+
+}  // namespace
+}  // namespace mavoea::test
