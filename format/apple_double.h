@@ -1,0 +1,84 @@
+// AppleDouble: Apple's container for what a file has beside its data. A header, entry descriptors,
+// then the entries' data wherever the descriptors say. From Apple's "AppleSingle/AppleDouble
+// Formats for Foreign Files"; all integers are big-endian.
+#ifndef MAVOEA_FORMAT_APPLE_DOUBLE_H_
+#define MAVOEA_FORMAT_APPLE_DOUBLE_H_
+
+#include <array>
+#include <cstddef>
+#include <cstdint>
+
+#include "util/bytes.h"
+
+namespace mavoea {
+
+inline constexpr std::uint32_t kAppleDoubleMagic = 0x00051607;
+inline constexpr std::uint32_t kAppleDoubleVersion2 = 0x00020000;
+
+// What an entry holds. There are more kinds; these two are the ones that streams keep.
+enum class EntryId : std::uint32_t { kNone = 0, kResourceFork = 2, kFinderInfo = 9 };
+
+//   offset  size  field
+//        0     4  magic
+//        4     4  version
+//        8    16  filler            the home file system in version 1, zeros or text since
+//       24     2  number of entries
+struct AppleDoubleHeader {
+    static constexpr std::size_t kSize = 26;
+
+    std::uint32_t magic = 0;
+    std::uint32_t version = 0;
+    std::array<std::uint8_t, 16> filler{};
+    std::uint16_t entry_count = 0;
+};
+
+//   offset  size  field
+//        0     4  id       what the entry holds, see EntryId
+//        4     4  offset   from the start of the file
+//        8     4  length   in bytes, may be 0
+struct EntryDescriptor {
+    static constexpr std::size_t kSize = 12;
+
+    EntryId id = EntryId::kNone;
+    Range data;
+};
+
+// Where a header with that many entries and its descriptors end.
+constexpr std::size_t DescriptorsEnd(std::uint16_t entry_count) {
+    return AppleDoubleHeader::kSize + entry_count * EntryDescriptor::kSize;
+}
+
+// Decoding never fails: past the end of the bytes, fields are 0 and the reader's ok() turns false.
+constexpr AppleDoubleHeader DecodeAppleDoubleHeader(BeReader& in) {
+    AppleDoubleHeader header;
+    header.magic = in.U32();
+    header.version = in.U32();
+    in.Copy(header.filler);
+    header.entry_count = in.U16();
+    return header;
+}
+
+constexpr void EncodeAppleDoubleHeader(const AppleDoubleHeader& header, BeWriter& out) {
+    out.U32(header.magic);
+    out.U32(header.version);
+    out.Copy(header.filler);
+    out.U16(header.entry_count);
+}
+
+constexpr EntryDescriptor DecodeEntryDescriptor(BeReader& in) {
+    EntryDescriptor entry;
+    entry.id = static_cast<EntryId>(in.U32());
+    entry.data.offset = in.U32();
+    entry.data.length = in.U32();
+    return entry;
+}
+
+constexpr void EncodeEntryDescriptor(const EntryDescriptor& entry, BeWriter& out) {
+    out.U32(static_cast<std::uint32_t>(entry.id));
+    out.U32(entry.data.offset);
+    out.U32(entry.data.length);
+}
+
+}  // namespace mavoea
+
+#endif  // MAVOEA_FORMAT_APPLE_DOUBLE_H_

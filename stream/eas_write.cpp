@@ -1,0 +1,133 @@
+// Writes an attribute's value, durably. The attribute becomes the last one: its value goes behind
+// all others, and the resource fork makes way.
+
+#include <errno.h>
+#include <string.h>
+
+#include <algorithm>
+#include <climits>
+
+#include "include/mavoea.h"
+#include "stream/internal.h"
+#include "stream/layout.h"
+#include "util/file_io.h"
+#include "util/unit.h"
+
+namespace mavoea {
+namespace {
+
+constexpr Unit unit("eas_write");
+
+// Puts `image` on disk, the fork first: it still lies where the old header says while it moves.
+int Commit(EASHandle* h, const StreamImage& image, Range fork) {
+    const std::uint32_t total_size = LoadHeader(*h).attributes.total_size;
+    if (EASShiftRFork(h, total_size, fork.offset, fork.length) != 0) return -1;
+    if (image.Write(h->fd, unit) != 0) return -1;
+    return MAVOEASFlush(h);
+}
+
+// Appends a new attribute. Whatever can fail before the disk changes comes first, memory last.
+int Create(EASHandle* h, const char* name, ByteView value, unsigned offset) {
+    Survey survey;
+    if (SurveyTable(h, unit, &survey) != 0) return -1;
+    Range fork;
+    if (SurveyFork(h, survey, unit, &fork) != 0) return -1;
+
+    AttributeHeader& attributes = survey.header.attributes;
+    const Range old_data = attributes.data;
+    const auto name_size = static_cast<std::uint8_t>(strlen(name) + 1);
+    const std::uint32_t record_size = RecordSize(name_size);
+    const std::uint64_t length = std::uint64_t{offset} + value.size();
+    const std::uint64_t total_size = old_data.end() + record_size + length;
+    if (attributes.count == kAttributeCountMax || !FitsStream(total_size, fork.length)) {
+        return unit.Fail(Err::kBadArgument);
+    }
+
+    auto own_name = Owned<char>::Allocate(name_size);
+    StreamImage image(total_size);
+    if (!own_name || !image.ok()) return unit.Fail(Err::kMemory);
+    memcpy(own_name.get(), name, name_size);
+    if (attributes.count == h->capacity && MAVOEASAllocEntry(h, 0) != 0) return -1;
+
+    attributes.data.offset += record_size;
+    std::uint8_t* const data = image.At(attributes.data.offset);
+    if (ReadAt(h->fd, {data, old_data.length}, old_data.offset) != old_data.length) {
+        return unit.Fail(Err::kRead);
+    }
+    memset(data + old_data.length, 0, offset);
+    std::copy(value.begin(), value.end(), data + old_data.length + offset);
+
+    for (EASEntry& entry : Attributes(*h)) entry.offset += record_size;
+    h->entries[attributes.count] = {
+        .offset = static_cast<std::uint32_t>(attributes.data.end()),
+        .length = static_cast<std::uint32_t>(length),
+        .flags = 0,
+        .nameLength = name_size,
+        .name = own_name.Release(),
+    };
+    attributes.data.length += static_cast<std::uint32_t>(length);
+    ++attributes.count;
+    StoreHeader(survey.header, h);
+    image.PutHead(survey.header, h);
+    return Commit(h, image, fork);
+}
+
+int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
+    Survey survey;
+    if (SurveyTable(h, unit, &survey) != 0) return -1;
+    Range fork;
+    if (SurveyFork(h, survey, unit, &fork) != 0) return -1;
+
+    // A value never shrinks.
+    Range& data = survey.header.attributes.data;
+    const std::uint32_t old_length = h->entries[index].length;
+    const std::uint64_t length = std::max<std::uint64_t>(old_length, offset + value.size());
+    const std::uint64_t added = length - old_length;
+    const std::uint64_t total_size = data.end() + added;
+    if (!FitsStream(total_size, fork.length)) return unit.Fail(Err::kBadArgument);
+
+    StreamImage image(total_size);
+    if (!image.ok()) return unit.Fail(Err::kMemory);
+    if (GatherValues(h, index, image.At(data.offset), false) != 0) return -1;
+    std::uint8_t* const at = image.At(data.end() - old_length);
+    memset(at + old_length, 0, static_cast<std::size_t>(added));
+    std::copy(value.begin(), value.end(), at + offset);
+
+    Attributes(*h).back().length = static_cast<std::uint32_t>(length);
+    data.length += static_cast<std::uint32_t>(added);
+    image.PutHead(survey.header, h);
+    return Commit(h, image, fork);
+}
+
+}  // namespace
+}  // namespace mavoea
+
+using namespace mavoea;
+
+int MAVOEASWrite(EASHandle* h, const char* name, const void* data, unsigned size, unsigned offset,
+                 int flags) {
+    if (h == nullptr || name == nullptr || h->fd < 0 || (data == nullptr && size > 0)) {
+        return unit.Fail(Err::kBadArgument);
+    }
+    // A name that the record's one byte cannot count, a size that the result could not tell from a
+    // failure.
+    if (strlen(name) >= kNameSizeMax || size > INT_MAX) return unit.Fail(Err::kBadArgument);
+    if (h->lockType != F_WRLCK) return unit.Fail(Err::kNotPermitted);
+
+    const ByteView value(static_cast<const std::uint8_t*>(data), size);
+    const int index = FindAttribute(*h, name);
+    if (index < 0) {
+        if ((flags & EAS_WRITE_MUST_EXIST) != 0) {
+            errno = ENOENT;
+            return -1;
+        }
+        if (Create(h, name, value, offset) != 0) return -1;
+    } else {
+        if ((flags & EAS_WRITE_OVERWRITE) == 0) {
+            errno = EEXIST;
+            return size > 0 ? -1 : 0;  // Writing nothing succeeds, whatever is there.
+        }
+        if (Overwrite(h, static_cast<unsigned>(index), value, offset) != 0) return -1;
+    }
+    return static_cast<int>(size);
+}

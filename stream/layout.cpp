@@ -1,0 +1,115 @@
+#include "stream/layout.h"
+
+#include <algorithm>
+#include <cstring>
+
+#include "stream/internal.h"
+#include "util/file_io.h"
+
+namespace mavoea {
+namespace {
+
+constexpr Unit header_unit("eas_write_header");
+
+}  // namespace
+
+std::span<EASEntry> Attributes(const EASHandle& h) {
+    return {h.entries, LoadHeader(h).attributes.count};
+}
+
+int FindAttribute(const EASHandle& h, const char* name) {
+    const std::span<EASEntry> attributes = Attributes(h);
+    for (std::size_t i = attributes.size(); i-- > 0;) {
+        if (std::strcmp(attributes[i].name, name) == 0) return static_cast<int>(i);
+    }
+    return -1;
+}
+
+std::uint64_t TableEnd(const EASHandle& h) {
+    std::uint64_t end = kStreamHeaderSize;
+    for (const EASEntry& entry : Attributes(h)) end += RecordSize(entry.nameLength);
+    return end;
+}
+
+int SurveyTable(EASHandle* h, const Unit& unit, Survey* found, int line) {
+    struct stat info;
+    if (kernel::Fstat(h->fd, &info) != 0) return unit.Fail(Err::kRead, line);
+    found->file_size = static_cast<std::uint64_t>(info.st_size);
+    found->header = LoadHeader(*h);
+
+    Range& data = found->header.attributes.data;
+    const std::span<EASEntry> attributes = Attributes(*h);
+    if (attributes.empty() && data.length == 0) {
+        data.offset = kStreamHeaderSize;  // Whatever it was, nothing lies there.
+        return 0;
+    }
+    std::uint64_t next = data.offset;
+    for (const EASEntry& entry : attributes) {
+        if (entry.length != 0 && entry.offset != next) return unit.Fail(Err::kRead, line);
+        next += entry.length;
+    }
+    if (next != data.end() || data.offset < TableEnd(*h) || data.end() > found->file_size) {
+        return unit.Fail(Err::kRead, line);
+    }
+    next = data.offset;
+    for (EASEntry& entry : attributes) {
+        entry.offset = static_cast<std::uint32_t>(next);
+        next += entry.length;
+    }
+    return 0;
+}
+
+int SurveyFork(EASHandle* h, const Survey& survey, const Unit& unit, Range* fork, int line) {
+    unsigned start = 0;
+    unsigned length = 0;
+    if (EASGetRForkRange(h, &start, &length) != 0) return -1;
+    if (length != 0) {
+        const AttributeHeader& attributes = survey.header.attributes;
+        const bool plain = survey.header.finder_info.data.length == kFinderInfoSize;
+        const std::uint64_t before = plain ? kAttributeHeaderOffset : attributes.data.end();
+        if (survey.header.resource_fork.data.offset != start || start < before) {
+            return unit.Fail(Err::kRead, line);
+        }
+        const std::uint64_t there = survey.file_size > start ? survey.file_size - start : 0;
+        length = static_cast<unsigned>(std::min<std::uint64_t>(length, there));
+    }
+    *fork = {start, length};
+    return 0;
+}
+
+bool FitsStream(std::uint64_t total_size, std::uint32_t fork_length) {
+    return total_size < kStreamSizeMax && total_size + fork_length <= kStreamSizeMax;
+}
+
+void StreamImage::PutHead(StreamHeader header, EASHandle* h) {
+    AttributeHeader& attributes = header.attributes;
+    attributes.total_size = static_cast<std::uint32_t>(attributes.data.end());
+    // Wherever the file had its Finder info, the header has it here.
+    if (header.finder_info.id == EntryId::kFinderInfo) {
+        header.finder_info.data.offset = kFinderInfoOffset;
+    }
+    header.finder_info.data.length = attributes.total_size - header.finder_info.data.offset;
+    header.resource_fork.data.offset = attributes.total_size;
+    StoreHeader(header, h);
+
+    std::memcpy(At(0), h->header, kStreamHeaderSize);
+    std::uint8_t* to = At(kStreamHeaderSize);
+    for (const EASEntry& entry : Attributes(*h)) {
+        EncodeAttributeRecord({.value = {entry.offset, entry.length},
+                               .flags = entry.flags,
+                               .name_size = entry.nameLength},
+                              entry.name, to);
+        to += RecordSize(entry.nameLength);
+    }
+    const auto table_end = static_cast<std::uint64_t>(to - At(0));
+    head_size_ = std::clamp<std::uint64_t>(attributes.data.offset, table_end, size_);
+    std::memset(to, 0, static_cast<std::size_t>(head_size_ - table_end));
+}
+
+int StreamImage::Write(int fd, const Unit& unit, int line) const {
+    const std::uint64_t written = WriteAt(fd, {bytes_.get(), static_cast<std::size_t>(size_)}, 0);
+    if (written == size_) return 0;
+    return written < head_size_ ? header_unit.Fail(Err::kWrite) : unit.Fail(Err::kWrite, line);
+}
+
+}  // namespace mavoea

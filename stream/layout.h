@@ -1,0 +1,88 @@
+// A stream's layout: what its rewrites start from, and the bytes that they put on disk.
+#ifndef MAVOEA_STREAM_LAYOUT_H_
+#define MAVOEA_STREAM_LAYOUT_H_
+
+#include <cstdint>
+
+#include "format/ea_stream.h"
+#include "include/mavoea.h"
+#include "util/owned.h"
+#include "util/unit.h"
+
+namespace mavoea {
+
+inline StreamHeader LoadHeader(const EASHandle& h) { return DecodeStreamHeader(h.header); }
+inline void StoreHeader(const StreamHeader& header, EASHandle* h) {
+    EncodeStreamHeader(header, h->header);
+}
+
+// The attributes in use, from the header's count.
+std::span<EASEntry> Attributes(const EASHandle& h);
+
+// The index of the last attribute of that name, -1 when there is none.
+int FindAttribute(const EASHandle& h, const char* name);
+
+// Where the table of h's attributes ends.
+std::uint64_t TableEnd(const EASHandle& h);
+
+// What a rewrite starts from: h's header and the file's size, once offsets, lengths and counts have
+// been found to fit together and to lie in the file. Values must lie one behind the other in table
+// order; between table and values there may be a gap. Empty values, whose offset means nothing, are
+// given the one that their place calls for. 0, or -1 after recording 0xA00 for `unit`.
+struct Survey {
+    StreamHeader header;
+    std::uint64_t file_size = 0;
+};
+int SurveyTable(EASHandle* h, const Unit& unit, Survey* found, int line = __builtin_LINE());
+
+// Where the resource fork lies, and how many of its bytes are there. 0, or -1 after recording 0xA00
+// for `unit`: it does not lie where the layout puts it, and would be moved from a guess; or as
+// EASGetRForkRange().
+int SurveyFork(EASHandle* h, const Survey& survey, const Unit& unit, Range* fork,
+               int line = __builtin_LINE());
+
+// Whether attributes that end there leave a fork of that length within a stream's 32-bit offsets.
+bool FitsStream(std::uint64_t total_size, std::uint32_t fork_length);
+
+// A stream's bytes before its resource fork, put together in memory before anything on disk
+// changes: header, table, values.
+class StreamImage {
+ public:
+    explicit StreamImage(std::uint64_t total_size)
+        : bytes_(Owned<std::uint8_t>::Allocate(total_size)), size_(total_size) {}
+
+    bool ok() const { return static_cast<bool>(bytes_); }  // false: out of memory
+    std::uint8_t* At(std::uint64_t offset) const { return bytes_.get() + offset; }
+
+    // Leaves out what lies behind total_size.
+    void Cut(std::uint64_t total_size) { size_ = total_size; }
+
+    // Makes `header` h's, with the sizes that follow from its data, and puts it and h's table into
+    // the image. What lies between table and values is cleared.
+    void PutHead(StreamHeader header, EASHandle* h);
+
+    // Writes the image at the start of the file. 0, or -1 after recording 0xB00: for the header's
+    // unit when not even header and table could be written, for `unit` otherwise.
+    int Write(int fd, const Unit& unit, int line = __builtin_LINE()) const;
+
+ private:
+    Owned<std::uint8_t> bytes_;
+    std::uint64_t size_;
+    std::uint64_t head_size_ = 0;
+};
+
+// MAVOEASUpdateEntry() for a stream that has been surveyed and a `to` that is large enough. Records
+// failures for its own unit; nothing has changed then.
+int GatherValues(EASHandle* h, unsigned index, std::uint8_t* to, bool remove);
+
+// How much shorter MAVOEASUpdateEntry() makes the table when it removes a record. Computed in 8
+// bits, which is too little for names of more than 240 bytes: a gap of 256 bytes then stays between
+// table and values. Streams in the field have it, so it is kept.
+constexpr std::uint32_t RemovedRecordSize(std::uint8_t name_size) {
+    return RecordSize(name_size) & 0xFC;
+}
+static_assert(RemovedRecordSize(241) == RecordSize(241) && RemovedRecordSize(242) == 0);
+
+}  // namespace mavoea
+
+#endif  // MAVOEA_STREAM_LAYOUT_H_

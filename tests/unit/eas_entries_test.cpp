@@ -1,0 +1,1040 @@
+// Finding, listing, reading, writing, removing and truncating the attributes of an open EA stream.
+
+#include <errno.h>
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstring>
+#include <functional>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "include/mavoea.h"
+#include "stream/internal.h"
+#include "tests/support/fake_platform.h"
+#include "tests/support/kernel_control.h"
+#include "tests/support/stream_builder.h"
+#include "tests/support/stream_fixture.h"
+
+namespace mavoea::test {
+namespace {
+
+using ::testing::Contains;
+using ::testing::Each;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using ::testing::StartsWith;
+
+class EasEntriesTest : public StreamTest {
+ protected:
+    // A stream of three attributes and a fork, open for writing.
+    void OpenThree() {
+        image_ = {.attributes = {{"a", Ascii("one")}, {"b", Ascii("seconds")}, {"c", Ascii("3")}},
+                  .fork = Pattern(100),
+                  .finder_info = Pattern(32, 2)};
+        Reopen();
+    }
+    void Reopen() {
+        handle_.reset();
+        Fill(image_);
+        handle_ = Open();
+        ASSERT_NE(nullptr, handle_);
+        TakeCalls();
+    }
+    EASHandle* h() { return handle_.get(); }
+
+    StreamImage image_;
+    Handle handle_;
+};
+
+// ---- Search -------------------------------------------------------------------------------------
+
+TEST_F(EasEntriesTest, SearchComparesByteByByte) {
+    image_.attributes = {{"name", {}}, {"Name", {}}, {"names", {}}, {"nam", {}}, {"", {}}};
+    Reopen();
+    EXPECT_EQ(0, MAVOEASSearch(h(), "name"));
+    EXPECT_EQ(1, MAVOEASSearch(h(), "Name"));
+    EXPECT_EQ(2, MAVOEASSearch(h(), "names"));
+    EXPECT_EQ(3, MAVOEASSearch(h(), "nam"));
+    EXPECT_EQ(4, MAVOEASSearch(h(), ""));
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+    for (const std::string& name :
+         {std::string("NAME"), std::string("na"), std::string("namesx"), std::string(300, 'n')}) {
+        EXPECT_EQ(-1, MAVOEASSearch(h(), name.c_str())) << name;
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2000, "eas_search")));
+        EXPECT_EQ(0x2000, MLIBCErrGet());
+    }
+    EXPECT_THAT(TakeCallNames(), IsEmpty());
+}
+
+TEST_F(EasEntriesTest, SearchInAStreamWithoutAttributesFindsNone) {
+    handle_ = Open();
+    EXPECT_EQ(-1, MAVOEASSearch(h(), "a"));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2000, "eas_search")));
+}
+
+TEST_F(EasEntriesTest, SearchRefusesMissingArguments) {
+    OpenThree();
+    EXPECT_EQ(-1, MAVOEASSearch(nullptr, "a"));
+    EXPECT_EQ(-1, MAVOEASSearch(h(), nullptr));
+    h()->fd = -1;
+    EXPECT_EQ(-1, MAVOEASSearch(h(), "a"));
+    h()->fd = fd_;
+    const std::vector<Record> records = TakeRecords();
+    EXPECT_EQ(3u, records.size());
+    EXPECT_THAT(records, Each(RecordOf(0xD00, "eas_search")));
+}
+
+TEST_F(EasEntriesTest, OfTwoRecordsWithTheSameNameTheLastIsMeant) {
+    image_.attributes = {
+        {"a", Ascii("first")}, {"b", Ascii("2")}, {"a", Ascii("last")}, {"c", Ascii("3")}};
+    Reopen();
+    EXPECT_EQ(2, MAVOEASSearch(h(), "a"));
+    EXPECT_EQ(Ascii("last"), Read(handle_, "a"));
+    ASSERT_EQ(1, Write(handle_, "a", "L"));
+    image_.attributes = {
+        {"a", Ascii("first")}, {"b", Ascii("2")}, {"c", Ascii("3")}, {"a", Ascii("Last")}};
+    EXPECT_EQ(image_.Build(), Contents());
+    ASSERT_EQ(0, MAVOEASRemove(h(), "a"));
+    image_.attributes.pop_back();
+    EXPECT_EQ(image_.Build(), Contents());
+    EXPECT_EQ(Ascii("first"), Read(handle_, "a"));
+    ASSERT_EQ(0, MAVOEASRemove(h(), "a"));
+    EXPECT_EQ(-1, MAVOEASRemove(h(), "a"));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2000, "eas_search")));
+}
+
+// ---- Enum ---------------------------------------------------------------------------------------
+
+TEST_F(EasEntriesTest, EnumAppendsNamesInTableOrder) {
+    OpenThree();
+    MLIBCSzList* list = NewList({"before"});
+    EXPECT_EQ(3, MAVOEASEnum(h(), &list));
+    EXPECT_THAT(Strings(list), ElementsAre("before", "a", "b", "c"));
+    MLIBCSzListFree(list);
+    EXPECT_THAT(TakeCallNames(), IsEmpty());
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasEntriesTest, EnumOfNoAttributesLeavesTheListAlone) {
+    handle_ = Open();
+    MLIBCSzList* list = NewList({"before"});
+    EXPECT_EQ(0, MAVOEASEnum(h(), &list));
+    EXPECT_THAT(Strings(list), ElementsAre("before"));
+    MLIBCSzListFree(list);
+}
+
+TEST_F(EasEntriesTest, EnumThatCannotAppendEmptiesTheWholeList) {
+    OpenThree();
+    for (const int pushes : {0, 1, 2}) {
+        SCOPED_TRACE(pushes);
+        MLIBCSzList* list = NewList({"before"});
+        Platform().pushes_until_failure = pushes;
+        EXPECT_EQ(-1, MAVOEASEnum(h(), &list));
+        Platform().pushes_until_failure = -1;
+        EXPECT_THAT(Strings(list), IsEmpty());
+        EXPECT_THAT(TakeRecords(), IsEmpty());
+        MLIBCSzListFree(list);
+    }
+}
+
+TEST_F(EasEntriesTest, EnumNeedsAList) {
+    OpenThree();
+    EXPECT_EQ(-1, MAVOEASEnum(h(), nullptr));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_enum")));
+    EXPECT_EQ(-1, MAVOEASEnum(nullptr, nullptr));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_enum")));
+}
+
+// ---- Read ---------------------------------------------------------------------------------------
+
+TEST_F(EasEntriesTest, ReadCopiesWhatLiesInTheRange) {
+    OpenThree();
+    struct Case {
+        unsigned size, offset;
+        int result;
+        const char* bytes;
+    };
+    // "seconds" has seven bytes.
+    for (const Case& c :
+         {Case{7, 0, 7, "seconds"}, Case{100, 0, 7, "seconds"}, Case{3, 0, 3, "sec"},
+          Case{3, 2, 3, "con"}, Case{100, 5, 2, "ds"}, Case{1, 6, 1, "s"}, Case{1, 7, 0, ""},
+          Case{1, 8, 0, ""}, Case{100, 0xFFFFFFFF, 0, ""}, Case{0x7FFFFFFF, 6, 1, "s"},
+          Case{0xFFFFFFFF, 6, 1, "s"}, Case{0, 0, 7, ""}, Case{0, 7, 7, ""}, Case{0, 3, 7, ""},
+          Case{0, 8, 0, ""}, Case{0, 0xFFFFFFFF, 0, ""}}) {
+        SCOPED_TRACE(std::to_string(c.size) + " from " + std::to_string(c.offset));
+        Bytes buffer = Repeat('#', 12);
+        EXPECT_EQ(c.result, MAVOEASRead(h(), "b", buffer.data(), c.size, c.offset));
+        Bytes expected = Ascii(c.bytes);
+        expected.resize(12, '#');
+        EXPECT_EQ(expected, buffer);
+    }
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasEntriesTest, ReadIsOneRead) {
+    OpenThree();
+    char buffer[8];
+    EXPECT_EQ(4, MAVOEASRead(h(), "b", buffer, 4, 2));
+    EXPECT_THAT(TakeCalls(), ElementsAre("pread(4, 173)"));  // 120 + 3 * 16 + 3 + 2
+    EXPECT_EQ(0, MAVOEASRead(h(), "b", buffer, 4, 7));
+    EXPECT_EQ(7, MAVOEASRead(h(), "b", buffer, 0, 0));
+    EXPECT_THAT(TakeCalls(), IsEmpty());
+}
+
+TEST_F(EasEntriesTest, ReadRefusesMissingArguments) {
+    OpenThree();
+    char buffer[8];
+    EXPECT_EQ(-1, MAVOEASRead(nullptr, "a", buffer, 1, 0));
+    EXPECT_EQ(-1, MAVOEASRead(h(), nullptr, buffer, 1, 0));
+    EXPECT_EQ(-1, MAVOEASRead(h(), "a", nullptr, 1, 0));
+    EXPECT_EQ(-1, MAVOEASRead(h(), "a", nullptr, 0, 0));
+    h()->fd = -1;
+    EXPECT_EQ(-1, MAVOEASRead(h(), "a", buffer, 1, 0));
+    h()->fd = fd_;
+    const std::vector<Record> records = TakeRecords();
+    EXPECT_EQ(5u, records.size());
+    EXPECT_THAT(records, Each(RecordOf(0xD00, "eas_read")));
+}
+
+TEST_F(EasEntriesTest, ReadOfAnAbsentNameLeavesTheSearchsRecord) {
+    OpenThree();
+    char buffer[8];
+    EXPECT_EQ(-1, MAVOEASRead(h(), "z", buffer, 1, 0));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2000, "eas_search")));
+}
+
+TEST_F(EasEntriesTest, ReadUnderEitherLockButNotWithout) {
+    OpenThree();
+    char buffer[8];
+    h()->lockType = F_RDLCK;
+    EXPECT_EQ(3, MAVOEASRead(h(), "a", buffer, 8, 0));
+    h()->lockType = F_WRLCK;
+    EXPECT_EQ(3, MAVOEASRead(h(), "a", buffer, 8, 0));
+    h()->lockType = F_UNLCK;
+    EXPECT_EQ(-1, MAVOEASRead(h(), "a", buffer, 0, 0));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x300, "eas_read")));
+    h()->lockType = F_WRLCK;
+}
+
+TEST_F(EasEntriesTest, AShortOrFailedReadIsRecorded) {
+    OpenThree();
+    char buffer[8];
+    {
+        const FailCall fault("pread", EIO);
+        EXPECT_EQ(-1, MAVOEASRead(h(), "b", buffer, 8, 0));
+        EXPECT_EQ(EIO, errno);
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_read")));
+    }
+    {
+        const ShortCall fault("pread", 1, 3);
+        EXPECT_EQ(-1, MAVOEASRead(h(), "b", buffer, 8, 0));
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_read")));
+    }
+    ASSERT_EQ(0, ftruncate(fd_, 175));  // in the middle of the second value
+    EXPECT_EQ(3, MAVOEASRead(h(), "a", buffer, 8, 0));
+    EXPECT_EQ(-1, MAVOEASRead(h(), "b", buffer, 8, 0));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_read")));
+    EXPECT_EQ(4, MAVOEASRead(h(), "b", buffer, 4, 0));  // these bytes are there
+}
+
+TEST_F(EasEntriesTest, AValueTooLongForAResultIsARefusedRead) {
+    image_.attributes = {{"a", {}}};
+    for (const std::uint32_t length : {0x80000000u, 0xFFFFFFFFu}) {
+        SCOPED_TRACE(length);
+        Bytes bytes = image_.Build();
+        PutU32(bytes, image_.RecordAt(0) + 4, length);
+        Fill(bytes);
+        handle_ = Open();
+        ASSERT_NE(nullptr, handle_);
+        char buffer[8];
+        EXPECT_EQ(-1, MAVOEASRead(h(), "a", buffer, 0, 0));
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_read")));
+    }
+}
+
+// ---- Write --------------------------------------------------------------------------------------
+
+TEST_F(EasEntriesTest, WritingOneByteOverThreeChangesTheFirstOnly) {
+    handle_ = Open();
+    ASSERT_EQ(3, Write(handle_, "a", "xyz", 0, 0));
+    ASSERT_EQ(1, Write(handle_, "a", "X"));
+    image_.attributes = {{"a", Ascii("Xyz")}};
+    EXPECT_EQ(image_.Build(), Contents());
+    EXPECT_EQ(139u, FileSize());
+}
+
+TEST_F(EasEntriesTest, ANewValueIsZeroBeforeItsOffset) {
+    handle_ = Open();
+    ASSERT_EQ(2, Write(handle_, "a", "ef", 4, 0));
+    image_.attributes = {{"a", Hex("00*4 'ef'")}};
+    EXPECT_EQ(image_.Build(), Contents());
+    // Nothing written far out makes zeros too.
+    ASSERT_EQ(0, Write(handle_, "b", "", 3, 0));
+    image_.attributes.push_back({"b", Repeat(0, 3)});
+    EXPECT_EQ(image_.Build(), Contents());
+}
+
+TEST_F(EasEntriesTest, WritingInsideAtTheEndAndBeyondAValue) {
+    struct Case {
+        unsigned offset;
+        const char* bytes;
+        Bytes value;
+    };
+    for (const Case& c :
+         {Case{2, "CO", Ascii("seCOnds")}, Case{5, "DS", Ascii("seconDS")},
+          Case{6, "S!", Ascii("secondS!")}, Case{7, "!!", Ascii("seconds!!")},
+          Case{9, "!", Hex("'seconds' 00 00 '!'")},
+          Case{0, "SECONDS AND MORE", Ascii("SECONDS AND MORE")}, Case{0, "", Ascii("seconds")},
+          Case{7, "", Ascii("seconds")}, Case{9, "", Hex("'seconds' 00 00")}}) {
+        SCOPED_TRACE(std::to_string(c.offset) + " " + c.bytes);
+        OpenThree();
+        ASSERT_EQ(static_cast<int>(strlen(c.bytes)), Write(handle_, "b", c.bytes, c.offset));
+        image_.attributes = {{"a", Ascii("one")}, {"c", Ascii("3")}, {"b", c.value}};
+        EXPECT_EQ(image_.Build(), Contents(image_.End()));
+        EXPECT_EQ(image_.End(), FileSize());
+        EXPECT_EQ(c.value, Read(handle_, "b"));
+        // Once more, now that it is the last one.
+        ASSERT_EQ(static_cast<int>(strlen(c.bytes)), Write(handle_, "b", c.bytes, c.offset));
+        EXPECT_EQ(image_.Build(), Contents());
+        EXPECT_THAT(TakeRecords(), IsEmpty());
+    }
+}
+
+TEST_F(EasEntriesTest, ARewrittenAttributeBecomesTheLast) {
+    handle_ = Open();
+    ASSERT_EQ(3, Write(handle_, "A", "aaa"));
+    ASSERT_EQ(2, Write(handle_, "B", "bb"));
+    ASSERT_EQ(4, Write(handle_, "C", "cccc"));
+    ASSERT_EQ(2, Write(handle_, "A", "zz"));
+    image_.attributes = {{"B", Ascii("bb")}, {"C", Ascii("cccc")}, {"A", Ascii("zza")}};
+    EXPECT_EQ(image_.Build(), Contents());
+    EXPECT_THAT(Names(handle_), ElementsAre("B", "C", "A"));
+}
+
+TEST_F(EasEntriesTest, AnExistingNameIsNotWrittenWithoutTheFlag) {
+    OpenThree();
+    for (const int flags : {0, EAS_WRITE_MUST_EXIST + 0}) {
+        SCOPED_TRACE(flags);
+        errno = 0;
+        EXPECT_EQ(-1, Write(handle_, "b", "x", 0, flags));
+        EXPECT_EQ(EEXIST, errno);
+        // Nothing to write counts as done.
+        errno = 0;
+        EXPECT_EQ(0, Write(handle_, "b", "", 0, flags));
+        EXPECT_EQ(EEXIST, errno);
+        errno = 0;
+        EXPECT_EQ(0, MAVOEASWrite(h(), "b", nullptr, 0, 50, flags));
+        EXPECT_EQ(EEXIST, errno);
+    }
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+    EXPECT_THAT(TakeWrites(), IsEmpty());
+    EXPECT_EQ(image_.Build(), Contents());
+}
+
+TEST_F(EasEntriesTest, AMissingNameIsNotCreatedWhenItMustExist) {
+    OpenThree();
+    for (const int flags : {EAS_WRITE_MUST_EXIST + 0, EAS_WRITE_MUST_EXIST | EAS_WRITE_OVERWRITE}) {
+        errno = 0;
+        EXPECT_EQ(-1, Write(handle_, "z", "x", 0, flags));
+        EXPECT_EQ(ENOENT, errno);
+        EXPECT_EQ(-1, Write(handle_, "z", "", 0, flags));
+    }
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+    EXPECT_THAT(TakeFileCalls(), IsEmpty());
+    EXPECT_EQ(image_.Build(), Contents());
+    // One that does exist is written.
+    EXPECT_EQ(1, Write(handle_, "c", "X", 0, EAS_WRITE_MUST_EXIST | EAS_WRITE_OVERWRITE));
+    EXPECT_EQ(Ascii("X"), Read(handle_, "c"));
+}
+
+TEST_F(EasEntriesTest, AnAttributeThatIsCreatedLeavesNoRecord) {
+    handle_ = Open();
+    EXPECT_EQ(1, Write(handle_, "a", "1", 0, 0));
+    EXPECT_EQ(1, Write(handle_, "b", "1", 0, EAS_WRITE_OVERWRITE));
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+    EXPECT_EQ(0, MLIBCErrGet());
+}
+
+TEST_F(EasEntriesTest, WriteRefusesMissingArguments) {
+    OpenThree();
+    EXPECT_EQ(-1, MAVOEASWrite(nullptr, "a", "x", 1, 0, 1));
+    EXPECT_EQ(-1, MAVOEASWrite(h(), nullptr, "x", 1, 0, 1));
+    EXPECT_EQ(-1, MAVOEASWrite(h(), "a", nullptr, 1, 0, 1));
+    EXPECT_EQ(-1, MAVOEASWrite(h(), "a", "x", 0x80000000u, 0, 1));
+    h()->fd = -1;
+    EXPECT_EQ(-1, MAVOEASWrite(h(), "a", "x", 1, 0, 1));
+    h()->fd = fd_;
+    const std::vector<Record> records = TakeRecords();
+    EXPECT_EQ(5u, records.size());
+    EXPECT_THAT(records, Each(RecordOf(0xD00, "eas_write")));
+    EXPECT_EQ(0, MAVOEASWrite(h(), "a", nullptr, 0, 0, 1));  // no data is no missing data
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasEntriesTest, ChangesNeedTheWriteLock) {
+    OpenThree();
+    for (const int lock_type : {F_RDLCK, F_UNLCK}) {
+        SCOPED_TRACE(lock_type);
+        h()->lockType = lock_type;
+        EXPECT_EQ(-1, Write(handle_, "a", "x"));
+        EXPECT_EQ(-1, MAVOEASRemove(h(), "a"));
+        EXPECT_EQ(-1, MAVOEASTruncate(h(), "a", 1));
+        EXPECT_THAT(TakeRecords(),
+                    ElementsAre(RecordOf(0x300, "eas_write"), RecordOf(0x300, "eas_remove"),
+                                RecordOf(0x300, "eas_truncate")));
+    }
+    h()->lockType = F_WRLCK;
+    EXPECT_THAT(TakeCallNames(), IsEmpty());
+    EXPECT_EQ(image_.Build(), Contents());
+}
+
+TEST_F(EasEntriesTest, TheTableGrowsByFive) {
+    handle_ = Open();
+    ASSERT_EQ(5, h()->capacity);
+    for (int i = 0; i < 11; ++i) {
+        SCOPED_TRACE(i);
+        ASSERT_EQ(1, Write(handle_, "n" + std::to_string(i), "v"));
+        EXPECT_EQ(i < 5 ? 5 : i < 10 ? 10 : 15, h()->capacity);
+    }
+    for (int i = 11; i < 15; ++i) EXPECT_EQ(nullptr, h()->entries[i].name);
+    // Opened again, the table has no room to spare.
+    handle_ = Open();
+    EXPECT_EQ(11, h()->capacity);
+    ASSERT_EQ(1, Write(handle_, "one more", "v"));
+    EXPECT_EQ(16, h()->capacity);
+}
+
+TEST_F(EasEntriesTest, AnOverwriteIsOneReadOneWriteAndOneSync) {
+    image_ = {};
+    for (int i = 0; i < 10; ++i) image_.attributes.push_back({"n" + std::to_string(i), Ascii("v")});
+    image_.fork = Pattern(40000);
+    Reopen();
+    ASSERT_EQ(1, Write(handle_, "n4", "w"));
+    const std::vector<std::string> calls = TakeCalls();
+    ASSERT_EQ(4u, calls.size());
+    EXPECT_EQ("fstat()", calls[0]);
+    EXPECT_THAT(calls[1], StartsWith("preadv("));
+    EXPECT_THAT(calls[2], WriteOfAll(image_.TotalSize()));
+    EXPECT_EQ("fsync()", calls[3]);
+}
+
+TEST_F(EasEntriesTest, EveryChangeIsSyncedOnce) {
+    OpenThree();
+    ASSERT_EQ(1, Write(handle_, "new", "x"));
+    EXPECT_THAT(TakeCallNames(), Contains("fsync").Times(1));
+    ASSERT_EQ(1, Write(handle_, "new", "y"));
+    EXPECT_THAT(TakeCallNames(), Contains("fsync").Times(1));
+    ASSERT_EQ(0, MAVOEASTruncate(h(), "new", 1));
+    EXPECT_THAT(TakeCallNames(), Contains("fsync").Times(1));
+    ASSERT_EQ(0, MAVOEASRemove(h(), "new"));
+    const std::vector<std::string> calls = TakeCallNames();
+    EXPECT_THAT(calls, Contains("fsync").Times(1));
+    EXPECT_EQ("fsync", calls.back());
+}
+
+TEST_F(EasEntriesTest, TheTableIsContiguousHoweverLong) {
+    handle_ = Open();
+    for (int i = 0; i < 60; ++i) {
+        const std::string name(static_cast<std::size_t>(i * 37 % 255), static_cast<char>('A' + i));
+        const Bytes value = Pattern(static_cast<std::size_t>(i * 13 % 50), 7);
+        if (name.empty()) continue;
+        image_.attributes.push_back({name, value});
+        ASSERT_EQ(static_cast<int>(value.size()), Write(handle_, name, value));
+    }
+    ASSERT_GT(image_.TableSize(), 5000u);
+    EXPECT_EQ(image_.Build(), Contents());
+}
+
+// ---- Remove -------------------------------------------------------------------------------------
+
+TEST_F(EasEntriesTest, RemovingTheOnlyAttributeCutsTheFileTo120BytesAndTheFork) {
+    for (const std::size_t fork : {0u, 1u, 100u, 20000u}) {
+        SCOPED_TRACE(fork);
+        image_ = {.attributes = {{"a", Pattern(300)}}, .fork = Pattern(fork)};
+        Reopen();
+        ASSERT_EQ(0, MAVOEASRemove(h(), "a"));
+        EXPECT_EQ(120u + fork, FileSize());
+        image_.attributes.clear();
+        EXPECT_EQ(image_.Build(), Contents());
+        EXPECT_EQ(120u, U32At(h()->header, kDataStartAt));
+        EXPECT_EQ(0u, U32At(h()->header, kDataLengthAt));
+        EXPECT_EQ(nullptr, h()->entries[0].name);
+    }
+}
+
+TEST_F(EasEntriesTest, EachAttributeCanBeRemoved) {
+    for (const std::size_t index : {0u, 1u, 2u}) {
+        SCOPED_TRACE(index);
+        OpenThree();
+        ASSERT_EQ(0, MAVOEASRemove(h(), image_.attributes[index].name.c_str()));
+        image_.attributes.erase(image_.attributes.begin() + static_cast<std::ptrdiff_t>(index));
+        EXPECT_EQ(image_.Build(), Contents());
+        const HandleState state = StateOf(*h());
+        handle_ = Open();
+        EXPECT_TRUE(state == StateOf(*h()));  // memory and file agree
+    }
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasEntriesTest, RemoveCutsWhatLaysBehindTheFork) {
+    OpenThree();
+    ASSERT_EQ(0, ftruncate(fd_, 10000));
+    ASSERT_EQ(0, MAVOEASRemove(h(), "b"));
+    image_.attributes.erase(image_.attributes.begin() + 1);
+    EXPECT_EQ(image_.Build(), Contents());
+}
+
+TEST_F(EasEntriesTest, AFileThatCannotBeCutIsARemovalAllTheSame) {
+    OpenThree();
+    const FailCall fault("ftruncate", EIO, 0);
+    EXPECT_EQ(0, MAVOEASRemove(h(), "b"));
+    EXPECT_TRUE(fault.fired());
+    image_.attributes.erase(image_.attributes.begin() + 1);
+    EXPECT_EQ(image_.Build(), Contents(image_.End()));
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasEntriesTest, RemoveRefusesWhatIsNotThere) {
+    OpenThree();
+    EXPECT_EQ(-1, MAVOEASRemove(nullptr, "a"));
+    EXPECT_EQ(-1, MAVOEASRemove(h(), nullptr));
+    h()->fd = -1;
+    EXPECT_EQ(-1, MAVOEASRemove(h(), "a"));
+    h()->fd = fd_;
+    EXPECT_THAT(TakeRecords(),
+                ElementsAre(RecordOf(0xD00, "eas_remove"), RecordOf(0xD00, "eas_remove"),
+                            RecordOf(0xD00, "eas_remove")));
+    EXPECT_EQ(-1, MAVOEASRemove(h(), "z"));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2000, "eas_search")));
+    EXPECT_EQ(image_.Build(), Contents());
+}
+
+// The size of a dropped record is counted in eight bits: with names of 242 bytes or more, their NUL
+// included, 256 bytes too few are taken out.
+TEST_F(EasEntriesTest, RemovingALongNameLeavesAGapOf256Bytes) {
+    for (const std::size_t letters : {240u, 241u, 250u, 254u}) {
+        SCOPED_TRACE(letters);
+        const std::uint32_t gap = letters >= 241 ? 256 : 0;
+        const std::string name(letters, 'n');
+        image_ = {.attributes = {{"a", Ascii("one")}, {name, Ascii("long")}, {"c", Ascii("three")}},
+                  .fork = Pattern(500)};
+        Reopen();
+        ASSERT_EQ(0, MAVOEASRemove(h(), name.c_str()));
+        image_.attributes.erase(image_.attributes.begin() + 1);
+        image_.gap = gap;
+        EXPECT_EQ(120u + 32u + gap, U32At(h()->header, kDataStartAt));
+
+        const auto matches = [&] {
+            Bytes expected = image_.Build();
+            const Bytes found = Contents();
+            if (found.size() < expected.size()) return false;
+            const std::size_t gap_at = kTableAt + image_.TableSize();
+            std::copy_n(found.begin() + static_cast<std::ptrdiff_t>(gap_at), image_.gap,
+                        expected.begin() + static_cast<std::ptrdiff_t>(gap_at));
+            return expected == found;
+        };
+        EXPECT_TRUE(matches());
+
+        // The stream goes on being read and written.
+        handle_ = Open();
+        ASSERT_NE(nullptr, handle_);
+        EXPECT_EQ(Ascii("one"), Read(handle_, "a"));
+        EXPECT_EQ(Ascii("three"), Read(handle_, "c"));
+        ASSERT_EQ(3, Write(handle_, "d", "new"));
+        image_.attributes.push_back({"d", Ascii("new")});
+        EXPECT_TRUE(matches());
+        ASSERT_EQ(3, Write(handle_, "a", "ONE"));
+        std::rotate(image_.attributes.begin(), image_.attributes.begin() + 1,
+                    image_.attributes.end());
+        image_.attributes.back().value = Ascii("ONE");
+        EXPECT_TRUE(matches());
+        ASSERT_EQ(0, MAVOEASRemove(h(), "c"));
+        image_.attributes.erase(image_.attributes.begin());
+        EXPECT_TRUE(matches());
+        EXPECT_THAT(TakeRecords(), IsEmpty());
+        // With the last attribute gone, the next write begins at 120 again.
+        ASSERT_EQ(0, MAVOEASRemove(h(), "a"));
+        ASSERT_EQ(0, MAVOEASRemove(h(), "d"));
+        image_.attributes.clear();
+        EXPECT_TRUE(matches());
+        handle_ = Open();
+        ASSERT_NE(nullptr, handle_);
+        ASSERT_EQ(5, Write(handle_, "fresh", "start"));
+        image_.attributes = {{"fresh", Ascii("start")}};
+        image_.gap = 0;
+        EXPECT_EQ(image_.Build(), Contents(image_.End()));
+        EXPECT_THAT(TakeRecords(), IsEmpty());
+    }
+}
+
+TEST_F(EasEntriesTest, RemovingOnlyALongNameLeavesDataStartAt376) {
+    image_ = {.attributes = {{std::string(254, 'n'), Ascii("long")}}, .fork = Pattern(50)};
+    Reopen();
+    ASSERT_EQ(0, MAVOEASRemove(h(), image_.attributes[0].name.c_str()));
+    EXPECT_EQ(376u, U32At(h()->header, kDataStartAt));
+    EXPECT_EQ(376u, U32At(h()->header, kTotalSizeAt));
+    EXPECT_EQ(376u, U32At(h()->header, kForkOffsetAt));
+    EXPECT_EQ(426u, FileSize());
+    EXPECT_EQ(Pattern(50), Contents(50, 376));
+}
+
+// ---- Truncate -----------------------------------------------------------------------------------
+
+TEST_F(EasEntriesTest, TruncateShortensAValueButNotTheFile) {
+    OpenThree();
+    image_.fork.clear();
+    Reopen();
+    const std::size_t size = FileSize();
+    ASSERT_EQ(0, MAVOEASTruncate(h(), "b", 3));
+    image_.attributes = {{"a", Ascii("one")}, {"c", Ascii("3")}, {"b", Ascii("sec")}};
+    EXPECT_EQ(image_.Build(), Contents(image_.End()));
+    EXPECT_EQ(size, FileSize());
+    ASSERT_EQ(0, MAVOEASTruncate(h(), "b", 0));
+    image_.attributes[2].value.clear();
+    EXPECT_EQ(image_.Build(), Contents(image_.End()));
+    EXPECT_EQ(size, FileSize());
+    EXPECT_EQ(Bytes{}, Read(handle_, "b"));
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasEntriesTest, TruncateLengthensAValueWithZeros) {
+    OpenThree();
+    image_.fork.clear();
+    Reopen();
+    ASSERT_EQ(0, MAVOEASTruncate(h(), "a", 3000));
+    Bytes value = Ascii("one");
+    value.resize(3000);
+    image_.attributes = {{"b", Ascii("seconds")}, {"c", Ascii("3")}, {"a", value}};
+    EXPECT_EQ(image_.Build(), Contents());
+    // The same length again changes nothing but the order.
+    ASSERT_EQ(0, MAVOEASTruncate(h(), "b", 7));
+    std::rotate(image_.attributes.begin(), image_.attributes.begin() + 1, image_.attributes.end());
+    EXPECT_EQ(image_.Build(), Contents());
+}
+
+TEST_F(EasEntriesTest, TruncateLeavesNoOldBytesInAValueThatGrowsAgain) {
+    image_ = {.attributes = {{"a", Pattern(100)}}};
+    Reopen();
+    ASSERT_EQ(0, MAVOEASTruncate(h(), "a", 10));
+    ASSERT_EQ(0, MAVOEASTruncate(h(), "a", 50));
+    Bytes value = Pattern(100);
+    value.resize(10);
+    value.resize(50);
+    EXPECT_EQ(value, Read(handle_, "a"));
+}
+
+TEST_F(EasEntriesTest, TruncateMovesTheForksOffsetButNotItsBytes) {
+    for (const unsigned length : {0u, 7u, 50u}) {
+        SCOPED_TRACE(length);
+        OpenThree();
+        const Bytes before = Contents();
+        ASSERT_EQ(0, MAVOEASTruncate(h(), "b", length));
+        Bytes value = Ascii("seconds");
+        value.resize(length);
+        StreamImage after = image_;
+        after.attributes = {{"a", Ascii("one")}, {"c", Ascii("3")}, {"b", value}};
+        const std::uint32_t total = after.TotalSize();
+        Bytes expected = after.Build();
+        expected.resize(total);
+        expected.insert(expected.end(), before.begin() + static_cast<std::ptrdiff_t>(total),
+                        before.end());
+        EXPECT_EQ(expected, Contents());
+        EXPECT_EQ(before.size(), FileSize());
+        EXPECT_EQ(total, U32At(h()->header, kForkOffsetAt));
+        EXPECT_EQ(100u, U32At(h()->header, kForkLengthAt));
+        EXPECT_THAT(TakeCallNames(), ::testing::Not(Contains("ftruncate")));
+    }
+}
+
+TEST_F(EasEntriesTest, TruncateRecordsAFailedFlushTwice) {
+    OpenThree();
+    const FailCall fault("fsync", EIO);
+    EXPECT_EQ(-1, MAVOEASTruncate(h(), "b", 3));
+    EXPECT_EQ(EIO, errno);
+    EXPECT_THAT(TakeRecords(),
+                ElementsAre(RecordOf(0x2A00, "eas_flush"), RecordOf(0x2A00, "eas_truncate")));
+}
+
+TEST_F(EasEntriesTest, OtherChangesRecordAFailedFlushOnce) {
+    OpenThree();
+    const FailCall fault("fsync", EIO, 0);
+    EXPECT_EQ(-1, Write(handle_, "b", "B"));
+    EXPECT_EQ(EIO, errno);
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2A00, "eas_flush")));
+    EXPECT_EQ(-1, MAVOEASRemove(h(), "b"));
+    EXPECT_EQ(EIO, errno);
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2A00, "eas_flush")));
+}
+
+TEST_F(EasEntriesTest, TruncateRefusesWhatIsNotThere) {
+    OpenThree();
+    EXPECT_EQ(-1, MAVOEASTruncate(nullptr, "a", 1));
+    EXPECT_EQ(-1, MAVOEASTruncate(h(), nullptr, 1));
+    h()->fd = -1;
+    EXPECT_EQ(-1, MAVOEASTruncate(h(), "a", 1));
+    h()->fd = fd_;
+    EXPECT_THAT(TakeRecords(),
+                ElementsAre(RecordOf(0xD00, "eas_truncate"), RecordOf(0xD00, "eas_truncate"),
+                            RecordOf(0xD00, "eas_truncate")));
+    EXPECT_EQ(-1, MAVOEASTruncate(h(), "z", 1));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2000, "eas_search")));
+    EXPECT_EQ(image_.Build(), Contents());
+}
+
+// ---- The table ----------------------------------------------------------------------------------
+
+TEST_F(EasEntriesTest, AllocEntryAddsFiveRecordsOrAsManyAsAreAskedFor) {
+    OpenThree();
+    const HandleState before = StateOf(*h());
+    EXPECT_EQ(0, MAVOEASAllocEntry(h(), 0));
+    EXPECT_EQ(8, h()->capacity);
+    EXPECT_EQ(0, MAVOEASAllocEntry(h(), 7));
+    EXPECT_EQ(15, h()->capacity);
+    for (int i = 3; i < 15; ++i) {
+        const EASEntry& entry = h()->entries[i];
+        EXPECT_EQ(nullptr, entry.name);
+        EXPECT_EQ(0u, entry.offset + entry.length + entry.flags + entry.nameLength);
+    }
+    EXPECT_TRUE(before == StateOf(*h()));
+
+    const FailCall fault("malloc", ENOMEM);
+    EXPECT_EQ(-1, MAVOEASAllocEntry(h(), 3));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x200, "eas_alloc_entry")));
+    EXPECT_EQ(15, h()->capacity);
+    EXPECT_TRUE(before == StateOf(*h()));
+    EXPECT_EQ(-1, MAVOEASAllocEntry(nullptr, 0));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_alloc_entry")));
+}
+
+TEST_F(EasEntriesTest, WriteHeaderWritesHeaderAndTableAndStandsAtDataStart) {
+    OpenThree();
+    image_.finder_info = Pattern(32, 77);
+    std::copy(image_.finder_info.begin(), image_.finder_info.end(), h()->header + kFinderInfoAt);
+    PutU32(h()->header, kTotalSizeAt, 1);
+    PutU32(h()->header, kFinderLengthAt, 2);
+    PutU32(h()->header, kForkOffsetAt, 3);
+    ASSERT_EQ(0, ::lseek(fd_, 0, SEEK_SET));
+    EXPECT_EQ(0, MAVOEASWriteHeader(h()));
+    EXPECT_EQ(168, ::lseek(fd_, 0, SEEK_CUR));
+    EXPECT_EQ(image_.Build(), Contents());
+    EXPECT_EQ(Contents(120), StateOf(*h()).header);
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasEntriesTest, WriteHeaderOfANewStreamWrites120Bytes) {
+    handle_ = Open();
+    EXPECT_EQ(0, MAVOEASWriteHeader(h()));
+    EXPECT_EQ(StreamImage{}.Build(), Contents());
+    EXPECT_EQ(120, ::lseek(fd_, 0, SEEK_CUR));
+}
+
+TEST_F(EasEntriesTest, WriteHeaderReportsWhatFails) {
+    EXPECT_EQ(-1, MAVOEASWriteHeader(nullptr));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_write_header")));
+    OpenThree();
+    h()->fd = -1;
+    EXPECT_EQ(-1, MAVOEASWriteHeader(h()));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_write_header")));
+    h()->fd = fd_;
+    const int live = TakeAllocations().live;
+    for (int nth = 1;; ++nth) {
+        SCOPED_TRACE(nth);
+        const FailNthCall fault(nth, EIO);
+        const int result = MAVOEASWriteHeader(h());
+        const int error = errno;
+        EXPECT_EQ(live, TakeAllocations().live);
+        if (!fault.fired()) {
+            EXPECT_EQ(0, result);
+            break;
+        }
+        EXPECT_EQ(-1, result);
+        EXPECT_EQ(EIO, error);
+        const int code = fault.name() == "malloc"                             ? 0x200
+                         : fault.name() == "lseek" || fault.name() == "fstat" ? 0xA00
+                                                                              : 0xB00;
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(code, "eas_write_header"))) << fault.name();
+    }
+    EXPECT_EQ(image_.Build(), Contents());
+}
+
+TEST_F(EasEntriesTest, AShortWriteIsRecordedByTheUnitWhosePartItCuts) {
+    struct Change {
+        const char* unit;
+        std::uint32_t data_start;  // header and table end here, the values begin
+        std::function<int()> run;
+    };
+    const std::vector<Change> changes = {
+        {"eas_write", 168, [&] { return Write(handle_, "c", "X"); }},
+        {"eas_write", 184, [&] { return Write(handle_, "d", "new"); }},
+        {"eas_remove", 152, [&] { return MAVOEASRemove(h(), "c"); }},
+        {"eas_truncate", 168, [&] { return MAVOEASTruncate(h(), "c", 0); }},
+    };
+    for (const Change& change : changes) {
+        for (const std::uint32_t bytes :
+             {0u, 1u, 119u, 120u, 150u, change.data_start - 1, change.data_start + 1}) {
+            SCOPED_TRACE(std::string(change.unit) + " " + std::to_string(bytes));
+            OpenThree();
+            image_.fork.clear();
+            Reopen();
+            {
+                const ShortCall fault("pwrite", 1, bytes);
+                EXPECT_EQ(-1, change.run());
+                EXPECT_TRUE(fault.fired());
+            }
+            EXPECT_THAT(TakeRecords(),
+                        ElementsAre(RecordOf(
+                            0xB00, bytes < change.data_start ? "eas_write_header" : change.unit)));
+            // What comes after is not done.
+            const std::vector<std::string> calls = TakeCallNames();
+            EXPECT_THAT(calls, ::testing::Not(Contains("fsync")));
+            EXPECT_THAT(calls, ::testing::Not(Contains("ftruncate")));
+        }
+    }
+}
+
+TEST_F(EasEntriesTest, AWriteThatComesBackShortOnceIsGoneOnWith) {
+    OpenThree();
+    image_.fork.clear();
+    Reopen();
+    const ShortCall fault("pwrite", 1, 100, true);
+    EXPECT_EQ(3, Write(handle_, "d", "new"));
+    EXPECT_TRUE(fault.fired());
+    image_.attributes.push_back({"d", Ascii("new")});
+    EXPECT_EQ(image_.Build(), Contents());
+}
+
+// ---- Update entry -------------------------------------------------------------------------------
+
+TEST_F(EasEntriesTest, UpdateEntryPutsARecordLastAndItsValueBehindTheOthers) {
+    OpenThree();
+    const Bytes before = Contents();
+    Bytes buffer(11);
+    ASSERT_EQ(0, MAVOEASUpdateEntry(h(), 0, buffer.data(), 11, 0));
+    EXPECT_EQ(Ascii("seconds3one"), buffer);
+    EXPECT_THAT(Names(handle_), ElementsAre("b", "c", "a"));
+    const std::vector<HandleState::Entry> expected = {
+        {168, 7, 0, 2, "b"}, {175, 1, 0, 2, "c"}, {176, 3, 0, 2, "a"}};
+    EXPECT_TRUE(expected == StateOf(*h()).entries);
+    EXPECT_EQ(before, Contents());
+    EXPECT_EQ(168u, U32At(h()->header, kDataStartAt));
+    EXPECT_EQ(11u, U32At(h()->header, kDataLengthAt));
+    EXPECT_THAT(TakeWrites(), IsEmpty());
+}
+
+TEST_F(EasEntriesTest, UpdateEntryOfTheLastGathersOnly) {
+    OpenThree();
+    const HandleState before = StateOf(*h());
+    Bytes buffer = Repeat('#', 20);
+    ASSERT_EQ(0, MAVOEASUpdateEntry(h(), 2, buffer.data(), 20, 0));
+    EXPECT_EQ(Ascii("oneseconds3#########"), buffer);
+    EXPECT_TRUE(before == StateOf(*h()));
+}
+
+TEST_F(EasEntriesTest, UpdateEntryDropsARecord) {
+    OpenThree();
+    const Bytes before = Contents();
+    const int live = TakeAllocations().live;
+    Bytes buffer = Repeat('#', 6);
+    ASSERT_EQ(0, MAVOEASUpdateEntry(h(), 1, buffer.data(), 4, 1));
+    EXPECT_EQ(Ascii("one3##"), buffer);
+    const std::vector<HandleState::Entry> expected = {{152, 3, 0, 2, "a"}, {155, 1, 0, 2, "c"}};
+    EXPECT_TRUE(expected == StateOf(*h()).entries);
+    EXPECT_EQ(152u, U32At(h()->header, kDataStartAt));
+    EXPECT_EQ(4u, U32At(h()->header, kDataLengthAt));
+    EXPECT_EQ(2u, U16At(h()->header, kAttributeCountAt));
+    EXPECT_EQ(nullptr, h()->entries[2].name);
+    EXPECT_EQ(0u, h()->entries[2].offset + h()->entries[2].length + h()->entries[2].nameLength);
+    EXPECT_EQ(before, Contents());
+    EXPECT_EQ(live - 1, TakeAllocations().live);
+}
+
+TEST_F(EasEntriesTest, UpdateEntryRefusesBadArgumentsAndSmallBuffers) {
+    OpenThree();
+    const HandleState before = StateOf(*h());
+    Bytes buffer(100);
+    EXPECT_EQ(-1, MAVOEASUpdateEntry(nullptr, 0, buffer.data(), 100, 0));
+    EXPECT_EQ(-1, MAVOEASUpdateEntry(h(), 3, buffer.data(), 100, 0));
+    EXPECT_EQ(-1, MAVOEASUpdateEntry(h(), 0xFFFFFFFF, buffer.data(), 100, 1));
+    h()->fd = -1;
+    EXPECT_EQ(-1, MAVOEASUpdateEntry(h(), 0, buffer.data(), 100, 0));
+    h()->fd = fd_;
+    std::vector<Record> records = TakeRecords();
+    EXPECT_EQ(4u, records.size());
+    EXPECT_THAT(records, Each(RecordOf(0xD00, "eas_update_entry")));
+
+    EXPECT_EQ(-1, MAVOEASUpdateEntry(h(), 1, buffer.data(), 10, 0));
+    EXPECT_EQ(-1, MAVOEASUpdateEntry(h(), 1, buffer.data(), 3, 1));
+    EXPECT_EQ(-1, MAVOEASUpdateEntry(h(), 1, buffer.data(), 0, 1));
+    records = TakeRecords();
+    EXPECT_EQ(3u, records.size());
+    EXPECT_THAT(records, Each(RecordOf(0x100, "eas_update_entry")));
+    EXPECT_TRUE(before == StateOf(*h()));
+    EXPECT_EQ(Repeat(0, 100), buffer);
+}
+
+TEST_F(EasEntriesTest, UpdateEntryThatCannotReadChangesNothing) {
+    OpenThree();
+    const HandleState before = StateOf(*h());
+    Bytes buffer(100);
+    for (const int remove : {0, 1}) {
+        for (const unsigned index : {0u, 1u, 2u}) {
+            SCOPED_TRACE(index);
+            for (int nth = 1;; ++nth) {
+                SCOPED_TRACE(nth);
+                const FailNthCall fault(nth, EIO);
+                const int result = MAVOEASUpdateEntry(h(), index, buffer.data(), 100, remove);
+                if (!fault.fired()) {
+                    EXPECT_EQ(0, result);
+                    break;
+                }
+                EXPECT_EQ(-1, result);
+                EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_update_entry")));
+                EXPECT_TRUE(before == StateOf(*h()));
+            }
+            Reopen();
+        }
+    }
+}
+
+// ---- Against a model ----------------------------------------------------------------------------
+
+class EasModelTest : public EasEntriesTest {
+ protected:
+    // The file up to the end of its fork; the bytes of a gap are anything.
+    ::testing::AssertionResult FileMatches() {
+        Bytes expected = image_.Build();
+        Bytes found = Contents();
+        if (found.size() < expected.size()) {
+            return ::testing::AssertionFailure()
+                   << found.size() << " bytes instead of " << expected.size();
+        }
+        found.resize(expected.size());
+        const auto gap_at = static_cast<std::ptrdiff_t>(kTableAt + image_.TableSize());
+        std::copy_n(found.begin() + gap_at, image_.gap, expected.begin() + gap_at);
+        if (found == expected) return ::testing::AssertionSuccess();
+        const auto place = std::mismatch(found.begin(), found.end(), expected.begin());
+        return ::testing::AssertionFailure() << "differ at " << place.first - found.begin();
+    }
+
+    std::vector<Attribute>::iterator Find(const std::string& name) {
+        return std::find_if(image_.attributes.begin(), image_.attributes.end(),
+                            [&](const Attribute& a) { return a.name == name; });
+    }
+
+    unsigned Below(unsigned limit) { return static_cast<unsigned>(random_() % limit); }
+
+    Bytes SomeBytes() {
+        return Pattern(Below(20) == 0 ? Below(5000) : Below(40),
+                       static_cast<std::uint8_t>(Below(256)));
+    }
+
+    void ModelWrite(const std::string& name, const Bytes& data, unsigned offset) {
+        auto at = Find(name);
+        Attribute attribute{name, {}};
+        if (at != image_.attributes.end()) {
+            attribute = *at;
+            image_.attributes.erase(at);
+        } else if (image_.attributes.empty()) {
+            image_.gap = 0;
+        }
+        attribute.value.resize(std::max(attribute.value.size(), offset + data.size()));
+        std::copy(data.begin(), data.end(),
+                  attribute.value.begin() + static_cast<std::ptrdiff_t>(offset));
+        image_.attributes.push_back(attribute);
+    }
+
+    void Step() {
+        const std::string name = names_[Below(static_cast<unsigned>(names_.size()))];
+        const bool present = Find(name) != image_.attributes.end();
+        const unsigned kind = Below(100);
+        if (kind < 50) {
+            const Bytes data = SomeBytes();
+            const unsigned offset = Below(3) == 0 ? Below(60) : 0;
+            const int flags = Below(4) == 0 ? 0 : EAS_WRITE_OVERWRITE;
+            const int result = Write(handle_, name, data, offset, flags);
+            if (present && flags == 0) {
+                EXPECT_EQ(data.empty() ? 0 : -1, result);
+            } else {
+                ASSERT_EQ(static_cast<int>(data.size()), result);
+                ModelWrite(name, data, offset);
+            }
+        } else if (kind < 80) {
+            ASSERT_EQ(present ? 0 : -1, MAVOEASRemove(h(), name.c_str()));
+            if (present) {
+                if (name.size() + 1 >= 242) image_.gap += 256;
+                image_.attributes.erase(Find(name));
+                EXPECT_EQ(image_.End(), FileSize());
+            } else {
+                EXPECT_THAT(TakeCodes(), ElementsAre(0x2000));
+            }
+        } else if (kind < 88) {
+            if (!image_.fork.empty() || !present) return;
+            const unsigned length = Below(100);
+            ASSERT_EQ(0, MAVOEASTruncate(h(), name.c_str(), length));
+            Attribute attribute = *Find(name);
+            image_.attributes.erase(Find(name));
+            attribute.value.resize(length);
+            image_.attributes.push_back(attribute);
+        } else if (kind < 92) {
+            handle_ = Open();
+            ASSERT_NE(nullptr, handle_);
+        } else if (kind < 95) {
+            image_.finder_info = Pattern(32, static_cast<std::uint8_t>(Below(256)));
+            std::copy(image_.finder_info.begin(), image_.finder_info.end(),
+                      h()->header + kFinderInfoAt);
+            ASSERT_EQ(0, MAVOEASWriteHeader(h()));
+        } else if (present) {
+            EXPECT_EQ(Find(name)->value, Read(handle_, name));
+        }
+        EXPECT_THAT(TakeRecords(), IsEmpty());
+    }
+
+    void Run(std::size_t fork, int steps, unsigned seed) {
+        random_.seed(seed);
+        image_ = {.fork = Pattern(fork)};
+        Reopen();
+        for (int step = 0; step < steps; ++step) {
+            SCOPED_TRACE(step);
+            Step();
+            if (HasFatalFailure()) return;
+            ASSERT_TRUE(FileMatches());
+            std::vector<std::string> names;
+            for (const Attribute& attribute : image_.attributes) names.push_back(attribute.name);
+            ASSERT_EQ(names, Names(handle_));
+        }
+        handle_.reset();
+    }
+
+    std::mt19937 random_;
+    const std::vector<std::string> names_ = {"",
+                                             "a",
+                                             "b",
+                                             "user.comment",
+                                             "com.apple.metadata:_kMDItemUserTags",
+                                             "com.apple.quarantine",
+                                             std::string(240, 'l'),
+                                             std::string(241, 'm'),
+                                             std::string(254, 'n'),
+                                             "\xC3\xA4",
+                                             "tenth"};
+};
+
+TEST_F(EasModelTest, ThousandsOfOperationsWithoutAForkGiveTheBytesOfAModel) {
+    const int live = TakeAllocations().live;
+    Run(0, 3000, 1);
+    EXPECT_EQ(live, TakeAllocations().live);
+}
+
+TEST_F(EasModelTest, ThousandsOfOperationsBeforeAForkGiveTheBytesOfAModel) {
+    const int live = TakeAllocations().live;
+    Run(40000, 2000, 2);
+    Run(100, 2000, 3);
+    EXPECT_EQ(live, TakeAllocations().live);
+}
+
+}  // namespace
+}  // namespace mavoea::test

@@ -1,0 +1,552 @@
+// Opening and closing EA streams, their locks, flushing, and counting attributes without a handle.
+
+#include <errno.h>
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <string>
+#include <vector>
+
+#include "include/mavoea.h"
+#include "stream/internal.h"
+#include "tests/support/fake_platform.h"
+#include "tests/support/kernel_control.h"
+#include "tests/support/stream_builder.h"
+#include "tests/support/stream_fixture.h"
+
+namespace mavoea::test {
+namespace {
+
+using ::testing::AnyOf;
+using ::testing::Contains;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using ::testing::Not;
+
+// The values are the platform's; callers pass the numbers.
+static_assert(F_RDLCK == 0 && F_WRLCK == 1 && F_UNLCK == 2);
+
+class EasHandleTest : public StreamTest {
+ protected:
+    static StreamImage Image() {
+        return {.attributes = {{"a", Ascii("one")}, {"b", Ascii("two")}, {"c", Pattern(300)}},
+                .fork = Pattern(1000),
+                .finder_info = Pattern(32)};
+    }
+};
+
+// ---- Open and close -----------------------------------------------------------------------------
+
+TEST_F(EasHandleTest, OpeningAnEmptyFileToWriteAndClosingItLeavesItEmpty) {
+    EASHandle* const handle = MAVOEASOpen(fd_, F_WRLCK);
+    ASSERT_NE(nullptr, handle);
+    EXPECT_EQ(5, handle->capacity);
+    EXPECT_EQ(F_WRLCK, handle->lockType);
+    EXPECT_EQ(fd_, handle->fd);
+    EXPECT_EQ(0, MAVOEASClose(handle));
+    EXPECT_EQ(0u, FileSize());
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasHandleTest, AnOpenHandleHoldsHeaderAndTableAsTheyAreOnDisk) {
+    const StreamImage image = Image();
+    const Bytes bytes = image.Build();
+    Fill(bytes);
+    const Handle handle = Open(F_RDLCK);
+    ASSERT_NE(nullptr, handle);
+    const HandleState expected{Bytes(bytes.begin(), bytes.begin() + 120),
+                               {{168, 3, 0, 2, "a"}, {171, 3, 0, 2, "b"}, {174, 300, 0, 2, "c"}},
+                               F_RDLCK};
+    EXPECT_EQ(expected.header, StateOf(*handle).header);
+    EXPECT_TRUE(expected == StateOf(*handle));
+    EXPECT_EQ(3, handle->capacity);
+    EXPECT_EQ(bytes, Contents());
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasHandleTest, ANegativeDescriptorIsRefused) {
+    TakeCallNames();
+    EXPECT_EQ(nullptr, MAVOEASOpen(-1, F_RDLCK));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_open")));
+    EXPECT_EQ(nullptr, MAVOEASOpen(-100, F_UNLCK));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_open")));
+    EXPECT_THAT(TakeCallNames(), IsEmpty());
+}
+
+TEST_F(EasHandleTest, ClosingLeavesTheDescriptorOpen) {
+    Fill(Image());
+    ASSERT_EQ(0, MAVOEASClose(MAVOEASOpen(fd_, F_WRLCK)));
+    EXPECT_EQ(Image().Build(), Contents());
+    EXPECT_THAT(TakeCallNames(), Not(Contains("close")));
+    const Handle again = Open();
+    EXPECT_NE(nullptr, again);
+}
+
+TEST_F(EasHandleTest, ClosingNothingIsRefused) {
+    EXPECT_EQ(-1, MAVOEASClose(nullptr));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_close")));
+}
+
+TEST_F(EasHandleTest, ACloseThatCannotReleaseTheLockFreesTheHandleAllTheSame) {
+    Fill(Image());
+    const int live = TakeAllocations().live;
+    EASHandle* const handle = MAVOEASOpen(fd_, F_RDLCK);
+    ASSERT_NE(nullptr, handle);
+    {
+        const FailCall fault("setlock", ENOLCK);
+        EXPECT_EQ(-1, MAVOEASClose(handle));
+        EXPECT_EQ(ENOLCK, errno);
+        EXPECT_TRUE(fault.fired());
+    }
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
+    EXPECT_EQ(live, TakeAllocations().live);
+}
+
+TEST_F(EasHandleTest, AHandleWithoutALockSearchesAndEnumeratesOnly) {
+    Fill(Image());
+    const Handle handle = Open(F_UNLCK);
+    ASSERT_NE(nullptr, handle);
+    EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
+    EXPECT_THAT(Names(handle), ElementsAre("a", "b", "c"));
+    EXPECT_EQ(1, MAVOEASSearch(handle.get(), "b"));
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+
+    char buffer[8];
+    EXPECT_EQ(-1, MAVOEASRead(handle.get(), "a", buffer, sizeof buffer, 0));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x300, "eas_read")));
+    EXPECT_EQ(-1, Write(handle, "a", "x"));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x300, "eas_write")));
+    EXPECT_EQ(-1, MAVOEASRemove(handle.get(), "a"));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x300, "eas_remove")));
+    EXPECT_EQ(-1, MAVOEASTruncate(handle.get(), "a", 0));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x300, "eas_truncate")));
+    EXPECT_EQ(Image().Build(), Contents());
+}
+
+TEST_F(EasHandleTest, AHandleWithoutALockReleasesNoneWhenItIsClosed) {
+    Fill(Image());
+    EASHandle* const handle = MAVOEASOpen(fd_, F_UNLCK);
+    ASSERT_NE(nullptr, handle);
+    TakeCallNames();
+    EXPECT_EQ(0, MAVOEASClose(handle));
+    EXPECT_THAT(TakeCallNames(), Not(Contains("setlock")));
+}
+
+TEST_F(EasHandleTest, AShortFileIsRefusedAtEveryLengthWithoutALockLeft) {
+    const StreamImage image = Image();
+    const Bytes bytes = image.Build();
+    // The last record's padding is skipped, not read.
+    const std::size_t table_end = image.RecordAt(2) + 11 + 2;
+    const int live = TakeAllocations().live;
+    for (std::size_t length = 1; length < table_end; ++length) {
+        SCOPED_TRACE(length);
+        Fill(Bytes(bytes.begin(), bytes.begin() + static_cast<std::ptrdiff_t>(length)));
+        TakeCalls();
+        EXPECT_EQ(nullptr, MAVOEASOpen(fd_, F_WRLCK));
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_open")));
+        EXPECT_EQ("setlock(2)", TakeCalls().back());
+        EXPECT_EQ(length, FileSize());
+        EXPECT_EQ(live, TakeAllocations().live);
+    }
+    EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
+    // From here on only values and fork are missing, which opening does not read.
+    for (std::size_t length = table_end; length <= bytes.size(); ++length) {
+        Fill(Bytes(bytes.begin(), bytes.begin() + static_cast<std::ptrdiff_t>(length)));
+        EXPECT_NE(nullptr, Open()) << length;
+    }
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasHandleTest, TheFileIsReadInOneOrTwoReads) {
+    Fill(Image());
+    TakeCalls();
+    Handle handle = Open(F_RDLCK);
+    EXPECT_THAT(TakeCalls(), ElementsAre("getpid()", "setlock(0)", "lseek(0, 2)",
+                                         ::testing::StartsWith("pread(")));
+    handle.reset();
+    TakeCalls();
+
+    StreamImage image;
+    for (int i = 0; i < 1000; ++i) image.attributes.push_back({"name" + std::to_string(i), {}});
+    Fill(image);
+    handle = Open(F_RDLCK);
+    EXPECT_THAT(TakeCallNames(), ElementsAre("getpid", "setlock", "lseek", "pread", "pread"));
+    EXPECT_EQ(1000, U16At(handle->header, kAttributeCountAt));
+}
+
+TEST_F(EasHandleTest, ReadsThatComeBackShortButNotEmptyAreGoneOnWith) {
+    Fill(Image());
+    const ShortCall fault("pread", 1, 70, true);
+    const Handle handle = Open(F_RDLCK);
+    EXPECT_TRUE(fault.fired());
+    ASSERT_NE(nullptr, handle);
+    EXPECT_THAT(Names(handle), ElementsAre("a", "b", "c"));
+}
+
+TEST_F(EasHandleTest, OneTenAHundredAndAThousandAttributesAreReadInAtMostTenCalls) {
+    struct Case {
+        int attributes;
+        std::size_t calls;  // the caller's own open and close among them
+    };
+    for (const Case& c : {Case{1, 9}, Case{10, 9}, Case{100, 9}, Case{1000, 10}}) {
+        SCOPED_TRACE(c.attributes);
+        StreamImage image;
+        for (int i = 0; i < c.attributes; ++i) {
+            image.attributes.push_back({"user.name" + std::to_string(i), Ascii("value")});
+        }
+        Fill(image);
+        TakeCallNames();
+        EASHandle* const handle = MAVOEASOpen(fd_, F_RDLCK);
+        ASSERT_NE(nullptr, handle);
+        char buffer[16];
+        EXPECT_EQ(5, MAVOEASRead(handle, "user.name0", buffer, sizeof buffer, 0));
+        EXPECT_EQ(0, MAVOEASClose(handle));
+        EXPECT_LE(TakeCallNames().size() + 2, c.calls);
+    }
+}
+
+// What each call of an open that fails makes of it.
+int CodeOfOpenFailure(const std::string& call) {
+    if (call == "malloc") return 0x200;
+    if (call == "setlock") return 0x400;
+    return 0xA00;
+}
+
+TEST_F(EasHandleTest, EveryFailingCallOfAnOpenIsRecordedOnceAndLeavesNothingBehind) {
+    StreamImage long_table;
+    for (int i = 0; i < 600; ++i) long_table.attributes.push_back({"name" + std::to_string(i), {}});
+    for (const Bytes& bytes : {Bytes{}, PlainAppleDouble(Pattern(32), Pattern(9)), Image().Build(),
+                               long_table.Build()}) {
+        SCOPED_TRACE(bytes.size());
+        Fill(bytes);
+        const int live = TakeAllocations().live;
+        for (int nth = 1;; ++nth) {
+            SCOPED_TRACE(nth);
+            EASHandle* handle = nullptr;
+            std::string failed;
+            int error = 0;
+            TakeCalls();
+            {
+                const FailNthCall fault(nth, EIO);
+                handle = MAVOEASOpen(fd_, F_WRLCK);
+                error = errno;
+                failed = fault.name();
+            }
+            if (failed.empty()) {
+                ASSERT_NE(nullptr, handle);
+                EXPECT_EQ(F_WRLCK, LockInTheWay(path_, F_RDLCK));
+                EXPECT_EQ(0, MAVOEASClose(handle));
+                break;
+            }
+            EXPECT_EQ(nullptr, handle);
+            EXPECT_EQ(EIO, error);
+            const std::vector<Record> records = TakeRecords();
+            ASSERT_EQ(1u, records.size());
+            EXPECT_EQ(CodeOfOpenFailure(failed), records[0].code) << failed;
+            EXPECT_THAT(records[0].unit, failed == "setlock"
+                                             ? ::testing::Matcher<std::string>("eas_lock_set")
+                                             : AnyOf("eas_open", "eas_alloc_entry"));
+            EXPECT_EQ(live, TakeAllocations().live);
+            const std::vector<std::string> calls = TakeCalls();
+            if (failed != "setlock" && !calls.empty()) {
+                EXPECT_EQ("setlock(2)", calls.back());
+            }
+            EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
+        }
+        EXPECT_EQ(bytes, Contents());
+    }
+}
+
+TEST_F(EasHandleTest, ADescriptorThatCannotBeReadIsAReadFailure) {
+    Fill(Image());
+    const int fd = ::open(path_.c_str(), O_WRONLY);
+    ASSERT_GE(fd, 0);
+    EXPECT_EQ(nullptr, MAVOEASOpen(fd, F_WRLCK));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_open")));
+    EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
+    ::close(fd);
+}
+
+TEST_F(EasHandleTest, AWriteLockNeedsADescriptorToWriteTo) {
+    Fill(Image());
+    const int fd = ::open(path_.c_str(), O_RDONLY);
+    ASSERT_GE(fd, 0);
+    EXPECT_EQ(nullptr, MAVOEASOpen(fd, F_WRLCK));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
+    ::close(fd);
+}
+
+// ---- Locks --------------------------------------------------------------------------------------
+
+TEST_F(EasHandleTest, ReadersShareAStreamBetweenProcesses) {
+    Fill(Image());
+    OtherProcess first(path_, F_RDLCK);
+    OtherProcess second(path_, F_RDLCK);
+    EXPECT_EQ(0, first.code());
+    EXPECT_EQ(0, second.code());
+    const Handle handle = Open(F_RDLCK);
+    ASSERT_NE(nullptr, handle);
+    EXPECT_EQ(Ascii("two"), Read(handle, "b"));
+}
+
+TEST_F(EasHandleTest, AWriterInAnotherProcessKeepsReadersAndWritersOutAtOnce) {
+    Fill(Image());
+    OtherProcess writer(path_, F_WRLCK);
+    ASSERT_EQ(0, writer.code());
+    const int live = TakeAllocations().live;
+    for (const int lock_type : {F_RDLCK, F_WRLCK}) {
+        SCOPED_TRACE(lock_type);
+        EXPECT_EQ(nullptr, Open(lock_type));
+        EXPECT_THAT(errno, AnyOf(EAGAIN, EACCES));
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
+        EXPECT_EQ(live, TakeAllocations().live);
+    }
+    EXPECT_NE(nullptr, Open(F_UNLCK));  // which asks for no lock
+    EXPECT_EQ(-1, EASGetEntryCount(fd_));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
+
+    writer.Release();
+    EXPECT_NE(nullptr, Open(F_WRLCK));
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasHandleTest, AReaderInAnotherProcessKeepsWritersOutAtOnce) {
+    Fill(Image());
+    OtherProcess reader(path_, F_RDLCK);
+    ASSERT_EQ(0, reader.code());
+    EXPECT_EQ(nullptr, Open(F_WRLCK));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
+    EXPECT_EQ(3, EASGetEntryCount(fd_));
+    reader.Release();
+    EXPECT_NE(nullptr, Open(F_WRLCK));
+}
+
+TEST_F(EasHandleTest, ThisProcessKeepsOthersOutUntilItCloses) {
+    Fill(Image());
+    Handle handle = Open(F_WRLCK);
+    ASSERT_NE(nullptr, handle);
+    EXPECT_EQ(0x400, OtherProcess(path_, F_RDLCK).code());
+    EXPECT_EQ(0x400, OtherProcess(path_, F_WRLCK).code());
+    EXPECT_EQ(0, OtherProcess(path_, F_UNLCK).code());
+    handle.reset();
+    EXPECT_EQ(0, OtherProcess(path_, F_WRLCK).code());
+
+    handle = Open(F_RDLCK);
+    ASSERT_NE(nullptr, handle);
+    EXPECT_EQ(0, OtherProcess(path_, F_RDLCK).code());
+    EXPECT_EQ(0x400, OtherProcess(path_, F_WRLCK).code());
+}
+
+TEST_F(EasHandleTest, TheLockIsDroppedWhenAStreamIsRefused) {
+    Bytes bytes = Image().Build();
+    PutU16(bytes, kDescriptorCountAt, 14);
+    Fill(bytes);
+    EXPECT_EQ(nullptr, Open(F_WRLCK));
+    EXPECT_THAT(TakeCodes(), ElementsAre(0xD00));
+    EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
+}
+
+TEST_F(EasHandleTest, TheLockCoversTheFileHoweverItGrows) {
+    const Handle handle = Open(F_WRLCK);
+    ASSERT_NE(nullptr, handle);
+    struct flock64 asked = {};
+    asked.l_type = F_RDLCK;
+    asked.l_whence = SEEK_SET;
+    asked.l_start = 1000000000;
+    asked.l_len = 1;
+    const pid_t child = fork();
+    if (child == 0) {
+        const int fd = ::open(path_.c_str(), O_RDWR);
+        const bool blocked = fcntl(fd, F_GETLK64, &asked) == 0 && asked.l_type == F_WRLCK &&
+                             asked.l_start == 0 && asked.l_len == 0;
+        _exit(blocked ? 0 : 1);
+    }
+    int status = -1;
+    ASSERT_EQ(child, waitpid(child, &status, 0));
+    EXPECT_EQ(0, status);
+}
+
+TEST_F(EasHandleTest, TheLockIsChangedAndTheHandleKnows) {
+    Fill(Image());
+    const Handle handle = Open(F_UNLCK);
+    ASSERT_NE(nullptr, handle);
+    EXPECT_EQ(0, MAVOEASLockSet(handle.get(), F_RDLCK));
+    EXPECT_EQ(F_RDLCK, handle->lockType);
+    EXPECT_EQ(F_RDLCK, LockInTheWay(path_, F_WRLCK));
+    EXPECT_EQ(Ascii("one"), Read(handle, "a"));
+    EXPECT_EQ(0, MAVOEASLockSet(handle.get(), F_WRLCK));
+    EXPECT_EQ(F_WRLCK, handle->lockType);
+    EXPECT_EQ(F_WRLCK, LockInTheWay(path_, F_RDLCK));
+    EXPECT_EQ(1, Write(handle, "a", "1"));
+    EXPECT_EQ(0, MAVOEASLockSet(handle.get(), F_UNLCK));
+    EXPECT_EQ(F_UNLCK, handle->lockType);
+    EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
+    EXPECT_EQ(-1, Write(handle, "a", "2"));
+    EXPECT_THAT(TakeCodes(), ElementsAre(0x300));
+}
+
+TEST_F(EasHandleTest, ALockThatIsNotGrantedLeavesTheOldOne) {
+    Fill(Image());
+    const Handle handle = Open(F_RDLCK);
+    ASSERT_NE(nullptr, handle);
+    OtherProcess reader(path_, F_RDLCK);
+    ASSERT_EQ(0, reader.code());
+    EXPECT_EQ(-1, MAVOEASLockSet(handle.get(), F_WRLCK));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
+    EXPECT_EQ(F_RDLCK, handle->lockType);
+    reader.Release();
+    EXPECT_EQ(F_RDLCK, LockInTheWay(path_, F_WRLCK));
+}
+
+TEST_F(EasHandleTest, LocksWithoutAHandleOrDescriptorAreRefused) {
+    EXPECT_EQ(-1, MAVOEASLockSet(nullptr, F_RDLCK));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_lock_set")));
+    struct flock64 lock = {};
+    EXPECT_EQ(-1, MAVOEASLockGet(nullptr, &lock));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_lock_get")));
+
+    const Handle handle = Open(F_RDLCK);
+    ASSERT_NE(nullptr, handle);
+    EXPECT_EQ(-1, MAVOEASLockGet(handle.get(), nullptr));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_lock_get")));
+    handle->fd = -1;
+    EXPECT_EQ(-1, MAVOEASLockGet(handle.get(), &lock));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_lock_get")));
+    EXPECT_EQ(-1, MAVOEASLockSet(handle.get(), F_WRLCK));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_lock_set")));
+    EXPECT_EQ(F_RDLCK, handle->lockType);
+    handle->fd = fd_;
+}
+
+TEST_F(EasHandleTest, AnUnknownLockTypeIsALockFailure) {
+    const Handle handle = Open(F_RDLCK);
+    ASSERT_NE(nullptr, handle);
+    EXPECT_EQ(-1, MAVOEASLockSet(handle.get(), 77));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
+    EXPECT_EQ(F_RDLCK, handle->lockType);
+}
+
+TEST_F(EasHandleTest, TheKernelIsAskedAboutALock) {
+    Fill(Image());
+    const Handle handle = Open(F_UNLCK);
+    ASSERT_NE(nullptr, handle);
+    struct flock64 lock = {};
+    lock.l_type = F_WRLCK;
+    lock.l_whence = SEEK_SET;
+    EXPECT_EQ(0, MAVOEASLockGet(handle.get(), &lock));
+    EXPECT_EQ(F_UNLCK, lock.l_type);
+
+    OtherProcess reader(path_, F_RDLCK);
+    ASSERT_EQ(0, reader.code());
+    lock = {};
+    lock.l_type = F_WRLCK;
+    lock.l_whence = SEEK_SET;
+    EXPECT_EQ(0, MAVOEASLockGet(handle.get(), &lock));
+    EXPECT_EQ(F_RDLCK, lock.l_type);
+    EXPECT_EQ(reader.pid(), lock.l_pid);
+    EXPECT_EQ(F_UNLCK, handle->lockType);
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasHandleTest, AQuestionThatTheKernelRefusesIsASystemCallFailure) {
+    const Handle handle = Open(F_RDLCK);
+    ASSERT_NE(nullptr, handle);
+    struct flock64 lock = {};
+    lock.l_type = F_WRLCK;
+    const FailCall fault("getlock", EINVAL);
+    EXPECT_EQ(-1, MAVOEASLockGet(handle.get(), &lock));
+    EXPECT_EQ(EINVAL, errno);
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2A00, "eas_lock_get")));
+}
+
+// ---- Flush --------------------------------------------------------------------------------------
+
+TEST_F(EasHandleTest, FlushingSyncsTheDescriptor) {
+    const Handle handle = Open(F_RDLCK);
+    ASSERT_NE(nullptr, handle);
+    TakeCallNames();
+    EXPECT_EQ(0, MAVOEASFlush(handle.get()));
+    EXPECT_THAT(TakeCallNames(), ElementsAre("fsync"));
+    {
+        const FailCall fault("fsync", EIO);
+        EXPECT_EQ(-1, MAVOEASFlush(handle.get()));
+        EXPECT_EQ(EIO, errno);
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2A00, "eas_flush")));
+    }
+    handle->fd = -1;
+    EXPECT_EQ(-1, MAVOEASFlush(handle.get()));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_flush")));
+    handle->fd = fd_;
+    EXPECT_EQ(-1, MAVOEASFlush(nullptr));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_flush")));
+}
+
+// ---- Entry count --------------------------------------------------------------------------------
+
+TEST_F(EasHandleTest, AttributesAreCountedWithoutTheTable) {
+    EXPECT_EQ(0, EASGetEntryCount(fd_));
+    EXPECT_EQ(0u, FileSize());
+    Fill(PlainAppleDouble(Pattern(32), Pattern(10)));
+    EXPECT_EQ(0, EASGetEntryCount(fd_));
+    const Bytes bytes = Image().Build();
+    Fill(bytes);
+    EXPECT_EQ(3, EASGetEntryCount(fd_));
+    // Only the 120 bytes in front are looked at.
+    Fill(Bytes(bytes.begin(), bytes.begin() + 120));
+    EXPECT_EQ(3, EASGetEntryCount(fd_));
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+    for (std::size_t length = 1; length < 120; ++length) {
+        Fill(Bytes(bytes.begin(), bytes.begin() + static_cast<std::ptrdiff_t>(length)));
+        EXPECT_EQ(-1, EASGetEntryCount(fd_)) << length;
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_open"))) << length;
+    }
+    EXPECT_EQ(-1, EASGetEntryCount(-1));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_open")));
+}
+
+TEST_F(EasHandleTest, CountingHoldsAReadLockMeanwhile) {
+    Fill(Image());
+    TakeCalls();
+    EXPECT_EQ(3, EASGetEntryCount(fd_));
+    const std::vector<std::string> calls = TakeCalls();
+    ASSERT_GE(calls.size(), 3u);
+    EXPECT_EQ("setlock(0)", *std::find(calls.begin(), calls.end(), "setlock(0)"));
+    EXPECT_EQ("setlock(2)", calls.back());
+    EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
+}
+
+TEST_F(EasHandleTest, EveryFailingCallOfACountIsRecordedOnceAndLeavesNothingBehind) {
+    Fill(Image());
+    const int live = TakeAllocations().live;
+    for (int nth = 1;; ++nth) {
+        SCOPED_TRACE(nth);
+        int count = 0;
+        std::string failed;
+        TakeCalls();
+        {
+            const FailNthCall fault(nth, EIO);
+            count = EASGetEntryCount(fd_);
+            failed = fault.name();
+        }
+        EXPECT_EQ(live, TakeAllocations().live);
+        const std::vector<std::string> calls = TakeCalls();
+        if (failed.empty()) {
+            EXPECT_EQ(3, count);
+            break;
+        }
+        if (failed == "setlock" && calls.back() == "setlock(2)") {
+            // The count was taken; only the release failed, for which no result is laid down.
+            EXPECT_THAT(TakeCodes(), ElementsAre(0x400));
+            EXPECT_EQ(3, EASGetEntryCount(fd_));  // which drops it
+            continue;
+        }
+        EXPECT_EQ(-1, count);
+        EXPECT_THAT(TakeCodes(), ElementsAre(CodeOfOpenFailure(failed))) << failed;
+        EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
+    }
+}
+
+}  // namespace
+}  // namespace mavoea::test
