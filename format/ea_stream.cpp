@@ -1,7 +1,5 @@
 #include "format/ea_stream.h"
 
-#include <cstring>
-
 namespace mavoea {
 namespace {
 
@@ -74,27 +72,6 @@ bool DecodeAttributeHeader(ByteView bytes, AttributeHeader* header) {
     BeReader in(bytes);
     *header = ReadAttributeHeader(in);
     return in.ok();
-}
-
-bool DecodeAttributeRecord(ByteView bytes, AttributeRecord* record) {
-    BeReader in(bytes);
-    record->value.offset = in.U32();
-    record->value.length = in.U32();
-    record->flags = in.U16();
-    record->name_size = in.U8();
-    return in.ok();
-}
-
-void EncodeAttributeRecord(const AttributeRecord& record, const char* name, std::uint8_t* to) {
-    const std::size_t size = RecordSize(record.name_size);
-    BeWriter out({to, size});
-    out.U32(record.value.offset);
-    out.U32(record.value.length);
-    out.U16(record.flags);
-    out.U8(record.name_size);
-    std::uint8_t* const text = to + AttributeRecord::kFixedSize;
-    std::memcpy(text, name, record.name_size);
-    std::memset(text + record.name_size, 0, size - AttributeRecord::kFixedSize - record.name_size);
 }
 
 }  // namespace mavoea

@@ -73,6 +73,12 @@ StreamHeader DecodeStreamHeader(std::span<const std::uint8_t, kStreamHeaderSize>
 void EncodeStreamHeader(const StreamHeader& header,
                         std::span<std::uint8_t, kStreamHeaderSize> bytes);
 
+// The number of attributes alone.
+constexpr std::uint16_t DecodeAttributeCount(
+    std::span<const std::uint8_t, kStreamHeaderSize> bytes) {
+    return LoadBe16(&bytes[118]);
+}
+
 // From the bytes at kAttributeHeaderOffset; false when they are too few.
 bool DecodeAttributeHeader(ByteView bytes, AttributeHeader* header);
 inline constexpr std::size_t kAttributeHeaderSize = kStreamHeaderSize - kAttributeHeaderOffset;
@@ -103,11 +109,28 @@ constexpr std::uint64_t SmallestTable(std::uint16_t count) {
 }
 
 // The fixed part of a record; false when the bytes are too few.
-bool DecodeAttributeRecord(ByteView bytes, AttributeRecord* record);
+constexpr bool DecodeAttributeRecord(ByteView bytes, AttributeRecord* record) {
+    BeReader in(bytes);
+    record->value.offset = in.U32();
+    record->value.length = in.U32();
+    record->flags = in.U16();
+    record->name_size = in.U8();
+    return in.ok();
+}
 
 // A whole record, its padding included, into RecordSize(record.name_size) bytes. `name` has
 // record.name_size bytes.
-void EncodeAttributeRecord(const AttributeRecord& record, const char* name, std::uint8_t* to);
+inline void EncodeAttributeRecord(const AttributeRecord& record, const char* name,
+                                  std::uint8_t* to) {
+    const std::size_t size = RecordSize(record.name_size);
+    StoreBe32(0, to + size - 4);  // the padding; what is none is written over
+    BeWriter out({to, AttributeRecord::kFixedSize});
+    out.U32(record.value.offset);
+    out.U32(record.value.length);
+    out.U16(record.flags);
+    out.U8(record.name_size);
+    CopyShort(to + AttributeRecord::kFixedSize, name, record.name_size);
+}
 
 }  // namespace mavoea
 

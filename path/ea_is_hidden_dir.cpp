@@ -14,25 +14,24 @@ namespace {
 
 constexpr Unit unit("ea_is_hidden_dir");
 
-// Every hidden directory's name begins with one of these.
-constexpr bool MayBeHidden(char first) { return first == '@' || first == '.'; }
+}  // namespace
 
-int IsHiddenDirName(const char* name) {
-    if (!MayBeHidden(*name)) return 0;
+bool IsHiddenDirAtName(const char* name) {
+    const char letter = static_cast<char>(name[1] | ('a' - 'A'));
     for (const char* hidden : kHiddenDirNames) {
-        if (strcasecmp(name, hidden) == 0) return 1;
+        // Their second letters differ, so that at most one is compared whole.
+        if (letter == hidden[1] && strcasecmp(name, hidden) == 0) return true;
     }
-    return 0;
+    return false;
 }
 
-}  // namespace
 }  // namespace mavoea
 
 using namespace mavoea;
 
 int MAVOEAIsHiddenDir(const char* szPath) {
     if (szPath == nullptr) return -1;
-    if (*szPath != '/') return IsHiddenDirName(szPath);
+    if (*szPath != '/') return IsHiddenDirName(szPath) ? 1 : 0;
 
     const std::size_t size = strlen(szPath) + 1;
     const auto copy = Owned<char>::Allocate(size);  // basename writes into what it is given
@@ -40,10 +39,10 @@ int MAVOEAIsHiddenDir(const char* szPath) {
     memcpy(copy.get(), szPath, size);
     const char* const name = basename(copy.get());
     if (name == nullptr) return unit.Fail(Err::kBaseName);
-    return IsHiddenDirName(name);
+    return IsHiddenDirName(name) ? 1 : 0;
 }
 
 int MAVOEAIsHiddenDirName(const char* szName) {
     if (szName == nullptr) return -1;
-    return MayBeHidden(*szName) ? MAVOEAIsHiddenDir(szName) : 0;
+    return IsHiddenDirName(szName) ? 1 : 0;
 }

@@ -2,9 +2,9 @@
 // and the "._" file.
 
 #include <errno.h>
+#include <string.h>
 
 #include <cstdint>
-#include <cstring>
 
 #include "include/mavoea.h"
 #include "path/ea_dir_path.h"
@@ -38,14 +38,13 @@ char CheckCharacter(std::string_view dropped) {
 
 // Shortens a name of more than kNameMax bytes in place, to exactly kNameMax.
 void Shorten(char* name, std::size_t size) {
-    const std::string_view text(name, size);
     // It stands for all from the last byte that has room on.
     const char check = CheckCharacter({name + kNameMax - 1, size - (kNameMax - 1)});
-    const std::size_t dot = text.rfind('.');
-    const bool kept = dot != text.npos && size - dot <= kExtensionMax;
-    const std::size_t extension = kept ? size - dot : 0;
+    const auto* const dot =
+        static_cast<const char*>(memrchr(name + size - kExtensionMax, '.', kExtensionMax));
+    const auto extension = dot == nullptr ? 0 : static_cast<std::size_t>(name + size - dot);
     // The extension may overlap the place where it goes.
-    std::memmove(name + kNameMax - extension, name + size - extension, extension);
+    memmove(name + kNameMax - extension, name + size - extension, extension);
     name[kNameMax - extension - 1] = check;
 }
 
@@ -71,17 +70,20 @@ int MAVOEAPathNoADFS(int form, const char* szPath, const char* szName, char* szB
         return unit.Fail(Err::kNameTooLong);
     }
 
-    const std::size_t parent_size = SplitObject(path).parent.size();
-    if (form == EA_FORM_FILE && path.size() - parent_size > kNameMax) {
-        Shorten(copy.data() + parent_size, path.size() - parent_size);
-        path = path.substr(0, parent_size + kNameMax);
+    std::string_view name;
+    if (form == EA_FORM_FILE) {
+        name = SplitObject(path).name;
+        if (name.size() > kNameMax) {
+            Shorten(copy.data() + (name.data() - path.data()), name.size());
+            path.remove_suffix(name.size() - kNameMax);
+            name = {name.data(), kNameMax};
+        }
     }
-
     char* const dir_end = DeriveDirPath(form, path, szBuf, cbBuf);
     if (dir_end == nullptr) return -1;
     PathWriter out(dir_end);
     out.Add("/");
-    if (form == EA_FORM_FILE) out.Add(SplitObject(path).name).Add("@");
+    if (form == EA_FORM_FILE) out.Add(name).Add("@");
     out.Add(kind).Finish();
     return 0;
 }

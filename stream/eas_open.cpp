@@ -8,6 +8,7 @@
 #include "include/mavoea.h"
 #include "stream/internal.h"
 #include "stream/layout.h"
+#include "stream/open_stream.h"
 #include "util/file_io.h"
 #include "util/owned.h"
 #include "util/unit.h"
@@ -17,72 +18,44 @@ namespace {
 
 constexpr Unit unit("eas_open");
 
-// Parts of a file by offset, out of one buffer that moves along. The first read takes most streams
-// whole; what a damaged header declares never makes the buffer larger than the file, nor than
-// kMost.
-class FileWindow {
- public:
-    FileWindow(int fd, std::uint64_t file_size) : fd_(fd), file_size_(file_size) {}
+// The file's size, -1 after recording why it could not be told.
+std::int64_t FileSize(int fd) {
+    const off_t size = kernel::Lseek(fd, 0, SEEK_END);
+    return size < 0 ? unit.Fail(Err::kRead) : std::int64_t{size};
+}
 
-    // `size` bytes at `offset`, valid until the next call; none when the file ends before or cannot
-    // be read.
-    ByteView At(std::uint64_t offset, std::size_t size) {
-        if (offset < start_ || offset + size > start_ + filled_) {
-            if (offset + size > file_size_ || !MoveTo(offset, size)) return {};
-        }
-        return {buffer_ + (offset - start_), size};
+// How a file begins, read once: most streams whole.
+class FirstBytes {
+ public:
+    FirstBytes(int fd, std::uint64_t file_size) {
+        const auto want = static_cast<std::size_t>(std::min<std::uint64_t>(file_size, kMost));
+        const std::int64_t got = ReadAt(fd, {bytes_, want}, 0);
+        size_ = got < 0 ? 0 : static_cast<std::size_t>(got);
     }
 
-    // Lets the next read, when there has to be one, go on to here.
-    void Expect(std::uint64_t end) { expected_ = end; }
-
-    bool OutOfMemory() const { return out_of_memory_; }
+    // `size` bytes at `offset`; none when they are not all here.
+    ByteView At(std::uint64_t offset, std::size_t size) const {
+        if (offset > size_ || size > size_ - offset) return {};
+        return {bytes_ + offset, size};
+    }
+    std::size_t size() const { return size_; }
 
  private:
-    static constexpr std::size_t kFirst = 8192;
-    static constexpr std::size_t kMost = std::size_t{1} << 20;
+    static constexpr std::size_t kMost = 8192;
 
-    bool MoveTo(std::uint64_t offset, std::size_t size) {
-        const std::uint64_t end =
-            std::min(file_size_, std::max({offset + size, offset + kFirst, expected_}));
-        const auto want = static_cast<std::size_t>(std::min<std::uint64_t>(end - offset, kMost));
-        if (want > capacity_) {
-            more_ = Owned<std::uint8_t>::Allocate(want);
-            filled_ = 0;
-            if (!more_) {
-                out_of_memory_ = true;
-                return false;
-            }
-            buffer_ = more_.get();
-            capacity_ = want;
-        }
-        const std::int64_t got = ReadAt(fd_, {buffer_, want}, offset);
-        start_ = offset;
-        filled_ = got < 0 ? 0 : static_cast<std::size_t>(got);
-        return filled_ >= size;
-    }
-
-    int fd_;
-    std::uint64_t file_size_;
-    std::uint64_t expected_ = 0;
-    std::uint64_t start_ = 0;
-    std::size_t filled_ = 0;
-    std::size_t capacity_ = kFirst;
-    bool out_of_memory_ = false;
-    Owned<std::uint8_t> more_;
-    std::uint8_t first_[kFirst];
-    std::uint8_t* buffer_ = first_;
+    std::size_t size_ = 0;
+    std::uint8_t bytes_[kMost];
 };
 
-int ReadHeader(FileWindow& file, StreamHeader* header) {
-    ByteView bytes = file.At(0, AppleDoubleHeader::kSize);
+int ReadHeader(int fd, const FirstBytes& first, StreamHeader* header) {
+    ByteView bytes = first.At(0, AppleDoubleHeader::kSize);
     if (bytes.empty()) return unit.Fail(Err::kRead);
     BeReader in(bytes);
     header->file = DecodeAppleDoubleHeader(in);
     const std::uint16_t count = header->file.entry_count;
     if (count > kStreamDescriptorMax) return unit.Fail(Err::kBadArgument);
 
-    bytes = file.At(0, DescriptorsEnd(count));
+    bytes = first.At(0, DescriptorsEnd(count));
     if (bytes.empty()) return unit.Fail(Err::kRead);
     BeReader descriptors(bytes.subspan(AppleDoubleHeader::kSize));
     for (std::uint16_t i = 0; i < count; ++i) {
@@ -91,71 +64,145 @@ int ReadHeader(FileWindow& file, StreamHeader* header) {
         if (entry.id == EntryId::kResourceFork) header->resource_fork = entry;
     }
 
-    bytes = file.At(header->finder_info.data.offset, kFinderInfoSize);
-    if (bytes.empty()) return unit.Fail(Err::kRead);
-    BeReader(bytes).Copy(header->finder_info_bytes);
-
-    if (header->finder_info.data.length == kFinderInfoSize) {
+    const Range finder_info = header->finder_info.data;
+    bytes = first.At(finder_info.offset, kFinderInfoSize);
+    if (!bytes.empty()) {
+        std::copy(bytes.begin(), bytes.end(), header->finder_info_bytes.begin());
+    } else if (ReadAt(fd, header->finder_info_bytes, finder_info.offset) !=
+               std::int64_t{kFinderInfoSize}) {
+        return unit.Fail(Err::kRead);
+    }
+    if (finder_info.length == kFinderInfoSize) {
         header->attributes = NoAttributes();
         return 0;
     }
-    bytes = file.At(kAttributeHeaderOffset, kAttributeHeaderSize);
+    bytes = first.At(kAttributeHeaderOffset, kAttributeHeaderSize);
     return DecodeAttributeHeader(bytes, &header->attributes) ? 0 : unit.Fail(Err::kRead);
 }
 
-// Reads one record at *at, and moves on behind it.
-int ReadRecord(FileWindow& file, std::uint64_t* at, EASEntry* entry) {
-    AttributeRecord record;
-    if (!DecodeAttributeRecord(file.At(*at, AttributeRecord::kFixedSize), &record)) {
-        return unit.Fail(file.OutOfMemory() ? Err::kMemory : Err::kRead);
-    }
-    const std::size_t size = AttributeRecord::kFixedSize + record.name_size;
-    const ByteView bytes = file.At(*at, size);
-    if (bytes.empty()) return unit.Fail(file.OutOfMemory() ? Err::kMemory : Err::kRead);
+// The attribute table while it is read: its bytes from kStreamHeaderSize on, as many as its records
+// turn out to take.
+class TableReader {
+ public:
+    TableReader(int fd, std::uint64_t file_size, const FirstBytes& first)
+        : fd_(fd), most_(file_size - kStreamHeaderSize), first_(first) {}
 
-    auto name = Owned<char>::Allocate(record.name_size + 1U);
-    if (!name) return unit.Fail(Err::kMemory);
-    memcpy(name.get(), bytes.data() + AttributeRecord::kFixedSize, record.name_size);
-    name.get()[record.name_size] = '\0';
-    *entry = {.offset = record.value.offset,
-              .length = record.value.length,
-              .flags = record.flags,
-              .nameLength = record.name_size,
-              .name = name.Release()};
-    *at += RecordSize(record.name_size);
-    return 0;
+    // Reads `count` records, which the header says end at `end`. What it says decides how much is
+    // read at once and nothing else: never more than the file has, and little more than is needed.
+    int Read(std::uint16_t count, std::uint64_t end) {
+        const std::uint64_t likely = end > kStreamHeaderSize ? end - kStreamHeaderSize : 0;
+        std::uint64_t at = 0;
+        for (std::uint16_t i = 0; i < count; ++i) {
+            if (!Reach(at + AttributeRecord::kFixedSize, likely)) return Refuse();
+            AttributeRecord record;
+            DecodeAttributeRecord({table_.get() + at, AttributeRecord::kFixedSize}, &record);
+            if (!Reach(at + AttributeRecord::kFixedSize + record.name_size, likely)) {
+                return Refuse();
+            }
+            at += RecordSize(record.name_size);
+        }
+        return 0;
+    }
+
+    std::size_t size() const { return size_; }
+    std::uint8_t* Release() { return table_.Release(); }
+
+ private:
+    static constexpr std::uint64_t kStep = std::uint64_t{1} << 16;
+
+    // Whether `size` bytes of the table are here, or could be read.
+    bool Reach(std::uint64_t size, std::uint64_t likely) {
+        if (size <= size_) return true;
+        if (size > most_) return false;
+        const std::uint64_t want =
+            std::min(most_, likely > size_ && likely >= size ? std::min(likely, size_ + 16 * kStep)
+                                                             : size + kStep);
+        void* const larger = kernel::Reallocate(table_.get(), want);
+        if (larger == nullptr) {
+            out_of_memory_ = true;
+            return false;
+        }
+        (void)table_.Release();
+        table_ = Owned<std::uint8_t>(static_cast<std::uint8_t*>(larger));
+        if (size_ == 0) {
+            const std::size_t here = first_.size() - kStreamHeaderSize;
+            size_ = static_cast<std::size_t>(std::min<std::uint64_t>(here, want));
+            memcpy(table_.get(), first_.At(kStreamHeaderSize, size_).data(), size_);
+        }
+        if (size_ < want) {
+            const std::int64_t got =
+                ReadAt(fd_, {table_.get() + size_, static_cast<std::size_t>(want - size_)},
+                       kStreamHeaderSize + size_);
+            if (got < 0) return false;
+            size_ += static_cast<std::size_t>(got);
+        }
+        return size <= size_;
+    }
+
+    int Refuse() const { return unit.Fail(out_of_memory_ ? Err::kMemory : Err::kRead); }
+
+    int fd_;
+    std::uint64_t most_;
+    const FirstBytes& first_;
+    Owned<std::uint8_t> table_;
+    std::size_t size_ = 0;
+    bool out_of_memory_ = false;
+};
+
+// The name of a record of the table as read: where it lies when it ends in a NUL, as all but
+// damaged ones do, else a copy that does; nullptr when memory ran out.
+char* NameOf(std::uint8_t* bytes, std::uint8_t size) {
+    if (size > 0 && bytes[size - 1] == '\0') return reinterpret_cast<char*>(bytes);
+    auto* const name = static_cast<char*>(kernel::Allocate(size + 1ULL));
+    if (name == nullptr) return nullptr;
+    memcpy(name, bytes, size);
+    name[size] = '\0';
+    return name;
 }
 
-// The file's size, -1 after recording why it could not be told.
-std::int64_t FileSize(int fd) {
-    const off_t size = kernel::Lseek(fd, 0, SEEK_END);
-    return size < 0 ? unit.Fail(Err::kRead) : std::int64_t{size};
+int LoadTable(EASHandle* h, std::uint64_t file_size, const FirstBytes& first,
+              const AttributeHeader& attributes) {
+    const std::uint16_t count = attributes.count;
+    if (count != 0 && kStreamHeaderSize + SmallestTable(count) > file_size) {
+        return unit.Fail(Err::kRead);
+    }
+    if (MAVOEASAllocEntry(h, count) != 0) return -1;
+    if (count == 0) return 0;
+    TableReader reader(h->fd, file_size, first);
+    if (reader.Read(count, attributes.data.offset) != 0) return -1;
+
+    OpenStream* const stream = StreamOf(h);
+    stream->table_size = reader.size();
+    stream->table = reader.Release();
+    std::uint8_t* at = stream->table;
+    for (std::uint16_t i = 0; i < count; ++i) {
+        AttributeRecord record;
+        DecodeAttributeRecord({at, AttributeRecord::kFixedSize}, &record);
+        char* const name = NameOf(at + AttributeRecord::kFixedSize, record.name_size);
+        if (name == nullptr) return unit.Fail(Err::kMemory);
+        h->entries[i] = {.offset = record.value.offset,
+                         .length = record.value.length,
+                         .flags = record.flags,
+                         .nameLength = record.name_size,
+                         .name = name};
+        at += RecordSize(record.name_size);
+    }
+    return 0;
 }
 
 int Load(EASHandle* h) {
-    const std::int64_t file_size = FileSize(h->fd);
-    if (file_size < 0) return -1;
-    if (file_size == 0) {
+    const std::int64_t size = FileSize(h->fd);
+    if (size < 0) return -1;
+    if (size == 0) {
         StoreHeader(NewStreamHeader(), h);
         return MAVOEASAllocEntry(h, 0);
     }
-    FileWindow file(h->fd, static_cast<std::uint64_t>(file_size));
+    const auto file_size = static_cast<std::uint64_t>(size);
+    const FirstBytes first(h->fd, file_size);
     StreamHeader header;
-    if (ReadHeader(file, &header) != 0) return -1;
+    if (ReadHeader(h->fd, first, &header) != 0) return -1;
     StoreHeader(header, h);
-
-    const AttributeHeader& attributes = header.attributes;
-    const auto most = static_cast<std::uint64_t>(file_size);
-    if (attributes.count != 0 && kStreamHeaderSize + SmallestTable(attributes.count) > most) {
-        return unit.Fail(Err::kRead);
-    }
-    if (MAVOEASAllocEntry(h, attributes.count) != 0) return -1;
-    file.Expect(attributes.data.offset);
-    std::uint64_t at = kStreamHeaderSize;
-    for (std::uint16_t i = 0; i < attributes.count; ++i) {
-        if (ReadRecord(file, &at, &h->entries[i]) != 0) return -1;
-    }
-    return 0;
+    return LoadTable(h, file_size, first, header.attributes);
 }
 
 }  // namespace
@@ -172,9 +219,9 @@ int EASGetEntryCount(int fd) {
     if (file_size < 0) {
         count = -1;
     } else if (file_size > 0) {
-        FileWindow file(fd, static_cast<std::uint64_t>(file_size));
+        const FirstBytes first(fd, static_cast<std::uint64_t>(file_size));
         StreamHeader header;
-        count = ReadHeader(file, &header) == 0 ? header.attributes.count : -1;
+        count = ReadHeader(fd, first, &header) == 0 ? header.attributes.count : -1;
     }
     const ErrnoKeeper keep;
     (void)MAVOEASLockSet(&h, F_UNLCK);
@@ -190,19 +237,20 @@ EASHandle* MAVOEASOpen(int fd, int lockType) {
         unit.Fail(Err::kBadArgument);
         return nullptr;
     }
-    auto h = Owned<EASHandle>::AllocateZeroed(1);
-    if (!h) {
+    auto stream = Owned<OpenStream>::AllocateZeroed(1);
+    if (!stream) {
         unit.Fail(Err::kMemory);
         return nullptr;
     }
+    EASHandle* const h = &stream->handle;
     h->fd = fd;
     h->lockType = F_UNLCK;
-    if (MAVOEASLockSet(h.get(), lockType) != 0) return nullptr;
-    if (Load(h.get()) != 0) {
-        const ErrnoKeeper keep;
-        FreeTable(h.get());
-        if (h->lockType != F_UNLCK) (void)MAVOEASLockSet(h.get(), F_UNLCK);
-        return nullptr;
-    }
-    return h.Release();
+    if (MAVOEASLockSet(h, lockType) != 0) return nullptr;
+    const bool loaded = Load(h) == 0;
+    (void)stream.Release();
+    if (loaded) return h;
+    const ErrnoKeeper keep;
+    if (h->lockType != F_UNLCK) (void)MAVOEASLockSet(h, F_UNLCK);
+    FreeStream(h);
+    return nullptr;
 }

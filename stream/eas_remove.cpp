@@ -29,13 +29,16 @@ int MAVOEASRemove(EASHandle* h, const char* name) {
     if (SurveyFork(h, survey, unit, &fork) != 0) return -1;
 
     const EASEntry& dropped = h->entries[index];
-    Range data = survey.header.attributes.data;
+    Range data = survey.header.attributes.data;  // as it will be
     data.offset -= RemovedRecordSize(dropped.nameLength);
     data.length -= dropped.length;
     StreamImage image(data.end());
     if (!image.ok()) return unit.Fail(Err::kMemory);
-    if (GatherValues(h, static_cast<unsigned>(index), image.At(data.offset), true) != 0) return -1;
-    image.PutHead(LoadHeader(*h), h);
+    if (GatherValues(h, &survey.header, static_cast<unsigned>(index), image.At(data.offset),
+                     true) != 0) {
+        return -1;
+    }
+    image.PutHead(survey.header, h);
 
     if (EASShiftRFork(h, static_cast<unsigned>(data.end()), fork.offset, fork.length) != 0) {
         return -1;

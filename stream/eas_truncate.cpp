@@ -39,7 +39,8 @@ int MAVOEASTruncate(EASHandle* h, const char* name, unsigned length) {
     // The image has room for the value as it is, too: it is gathered whole.
     StreamImage image(std::max(total_size, data.end()));
     if (!image.ok()) return unit.Fail(Err::kMemory);
-    if (GatherValues(h, static_cast<unsigned>(index), image.At(data.offset), false) != 0) {
+    if (GatherValues(h, &survey.header, static_cast<unsigned>(index), image.At(data.offset),
+                     false) != 0) {
         return -1;
     }
     if (length > old_length) memset(image.At(data.end()), 0, length - old_length);

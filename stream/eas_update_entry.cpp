@@ -5,6 +5,7 @@
 
 #include "include/mavoea.h"
 #include "stream/layout.h"
+#include "stream/open_stream.h"
 #include "util/file_io.h"
 #include "util/unit.h"
 
@@ -28,9 +29,9 @@ bool ReadValues(int fd, Range data, Range value, std::uint8_t* to, bool remove) 
 
 }  // namespace
 
-int GatherValues(EASHandle* h, unsigned index, std::uint8_t* to, bool remove) {
-    StreamHeader header = LoadHeader(*h);
-    Range& data = header.attributes.data;
+int GatherValues(EASHandle* h, StreamHeader* header, unsigned index, std::uint8_t* to,
+                 bool remove) {
+    Range& data = header->attributes.data;
     const std::span<EASEntry> attributes = Attributes(*h);
     const EASEntry moved = attributes[index];
     if (!ReadValues(h->fd, data, {moved.offset, moved.length}, to, remove)) {
@@ -50,10 +51,8 @@ int GatherValues(EASHandle* h, unsigned index, std::uint8_t* to, bool remove) {
     for (EASEntry& entry : attributes) entry.offset -= record_size;
     data.offset -= record_size;
     data.length -= moved.length;
-    --header.attributes.count;
-    StoreHeader(header, h);
-    kernel::Free(last.name);
-    last = {};
+    --header->attributes.count;
+    FreeEntry(h, &last);
     return 0;
 }
 
@@ -73,5 +72,7 @@ int MAVOEASUpdateEntry(EASHandle* h, unsigned index, unsigned char* buf, unsigne
     if (buf == nullptr && bufSize > 0) return unit.Fail(Err::kBadArgument);
     Survey survey;
     if (SurveyTable(h, unit, &survey) != 0) return -1;
-    return GatherValues(h, index, buf, drop);
+    if (GatherValues(h, &survey.header, index, buf, drop) != 0) return -1;
+    StoreHeader(survey.header, h);
+    return 0;
 }

@@ -19,9 +19,9 @@ namespace {
 constexpr Unit unit("eas_write");
 
 // Puts `image` on disk, the fork first: it still lies where the old header says while it moves.
-int Commit(EASHandle* h, const StreamImage& image, Range fork) {
-    const std::uint32_t total_size = LoadHeader(*h).attributes.total_size;
-    if (EASShiftRFork(h, total_size, fork.offset, fork.length) != 0) return -1;
+int Commit(EASHandle* h, const StreamImage& image, std::uint64_t total_size, Range fork) {
+    const auto fork_start = static_cast<unsigned>(total_size);
+    if (EASShiftRFork(h, fork_start, fork.offset, fork.length) != 0) return -1;
     if (image.Write(h->fd, unit) != 0) return -1;
     return MAVOEASFlush(h);
 }
@@ -67,9 +67,8 @@ int Create(EASHandle* h, const char* name, ByteView value, unsigned offset) {
     };
     attributes.data.length += static_cast<std::uint32_t>(length);
     ++attributes.count;
-    StoreHeader(survey.header, h);
     image.PutHead(survey.header, h);
-    return Commit(h, image, fork);
+    return Commit(h, image, total_size, fork);
 }
 
 int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
@@ -88,7 +87,7 @@ int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
 
     StreamImage image(total_size);
     if (!image.ok()) return unit.Fail(Err::kMemory);
-    if (GatherValues(h, index, image.At(data.offset), false) != 0) return -1;
+    if (GatherValues(h, &survey.header, index, image.At(data.offset), false) != 0) return -1;
     std::uint8_t* const at = image.At(data.end() - old_length);
     memset(at + old_length, 0, static_cast<std::size_t>(added));
     std::copy(value.begin(), value.end(), at + offset);
@@ -96,7 +95,7 @@ int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
     Attributes(*h).back().length = static_cast<std::uint32_t>(length);
     data.length += static_cast<std::uint32_t>(added);
     image.PutHead(survey.header, h);
-    return Commit(h, image, fork);
+    return Commit(h, image, total_size, fork);
 }
 
 }  // namespace

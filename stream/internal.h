@@ -28,9 +28,6 @@ int EASShiftRFork(EASHandle* h, unsigned newStart, unsigned oldStart, unsigned l
 // no code.
 int EASMoveRFork(int fd, unsigned length, unsigned newStart, unsigned oldStart, int backwards);
 
-// Frees the attribute table and the names in it.
-void FreeTable(EASHandle* h);
-
 }  // namespace mavoea
 
 #endif  // MAVOEA_STREAM_INTERNAL_H_

@@ -11,10 +11,13 @@ namespace {
 
 constexpr Unit header_unit("eas_write_header");
 
+// Memory that a stream may take on the word of its header alone.
+constexpr std::uint64_t kSmallStream = std::uint64_t{1} << 16;
+
 }  // namespace
 
 std::span<EASEntry> Attributes(const EASHandle& h) {
-    return {h.entries, LoadHeader(h).attributes.count};
+    return {h.entries, DecodeAttributeCount(h.header)};
 }
 
 int FindAttribute(const EASHandle& h, const char* name) {
@@ -32,12 +35,18 @@ std::uint64_t TableEnd(const EASHandle& h) {
 }
 
 int SurveyTable(EASHandle* h, const Unit& unit, Survey* found, int line) {
-    struct stat info;
-    if (kernel::Fstat(h->fd, &info) != 0) return unit.Fail(Err::kRead, line);
-    found->file_size = static_cast<std::uint64_t>(info.st_size);
     found->header = LoadHeader(*h);
-
     Range& data = found->header.attributes.data;
+    found->file_size = data.end();
+    // What a small stream lacks shows when it is read. What could be large, or has to move, must be
+    // known to be there. Not with fstat(2): a file whose times have been looked at gets new ones
+    // with its next write, which makes the sync behind that write cost half as much again.
+    if (data.end() > kSmallStream || found->header.resource_fork.data.length != 0) {
+        const off_t size = kernel::Lseek(h->fd, 0, SEEK_END);
+        if (size < 0) return unit.Fail(Err::kRead, line);
+        found->file_size = static_cast<std::uint64_t>(size);
+    }
+
     const std::span<EASEntry> attributes = Attributes(*h);
     if (attributes.empty() && data.length == 0) {
         data.offset = kStreamHeaderSize;  // Whatever it was, nothing lies there.

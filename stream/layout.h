@@ -71,9 +71,10 @@ class StreamImage {
     std::uint64_t head_size_ = 0;
 };
 
-// MAVOEASUpdateEntry() for a stream that has been surveyed and a `to` that is large enough. Records
-// failures for its own unit; nothing has changed then.
-int GatherValues(EASHandle* h, unsigned index, std::uint8_t* to, bool remove);
+// MAVOEASUpdateEntry() for a stream that has been surveyed and a `to` that is large enough. What
+// changes in the header changes in *header, for the caller to store. Records failures for its own
+// unit; nothing has changed then.
+int GatherValues(EASHandle* h, StreamHeader* header, unsigned index, std::uint8_t* to, bool remove);
 
 // How much shorter MAVOEASUpdateEntry() makes the table when it removes a record. Computed in 8
 // bits, which is too little for names of more than 240 bytes: a gap of 256 bytes then stays between

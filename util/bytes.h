@@ -5,7 +5,9 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <span>
+#include <utility>
 
 namespace mavoea {
 
@@ -21,42 +23,73 @@ struct Range {
     friend constexpr bool operator==(const Range&, const Range&) = default;
 };
 
+// memcpy itself. Where compilers know that a size fits in a byte they copy with string
+// instructions, which take longer to start than a name takes to copy.
+inline void CopyShort(void* to, const void* from, std::size_t size) {
+    asm("" : "+r"(size));  // makes the size anybody's guess
+    std::memcpy(to, from, size);
+}
+
+// The spelling that compilers know as one load, or one store, and a byte swap.
+constexpr std::uint32_t LoadBe32(const std::uint8_t* at) {
+    return std::uint32_t{at[0]} << 24 | std::uint32_t{at[1]} << 16 | std::uint32_t{at[2]} << 8 |
+           std::uint32_t{at[3]};
+}
+constexpr std::uint16_t LoadBe16(const std::uint8_t* at) {
+    return static_cast<std::uint16_t>(at[0] << 8 | at[1]);
+}
+constexpr void StoreBe32(std::uint32_t value, std::uint8_t* at) {
+    at[0] = static_cast<std::uint8_t>(value >> 24);
+    at[1] = static_cast<std::uint8_t>(value >> 16);
+    at[2] = static_cast<std::uint8_t>(value >> 8);
+    at[3] = static_cast<std::uint8_t>(value);
+}
+constexpr void StoreBe16(std::uint16_t value, std::uint8_t* at) {
+    at[0] = static_cast<std::uint8_t>(value >> 8);
+    at[1] = static_cast<std::uint8_t>(value);
+}
+
 // Reads big-endian fields one after the other. Past the end it yields zeros and ok() turns false,
 // so that a decoder checks once, at its end.
 class BeReader {
  public:
-    constexpr explicit BeReader(ByteView bytes) : bytes_(bytes) {}
+    constexpr explicit BeReader(ByteView bytes) : at_(bytes.data()), left_(bytes.size()) {}
 
-    constexpr std::uint8_t U8() { return static_cast<std::uint8_t>(Take(1)); }
-    constexpr std::uint16_t U16() { return static_cast<std::uint16_t>(Take(2)); }
-    constexpr std::uint32_t U32() { return Take(4); }
-
+    constexpr std::uint8_t U8() {
+        const std::uint8_t* const at = Take(1);
+        return at == nullptr ? std::uint8_t{0} : *at;
+    }
+    constexpr std::uint16_t U16() {
+        const std::uint8_t* const at = Take(2);
+        return at == nullptr ? std::uint16_t{0} : LoadBe16(at);
+    }
+    constexpr std::uint32_t U32() {
+        const std::uint8_t* const at = Take(4);
+        return at == nullptr ? 0 : LoadBe32(at);
+    }
     constexpr void Copy(ByteSpan to) {
-        if (!Has(to.size())) {
+        const std::uint8_t* const at = Take(to.size());
+        if (at == nullptr) {
             std::fill(to.begin(), to.end(), std::uint8_t{0});
-            return;
+        } else {
+            std::copy_n(at, to.size(), to.begin());
         }
-        std::copy_n(bytes_.begin() + static_cast<std::ptrdiff_t>(at_), to.size(), to.begin());
-        at_ += to.size();
     }
 
     constexpr bool ok() const { return ok_; }
 
  private:
-    constexpr bool Has(std::size_t count) {
-        ok_ = ok_ && count <= bytes_.size() - at_;
-        return ok_;
+    constexpr const std::uint8_t* Take(std::size_t count) {
+        if (!ok_ || count > left_) {
+            ok_ = false;
+            return nullptr;
+        }
+        left_ -= count;
+        return std::exchange(at_, at_ + count);
     }
 
-    constexpr std::uint32_t Take(std::size_t count) {
-        if (!Has(count)) return 0;
-        std::uint32_t value = 0;
-        for (std::size_t i = 0; i < count; ++i) value = value << 8 | bytes_[at_++];
-        return value;
-    }
-
-    ByteView bytes_;
-    std::size_t at_ = 0;
+    const std::uint8_t* at_;
+    std::size_t left_;
     bool ok_ = true;
 };
 
@@ -64,28 +97,32 @@ class BeReader {
 // would pass the end is dropped.
 class BeWriter {
  public:
-    constexpr explicit BeWriter(ByteSpan bytes) : bytes_(bytes) {}
+    constexpr explicit BeWriter(ByteSpan bytes) : at_(bytes.data()), left_(bytes.size()) {}
 
-    constexpr void U8(std::uint8_t value) { Put(value, 1); }
-    constexpr void U16(std::uint16_t value) { Put(value, 2); }
-    constexpr void U32(std::uint32_t value) { Put(value, 4); }
-
-    constexpr void Copy(ByteView from) {
-        const std::size_t count = std::min(from.size(), bytes_.size() - at_);
-        std::copy_n(from.begin(), count, bytes_.begin() + static_cast<std::ptrdiff_t>(at_));
-        at_ += count;
+    constexpr void U8(std::uint8_t value) {
+        if (std::uint8_t* const at = Take(1)) *at = value;
     }
-
- private:
-    constexpr void Put(std::uint32_t value, std::size_t count) {
-        if (count > bytes_.size() - at_) return;
-        for (std::size_t i = count; i-- > 0;) {
-            bytes_[at_++] = static_cast<std::uint8_t>(value >> (8 * i));
+    constexpr void U16(std::uint16_t value) {
+        if (std::uint8_t* const at = Take(2)) StoreBe16(value, at);
+    }
+    constexpr void U32(std::uint32_t value) {
+        if (std::uint8_t* const at = Take(4)) StoreBe32(value, at);
+    }
+    constexpr void Copy(ByteView from) {
+        if (std::uint8_t* const at = Take(from.size())) {
+            std::copy_n(from.begin(), from.size(), at);
         }
     }
 
-    ByteSpan bytes_;
-    std::size_t at_ = 0;
+ private:
+    constexpr std::uint8_t* Take(std::size_t count) {
+        if (count > left_) return nullptr;
+        left_ -= count;
+        return std::exchange(at_, at_ + count);
+    }
+
+    std::uint8_t* at_;
+    std::size_t left_;
 };
 
 }  // namespace mavoea

@@ -2,10 +2,12 @@
 #ifndef MAVOEA_UTIL_PATH_TEXT_H_
 #define MAVOEA_UTIL_PATH_TEXT_H_
 
+#include <string.h>
+
 #include <algorithm>
 #include <cstddef>
-#include <cstring>
 #include <string_view>
+#include <type_traits>
 
 #include "util/owned.h"
 
@@ -23,7 +25,13 @@ struct ObjectPath {
 };
 
 constexpr ObjectPath SplitObject(std::string_view path) {
-    const std::size_t name = path.rfind('/') + 1;  // npos + 1 is 0
+    std::size_t name = 0;
+    if (std::is_constant_evaluated()) {
+        name = path.rfind('/') + 1;  // npos + 1 is 0
+    } else {
+        const auto* const slash = static_cast<const char*>(memrchr(path.data(), '/', path.size()));
+        if (slash != nullptr) name = static_cast<std::size_t>(slash - path.data()) + 1;
+    }
     return {std::string_view(path.data(), name),
             std::string_view(path.data() + name, path.size() - name)};
 }
@@ -44,9 +52,9 @@ static_assert(WithoutTrailingSlash("/").empty() && WithoutTrailingSlash("").empt
 // all that the kernel takes are, stay on the stack.
 class WorkingPath {
  public:
-    explicit WorkingPath(const char* path) : size_(std::strlen(path)) {
+    explicit WorkingPath(const char* path) : size_(strlen(path)) {
         if (size_ > kShortPathMax) heap_ = Owned<char>::Allocate(size_ + 1);
-        if (ok()) std::memcpy(data(), path, size_ + 1);
+        if (ok()) memcpy(data(), path, size_ + 1);
     }
 
     bool ok() const { return size_ <= kShortPathMax || heap_; }  // false: out of memory
@@ -69,7 +77,7 @@ class CutShort {
 
     CutShort& Add(std::string_view text) {
         const std::size_t count = std::min(text.size(), left_);
-        std::memcpy(at_, text.data(), count);
+        memcpy(at_, text.data(), count);
         at_ += count;
         left_ -= count;
         *at_ = '\0';
@@ -87,7 +95,7 @@ class PathWriter {
     explicit PathWriter(char* at) : at_(at) {}
 
     PathWriter& Add(std::string_view text) {
-        std::memcpy(at_, text.data(), text.size());
+        memcpy(at_, text.data(), text.size());
         at_ += text.size();
         return *this;
     }

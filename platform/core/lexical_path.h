@@ -35,8 +35,10 @@ constexpr std::size_t NormalizePath(std::string_view path, char* out) {
 }
 
 // Whether `path` is the normalized directory `directory` or something in it, by whole components.
+// (starts_with() would need libstdc++ in a build without optimization.)
 constexpr bool IsInside(std::string_view path, std::string_view directory) {
-    return path.starts_with(directory) &&
+    return path.size() >= directory.size() &&
+           std::string_view(path.data(), directory.size()) == directory &&
            (path.size() == directory.size() || path[directory.size()] == '/');
 }
 
