@@ -1,0 +1,158 @@
+// How many system calls the shared library's operations make.
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <functional>
+#include <initializer_list>
+#include <string>
+
+#include "include/mavoea.h"
+#include "tests/support/stream_builder.h"
+#include "tests/support/temp_dir.h"
+#include "tests/syscalls/traced.h"
+
+namespace mavoea::test {
+namespace {
+
+using ::testing::IsEmpty;
+using ::testing::PrintToString;
+
+constexpr unsigned kValueSize = 32;
+
+std::string NameOf(int index) { return "user.attribute." + std::to_string(1000 + index); }
+
+StreamImage ImageOf(int count) {
+    StreamImage image;
+    for (int i = 0; i < count; ++i) {
+        image.attributes.push_back({NameOf(i), Pattern(kValueSize, static_cast<std::uint8_t>(i))});
+    }
+    return image;
+}
+
+class SystemCallsTest : public ::testing::Test {
+ protected:
+    // Lists the calls of `code`, which must return true; skips the test where that is impossible.
+    void Trace(const std::function<bool()>& code) {
+        std::string why_not;
+        const auto trace = TraceCalls(code, &why_not);
+        if (!trace) GTEST_SKIP() << "system calls are not counted: " << why_not;
+        ASSERT_TRUE(trace->succeeded) << "the traced code failed";
+        calls_ = trace->calls;
+    }
+
+    long Count(std::initializer_list<const char*> names) const {
+        return std::count_if(calls_.begin(), calls_.end(), [&](const std::string& call) {
+            return std::find(names.begin(), names.end(), call) != names.end();
+        });
+    }
+    long Reads() const { return Count({"read", "readv", "pread", "preadv"}); }
+    long Writes() const { return Count({"write", "writev", "pwrite", "pwritev"}); }
+    long Syncs() const { return Count({"fsync", "fdatasync", "sync"}); }
+
+    // Opens, reads one of `count` values and closes, the descriptor included.
+    void TraceReadingOneOf(int count) {
+        const std::string path = dir_ / "stream";
+        const StreamImage image = ImageOf(count);
+        WriteFile(path, image.Build());
+        const auto& wanted = image.attributes[static_cast<std::size_t>(count) / 2];
+        Bytes value(kValueSize);
+        Trace([&] {
+            const int fd = open(path.c_str(), O_RDONLY);
+            EASHandle* const h = MAVOEASOpen(fd, F_RDLCK);
+            if (h == nullptr) return false;
+            const int got = MAVOEASRead(h, wanted.name.c_str(), value.data(), kValueSize, 0);
+            return MAVOEASClose(h) == 0 && close(fd) == 0 && got == kValueSize &&
+                   value == wanted.value;
+        });
+    }
+
+    // Overwrites the first value of a stream that is open, with as many bytes.
+    void TraceOverwritingIn(const StreamImage& image) {
+        const std::string path = dir_ / "stream";
+        WriteFile(path, image.Build());
+        const int fd = open(path.c_str(), O_RDWR);
+        ASSERT_GE(fd, 0);
+        const Bytes value = Pattern(kValueSize, 99);
+        EASHandle* h = nullptr;
+        int next = 0;
+        Trace([&] {
+            // In the child: locks are not inherited.
+            if (h == nullptr) h = MAVOEASOpen(fd, F_WRLCK);
+            return h != nullptr && MAVOEASWrite(h, NameOf(next++).c_str(), value.data(), kValueSize,
+                                                0, EAS_WRITE_OVERWRITE) == kValueSize;
+        });
+        close(fd);
+    }
+
+    TempDir dir_;
+    std::vector<std::string> calls_;
+};
+
+TEST_F(SystemCallsTest, PathDerivationMakesNone) {
+    const std::string longest = "/v/share/" + std::string(300, 'n') + ".txt";
+    Trace([&] {
+        char to[MAVOEA_PATH_SIZE + 1];
+        return MAVOEAPath(EA_FORM_FILE, "/v/share/a.txt", MAVOEA_KIND_STREAM, to, MAVOEA_PATH_SIZE,
+                          EA_PLACE_EADIR) == 0 &&
+               MAVOEAPath(EA_FORM_FILE, longest.c_str(), MAVOEA_KIND_STREAM, to, MAVOEA_PATH_SIZE,
+                          EA_PLACE_EADIR) == 0 &&
+               MAVOEAPathNoADFS(EA_FORM_FOLDER, "/v/share/a.txt", MAVOEA_KIND_LEGACY_RESOURCE, to,
+                                MAVOEA_PATH_SIZE) == 0 &&
+               MAVOEADirPath(EA_FORM_FILE, "/v/share/a.txt", to, MAVOEA_PATH_SIZE) == 0 &&
+               MAVOEAADPath("/v/share/a.txt", to, MAVOEA_PATH_SIZE) == 0;
+    });
+    EXPECT_THAT(calls_, IsEmpty());
+}
+
+TEST_F(SystemCallsTest, NameTestsMakeNone) {
+    Trace([] {
+        return MAVOEAIsHiddenName("MAVO:Resource") == 1 && MAVOEAIsHiddenDir("/v/@tmp") == 1 &&
+               MAVOEAIsHiddenDirName("@eaDir") == 1 && MAVOEAIsVetoFile("a.txt") == 0 &&
+               MAVOEAIsHiddenFile("._a.txt") == 1;
+    });
+    EXPECT_THAT(calls_, IsEmpty());
+}
+
+TEST_F(SystemCallsTest, ReadingOneValueOfAFewTakesAtMostNineAndTwoReads) {
+    for (const int count : {1, 10, 100}) {
+        SCOPED_TRACE(count);
+        TraceReadingOneOf(count);
+        if (IsSkipped() || HasFatalFailure()) return;
+        EXPECT_LE(calls_.size(), 9u) << PrintToString(calls_);
+        EXPECT_EQ(2, Reads()) << PrintToString(calls_);
+    }
+}
+
+TEST_F(SystemCallsTest, ReadingOneValueOfAThousandTakesAtMostTenAndThreeReads) {
+    TraceReadingOneOf(1000);
+    if (IsSkipped() || HasFatalFailure()) return;
+    EXPECT_LE(calls_.size(), 10u) << PrintToString(calls_);
+    EXPECT_EQ(3, Reads()) << PrintToString(calls_);
+}
+
+TEST_F(SystemCallsTest, OverwritingASmallValueTakesOneWriteAndOneSync) {
+    TraceOverwritingIn(ImageOf(10));
+    if (IsSkipped() || HasFatalFailure()) return;
+    EXPECT_EQ(1, Writes()) << PrintToString(calls_);
+    EXPECT_EQ(1, Syncs()) << PrintToString(calls_);
+    EXPECT_EQ(1, Count({"fsync"})) << PrintToString(calls_);
+    EXPECT_LE(Reads(), 1) << PrintToString(calls_);
+}
+
+TEST_F(SystemCallsTest, OverwritingWithAsManyBytesDoesNotTouchTheResourceFork) {
+    StreamImage image = ImageOf(10);
+    image.fork = Pattern(100000);
+    TraceOverwritingIn(image);
+    if (IsSkipped() || HasFatalFailure()) return;
+    EXPECT_EQ(1, Writes()) << PrintToString(calls_);
+    EXPECT_EQ(1, Syncs()) << PrintToString(calls_);
+    EXPECT_LE(Reads(), 1) << PrintToString(calls_);
+    EXPECT_EQ(0, Count({"ftruncate"})) << PrintToString(calls_);
+}
+
+}  // namespace
+}  // namespace mavoea::test
