@@ -1,0 +1,76 @@
+#include "tests/tool/tool.h"
+
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/resource.h>
+#include <sys/wait.h>
+#include <sys/xattr.h>
+#include <unistd.h>
+
+#include <cstdlib>
+
+namespace mavoea::test {
+namespace {
+
+std::string Contents(const std::string& path) {
+    const Bytes bytes = ReadFile(path);
+    return {bytes.begin(), bytes.end()};
+}
+
+void Limit(decltype(RLIMIT_AS) what, std::size_t bytes) {
+    const rlimit limit = {bytes, bytes};
+    if (setrlimit(what, &limit) != 0) _exit(125);
+}
+
+}  // namespace
+
+void PrintTo(const ToolResult& result, std::ostream* out) {
+    *out << "exit status " << result.status << "\nout: " << result.out << "\nerr: " << result.err;
+}
+
+ToolResult RunTool(const Arguments& arguments, const std::string& input, Limits limits) {
+    // Files, not pipes: neither side can wait for the other.
+    const TempDir dir;
+    WriteFile(dir / "in", Ascii(input));
+    std::vector<std::string> words = arguments;
+    words.insert(words.begin(), "mavoea");
+    std::vector<char*> argv;
+    for (std::string& word : words) argv.push_back(word.data());
+    argv.push_back(nullptr);
+
+    const std::string in = dir / "in";
+    const std::string out = dir / "out";
+    const std::string err = dir / "err";
+    const pid_t child = fork();
+    if (child < 0) abort();
+    if (child == 0) {
+        const int fds[] = {open(in.c_str(), O_RDONLY), open(out.c_str(), O_WRONLY | O_CREAT, 0600),
+                           open(err.c_str(), O_WRONLY | O_CREAT, 0600)};
+        for (int i = 0; i < 3; ++i) {
+            if (dup2(fds[i], i) != i) _exit(126);
+        }
+        if (limits.memory != 0 && std::string(MAVOEA_TOOL_SANITIZED).empty()) {
+            Limit(RLIMIT_AS, limits.memory);
+        }
+        if (limits.file_size != 0) {
+            signal(SIGXFSZ, SIG_IGN);  // the write fails instead
+            Limit(RLIMIT_FSIZE, limits.file_size);
+        }
+        execv(MAVOEA_TOOL_PATH, argv.data());
+        _exit(127);
+    }
+    int status = 0;
+    if (waitpid(child, &status, 0) != child) abort();
+    ToolResult result;
+    result.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+    result.out = Contents(out);
+    result.err = Contents(err);
+    return result;
+}
+
+bool KeepsUserAttributes(const std::string& directory) {
+    return setxattr(directory.c_str(), "user.mavoea.probe", "x", 1, 0) == 0 &&
+           removexattr(directory.c_str(), "user.mavoea.probe") == 0;
+}
+
+}  // namespace mavoea::test

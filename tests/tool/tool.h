@@ -1,0 +1,96 @@
+// Running the tool on a directory of a test's own.
+#ifndef MAVOEA_TESTS_TOOL_TOOL_H_
+#define MAVOEA_TESTS_TOOL_TOOL_H_
+
+#include <gmock/gmock.h>
+
+#include <nlohmann/json.hpp>
+#include <string>
+#include <vector>
+
+#include "tests/support/temp_dir.h"
+
+namespace mavoea::test {
+
+struct ToolResult {
+    int status = -1;  // exit status, 128 + number when a signal ended it
+    std::string out;
+    std::string err;
+
+    Bytes bytes() const { return Ascii(out); }
+    nlohmann::json json() const { return nlohmann::json::parse(out); }
+};
+void PrintTo(const ToolResult& result, std::ostream* out);
+
+using Arguments = std::vector<std::string>;
+
+// What the tool may use, in bytes, 0 for as much as it likes. A limit on memory has no effect under
+// a sanitizer, which needs much of its own.
+struct Limits {
+    std::size_t memory = 0;
+    std::size_t file_size = 0;  // of every file that it writes, its output too
+};
+
+ToolResult RunTool(const Arguments& arguments, const std::string& input = {}, Limits limits = {});
+
+// Matches a run that succeeded and said nothing on standard error.
+MATCHER(Succeeded, "") { return arg.status == 0 && arg.err.empty(); }
+
+// Matches a run that ended with this status and this line on standard error, and nothing else.
+MATCHER_P2(Failed, status, message, "") {
+    return arg.status == status && arg.err == "mavoea: " + std::string(message) + "\n";
+}
+
+// A directory that is declared to be a volume of a type, with one file in it.
+class Volume {
+ public:
+    explicit Volume(int type) : type_(std::to_string(type)) { WriteFile(object(), Ascii("data")); }
+    Volume(int type, const std::string& parent) : dir_(parent), type_(std::to_string(type)) {
+        WriteFile(object(), Ascii("data"));
+    }
+
+    const std::string& path() const { return dir_.path(); }
+    std::string object() const { return dir_ / "file.txt"; }
+    std::string stream() const { return dir_ / "@eaDir/file.txt@MavoEAStream"; }
+    std::string resource() const { return dir_ / "@eaDir/file.txt@MavoResource"; }
+    std::string apple_double() const { return dir_ / "._file.txt"; }
+
+    // Where named attributes go on this volume.
+    std::string attribute_file() const {
+        return type_ == "0" || type_ == "5" ? apple_double() : stream();
+    }
+    // Where Finder info and resource fork go.
+    std::string finder_file() const {
+        return type_ == "0" || type_ == "5" ? apple_double() : resource();
+    }
+
+    // The tool with the volume declared.
+    ToolResult Run(Arguments arguments, const std::string& input = {}, Limits limits = {}) const {
+        arguments.insert(arguments.begin(), {"--volume", path() + "=" + type_});
+        return RunTool(arguments, input, limits);
+    }
+
+    ToolResult List() const { return Run({"list", object()}); }
+    ToolResult Get(const std::string& name) const { return Run({"get", object(), name}); }
+    ToolResult Remove(const std::string& name) const { return Run({"remove", object(), name}); }
+    ToolResult Set(const std::string& name, const Bytes& value) const {
+        return Run({"set", object(), name}, std::string(value.begin(), value.end()));
+    }
+
+ private:
+    TempDir dir_;
+    std::string type_;
+};
+
+// Whether files in that directory keep extended attributes of users.
+bool KeepsUserAttributes(const std::string& directory);
+
+// Making EA directories takes the superuser.
+#define MAVOEA_SKIP_UNLESS_ROOT()                                                         \
+    if (::geteuid() != 0) {                                                               \
+        GTEST_SKIP() << "making EA directories takes the superuser; run this test as it"; \
+    }
+
+}  // namespace mavoea::test
+
+#endif  // MAVOEA_TESTS_TOOL_TOOL_H_

@@ -1,0 +1,135 @@
+#include "tools/command_line.h"
+
+#include <CLI/CLI.hpp>
+#include <iostream>
+
+#include "tools/messages.h"
+
+namespace mavoea::tool {
+namespace {
+
+constexpr const char* kExamples = R"(Examples:
+  mavoea --volume /srv/share=eadir where /srv/share/letter.txt
+  mavoea set letter.txt com.example.colour blue
+  mavoea set letter.txt com.apple.ResourceFork --file letter.rsrc
+  mavoea get letter.txt com.apple.FinderInfo --hex
+  mavoea list -l letter.txt
+  mavoea remove letter.txt com.example.colour
+  mavoea dump @eaDir/letter.txt@MavoEAStream
+
+Volume types: a number from 0 to 12, or appledouble (0), eadir (1), fileea (2), xattr (7).
+Exit status: 0 done; 1 not found, the object or the attribute; 2 anything else that went wrong.
+A NAME or VALUE that begins with '-' stands behind "--". Control characters in names are shown as
+"\x0A", backslashes doubled; --json has names as they are.)";
+
+// CLI11 takes "[a,b]" apart where an option has several values. A byte in front keeps it whole.
+constexpr char kGuard = '\x01';
+
+std::string Guarded(const char* argument) {
+    const bool needed = *argument == '[' || *argument == kGuard;
+    return needed ? kGuard + std::string(argument) : argument;
+}
+
+std::string Unguarded(std::string argument) {
+    if (!argument.empty() && argument.front() == kGuard) argument.erase(0, 1);
+    return argument;
+}
+
+CLI::App* AddCommand(CLI::App& app, const char* name, const char* what, Command command,
+                     Options* options) {
+    CLI::App* const sub = app.add_subcommand(name, what);
+    sub->callback([=] { options->command = command; });
+    return sub;
+}
+
+void AddPath(CLI::App* sub, Options* options, const char* what) {
+    sub->add_option_function<std::string>(
+           "PATH", [=](const std::string& path) { options->paths = {path}; }, what)
+        ->required();
+}
+
+void AddName(CLI::App* sub, Options* options) {
+    sub->add_option("NAME", options->name, "The attribute's name")->required();
+}
+
+}  // namespace
+
+std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
+    Options options;
+    CLI::App app(
+        "Shows and changes the Mac and SMB metadata of files: named attributes, resource "
+        "forks, Finder info.",
+        "mavoea");
+    app.require_subcommand(1);
+    app.fallthrough();
+    app.set_version_flag("--version", "mavoea " MAVOEA_VERSION, "Show the version");
+    app.add_flag("--json", options.json, "Write JSON; bytes are hexadecimal digits");
+    app.add_option("--volume", options.volumes,
+                   "Declare a directory's volume type for this run; may be repeated")
+        ->type_name("PATH=TYPE")
+        ->expected(1)
+        ->allow_extra_args(false)
+        ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
+
+    CLI::App* const where =
+        AddCommand(app, "where", "Show the volume's type and every place where metadata may lie",
+                   Command::kWhere, &options);
+    AddPath(where, &options, "A file or directory");
+
+    CLI::App* const list =
+        AddCommand(app, "list", "List attribute names, one a line", Command::kList, &options);
+    list->add_flag("-l", options.details, "With size, kind and the file that holds it");
+    list->add_option("PATH", options.paths, "Files and directories")->required();
+
+    CLI::App* const get =
+        AddCommand(app, "get", "Write a value to standard output", Command::kGet, &options);
+    get->add_flag("--hex", options.hex, "As a hex dump");
+    AddPath(get, &options, "A file or directory");
+    AddName(get, &options);
+
+    CLI::App* const set =
+        AddCommand(app, "set", "Set an attribute to VALUE, a file's bytes or standard input",
+                   Command::kSet, &options);
+    AddPath(set, &options, "A file or directory");
+    AddName(set, &options);
+    CLI::Option* const value = set->add_option_function<std::string>(
+        "VALUE", [&](const std::string& text) { options.value = text; }, "The value's bytes");
+    set->add_option_function<std::string>(
+           "--file", [&](const std::string& file) { options.file = file; },
+           "Take the value from a file")
+        ->type_name("FILE")
+        ->excludes(value);
+    set->add_flag("--hex", options.hex, "VALUE is hexadecimal digits")->needs(value);
+
+    CLI::App* const remove =
+        AddCommand(app, "remove", "Remove an attribute", Command::kRemove, &options);
+    AddPath(remove, &options, "A file or directory");
+    AddName(remove, &options);
+
+    CLI::App* const dump =
+        AddCommand(app, "dump", "Show and check every field of an EA stream or AppleDouble file",
+                   Command::kDump, &options);
+    dump->add_option_function<std::string>(
+            "FILE", [&](const std::string& path) { options.paths = {path}; }, "A metadata file")
+        ->required();
+
+    app.footer(kExamples);
+    try {
+        std::vector<std::string> last_first;
+        for (int i = argc - 1; i > 0; --i) last_first.push_back(Guarded(argv[i]));
+        app.parse(std::move(last_first));
+    } catch (const CLI::Success& success) {
+        return app.exit(success);
+    } catch (const CLI::ParseError& error) {
+        std::cerr << "mavoea: " << error.what() << "; mavoea --help has the usage\n";
+        return static_cast<int>(kFailed);
+    }
+    for (std::string& path : options.paths) path = Unguarded(std::move(path));
+    for (std::string& volume : options.volumes) volume = Unguarded(std::move(volume));
+    options.name = Unguarded(std::move(options.name));
+    if (options.value) options.value = Unguarded(*std::move(options.value));
+    if (options.file) options.file = Unguarded(*std::move(options.file));
+    return options;
+}
+
+}  // namespace mavoea::tool

@@ -1,0 +1,33 @@
+// The command line, parsed.
+#ifndef MAVOEA_TOOLS_COMMAND_LINE_H_
+#define MAVOEA_TOOLS_COMMAND_LINE_H_
+
+#include <optional>
+#include <string>
+#include <variant>
+#include <vector>
+
+namespace mavoea::tool {
+
+enum class Command { kWhere, kList, kGet, kSet, kRemove, kDump };
+
+struct Options {
+    Command command = Command::kWhere;
+    std::vector<std::string> volumes;  // PATH=TYPE
+    bool json = false;
+
+    std::vector<std::string> paths;  // one, but for list
+    std::string name;
+    bool details = false;              // list -l
+    bool hex = false;                  // get, set
+    std::optional<std::string> value;  // set: none of the two means standard input
+    std::optional<std::string> file;
+};
+
+// What to do, or the exit status when everything has been said: help, version, or what is wrong
+// with the command line.
+std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_COMMAND_LINE_H_

@@ -1,0 +1,277 @@
+#include "tools/commands.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <iomanip>
+#include <iostream>
+
+#include "format/ea_stream.h"
+#include "tools/dump.h"
+#include "tools/file.h"
+#include "tools/store.h"
+#include "tools/text.h"
+#include "tools/volume.h"
+
+namespace mavoea::tool {
+namespace {
+
+using Declarations = std::vector<Declaration>;
+
+const char* KindName(Kind kind) {
+    switch (kind) {
+        case Kind::kFinderInfo:
+            return "Finder info";
+        case Kind::kResourceFork:
+            return "resource fork";
+        case Kind::kAttribute:
+            break;
+    }
+    return "attribute";
+}
+
+void Print(const Json& json) {
+    std::cout << json.dump(2, ' ', false, Json::error_handler_t::replace) << '\n';
+}
+
+void CheckName(const Options& options) {
+    if (options.name.empty()) {
+        throw Failure(kFailed, options.paths.front(), "the attribute's name is empty",
+                      "give it a name");
+    }
+    if (options.name.size() >= kNameSizeMax) {
+        throw Failure(kFailed, options.paths.front(),
+                      "the attribute's name has " + std::to_string(options.name.size()) +
+                          " bytes, at most " + std::to_string(kNameSizeMax - 1) + " are possible",
+                      "use a shorter name");
+    }
+}
+
+Failure NoAttribute(const Options& options) {
+    return {kNotFound, options.paths.front(), "no attribute \"" + Printable(options.name) + "\"",
+            "mavoea list PATH has the names"};
+}
+
+// ---- where --------------------------------------------------------------------------------------
+
+ExitStatus Where(const Options& options, const Declarations& declarations) {
+    const Object object = FindObject(options.paths.front());
+    const std::string source = TypeSource(object, declarations);
+    Json json;
+    SetText(json, "path", object.path);
+    json["type"] = object.type;
+    json["typeName"] = TypeName(object.type);
+    json["typeSource"] = source;
+    json["files"] = Json::array();
+    std::string text = Printable(object.path) + "\n  volume type: " + std::to_string(object.type) +
+                       ", " + std::string(TypeName(object.type)) + " (" + source + ")\n";
+    for (const MetadataPath& place : MetadataPaths(object)) {
+        struct stat info;
+        const bool exists = !place.path.empty() && ::lstat(place.path.c_str(), &info) == 0;
+        Json entry;
+        entry["kind"] = place.id;
+        text += std::string("  ") + place.label + ": ";
+        if (place.path.empty()) {
+            entry["path"] = nullptr;
+            entry["problem"] = place.problem;
+            text += "none, " + place.problem + '\n';
+        } else {
+            SetText(entry, "path", place.path);
+            text += Printable(place.path) + (exists ? " (exists" : " (missing");
+            if (exists && S_ISREG(info.st_mode)) {
+                text += ", " + std::to_string(info.st_size) + " bytes";
+                entry["size"] = info.st_size;
+            }
+            text += ")\n";
+        }
+        entry["exists"] = exists;
+        json["files"].push_back(std::move(entry));
+    }
+    if (options.json) {
+        Print(json);
+    } else {
+        std::cout << text;
+    }
+    if (object.keeping() == Keeping::kNone) throw NoStore(object);
+    return kSuccess;
+}
+
+// ---- list ---------------------------------------------------------------------------------------
+
+void ListText(const std::vector<Attribute>& list, bool details) {
+    std::size_t name_width = 0;
+    for (const Attribute& attribute : list) {
+        name_width = std::max(name_width, Printable(attribute.name).size());
+    }
+    for (const Attribute& attribute : list) {
+        const std::string name = Printable(attribute.name);
+        if (!details) {
+            std::cout << name << '\n';
+            continue;
+        }
+        std::cout << std::setw(10) << attribute.size << "  " << std::left << std::setw(13)
+                  << KindName(attribute.kind) << "  " << std::setw(static_cast<int>(name_width))
+                  << name << std::right << "  " << Printable(attribute.file) << '\n';
+    }
+}
+
+Json ListJson(const std::vector<Attribute>& list) {
+    Json json = Json::array();
+    for (const Attribute& attribute : list) {
+        Json entry;
+        SetText(entry, "name", attribute.name);
+        entry["size"] = attribute.size;
+        entry["kind"] = KindName(attribute.kind);
+        SetText(entry, "file", attribute.file);
+        json.push_back(std::move(entry));
+    }
+    return json;
+}
+
+ExitStatus List(const Options& options) {
+    ExitStatus status = kSuccess;
+    Json json = Json::array();
+    bool first = true;
+    for (const std::string& path : options.paths) {
+        try {
+            const Object object = FindObject(path);
+            const std::vector<Attribute> list = OpenStore(object)->List();
+            if (options.json) {
+                Json entry;
+                SetText(entry, "path", object.path);
+                entry["type"] = object.type;
+                entry["attributes"] = ListJson(list);
+                json.push_back(std::move(entry));
+                continue;
+            }
+            if (options.paths.size() > 1) {
+                std::cout << (first ? "" : "\n") << Printable(path) << ":\n";
+            }
+            first = false;
+            ListText(list, options.details);
+        } catch (const Failure& failure) {
+            Report(failure.what());
+            status = std::max(status, failure.status());
+        }
+    }
+    if (options.json) Print(json);
+    return status;
+}
+
+// ---- get, set, remove ---------------------------------------------------------------------------
+
+ExitStatus Get(const Options& options) {
+    CheckName(options);
+    const Object object = FindObject(options.paths.front());
+    const std::optional<Bytes> value = OpenStore(object)->Get(options.name);
+    if (!value) throw NoAttribute(options);
+    if (options.json) {
+        Json json;
+        SetText(json, "path", object.path);
+        SetText(json, "name", options.name);
+        json["size"] = value->size();
+        json["hex"] = HexDigits(*value);
+        Print(json);
+    } else if (options.hex) {
+        std::cout << HexDump(*value);
+    } else {
+        std::cout.write(reinterpret_cast<const char*>(value->data()),
+                        static_cast<std::streamsize>(value->size()));
+    }
+    return kSuccess;
+}
+
+Bytes ValueToSet(const Options& options) {
+    if (options.value && options.hex) {
+        if (auto bytes = ParseHex(*options.value)) return *std::move(bytes);
+        throw Failure(kFailed, options.paths.front(), "VALUE is not hexadecimal digits",
+                      "give two digits for each byte, or leave --hex out");
+    }
+    if (options.value) return {options.value->begin(), options.value->end()};
+    if (options.file) {
+        const File file = File::OpenAny(*options.file);
+        return ReadToEnd(file.fd(), file.path(), kStreamSizeMax);
+    }
+    return ReadToEnd(STDIN_FILENO, "standard input", kStreamSizeMax);
+}
+
+ExitStatus Set(const Options& options) {
+    CheckName(options);
+    const Object object = FindObject(options.paths.front());
+    const auto store = OpenStore(object);
+    const Bytes value = ValueToSet(options);
+    store->Set(options.name, value);
+    if (options.json) {
+        Json json;
+        SetText(json, "path", object.path);
+        SetText(json, "name", options.name);
+        json["size"] = value.size();
+        Print(json);
+    }
+    return kSuccess;
+}
+
+ExitStatus Remove(const Options& options) {
+    CheckName(options);
+    const Object object = FindObject(options.paths.front());
+    if (!OpenStore(object)->Remove(options.name)) throw NoAttribute(options);
+    if (options.json) {
+        Json json;
+        SetText(json, "path", object.path);
+        SetText(json, "name", options.name);
+        json["removed"] = true;
+        Print(json);
+    }
+    return kSuccess;
+}
+
+// ---- dump ---------------------------------------------------------------------------------------
+
+ExitStatus Dump(const Options& options) {
+    const std::string& path = options.paths.front();
+    const Layout layout = ReadLayout(File::OpenToRead(path));
+    const Findings findings = CheckLayout(layout);
+    if (options.json) {
+        Print(DumpJson(path, layout, findings));
+    } else {
+        std::cout << DumpText(path, layout, findings);
+    }
+    if (findings.violations.empty()) return kSuccess;
+    const std::size_t count = findings.violations.size();
+    throw Failure(
+        kFailed, path,
+        "the layout is violated in " + std::to_string(count) + (count == 1 ? " place" : " places"),
+        "restore the file from a copy, or leave it alone");
+}
+
+}  // namespace
+
+ExitStatus Run(const Options& options) {
+    Declarations declarations;
+    for (const std::string& volume : options.volumes) {
+        declarations.push_back(DeclareVolume(volume));
+    }
+    switch (options.command) {
+        case Command::kWhere:
+            return Where(options, declarations);
+        case Command::kList:
+            return List(options);
+        case Command::kGet:
+            return Get(options);
+        case Command::kSet:
+            return Set(options);
+        case Command::kRemove:
+            return Remove(options);
+        case Command::kDump:
+            break;
+    }
+    return Dump(options);
+}
+
+void Report(std::string_view message) {
+    std::cout.flush();  // What was found before comes first.
+    std::cerr << "mavoea: " << message << '\n';
+}
+
+}  // namespace mavoea::tool

@@ -1,0 +1,21 @@
+// What the tool does; results go to standard output.
+#ifndef MAVOEA_TOOLS_COMMANDS_H_
+#define MAVOEA_TOOLS_COMMANDS_H_
+
+#include <string_view>
+
+#include "tools/command_line.h"
+#include "tools/messages.h"
+
+namespace mavoea::tool {
+
+// Throws Failure for whatever ends the work; what ends it for one of several paths is reported
+// instead, and the others are still looked at.
+ExitStatus Run(const Options& options);
+
+// "mavoea: MESSAGE", on standard error.
+void Report(std::string_view message);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_COMMANDS_H_

@@ -1,0 +1,142 @@
+#include "tools/dump.h"
+
+#include "tools/text.h"
+
+namespace mavoea::tool {
+namespace {
+
+const char* FileKind(const Layout& layout) {
+    if (layout.file_size == 0) return "empty file";
+    if (!layout.header) return "too short a file";
+    if (!layout.IsAppleDouble()) return "no AppleDouble file";
+    return layout.HasAttributeArea() ? "EA stream" : "plain AppleDouble file";
+}
+
+std::string TextOf(ByteView bytes) { return {bytes.begin(), bytes.end()}; }
+
+std::string RangeText(Range range) {
+    return "offset " + std::to_string(range.offset) + "  length " + std::to_string(range.length);
+}
+
+// One field a line, its name padded to the widest.
+class Fields {
+ public:
+    void Add(std::string_view name, const std::string& value) {
+        constexpr std::size_t kWidth = 16;
+        std::string padded(name);
+        padded.resize(std::max(kWidth, name.size() + 1), ' ');
+        text_ += padded + value + '\n';
+    }
+    void Line(const std::string& line) { text_ += line + '\n'; }
+
+    std::string Take() { return std::move(text_); }
+
+ private:
+    std::string text_;
+};
+
+void AddHeader(const Layout& layout, Fields* out) {
+    const AppleDoubleHeader& header = *layout.header;
+    out->Add("magic", HexNumber(header.magic));
+    out->Add("version", HexNumber(header.version));
+    out->Add("filler", HexDigits(header.filler) + " \"" + Printable(TextOf(header.filler)) + "\"");
+    out->Add("entries", std::to_string(header.entry_count));
+    for (std::size_t i = 0; i < layout.entries.size(); ++i) {
+        const EntryDescriptor& entry = layout.entries[i];
+        out->Line("  " + std::to_string(i) + "  id " +
+                  std::to_string(static_cast<std::uint32_t>(entry.id)) + " (" +
+                  EntryName(entry.id) + ")  " + RangeText(entry.data));
+    }
+    if (!layout.finder_info.empty()) out->Add("Finder info", HexDigits(layout.finder_info));
+}
+
+void AddAttributes(const Layout& layout, Fields* out) {
+    const AttributeHeader& attributes = *layout.attributes;
+    out->Add("pad", HexNumber(attributes.pad, 4));
+    out->Add("attribute magic", HexNumber(attributes.magic));
+    out->Add("debug tag", HexNumber(attributes.debug_tag));
+    out->Add("total size", std::to_string(attributes.total_size));
+    out->Add("data start", std::to_string(attributes.data.offset));
+    out->Add("data length", std::to_string(attributes.data.length));
+    out->Add("reserved", HexDigits(attributes.reserved));
+    out->Add("flags", HexNumber(attributes.flags, 4));
+    out->Add("attributes", std::to_string(attributes.count));
+    for (std::size_t i = 0; i < layout.records.size(); ++i) {
+        const Layout::Record& record = layout.records[i];
+        out->Line("  " + std::to_string(i) + "  " + RangeText(record.fixed.value) + "  flags " +
+                  HexNumber(record.fixed.flags, 4) + "  name size " +
+                  std::to_string(record.fixed.name_size) + "  \"" + Printable(record.name()) +
+                  "\"");
+    }
+}
+
+Json RangeJson(Range range) { return {{"offset", range.offset}, {"length", range.length}}; }
+
+}  // namespace
+
+std::string DumpText(const std::string& path, const Layout& layout, const Findings& findings) {
+    Fields out;
+    out.Line(Printable(path) + ": " + FileKind(layout) + ", " + std::to_string(layout.file_size) +
+             " bytes");
+    if (layout.header) AddHeader(layout, &out);
+    if (layout.attributes) AddAttributes(layout, &out);
+    if (const auto fork = layout.FindEntry(EntryId::kResourceFork)) {
+        const Range range = layout.entries[*fork].data;
+        out.Add("resource fork", range.length == 0 ? "none" : RangeText(range));
+    }
+    for (const std::string& note : findings.notes) out.Line("note: " + note);
+    for (const std::string& violation : findings.violations) out.Line("violation: " + violation);
+    return out.Take();
+}
+
+Json DumpJson(const std::string& path, const Layout& layout, const Findings& findings) {
+    Json json;
+    SetText(json, "file", path);
+    json["kind"] = FileKind(layout);
+    json["size"] = layout.file_size;
+    if (layout.header) {
+        const AppleDoubleHeader& header = *layout.header;
+        json["header"] = {{"magic", header.magic},
+                          {"version", header.version},
+                          {"filler", HexDigits(header.filler)},
+                          {"entryCount", header.entry_count}};
+        json["entries"] = Json::array();
+        for (const EntryDescriptor& entry : layout.entries) {
+            json["entries"].push_back({{"id", static_cast<std::uint32_t>(entry.id)},
+                                       {"name", EntryName(entry.id)},
+                                       {"offset", entry.data.offset},
+                                       {"length", entry.data.length}});
+        }
+    }
+    if (!layout.finder_info.empty()) json["finderInfo"] = HexDigits(layout.finder_info);
+    if (layout.attributes) {
+        const AttributeHeader& attributes = *layout.attributes;
+        json["attributeHeader"] = {{"pad", attributes.pad},
+                                   {"magic", attributes.magic},
+                                   {"debugTag", attributes.debug_tag},
+                                   {"totalSize", attributes.total_size},
+                                   {"dataStart", attributes.data.offset},
+                                   {"dataLength", attributes.data.length},
+                                   {"reserved", HexDigits(attributes.reserved)},
+                                   {"flags", attributes.flags},
+                                   {"count", attributes.count}};
+        json["attributes"] = Json::array();
+        for (const Layout::Record& record : layout.records) {
+            Json entry;
+            SetText(entry, "name", record.name());
+            entry["offset"] = record.fixed.value.offset;
+            entry["length"] = record.fixed.value.length;
+            entry["flags"] = record.fixed.flags;
+            entry["nameSize"] = record.fixed.name_size;
+            json["attributes"].push_back(std::move(entry));
+        }
+    }
+    if (const auto fork = layout.FindEntry(EntryId::kResourceFork)) {
+        json["resourceFork"] = RangeJson(layout.entries[*fork].data);
+    }
+    json["notes"] = findings.notes;
+    json["violations"] = findings.violations;
+    return json;
+}
+
+}  // namespace mavoea::tool

@@ -1,0 +1,64 @@
+// What an EA stream or AppleDouble file says of itself, and whether that fits together.
+#ifndef MAVOEA_TOOLS_LAYOUT_H_
+#define MAVOEA_TOOLS_LAYOUT_H_
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "format/ea_stream.h"
+#include "tools/file.h"
+
+namespace mavoea::tool {
+
+// What could be read; nothing of it has been checked. What is missing at an end was not in the
+// file.
+struct Layout {
+    struct Record {
+        std::uint64_t at = 0;  // its place in the file
+        AttributeRecord fixed;
+        std::string stored_name;  // name_size bytes, its NUL included
+
+        // Up to the NUL.
+        std::string name() const { return stored_name.c_str(); }
+    };
+
+    std::uint64_t file_size = 0;
+    std::optional<AppleDoubleHeader> header;
+    std::vector<EntryDescriptor> entries;       // up to header->entry_count
+    Bytes finder_info;                          // 32 bytes, or none
+    std::optional<AttributeHeader> attributes;  // none in a plain AppleDouble file
+    std::vector<Record> records;                // up to attributes->count
+
+    bool IsAppleDouble() const { return header && header->magic == kAppleDoubleMagic; }
+
+    // The entry of that kind, the last should there be several; none when there is none.
+    std::optional<std::size_t> FindEntry(EntryId id) const;
+
+    // Whether the Finder info entry spans an attribute area.
+    bool HasAttributeArea() const;
+
+    // Where the table of the attributes that could be read ends.
+    std::uint64_t TableEnd() const;
+
+    // Where everything but the resource fork ends, whether the file is that long or not.
+    std::uint64_t EndBeforeFork() const;
+};
+
+// Whatever the file holds, it is read without failing and in memory bounded by the largest table;
+// only a failing disk throws.
+Layout ReadLayout(const File& file);
+
+struct Findings {
+    std::vector<std::string> violations;  // of the layout's invariants
+    std::vector<std::string> notes;       // unusual, but allowed
+};
+Findings CheckLayout(const Layout& layout);
+
+// "Finder info", "resource fork", ...; "unknown" for what Apple gave no meaning.
+const char* EntryName(EntryId id);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_LAYOUT_H_

@@ -1,0 +1,62 @@
+// An object's attributes, wherever its volume keeps them. "com.apple.FinderInfo" and
+// "com.apple.ResourceFork" are names like any other.
+#ifndef MAVOEA_TOOLS_STORE_H_
+#define MAVOEA_TOOLS_STORE_H_
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "tools/messages.h"
+#include "tools/text.h"
+#include "tools/volume.h"
+
+namespace mavoea::tool {
+
+inline constexpr std::string_view kFinderInfoName = "com.apple.FinderInfo";
+inline constexpr std::string_view kResourceForkName = "com.apple.ResourceFork";
+
+enum class Kind { kAttribute, kFinderInfo, kResourceFork };
+
+constexpr Kind KindOf(std::string_view name) {
+    if (name == kFinderInfoName) return Kind::kFinderInfo;
+    if (name == kResourceForkName) return Kind::kResourceFork;
+    return Kind::kAttribute;
+}
+
+struct Attribute {
+    std::string name;
+    std::uint64_t size = 0;  // of the value, in bytes
+    Kind kind = Kind::kAttribute;
+    std::string file;  // that holds it
+};
+
+// All members throw Failure.
+class Store {
+ public:
+    virtual ~Store() = default;
+
+    virtual std::vector<Attribute> List() = 0;
+    virtual std::optional<Bytes> Get(const std::string& name) = 0;
+    virtual void Set(const std::string& name, const Bytes& value) = 0;
+    virtual bool Remove(const std::string& name) = 0;  // false: there was none
+};
+
+// Finder info of another size than its own is a Failure.
+void CheckFinderInfoSize(const std::string& path, const Bytes& value);
+
+// Types 0 and 5, and types 1, 2, 3, 6 and 10.
+std::unique_ptr<Store> MakeEaFileStore(const Object& object);
+// Type 7.
+std::unique_ptr<Store> MakeXattrStore(const Object& object);
+
+// The one for the object's volume. Failure for a volume whose type has none.
+std::unique_ptr<Store> OpenStore(const Object& object);
+Failure NoStore(const Object& object);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_STORE_H_
