@@ -1,0 +1,49 @@
+#!/bin/sh
+# Builds everything and passes the whole test suite: optimised, under the sanitizers, and through
+# the checks of style. Installs what that takes. Prints what it runs.
+set -eu
+cd "$(dirname "$0")/.."
+root=$PWD
+
+step() {
+    echo
+    echo "==== $*"
+}
+
+step packages
+sh tests/packages.sh g++ cmake ninja-build pkg-config libacl1-dev libcli11-dev nlohmann-json3-dev \
+    libgtest-dev libgmock-dev libbenchmark-dev acl attr binutils \
+    clang-format clang-tidy clang cppcheck git python3
+
+for preset in release sanitize; do
+    step "build: $preset"
+    cmake --preset $preset
+    cmake --build --preset $preset
+    step "test: $preset"
+    ctest --preset $preset -j 2
+done
+
+step "style: formatting"
+files=$(git ls-files '*.c' '*.cpp' '*.h' 2>/dev/null || true)
+[ -n "$files" ] || files=$(find include path stream xattr adouble ops format util platform tools \
+    tests bench fuzz -name '*.c' -o -name '*.cpp' -o -name '*.h' 2>/dev/null)
+# shellcheck disable=SC2086: a list of words
+clang-format --dry-run --Werror $files
+
+step "style: includes point one way"
+sh tests/lint/includes.sh
+
+step "static analysis: clang-tidy"
+# shellcheck disable=SC2046: a list of words
+run-clang-tidy -quiet -j 2 -p build/release \
+    "^$root/(path|stream|xattr|adouble|ops|format|util|platform|tools)/.*\.cpp\$" \
+    > build/clang-tidy.log 2>&1 || { cat build/clang-tidy.log; exit 1; }
+echo "no findings"
+
+step "static analysis: cppcheck"
+cppcheck --quiet --error-exitcode=1 --std=c++20 --language=c++ --inline-suppr \
+    --enable=warning,performance,portability --suppress=missingInclude \
+    -I . path stream xattr format util platform
+echo "no findings"
+
+step "all passed"
