@@ -16,8 +16,8 @@ bool IsHiddenDotName(const char* name) {
 }  // namespace
 
 int MAVOEAIsHiddenFile(const char* szName) {
-    if (szName == nullptr || static_cast<unsigned char>(*szName) > '@')
-        return 0;  // as most names begin
+    if (szName == nullptr) return 0;
+    if (static_cast<unsigned char>(*szName) > '@') return 0;  // as most names begin
     if (*szName == '@') return mavoea::IsHiddenDirName(szName) ? 1 : 0;
     if (*szName == '.') return IsHiddenDotName(szName) ? 1 : 0;
     return MAVOEAIsVetoFile(szName);

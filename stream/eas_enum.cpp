@@ -15,8 +15,8 @@ constexpr Unit unit("eas_enum");
 using namespace mavoea;
 
 int MAVOEASEnum(EASHandle* h, MLIBCSzList** ppList) {
-    if (h == nullptr || ppList == nullptr || *ppList == nullptr)
-        return unit.Fail(Err::kBadArgument);
+    if (h == nullptr || ppList == nullptr) return unit.Fail(Err::kBadArgument);
+    if (*ppList == nullptr) return unit.Fail(Err::kBadArgument);
     const std::span<EASEntry> attributes = Attributes(*h);
     for (const EASEntry& entry : attributes) {
         if (MLIBCSzListPush(ppList, entry.name) < 0) {

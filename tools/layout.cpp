@@ -34,8 +34,8 @@ void ReadRecords(const File& file, Layout* layout) {
         const ByteView name = rest.first(size).last(record.fixed.name_size);
         record.at = kStreamHeaderSize + at;
         record.stored_name.assign(name.begin(), name.end());
-        layout->records.push_back(std::move(record));
         at += RecordSize(record.fixed.name_size);
+        layout->records.push_back(std::move(record));
     }
 }
 

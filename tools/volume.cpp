@@ -96,8 +96,8 @@ Declaration DeclareVolume(std::string_view declaration) {
                       "for example --volume /srv/share=eadir");
     }
     const std::string type_name(declaration.substr(equals + 1));
-    const Declaration result{Absolute(std::string(declaration.substr(0, equals))),
-                             MAVOVolumeTypeFromName(type_name.c_str())};
+    Declaration result{Absolute(std::string(declaration.substr(0, equals))),
+                       MAVOVolumeTypeFromName(type_name.c_str())};
     if (result.type < 0) {
         throw Failure(kFailed, subject, "unknown volume type \"" + type_name + "\"",
                       "take a number from 0 to 12, appledouble, eadir, fileea or xattr");

@@ -52,6 +52,7 @@ static_assert(WithoutTrailingSlash("/").empty() && WithoutTrailingSlash("").empt
 // all that the kernel takes are, stay on the stack.
 class WorkingPath {
  public:
+    // cppcheck-suppress uninitMemberVar; clearing it would cost more than the rest of a derivation
     explicit WorkingPath(const char* path) : size_(strlen(path)) {
         if (size_ > kShortPathMax) heap_ = Owned<char>::Allocate(size_ + 1);
         if (ok()) memcpy(data(), path, size_ + 1);

@@ -54,6 +54,7 @@ class LogFormat {
  public:
     // NOLINTNEXTLINE(google-explicit-constructor): stands in for a string literal.
     consteval LogFormat(const char* text, int line = __builtin_LINE()) : text_(text), line_(line) {
+        // cppcheck-suppress constStatement; it takes the pack's comma for an operator
         constexpr char kinds[] = {'s', 'd', KindOf<Args>()..., '\0'};
         std::size_t next = 0;
         for (const char* at = text; *at != '\0'; ++at) {

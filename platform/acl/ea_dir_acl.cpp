@@ -15,7 +15,7 @@ constexpr char kDefaultAcl[] = "user::rwx,group::rwx,other::rwx";
 
 // Sets the default ACL of the directory on fd. False with errno.
 bool SetDefaultAcl(int fd) {
-    const acl_t acl = acl_from_text(kDefaultAcl);
+    acl_t acl = acl_from_text(kDefaultAcl);
     if (acl == nullptr) return false;
     // libacl sets default ACLs by path only. This one leads to what the descriptor holds, whatever
     // has been put in its place since.

@@ -72,9 +72,10 @@ int MLIBCSzListPush(MLIBCSzList** ppList, const char* sz) {
     if (list->count == list->capacity && !Grow(list)) return -1;
 
     const std::size_t size = strlen(sz) + 1;
-    void* const copy = malloc(size);
+    auto* const copy = static_cast<char*>(malloc(size));
     if (copy == nullptr) return -1;
-    list->strings[list->count++] = static_cast<char*>(memcpy(copy, sz, size));
+    memcpy(copy, sz, size);
+    list->strings[list->count++] = copy;
     return 0;
 }
 

@@ -103,16 +103,13 @@ bool Same(const timespec& a, const timespec& b) {
 FILE* OpenRegular(const char* path, struct stat* status) {
     const int fd = open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
     if (fd < 0) return nullptr;
-    int error = 0;
-    if (fstat(fd, status) != 0) {
-        error = errno;
-    } else if (!S_ISREG(status->st_mode)) {
-        error = EINVAL;
-    } else if (FILE* const file = fdopen(fd, "r")) {
-        return file;
-    } else {
-        error = errno;
+    FILE* file = nullptr;
+    if (fstat(fd, status) == 0) {
+        errno = EINVAL;
+        if (S_ISREG(status->st_mode)) file = fdopen(fd, "r");
     }
+    if (file != nullptr) return file;
+    const int error = errno;
     close(fd);
     errno = error;
     return nullptr;
