@@ -4,6 +4,7 @@
 #include <sys/xattr.h>
 
 #include "include/mavoea.h"
+#include "util/bytes.h"
 #include "xattr/resource_fork.h"
 
 namespace mavoea {
@@ -11,20 +12,7 @@ namespace {
 
 constexpr Unit unit("ea_xattr_set");
 
-int WriteFork(const char* szPath, const void* szValue, std::size_t size, int flags) {
-    struct stat info;
-    if (kernel::Stat(szPath, &info) != 0) {
-        unit.Log("%s:%d Fail to stat(%s). %m", szPath);
-        return -1;
-    }
-    if (S_ISDIR(info.st_mode)) return unit.Fail(Err::kNothingThere);
-
-    const ForkAccess fork(unit, szPath, info.st_mode);
-    if (fork.Stat(&info) != 0) {
-        unit.Log("%s:%d Fail to stat(%s). %m", fork.path());
-        return -1;
-    }
-    const bool absent = info.st_size == 0;
+int WriteFork(const ForkAccess& fork, bool absent, ByteView value, int flags) {
     if (absent && (flags & XATTR_REPLACE) != 0) {
         errno = ENODATA;
         return -1;
@@ -40,7 +28,8 @@ int WriteFork(const char* szPath, const void* szValue, std::size_t size, int fla
         return -1;
     }
     // Only the close hands the last bytes to the kernel, so it decides, and sync() comes after it.
-    if (kernel::Fwrite(szValue, size, file.get()) != size || !file.Close()) {
+    const std::size_t written = kernel::Fwrite(value.data(), value.size(), file.get());
+    if (written != value.size() || !file.Close()) {
         unit.Log("%s:%d Fail to write(%s). %m", fork.path());
         return -1;
     }
@@ -60,6 +49,11 @@ int MAVOEAXattrSet(const char* szPath, const char* szName, const void* szValue, 
     if (szValue == nullptr) return unit.FailCheck("((void *)0) != szValue");
     if (cbValue < 0) return unit.FailCheck("0 <= cbValue");
     const auto size = static_cast<std::size_t>(cbValue);
-    if (szName == kResourceForkName) return WriteFork(szPath, szValue, size, flags);
+    if (szName == kResourceForkName) {
+        const ByteView value(static_cast<const std::uint8_t*>(szValue), size);
+        return ChangeFork(unit, szPath, [&](const ForkAccess& fork, off_t fork_size) {
+            return WriteFork(fork, fork_size == 0, value, flags);
+        });
+    }
     return kernel::Setxattr(szPath, szName, szValue, size, flags);
 }

@@ -41,6 +41,25 @@ class ForkAccess {
     char path_[4095];
 };
 
+// Hands the fork of an object that is to be changed, and its size in bytes, to `change`, and
+// returns what that returns. -1 when there is no fork to be reached: reported for `unit` and the
+// line that called.
+template <class Change>
+int ChangeFork(const Unit& unit, const char* object, Change change, int line = __builtin_LINE()) {
+    struct stat info;
+    if (kernel::Stat(object, &info) != 0) {
+        unit.LogAt(line, "%s:%d Fail to stat(%s). %m", object);
+        return -1;
+    }
+    if (S_ISDIR(info.st_mode)) return unit.Fail(Err::kNothingThere, line);
+    const ForkAccess fork(unit, object, info.st_mode, line);
+    if (fork.Stat(&info) != 0) {
+        unit.LogAt(line, "%s:%d Fail to stat(%s). %m", fork.path());
+        return -1;
+    }
+    return change(fork, info.st_size);
+}
+
 // Closes a stream.
 class UniqueFile {
  public:
