@@ -104,7 +104,7 @@ typedef struct EASEntry {
     uint32_t length;    /* of the value, in bytes */
     uint16_t flags;     /* carried through unchanged */
     uint8_t nameLength; /* of the name in bytes, its NUL included */
-    char* name;         /* heap copy owned by the record; NULL in unused records */
+    char* name;         /* NUL-terminated, owned by the handle; NULL in unused records */
 } EASEntry;
 
 /* An open EA stream, from MAVOEASOpen(). */
