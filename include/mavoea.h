@@ -332,6 +332,33 @@ MAVOEA_API int MAVOEAXattrSet(const char* szPath, const char* szName, const void
 /* Removes an attribute; a fork is emptied. -1: 0xD00; for the fork of a directory 0x700. */
 MAVOEA_API int MAVOEAXattrRemove(const char* szPath, const char* szName);
 
+/* ---- Netatalk record ------------------------------------------------------------------------- */
+/* The AFP service's metadata of an object: a small AppleDouble block, in the extended attribute
+ * "user.netatalk.Metadata" (402 bytes) on file-EA volumes, at the head of the resource file (741
+ * bytes) on EA-directory volumes. docs/formats.md has the layout. */
+
+/* Parses the len bytes at buf into *ad, which the caller has zeroed: absent entries stay as they
+ * are. Entries lie within the record's 1024 bytes of data, the resource fork's excepted, which may
+ * run past it. 0, or -1 with *ad filled as far as the parse went: 0xD00 NULL, len negative or over
+ * 1024, or an entry that is not acceptable (logged); 0xA00 magic or version (logged). */
+MAVOEA_API int MAVOEAAdoubleRead(const void* buf, int len, EAAdouble* ad);
+
+/* The record of path's object, from its attribute and from its resource file. 0; 1 there is none;
+ * -1, logged: 0xD00 NULL; 0xA00 unreadable, of another size, damaged or, in the attribute,
+ * incomplete; 0x900 the resource file could not be opened; the path functions' codes. */
+MAVOEA_API int MAVOEAFileEAAdoubleRead(const char* path, EAAdouble* ad);
+MAVOEA_API int MAVOEAEADirAdoubleRead(const char* path, EAAdouble* ad);
+
+/* Stores the len bytes at buf, 1024 at most, as the record of path's object. 0, or -1: 0xD00; 0x300
+ * not permitted (attribute); 0xB00 not written; and, logged, 0x900 the resource file could not be
+ * opened.
+ *
+ * The resource file is created where it is missing (and removed again when nothing could be
+ * written); of one that exists only the head changes. MAVOEAEADirAdoubleFlush() keeps the
+ * descriptor that it opens, one a call: a caller that flushes many files must allow for that. */
+MAVOEA_API int MAVOEAFileEAAdoubleFlush(const void* buf, int len, const char* path);
+MAVOEA_API int MAVOEAEADirAdoubleFlush(const void* buf, int len, const char* path);
+
 #ifdef __cplusplus
 }
 #endif

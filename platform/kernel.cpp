@@ -43,6 +43,7 @@ int GetLock(int fd, struct flock64* lock) { return ::fcntl(fd, F_GETLK64, lock);
 int MkdirAt(int dir, const char* path, mode_t mode) {
     return dir == AT_FDCWD ? ::mkdir(path, mode) : ::mkdirat(dir, path, mode);
 }
+int Unlink(const char* path) { return ::unlink(path); }
 int Chmod(const char* path, mode_t mode) { return ::chmod(path, mode); }
 int Fchmod(int fd, mode_t mode) { return ::fchmod(fd, mode); }
 

@@ -35,6 +35,7 @@ int SetLock(int fd, const struct flock64* lock);  // F_SETLK, 64-bit
 int GetLock(int fd, struct flock64* lock);        // F_GETLK, 64-bit
 
 int MkdirAt(int dir, const char* path, mode_t mode);
+int Unlink(const char* path);
 int Chmod(const char* path, mode_t mode);
 int Fchmod(int fd, mode_t mode);
 

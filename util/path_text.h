@@ -19,6 +19,9 @@ inline constexpr std::size_t kShortPathMax = 4094;
 // Room for every path that the library derives, and its NUL.
 inline constexpr int kPathBufferSize = MAVOEA_PATH_SIZE + 1;
 
+// How long a metadata path may be where the library derives one for itself.
+inline constexpr int kDerivedPathMax = MAVOEA_PATH_SIZE - 1;
+
 struct ObjectPath {
     std::string_view parent;  // with its '/'; empty when the path has none
     std::string_view name;

@@ -22,6 +22,7 @@ enum class Err : int {
     kNotPermitted = MAVOEA_ERR_NOT_PERMITTED,
     kLock = MAVOEA_ERR_LOCK,
     kNothingThere = MAVOEA_ERR_NOTHING_THERE,
+    kOpen = MAVOEA_ERR_OPEN,
     kRead = MAVOEA_ERR_READ,
     kWrite = MAVOEA_ERR_WRITE,
     kBadArgument = MAVOEA_ERR_BAD_ARGUMENT,
@@ -48,7 +49,7 @@ class ErrnoKeeper {
 
 // A log line's format that has been checked, when compiled, against the arguments after the first
 // two, which are always the unit's name and the line. Knows what the library's lines use: %s, %d,
-// %0nX and %m.
+// %i, %u, %0nX and %m.
 template <class... Args>
 class LogFormat {
  public:
@@ -62,7 +63,7 @@ class LogFormat {
             ++at;
             while (*at >= '0' && *at <= '9') ++at;
             if (*at == 'm') continue;
-            const char wanted = *at == 'X' ? 'd' : *at;
+            const char wanted = *at == 'X' || *at == 'i' ? 'd' : *at;
             if (kinds[next++] != wanted) FormatAndArgumentsDiffer();
         }
         if (kinds[next] != '\0') FormatAndArgumentsDiffer();
@@ -78,6 +79,7 @@ class LogFormat {
     static consteval char KindOf() {
         if constexpr (std::convertible_to<Arg, const char*>) return 's';
         if constexpr (std::same_as<std::remove_cvref_t<Arg>, int>) return 'd';
+        if constexpr (std::same_as<std::remove_cvref_t<Arg>, unsigned>) return 'u';
         return '?';
     }
 

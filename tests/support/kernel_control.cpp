@@ -310,6 +310,10 @@ int MkdirAt(int dir, const char* path, mode_t mode) {
     });
 }
 
+int Unlink(const char* path) {
+    return Call("unlink", Text(path), -1, [&] { return ::unlink(path); });
+}
+
 int Chmod(const char* path, mode_t mode) {
     return Call("chmod", Text(path) + ", " + Octal(mode), -1,
                 [&] { return Hooks().chmod ? Hooks().chmod(path, mode) : ::chmod(path, mode); });

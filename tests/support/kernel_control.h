@@ -3,8 +3,9 @@
 //
 // Call names are the C library's in lower case: "open", "close", "pread", "preadv", "pwrite",
 // "pwritev", "lseek", "ftruncate", "fsync", "sync", "fstat", "stat", "lstat", "setlock", "getlock",
-// "mkdir", "chmod", "fchmod", "geteuid", "seteuid", "getpid", "listxattr", "getxattr", "setxattr",
-// "removexattr", "fopen", "fread", "fwrite", "fclose", "archive", "malloc" (every allocation).
+// "mkdir", "unlink", "chmod", "fchmod", "geteuid", "seteuid", "getpid", "listxattr", "getxattr",
+// "setxattr", "removexattr", "fopen", "fread", "fwrite", "fclose", "archive", "malloc" (every
+// allocation).
 #ifndef MAVOEA_TESTS_SUPPORT_KERNEL_CONTROL_H_
 #define MAVOEA_TESTS_SUPPORT_KERNEL_CONTROL_H_
 
