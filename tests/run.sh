@@ -13,7 +13,7 @@ step() {
 step packages
 sh tests/packages.sh g++ cmake ninja-build pkg-config libacl1-dev libcli11-dev nlohmann-json3-dev \
     libgtest-dev libgmock-dev libbenchmark-dev acl attr binutils \
-    clang-format clang-tidy clang cppcheck git python3
+    e2fsprogs xfsprogs btrfs-progs clang-format clang-tidy clang cppcheck git python3
 
 for preset in release sanitize; do
     step "build: $preset"
@@ -43,7 +43,7 @@ echo "no findings"
 step "static analysis: cppcheck"
 cppcheck --quiet --error-exitcode=1 --std=c++20 --language=c++ --inline-suppr \
     --enable=warning,performance,portability --suppress=missingInclude \
-    -I . path stream xattr format util platform
+    -I . adouble path stream xattr format util platform
 echo "no findings"
 
 step "all passed"
