@@ -24,9 +24,8 @@ int MAVOEASRemove(EASHandle* h, const char* name) {
     if (index < 0) return -1;
 
     Survey survey;
-    if (SurveyTable(h, unit, &survey) != 0) return -1;
     Range fork;
-    if (SurveyFork(h, survey, unit, &fork) != 0) return -1;
+    if (SurveyStream(h, unit, &survey, &fork) != 0) return -1;
 
     const EASEntry& dropped = h->entries[index];
     Range data = survey.header.attributes.data;  // as it will be

@@ -29,9 +29,8 @@ int Commit(EASHandle* h, const StreamImage& image, std::uint64_t total_size, Ran
 // Appends a new attribute. Whatever can fail before the disk changes comes first, memory last.
 int Create(EASHandle* h, const char* name, ByteView value, unsigned offset) {
     Survey survey;
-    if (SurveyTable(h, unit, &survey) != 0) return -1;
     Range fork;
-    if (SurveyFork(h, survey, unit, &fork) != 0) return -1;
+    if (SurveyStream(h, unit, &survey, &fork) != 0) return -1;
 
     AttributeHeader& attributes = survey.header.attributes;
     const Range old_data = attributes.data;
@@ -73,9 +72,8 @@ int Create(EASHandle* h, const char* name, ByteView value, unsigned offset) {
 
 int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
     Survey survey;
-    if (SurveyTable(h, unit, &survey) != 0) return -1;
     Range fork;
-    if (SurveyFork(h, survey, unit, &fork) != 0) return -1;
+    if (SurveyStream(h, unit, &survey, &fork) != 0) return -1;
 
     // A value never shrinks.
     Range& data = survey.header.attributes.data;

@@ -41,6 +41,13 @@ int SurveyTable(EASHandle* h, const Unit& unit, Survey* found, int line = __buil
 int SurveyFork(EASHandle* h, const Survey& survey, const Unit& unit, Range* fork,
                int line = __builtin_LINE());
 
+// Both, for what moves the fork.
+inline int SurveyStream(EASHandle* h, const Unit& unit, Survey* survey, Range* fork,
+                        int line = __builtin_LINE()) {
+    if (SurveyTable(h, unit, survey, line) != 0) return -1;
+    return SurveyFork(h, *survey, unit, fork, line);
+}
+
 // Whether attributes that end there leave a fork of that length within a stream's 32-bit offsets.
 bool FitsStream(std::uint64_t total_size, std::uint32_t fork_length);
 

@@ -65,6 +65,10 @@ std::vector<Record> TakeRecords() { return std::exchange(TheState().records, {})
 }
 
 std::vector<std::string> TakeLog() { return std::exchange(TheState().log, {}); }
+void ExpectNothingReported() {
+    EXPECT_THAT(TakeRecords(), ::testing::IsEmpty());
+    EXPECT_THAT(TakeLog(), ::testing::IsEmpty());
+}
 std::vector<std::string> TakePlatformCalls() { return std::exchange(TheState().calls, {}); }
 FakePlatform& Platform() { return TheState().answers; }
 void ResetPlatform() { TheState() = State{}; }

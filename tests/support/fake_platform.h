@@ -35,6 +35,9 @@ std::vector<Record> TakeRecords();
 // trailing newline, and with every line number as "LINE": "ea_mkdir.c:LINE Invaild Argument ...".
 std::vector<std::string> TakeLog();
 
+// Expects no record and no line since the last time.
+void ExpectNothingReported();
+
 // The calls made to the platform since the last time, other than error stack and string lists:
 // "MAVOGetFSType(/v, 1)", "MAVOACLSetEADirACL(/v/@eaDir)", "MLIBMavoIndexAddEx(/v/a, NULL, 7, 0,
 // 0)", "MLIBMavoFileIndexAdd(/v/a, NULL, 6)", "MLIBCExec(/bin/cp, -f, /a, /b)",

@@ -13,6 +13,7 @@
 
 #include "include/mavoea.h"
 #include "tests/support/fake_platform.h"
+#include "tests/support/identity.h"
 #include "tests/support/kernel_control.h"
 #include "tests/support/process.h"
 #include "tests/support/temp_dir.h"
@@ -30,7 +31,7 @@ using ::testing::StartsWith;
 constexpr char kUnit[] = "ea_mkdir.c";
 constexpr uid_t kUser = 1000;
 
-class EaMkdirTest : public ::testing::Test {
+class EaMkdirTest : public ::testing::Test, protected Identity {
  protected:
     void SetUp() override {
         ResetKernel();
@@ -51,27 +52,6 @@ class EaMkdirTest : public ::testing::Test {
         EXPECT_EQ(descriptors_, OpenDescriptors());
         ResetKernel();
         ResetPlatform();
-    }
-
-    // Puts an identity of the test's own in front of the process's.
-    void BeUser(uid_t uid) {
-        uid_ = uid;
-        Hooks().geteuid = [this] { return uid_; };
-        Hooks().seteuid = [this](uid_t to) {
-            uid_ = to;
-            return 0;
-        };
-    }
-
-    // The process's own identity again.
-    static void BeWhoWeAre() {
-        Hooks().geteuid = nullptr;
-        Hooks().seteuid = nullptr;
-    }
-
-    static void ExpectNothingReported() {
-        EXPECT_THAT(TakeRecords(), IsEmpty());
-        EXPECT_THAT(TakeLog(), IsEmpty());
     }
 
     static void ExpectOnly(int code) {
@@ -99,7 +79,6 @@ class EaMkdirTest : public ::testing::Test {
     TempDir dir_;
     const std::string ea_dir_ = dir_ / "@eaDir";
     const std::string folder_ = ea_dir_ + "/name";
-    uid_t uid_ = 0;
     std::map<std::string, Bytes> attributes_;  // by "<path> <name>"
     int live_blocks_ = 0;
     long descriptors_ = 0;

@@ -12,6 +12,7 @@
 
 #include "include/mavoea.h"
 #include "tests/support/fake_platform.h"
+#include "tests/support/identity.h"
 #include "tests/support/kernel_control.h"
 #include "tests/support/process.h"
 #include "tests/support/temp_dir.h"
@@ -29,7 +30,7 @@ constexpr char kResource[] = "MavoResource";
 constexpr char kUnit[] = "ea_open";
 constexpr uid_t kUser = 1000;
 
-class EaOpenTest : public ::testing::Test {
+class EaOpenTest : public ::testing::Test, protected Identity {
  protected:
     void SetUp() override {
         ResetKernel();
@@ -45,25 +46,6 @@ class EaOpenTest : public ::testing::Test {
         EXPECT_EQ(descriptors_, OpenDescriptors());
         ResetKernel();
         ResetPlatform();
-    }
-
-    void BeUser(uid_t uid) {
-        uid_ = uid;
-        Hooks().geteuid = [this] { return uid_; };
-        Hooks().seteuid = [this](uid_t to) {
-            uid_ = to;
-            return 0;
-        };
-    }
-
-    static void BeWhoWeAre() {
-        Hooks().geteuid = nullptr;
-        Hooks().seteuid = nullptr;
-    }
-
-    static void ExpectNothingReported() {
-        EXPECT_THAT(TakeRecords(), IsEmpty());
-        EXPECT_THAT(TakeLog(), IsEmpty());
     }
 
     static void ExpectOnly(int code, const std::string& unit) {
@@ -99,7 +81,6 @@ class EaOpenTest : public ::testing::Test {
     const std::string folder_ = ea_dir_ + "/a.txt";
     const std::string legacy_ = folder_ + "/MAVO:Resource";
     const std::string sidecar_ = dir_ / "._a.txt";
-    uid_t uid_ = 0;
     int live_blocks_ = 0;
     long descriptors_ = 0;
 };

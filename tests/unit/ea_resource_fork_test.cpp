@@ -15,6 +15,7 @@
 
 #include "include/mavoea.h"
 #include "tests/support/fake_platform.h"
+#include "tests/support/identity.h"
 #include "tests/support/kernel_control.h"
 #include "tests/support/process.h"
 #include "tests/support/temp_dir.h"
@@ -33,7 +34,7 @@ using ::testing::StartsWith;
 constexpr char kFork[] = "com.apple.ResourceFork";
 constexpr uid_t kUser = 1000;
 
-class ResourceForkTestBase {
+class ResourceForkTestBase : protected Identity {
  protected:
     ResourceForkTestBase() {
         ResetKernel();
@@ -69,22 +70,6 @@ class ResourceForkTestBase {
 
     bool IsView(const std::string& path) const { return path == view_ || path == link_ + "/rsrc"; }
 
-    // Puts an identity of the test's own in front of the process's.
-    void BeUser(uid_t uid) {
-        uid_ = uid;
-        Hooks().geteuid = [this] { return uid_; };
-        Hooks().seteuid = [this](uid_t to) {
-            uid_ = to;
-            return 0;
-        };
-    }
-
-    // The process's own identity again.
-    static void BeWhoWeAre() {
-        Hooks().geteuid = nullptr;
-        Hooks().seteuid = nullptr;
-    }
-
     void SetMode(mode_t mode) const { ASSERT_EQ(0, ::chmod(object_.c_str(), mode)); }
     void SetFork(const std::string& content) const { WriteFile(fork_, Ascii(content)); }
     std::string Fork() const {
@@ -92,17 +77,11 @@ class ResourceForkTestBase {
         return std::string(bytes.begin(), bytes.end());
     }
 
-    static void ExpectNothingReported() {
-        EXPECT_THAT(TakeRecords(), IsEmpty());
-        EXPECT_THAT(TakeLog(), IsEmpty());
-    }
-
     TempDir dir_;
     const std::string object_ = dir_ / "object";
     const std::string view_ = object_ + "/rsrc";
     const std::string fork_ = dir_ / "fork";
     const std::string link_ = dir_ / "link";
-    uid_t uid_ = 0;
     uid_t uid_while_open_ = 0;
     int mode_while_open_ = -1;
     int live_blocks_ = 0;

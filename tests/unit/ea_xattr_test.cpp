@@ -46,11 +46,6 @@ class XattrTest : public ::testing::Test {
         ResetPlatform();
     }
 
-    static void ExpectNothingReported() {
-        EXPECT_THAT(TakeRecords(), IsEmpty());
-        EXPECT_THAT(TakeLog(), IsEmpty());
-    }
-
     static void ExpectCheckFailed(const std::string& unit, const std::string& check) {
         EXPECT_THAT(TakeLog(), ElementsAre(InvalidArgument(unit, check)));
         EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, unit)));
