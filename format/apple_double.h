@@ -13,10 +13,16 @@
 namespace mavoea {
 
 inline constexpr std::uint32_t kAppleDoubleMagic = 0x00051607;
+inline constexpr std::uint32_t kAppleDoubleVersion1 = 0x00010000;
 inline constexpr std::uint32_t kAppleDoubleVersion2 = 0x00020000;
 
-// What an entry holds. There are more kinds; these two are the ones that streams keep.
-enum class EntryId : std::uint32_t { kNone = 0, kResourceFork = 2, kFinderInfo = 9 };
+// What an entry holds. There are more kinds; streams keep the resource fork and the Finder info.
+enum class EntryId : std::uint32_t {
+    kNone = 0,
+    kResourceFork = 2,
+    kFinderInfo = 9,
+    kAfpFileInfo = 14
+};
 
 //   offset  size  field
 //        0     4  magic
@@ -42,6 +48,20 @@ struct EntryDescriptor {
     EntryId id = EntryId::kNone;
     Range data;
 };
+
+// Finder info: 32 bytes, which are the Finder's. The flags, 16 bits, are at 8.
+inline constexpr std::size_t kFinderInfoSize = 32;
+inline constexpr std::size_t kFinderFlagsOffset = 8;
+inline constexpr std::uint16_t kFinderInvisible = 0x4000;
+
+// AFP file info: 4 bytes, of which the last two are the AFP attributes. From the Apple Filing
+// Protocol; the attributes forbid writing, renaming and deleting one by one.
+inline constexpr std::size_t kAfpFileInfoSize = 4;
+inline constexpr std::size_t kAfpAttributesOffset = 2;
+inline constexpr std::uint16_t kAfpInvisible = 0x0001;
+inline constexpr std::uint16_t kAfpNoWrite = 0x0020;
+inline constexpr std::uint16_t kAfpNoRename = 0x0080;
+inline constexpr std::uint16_t kAfpNoDelete = 0x0100;
 
 // Where a header with that many entries and its descriptors end.
 constexpr std::size_t DescriptorsEnd(std::uint16_t entry_count) {

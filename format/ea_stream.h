@@ -14,7 +14,6 @@
 namespace mavoea {
 
 inline constexpr std::size_t kStreamHeaderSize = 120;
-inline constexpr std::size_t kFinderInfoSize = 32;
 inline constexpr std::uint32_t kFinderInfoOffset = 50;
 inline constexpr std::uint16_t kStreamDescriptorMax = 13;
 inline constexpr std::uint32_t kAttributeMagic = 0x41545452;  // "ATTR"

@@ -7,6 +7,7 @@
 #include <array>
 #include <cstddef>
 #include <cstdint>
+#include <span>
 
 #include "format/apple_double.h"
 
@@ -69,6 +70,10 @@ constexpr bool AcceptableEntry(Slot slot, Range data) {
     return slot != Slot::kNone && data.offset < kRecordDataSize &&
            (slot == Slot::kResourceFork || data.end() <= kRecordDataSize);
 }
+
+// A fresh record with that Finder info, ready to be stored.
+std::array<std::uint8_t, kAttributeBlockSize> EncodeFreshRecord(
+    std::span<const std::uint8_t, kFinderInfoSize> finder_info);
 
 }  // namespace mavoea
 

@@ -359,6 +359,35 @@ MAVOEA_API int MAVOEAEADirAdoubleRead(const char* path, EAAdouble* ad);
 MAVOEA_API int MAVOEAFileEAAdoubleFlush(const void* buf, int len, const char* path);
 MAVOEA_API int MAVOEAEADirAdoubleFlush(const void* buf, int len, const char* path);
 
+/* ---- Finder info and flush time -------------------------------------------------------------- */
+/* File-EA volumes (type 2) keep an object's 32 bytes of Finder info twice: in the resource file and
+ * in the netatalk record of its attribute. Whoever changes one brings the other into step and
+ * stamps the time of the change, the attribute "user.mavo.filea.flushtime": seconds since
+ * 1970-01-01 UTC, 4 bytes, signed, big-endian. All zeros mean no Finder info.
+ *
+ * With checkFSType 1 nothing is done, with result 0, unless the platform says that path is on a
+ * volume of type 2; with any other value nobody is asked. */
+
+/* Finder info from the resource file (zeros when there is none) into the attribute, then the flush
+ * time. The attribute's record is replaced by a fresh one: its comment, dates, AFP file info and
+ * private entries are reset. 0, or -1: 0xD00 NULL; what opening the resource file, storing the
+ * record and the flush time give. */
+MAVOEA_API int MAVOEAFileEAFSFinfoEASync(const char* path, int checkFSType);
+
+/* Writes Finder info into the resource file, in place; one that is missing is created, of 82 bytes,
+ * and removed again when nothing could be written. 0, or -1: 0xD00 NULL; 0x300, 0xB00 not written;
+ * what MAVOEAOpen() and MAVOEASOpen() give. */
+MAVOEA_API int MAVOEAEADirFSFInfoWrite(const char* path, const unsigned char finfo[32]);
+
+/* Writes the Finder info of h's header (bytes 50 to 81) into its file, where the file's Finder info
+ * is. 0, or -1: 0xD00 NULL, no descriptor, no Finder info behind the file's header, or an offset
+ * that cannot be sought (logged); 0x300 no write lock; 0xB00 not written. */
+MAVOEA_API int EASWriteFinderInfo(EASHandle* h);
+
+/* Stamps the flush time with the present time. 0, or -1: 0xD00 NULL; 0x2A00 the attribute could not
+ * be set. */
+MAVOEA_API int MAVOEAFileEAWriteFlushTime(const char* path, int checkFSType);
+
 #ifdef __cplusplus
 }
 #endif

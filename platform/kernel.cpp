@@ -37,6 +37,7 @@ void Sync() { ::sync(); }
 int Fstat(int fd, struct stat* info) { return ::fstat(fd, info); }
 int Stat(const char* path, struct stat* info) { return ::stat(path, info); }
 int Lstat(const char* path, struct stat* info) { return ::lstat(path, info); }
+int Access(const char* path, int mode) { return ::access(path, mode); }
 int SetLock(int fd, const struct flock64* lock) { return ::fcntl(fd, F_SETLK64, lock); }
 int GetLock(int fd, struct flock64* lock) { return ::fcntl(fd, F_GETLK64, lock); }
 
@@ -44,12 +45,24 @@ int MkdirAt(int dir, const char* path, mode_t mode) {
     return dir == AT_FDCWD ? ::mkdir(path, mode) : ::mkdirat(dir, path, mode);
 }
 int Unlink(const char* path) { return ::unlink(path); }
+int Rmdir(const char* path) { return ::rmdir(path); }
+int Rename(const char* from, const char* to) { return ::rename(from, to); }
 int Chmod(const char* path, mode_t mode) { return ::chmod(path, mode); }
 int Fchmod(int fd, mode_t mode) { return ::fchmod(fd, mode); }
+
+int Chdir(const char* path) { return ::chdir(path); }
+int Fchdir(int dir) { return ::fchdir(dir); }
+DIR* Opendir(const char* path) { return ::opendir(path); }
+dirent* Readdir(DIR* dir) { return ::readdir(dir); }
+void Rewinddir(DIR* dir) { ::rewinddir(dir); }
+int Dirfd(DIR* dir) { return ::dirfd(dir); }
+int Closedir(DIR* dir) { return ::closedir(dir); }
 
 uid_t Geteuid() { return ::geteuid(); }
 int Seteuid(uid_t uid) { return ::seteuid(uid); }
 pid_t Getpid() { return ::getpid(); }
+time_t Time() { return ::time(nullptr); }
+int System(const char* command) { return ::system(command); }
 
 // The attr package's path-following calls; its libattr only forwards to the C library's.
 ssize_t Listxattr(const char* path, char* names, size_t size) {
@@ -71,6 +84,7 @@ size_t Fwrite(const void* bytes, size_t size, FILE* stream) {
 int Fclose(FILE* stream) { return ::fclose(stream); }
 
 int SetArchiveBit(int fd) { return marks::SetArchiveBit(fd); }
+int FileCommand(const char* path, int command) { return marks::FileCommand(path, command); }
 
 void* Allocate(unsigned long long size) {
     if (!std::in_range<size_t>(size)) {

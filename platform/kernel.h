@@ -6,11 +6,13 @@
 #ifndef MAVOEA_PLATFORM_KERNEL_H_
 #define MAVOEA_PLATFORM_KERNEL_H_
 
+#include <dirent.h>
 #include <fcntl.h>
 #include <stdio.h>
 #include <sys/stat.h>
 #include <sys/types.h>
 #include <sys/uio.h>
+#include <time.h>
 
 namespace mavoea::kernel {
 
@@ -31,17 +33,30 @@ void Sync();
 int Fstat(int fd, struct stat* info);
 int Stat(const char* path, struct stat* info);
 int Lstat(const char* path, struct stat* info);
+int Access(const char* path, int mode);
 int SetLock(int fd, const struct flock64* lock);  // F_SETLK, 64-bit
 int GetLock(int fd, struct flock64* lock);        // F_GETLK, 64-bit
 
 int MkdirAt(int dir, const char* path, mode_t mode);
 int Unlink(const char* path);
+int Rmdir(const char* path);
+int Rename(const char* from, const char* to);
 int Chmod(const char* path, mode_t mode);
 int Fchmod(int fd, mode_t mode);
+
+int Chdir(const char* path);
+int Fchdir(int dir);
+DIR* Opendir(const char* path);
+dirent* Readdir(DIR* dir);
+void Rewinddir(DIR* dir);
+int Dirfd(DIR* dir);
+int Closedir(DIR* dir);
 
 uid_t Geteuid();
 int Seteuid(uid_t uid);
 pid_t Getpid();
+time_t Time();
+int System(const char* command);
 
 ssize_t Listxattr(const char* path, char* names, size_t size);
 ssize_t Getxattr(const char* path, const char* name, void* value, size_t size);
@@ -55,6 +70,9 @@ int Fclose(FILE* stream);
 
 // The platform kernel's own file-control command 0x202: sets the SMB archive bit.
 int SetArchiveBit(int fd);
+
+// The platform kernel's own system call 403: a command of platform/marks.h about the file at path.
+int FileCommand(const char* path, int command);
 
 // The heap. `size` is 64-bit whatever the target: what does not fit in memory is out of memory.
 void* Allocate(unsigned long long size);        // uninitialised

@@ -11,8 +11,19 @@ namespace mavoea::marks {
 // File-control command that sets a file's SMB archive bit.
 inline constexpr int kSetArchive = 0x202;
 
+// The platform's system call that takes a path and one of the commands below it.
+inline constexpr long kFileCommandCall = 403;
+inline constexpr int kSetHidden = 0x203;
+inline constexpr int kClearHidden = 0x206;
+inline constexpr int kClearLocked = 521;  // the Mac lock
+inline constexpr int kSetLocked = 522;
+
 // Sets the archive bit of the file on fd. 0, or -1 with errno.
 int SetArchiveBit(int fd);
+
+// Sets or clears the hidden or locked bit of the file at path, symbolic links followed. 0, or -1
+// with errno.
+int FileCommand(const char* path, int command);
 
 }  // namespace mavoea::marks
 

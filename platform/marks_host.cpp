@@ -4,23 +4,87 @@
 #include <errno.h>
 #include <fcntl.h>
 #include <sys/xattr.h>
+#include <unistd.h>
 
 #include "platform/attribute_word.h"
 #include "platform/include/mavocore.h"
 #include "platform/marks.h"
 
 namespace mavoea::marks {
+namespace {
+
+struct Change {
+    unsigned set = 0;
+    unsigned clear = 0;
+};
+
+// Changes the word that `get` reads and `set` stores. A file without a word has none of the bits,
+// and gets no word to say so.
+template <class Get, class Set>
+int ChangeWord(Change change, Get get, Set set) {
+    unsigned char bytes[attribute_word::kSize];
+    const ssize_t size = get(bytes, sizeof bytes);
+    if (size < 0 && errno != ENODATA && errno != ERANGE) return -1;
+    const unsigned word = attribute_word::Decode(bytes, size);
+    const unsigned changed = (word | change.set) & ~change.clear;
+    if (changed == word) return 0;
+    attribute_word::Encode(changed, bytes);
+    return set(bytes, sizeof bytes);
+}
+
+bool FindChange(int command, Change* change) {
+    switch (command) {
+        case kSetHidden:
+            *change = {.set = MLIBC_ATTRIBUTE_HIDDEN};
+            return true;
+        case kClearHidden:
+            *change = {.clear = MLIBC_ATTRIBUTE_HIDDEN};
+            return true;
+        case kSetLocked:
+            *change = {.set = MLIBC_ATTRIBUTE_LOCKED};
+            return true;
+        case kClearLocked:
+            *change = {.clear = MLIBC_ATTRIBUTE_LOCKED};
+            return true;
+        default:
+            return false;
+    }
+}
+
+// What kernels answer that have no such call, or another one under its number.
+bool MeansNoCall(int error) { return error == ENOSYS || error == EINVAL || error == EFAULT; }
+
+}  // namespace
 
 int SetArchiveBit(int fd) {
     const int result = ::fcntl(fd, kSetArchive);
     if (result >= 0 || errno != EINVAL) return result;
+    return ChangeWord(
+        {.set = MLIBC_ATTRIBUTE_ARCHIVE},
+        [fd](void* bytes, size_t size) {
+            return ::fgetxattr(fd, attribute_word::kName, bytes, size);
+        },
+        [fd](const void* bytes, size_t size) {
+            return ::fsetxattr(fd, attribute_word::kName, bytes, size, 0);
+        });
+}
 
-    unsigned char bytes[attribute_word::kSize];
-    const ssize_t size = ::fgetxattr(fd, attribute_word::kName, bytes, sizeof bytes);
-    if (size < 0 && errno != ENODATA && errno != ERANGE) return -1;
-    const unsigned word = attribute_word::Decode(bytes, size) | MLIBC_ATTRIBUTE_ARCHIVE;
-    attribute_word::Encode(word, bytes);
-    return ::fsetxattr(fd, attribute_word::kName, bytes, sizeof bytes, 0);
+int FileCommand(const char* path, int command) {
+    const long result = ::syscall(kFileCommandCall, path, command);
+    if (result >= 0 || !MeansNoCall(errno)) return static_cast<int>(result);
+    Change change;
+    if (!FindChange(command, &change)) {
+        errno = EINVAL;
+        return -1;
+    }
+    return ChangeWord(
+        change,
+        [path](void* bytes, size_t size) {
+            return ::getxattr(path, attribute_word::kName, bytes, size);
+        },
+        [path](const void* bytes, size_t size) {
+            return ::setxattr(path, attribute_word::kName, bytes, size, 0);
+        });
 }
 
 }  // namespace mavoea::marks

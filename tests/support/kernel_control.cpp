@@ -2,11 +2,13 @@
 
 #include "tests/support/kernel_control.h"
 
+#include <dirent.h>
 #include <errno.h>
 #include <fcntl.h>
 #include <stdlib.h>
 #include <sys/uio.h>
 #include <sys/xattr.h>
+#include <time.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -295,6 +297,11 @@ int Lstat(const char* path, struct stat* info) {
                 [&] { return Hooks().lstat ? Hooks().lstat(path, info) : ::lstat(path, info); });
 }
 
+int Access(const char* path, int mode) {
+    return Call("access", Text(path) + ", " + Number(mode), -1,
+                [&] { return ::access(path, mode); });
+}
+
 int SetLock(int fd, const struct flock64* lock) {
     return Call("setlock", Number(lock->l_type), -1, [&] { return ::fcntl(fd, F_SETLK64, lock); });
 }
@@ -314,6 +321,14 @@ int Unlink(const char* path) {
     return Call("unlink", Text(path), -1, [&] { return ::unlink(path); });
 }
 
+int Rmdir(const char* path) {
+    return Call("rmdir", Text(path), -1, [&] { return ::rmdir(path); });
+}
+
+int Rename(const char* from, const char* to) {
+    return Call("rename", Text(from) + ", " + Text(to), -1, [&] { return ::rename(from, to); });
+}
+
 int Chmod(const char* path, mode_t mode) {
     return Call("chmod", Text(path) + ", " + Octal(mode), -1,
                 [&] { return Hooks().chmod ? Hooks().chmod(path, mode) : ::chmod(path, mode); });
@@ -321,6 +336,34 @@ int Chmod(const char* path, mode_t mode) {
 
 int Fchmod(int fd, mode_t mode) {
     return Call("fchmod", Octal(mode), -1, [&] { return ::fchmod(fd, mode); });
+}
+
+int Chdir(const char* path) {
+    return Call("chdir", Text(path), -1, [&] { return ::chdir(path); });
+}
+
+int Fchdir(int dir) {
+    return Call("fchdir", "", -1, [&] { return ::fchdir(dir); });
+}
+
+DIR* Opendir(const char* path) {
+    return Call("opendir", Text(path), static_cast<DIR*>(nullptr), [&] { return ::opendir(path); });
+}
+
+dirent* Readdir(DIR* dir) {
+    return Call("readdir", "", static_cast<dirent*>(nullptr), [&] { return ::readdir(dir); });
+}
+
+void Rewinddir(DIR* dir) {
+    Note("rewinddir", "rewinddir()");
+    ::rewinddir(dir);
+}
+
+int Dirfd(DIR* dir) { return ::dirfd(dir); }
+
+int Closedir(DIR* dir) {
+    Note("closedir", "closedir()");
+    return ::closedir(dir);
 }
 
 uid_t Geteuid() {
@@ -336,6 +379,15 @@ int Seteuid(uid_t uid) {
 pid_t Getpid() {
     Note("getpid", "getpid()");
     return ::getpid();
+}
+
+time_t Time() {
+    Note("time", "time()");
+    return Hooks().time ? Hooks().time() : ::time(nullptr);
+}
+
+int System(const char* command) {
+    return Call("system", Text(command), -1, [&] { return ::system(command); });
 }
 
 ssize_t Listxattr(const char* path, char* names, size_t size) {
@@ -396,6 +448,12 @@ int Fclose(FILE* stream) {
 int SetArchiveBit(int fd) {
     return Call("archive", "", -1,
                 [&] { return Hooks().archive ? Hooks().archive(fd) : marks::SetArchiveBit(fd); });
+}
+
+int FileCommand(const char* path, int command) {
+    return Call("command", Text(path) + ", " + Number(command), -1, [&] {
+        return Hooks().command ? Hooks().command(path, command) : marks::FileCommand(path, command);
+    });
 }
 
 void* Allocate(unsigned long long size) {

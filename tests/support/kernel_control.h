@@ -2,10 +2,11 @@
 // stand-ins, a log of the calls made.
 //
 // Call names are the C library's in lower case: "open", "close", "pread", "preadv", "pwrite",
-// "pwritev", "lseek", "ftruncate", "fsync", "sync", "fstat", "stat", "lstat", "setlock", "getlock",
-// "mkdir", "unlink", "chmod", "fchmod", "geteuid", "seteuid", "getpid", "listxattr", "getxattr",
-// "setxattr", "removexattr", "fopen", "fread", "fwrite", "fclose", "archive", "malloc" (every
-// allocation).
+// "pwritev", "lseek", "ftruncate", "fsync", "sync", "fstat", "stat", "lstat", "access",
+// "setlock", "getlock", "mkdir", "unlink", "rmdir", "rename", "chmod", "fchmod", "chdir", "fchdir",
+// "opendir", "readdir", "rewinddir", "closedir", "geteuid", "seteuid", "getpid", "time", "system",
+// "listxattr", "getxattr", "setxattr", "removexattr", "fopen", "fread", "fwrite", "fclose",
+// "archive", "command" (the platform's system call 403), "malloc" (every allocation).
 #ifndef MAVOEA_TESTS_SUPPORT_KERNEL_CONTROL_H_
 #define MAVOEA_TESTS_SUPPORT_KERNEL_CONTROL_H_
 
@@ -86,6 +87,8 @@ struct KernelHooks {
     std::function<int(const char*, const char*, const void*, size_t, int)> setxattr;
     std::function<int(const char*, const char*)> removexattr;
     std::function<int(int)> archive;
+    std::function<int(const char*, int)> command;
+    std::function<time_t()> time;
     std::function<int(int)> fsync;
     std::function<void()> sync;
     std::function<void(const std::string& name)> before;  // before every call of any name
