@@ -7,6 +7,7 @@
 #include <array>
 #include <cstddef>
 #include <cstdint>
+#include <string_view>
 
 #include "util/bytes.h"
 
@@ -53,6 +54,12 @@ struct EntryDescriptor {
 inline constexpr std::size_t kFinderInfoSize = 32;
 inline constexpr std::size_t kFinderFlagsOffset = 8;
 inline constexpr std::uint16_t kFinderInvisible = 0x4000;
+
+// What Macs write where a file that has no resource fork must have one: an empty fork with this
+// text in it.
+inline constexpr std::string_view kBlankForkText = "This resource fork intentionally left blank   ";
+inline constexpr std::size_t kBlankForkTextOffset = 16;
+static_assert(kBlankForkText.size() == 46);
 
 // AFP file info: 4 bytes, of which the last two are the AFP attributes. From the Apple Filing
 // Protocol; the attributes forbid writing, renaming and deleting one by one.

@@ -388,6 +388,22 @@ MAVOEA_API int EASWriteFinderInfo(EASHandle* h);
  * be set. */
 MAVOEA_API int MAVOEAFileEAWriteFlushTime(const char* path, int checkFSType);
 
+/* ---- AppleDouble files ----------------------------------------------------------------------- */
+
+/* Whether path is the "._" file of something that is there. 0 it is; -1 0xD00 NULL or empty, 0x200
+ * out of memory; and, with no code, -2 its name does not begin with "._", -3 it cannot be opened or
+ * does not begin with the AppleDouble magic (which is all that is looked at), -4 what it belongs to
+ * is missing (a symbolic link is there, wherever it points). */
+MAVOEA_API int MAVOEACheckADFile(const char* path);
+
+/* Repairs the resource file of the object at path, should it hold attributes: they go into the
+ * object's EA stream, over those of the same name, and the resource file is rewritten with Finder
+ * info and resource fork only, by way of "<resource file>Tmp". 0, also when there were none and the
+ * file was only rewritten; -1 with the resource file unchanged, while attributes that were copied
+ * stay in the stream: it is missing, is not an AppleDouble file of version 2 with 2 or 13 entries,
+ * or an attribute failed. No code of its own. */
+MAVOEA_API int MAVOEAFixErrorAD(const char* path);
+
 #ifdef __cplusplus
 }
 #endif

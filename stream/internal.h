@@ -28,6 +28,13 @@ int EASShiftRFork(EASHandle* h, unsigned newStart, unsigned oldStart, unsigned l
 // no code.
 int EASMoveRFork(int fd, unsigned length, unsigned newStart, unsigned oldStart, int backwards);
 
+// Copies every attribute of the stream on srcFd into the one on dstFd, one rewrite and fsync each.
+// Attributes of the same name are overwritten (a longer value keeps its end), others, Finder info
+// and fork are kept. 0; -1 when a stream could not be opened (codes of MAVOEASOpen(), none for a
+// negative descriptor); else -1 less the number of attributes that failed, with a code for each:
+// 0x100 out of memory, 0xA00 not read, 0xB00 not written, behind MAVOEASWrite()'s own.
+int EASWriteToFd(int srcFd, int dstFd);
+
 }  // namespace mavoea
 
 #endif  // MAVOEA_STREAM_INTERNAL_H_

@@ -5,6 +5,7 @@
 #include <errno.h>
 #include <grp.h>
 #include <gtest/gtest.h>
+#include <signal.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
@@ -44,6 +45,25 @@ inline void AsUser(uid_t id, Root root, const std::function<void()>& body) {
     int status = 0;
     ASSERT_EQ(child, waitpid(child, &status, 0)) << strerror(errno);
     EXPECT_EQ(0, status) << "wait status of the child that was user " << id;
+}
+
+// Runs `body` in a child process that is killed if it waits for what never comes. Expectations that
+// fail in it are printed there and fail the test here.
+inline void WithoutWaiting(const std::function<void()>& body) {
+    fflush(nullptr);
+    const pid_t child = fork();
+    ASSERT_LE(0, child) << strerror(errno);
+    if (child == 0) {
+        alarm(10);
+        body();
+        fflush(nullptr);
+        _exit(::testing::Test::HasFailure() ? 1 : 0);
+    }
+    int status = 0;
+    ASSERT_EQ(child, waitpid(child, &status, 0)) << strerror(errno);
+    EXPECT_EQ(0, status) << (WIFSIGNALED(status) && WTERMSIG(status) == SIGALRM
+                                 ? "it waited until it was killed"
+                                 : "wait status of the child");
 }
 
 inline long OpenDescriptors() {
