@@ -388,7 +388,7 @@ MAVOEA_API int EASWriteFinderInfo(EASHandle* h);
  * be set. */
 MAVOEA_API int MAVOEAFileEAWriteFlushTime(const char* path, int checkFSType);
 
-/* ---- AppleDouble files ----------------------------------------------------------------------- */
+/* ---- AppleDouble files and earlier layouts --------------------------------------------------- */
 
 /* Whether path is the "._" file of something that is there. 0 it is; -1 0xD00 NULL or empty, 0x200
  * out of memory; and, with no code, -2 its name does not begin with "._", -3 it cannot be opened or
@@ -403,6 +403,28 @@ MAVOEA_API int MAVOEACheckADFile(const char* path);
  * stay in the stream: it is missing, is not an AppleDouble file of version 2 with 2 or 13 entries,
  * or an attribute failed. No code of its own. */
 MAVOEA_API int MAVOEAFixErrorAD(const char* path);
+
+/* Converts what earlier versions kept for the object at szPath into the current layout; szName is
+ * what is about to be opened:
+ *
+ *   MAVOEA_KIND_STREAM    the files of the legacy folder "@eaDir/<name>/", one per attribute, each
+ *                         removed once it is in the stream; or a "._" file, which becomes the
+ *                         stream as it is when it was read no earlier than all of those
+ *   MAVOEA_KIND_RESOURCE  the legacy "MAVO:Resource"; the object gets its marks: write permissions
+ *                         for everybody or nobody, and the hidden bit
+ *   other "MAVO..."       a file of the legacy folder: its ':' becomes '@' there
+ *
+ * A legacy folder that is empty then is removed. MAVOEAOpen() calls this. Files that cannot be
+ * converted stay where they are. The process's working directory changes for a moment; it is kept,
+ * failures included, unless it can no longer be entered, which is 0x2A00 (and then the root
+ * directory if it was left already).
+ *
+ * 0 converted; 1 the current layout is there already; 2 there is nothing of that kind; -1: 0xD00 an
+ * unknown kind or NULL; 0x900 the stream could not be opened; 0x2800 rename; 0x3900 the legacy
+ * folder could not be removed; what the path and stream functions give. Codes are recorded for
+ * files that stay, too: 0x2A00 stat, 0x900 open, 0x100 memory, 0xA00 read; and for marks: 0x900,
+ * 0xA00, 0x4000 no AppleDouble file, or one without them. */
+MAVOEA_API int MAVOEAUpgrade(const char* szPath, const char* szName);
 
 #ifdef __cplusplus
 }

@@ -49,6 +49,8 @@ int MAVOEAOpenNoADFS(int form, const char* szPath, const char* szName, int oflag
 
     const int fd = kernel::Open(path, oflag & ~O_CREAT, kMode);
     if (fd >= 0 || errno != ENOENT) return fd;
+    // Before it is missed, or made empty, it is looked for where earlier versions kept it.
+    (void)MAVOEAUpgrade(szPath, szName);
     return kernel::Open(path, oflag, kMode);
 }
 

@@ -117,6 +117,21 @@ TEST_F(SystemCallsTest, NameTestsMakeNone) {
     EXPECT_THAT(calls_, IsEmpty());
 }
 
+// Two opens of the stream, and between them one look at each place of earlier layouts: the stream,
+// the folder, the "._" file.
+TEST_F(SystemCallsTest, OpeningAMissingStreamOfAnObjectWithoutLegacyMetadataTakesAtMostFive) {
+    const std::string object = dir_ / "a.txt";
+    WriteFile(object, Ascii("data"));
+    Trace([&] {
+        return MAVOEAOpen(EA_FORM_FILE, object.c_str(), MAVOEA_KIND_STREAM, O_RDONLY,
+                          EA_PLACE_EADIR) == -1;
+    });
+    if (IsSkipped() || HasFatalFailure()) return;
+    EXPECT_LE(calls_.size(), 5u) << PrintToString(calls_);
+    EXPECT_EQ(0, Reads()) << PrintToString(calls_);
+    EXPECT_EQ(0, Count({"chdir", "fchdir", "rmdir", "mkdir", "mkdirat"})) << PrintToString(calls_);
+}
+
 TEST_F(SystemCallsTest, ReadingOneValueOfAFewTakesAtMostNineAndTwoReads) {
     for (const int count : {1, 10, 100}) {
         SCOPED_TRACE(count);

@@ -7,6 +7,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <filesystem>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -14,12 +17,14 @@
 #include "tests/support/fake_platform.h"
 #include "tests/support/identity.h"
 #include "tests/support/kernel_control.h"
+#include "tests/support/mac_files.h"
 #include "tests/support/process.h"
 #include "tests/support/temp_dir.h"
 
 namespace mavoea::test {
 namespace {
 
+using ::testing::AnyOf;
 using ::testing::Contains;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
@@ -243,8 +248,16 @@ TEST_P(EaOpenInEaDirTest, AnyOtherFailureOfTheFirstOpenIsFinal) {
 
 TEST_P(EaOpenInEaDirTest, AFailureOfTheSecondOpenIsFinal) {
     MakeEaDir();
-    const FailCall fault("open", ENOSPC, 2);
+    // Between the two, the upgrade opens what it looks for.
+    TakeCallNames();
+    ExpectFailed(ENOENT, OpenStream(0));
+    const auto names = TakeCallNames();
+    ASSERT_EQ("open", names.back());
+    const auto last = std::count(names.begin(), names.end(), "open");
+    const FailCall fault("open", ENOSPC, static_cast<int>(last));
     ExpectFailed(ENOSPC, OpenStream(O_RDWR | O_CREAT));
+    EXPECT_TRUE(fault.fired());
+    EXPECT_THAT(OpensOf(stream_), ElementsAre("O_RDWR, 0777", "O_RDWR|O_CREAT, 0777"));
 }
 
 TEST_P(EaOpenInEaDirTest, ADirectoryInPlaceOfTheFileFailsWithEisdir) {
@@ -333,9 +346,10 @@ TEST_P(EaOpenInEaDirTest, AnyOtherFormNamesTheFileAfterTheKindAloneAndLooksTwice
         EXPECT_TRUE(fd.ok());
         EXPECT_THAT(OpensOf(ea_dir_ + "/" + kind),
                     ElementsAre("O_RDWR, 0777", "O_RDWR|O_CREAT, 0777"));
+        ExpectOnly(0xD00, "ea_upgrade");  // no kind of an earlier layout, which is no failure
     }
     EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("kind-1", "kind2"));
-    ExpectNothingReported();
+    EXPECT_THAT(TakeLog(), IsEmpty());
 }
 
 TEST_P(EaOpenInEaDirTest, NullArgumentsFailWith0xD00AndEnoent) {
@@ -373,14 +387,19 @@ TEST_P(EaOpenInEaDirTest, ThePathMayFillTheBufferOf4096Bytes) {
     const std::string longest = "/" + std::string(4096 - 9 - strlen(kStream) - 1, 'a');
     errno = 0;
     EXPECT_EQ(-1, Open(1, longest.c_str(), kStream, 0));
-    EXPECT_EQ(ENOENT, errno);  // "/@eaDir/aa...": shortened, and not there
-    ExpectNothingReported();
+    EXPECT_EQ(ENOENT, errno);       // "/@eaDir/aa...": shortened, and not there
+    ExpectOnly(0xC300, "ea_path");  // the upgrade's, which may use 4095 only
+    EXPECT_THAT(TakeLog(), IsEmpty());
     EXPECT_EQ(-1, Open(1, (longest + "a").c_str(), kStream, 0));
     ExpectOnly(0xC300, "ea_path");
 }
 
+// A call of the upgrade that fails is no failure: its result is ignored.
 TEST_P(EaOpenInEaDirTest, EveryFailingCallIsReportedOnceAndLeavesNothingOpen) {
     for (const int form : {1, 0}) {
+        int before_the_file = 0;
+        int at_the_file = 0;
+        int in_the_upgrade = 0;
         for (int nth = 1;; ++nth) {
             SCOPED_TRACE(std::to_string(form) + " " + std::to_string(nth));
             ASSERT_LT(nth, 100);
@@ -394,35 +413,219 @@ TEST_P(EaOpenInEaDirTest, EveryFailingCallIsReportedOnceAndLeavesNothingOpen) {
             const FailNthCall fault(nth, EIO);
             const int fd = Open(form, object.c_str(), kStream, O_RDWR | O_CREAT);
             const int error = errno;
-            std::vector<std::string> calls = TakeCalls();
-            const bool metadata_opened =
-                !calls.empty() && calls.back().starts_with("open(" + file + ", ");
+            const auto opens = OpensOf(file);
+            if (fd >= 0) ::close(fd);
+            EXPECT_EQ(descriptors_, OpenDescriptors());
+            EXPECT_EQ(live_blocks_, TakeAllocations().live);
             if (!fault.fired()) {
                 EXPECT_LE(0, fd);
-                ::close(fd);
                 ExpectNothingReported();
                 EXPECT_EQ(kUser, uid_);
                 break;
             }
+            SCOPED_TRACE(fault.name());
             if (fault.name() == "seteuid" && fd >= 0) {  // back again: not looked at
-                ::close(fd);
                 EXPECT_EQ(0u, uid_);
                 ExpectNothingReported();
                 continue;
             }
+            EXPECT_EQ(kUser, uid_);
+            if (fd >= 0) {
+                ++in_the_upgrade;
+                EXPECT_THAT(opens, ElementsAre("O_RDWR, 0777", "O_RDWR|O_CREAT, 0777"));
+                EXPECT_TRUE(Exists(file));
+                for (const Record& record : TakeRecords()) EXPECT_EQ("ea_upgrade", record.unit);
+                continue;
+            }
             EXPECT_EQ(-1, fd);
             EXPECT_EQ(EIO, error);
-            EXPECT_EQ(kUser, uid_);
-            if (metadata_opened) {
-                ExpectNothingReported();
-            } else {
+            EXPECT_FALSE(Exists(file));
+            if (opens.empty()) {
+                ++before_the_file;
                 EXPECT_EQ(1u, TakeRecords().size());
-                EXPECT_FALSE(Exists(file));
+            } else {
+                ++at_the_file;
+                EXPECT_EQ("open", fault.name());
+                ExpectNothingReported();
             }
-            EXPECT_EQ(descriptors_, OpenDescriptors());
-            EXPECT_EQ(live_blocks_, TakeAllocations().live);
+        }
+        EXPECT_LT(3, before_the_file);
+        EXPECT_EQ(form == 1 ? 2 : 1, at_the_file);
+        EXPECT_EQ(form == 1, in_the_upgrade > 0);
+    }
+}
+
+// ---- What earlier versions left -------------------------------------------------------------
+
+class EaOpenUpgradeTest : public EaOpenInEaDirTest {
+ protected:
+    using Values = std::map<std::string, Bytes>;
+
+    void SetUp() override {
+        EaOpenInEaDirTest::SetUp();
+        // The object has legacy metadata of every kind.
+        std::filesystem::create_directories(folder_);
+        for (const auto& [name, value] : values_) WriteFile(folder_ + "/" + name, value);
+        WriteFile(legacy_, Ascii("resource"));
+    }
+
+    // The descriptor is that of a stream with these attributes.
+    static void ExpectStreamOn(int fd, const Values& values) {
+        EASHandle* const handle = MAVOEASOpen(fd, F_RDLCK);
+        ASSERT_NE(nullptr, handle);
+        for (const auto& [name, value] : values) {
+            Bytes read(value.size() + 1);
+            EXPECT_EQ(static_cast<int>(value.size()),
+                      MAVOEASRead(handle, name.c_str(), read.data(),
+                                  static_cast<unsigned>(read.size()), 0));
+            read.pop_back();
+            EXPECT_EQ(value, read);
+        }
+        EXPECT_EQ(0, MAVOEASClose(handle));
+    }
+
+    // The open failed although only the upgrade recorded anything.
+    static void ExpectFailedAfter(int code, int error, int fd) {
+        const int found = errno;
+        EXPECT_EQ(-1, fd);
+        EXPECT_EQ(error, found) << strerror(found);
+        ExpectOnly(code, "ea_upgrade");
+    }
+
+    void ExpectLegacyMetadataUntouched() const {
+        EXPECT_THAT(NamesIn(folder_), ElementsAre("MAVO:Resource", "color", "tags"));
+        EXPECT_EQ(Ascii("blue"), ReadFile(folder_ + "/color"));
+        EXPECT_EQ(Ascii("resource"), ReadFile(legacy_));
+    }
+
+    // The calls since the last time did not look for earlier layouts.
+    static void ExpectNoUpgrade() {
+        EXPECT_THAT(TakeCallNames(), Not(Contains(AnyOf("access", "opendir", "rename", "rmdir"))));
+    }
+
+    const Values values_ = {{"color", Ascii("blue")}, {"tags", Ascii("work, home")}};
+};
+
+INSTANTIATE_TEST_SUITE_P(With, EaOpenUpgradeTest, ::testing::Bool(), [](const auto& through) {
+    return through.param ? "MAVOEAOpen" : "MAVOEAOpenNoADFS";
+});
+
+TEST_P(EaOpenUpgradeTest, AnObjectWithOnlyALegacyFolderGivesADescriptorOfTheUpgradedStream) {
+    std::filesystem::remove(legacy_);
+    TakeCalls();
+    const int fd = OpenStream(0);
+    ASSERT_LE(0, fd);
+    const auto opens = OpensOf(stream_);
+    ASSERT_LE(2u, opens.size());
+    EXPECT_EQ("O_RDONLY, 0777", opens.front());
+    EXPECT_EQ("O_RDONLY, 0777", opens.back());
+    ExpectStreamOn(fd, values_);
+    EXPECT_EQ(O_RDONLY, fcntl(fd, F_GETFL) & O_ACCMODE);
+    ::close(fd);
+    EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("a.txt@MavoEAStream"));
+    ExpectNothingReported();
+}
+
+TEST_P(EaOpenUpgradeTest, AnObjectWithOnlyASidecarGivesADescriptorOfIt) {
+    std::filesystem::remove_all(ea_dir_);
+    const MacFile file = MacSidecar({.attributes = values_, .fork = Ascii("fork")});
+    WriteFile(sidecar_, file.bytes);
+    const int fd = OpenStream(0);
+    ASSERT_LE(0, fd);
+    ExpectStreamOn(fd, values_);
+    ::close(fd);
+    EXPECT_EQ(file.bytes, ReadFile(stream_));
+    EXPECT_FALSE(Exists(sidecar_));
+    ExpectNothingReported();
+}
+
+TEST_P(EaOpenUpgradeTest, CreatingGivesTheUpgradedStreamAndNoEmptyOne) {
+    const int fd = OpenStream(O_RDWR | O_CREAT);
+    ASSERT_LE(0, fd);
+    ExpectStreamOn(fd, values_);
+    ::close(fd);
+    EXPECT_THAT(NamesIn(folder_), ElementsAre("MAVO:Resource"));
+    ExpectNothingReported();
+}
+
+TEST_P(EaOpenUpgradeTest, TheLegacyResourceFileIsFoundToo) {
+    {
+        const Fd fd(Open(1, object_.c_str(), kResource, 0));
+        EXPECT_EQ("resource", fd.Read());
+    }
+    EXPECT_THAT(NamesIn(folder_), ElementsAre("color", "tags"));
+    EXPECT_EQ(Ascii("resource"), ReadFile(resource_));
+}
+
+TEST_P(EaOpenUpgradeTest, TheFolderFormNeverUpgrades) {
+    for (const int oflag : {0, O_RDWR | O_CREAT}) {
+        for (const char* kind : {kStream, kResource, "MAVO:x"}) {
+            SCOPED_TRACE(kind);
+            TakeCallNames();
+            const Fd fd(Open(0, object_.c_str(), kind, oflag));
+            EXPECT_EQ((oflag & O_CREAT) != 0, fd.ok());
+            ExpectNoUpgrade();
+            std::filesystem::remove(folder_ + "/" + kind);
         }
     }
+    ExpectLegacyMetadataUntouched();
+    EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("a.txt"));
+    ExpectNothingReported();
+}
+
+// The kind alone names the file, but the object is what is upgraded.
+TEST_P(EaOpenUpgradeTest, EveryOtherFormUpgrades) {
+    ExpectFailed(ENOENT, Open(2, object_.c_str(), kStream, 0));
+    EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("a.txt", "a.txt@MavoEAStream"));
+    EXPECT_THAT(NamesIn(folder_), ElementsAre("MAVO:Resource"));
+}
+
+TEST_P(EaOpenUpgradeTest, AFileThatIsThereIsOpenedWithoutAnUpgrade) {
+    WriteFile(stream_, Ascii("stream"));
+    for (const int oflag : {0, O_RDWR | O_CREAT}) {
+        TakeCallNames();
+        const Fd fd(OpenStream(oflag));
+        EXPECT_EQ("stream", fd.Read());
+        ExpectNoUpgrade();
+    }
+    ExpectLegacyMetadataUntouched();
+}
+
+TEST_P(EaOpenUpgradeTest, AFailureOtherThanEnoentIsFinalWithoutAnUpgrade) {
+    for (const int error : {EACCES, EMFILE, EISDIR, ENOTDIR, ENAMETOOLONG, ELOOP, EIO}) {
+        SCOPED_TRACE(strerror(error));
+        TakeCallNames();
+        const FailCall fault("open", error);
+        ExpectFailed(error, OpenStream(O_RDWR | O_CREAT));
+        ExpectNoUpgrade();
+    }
+    ExpectLegacyMetadataUntouched();
+    EXPECT_FALSE(Exists(stream_));
+}
+
+TEST_P(EaOpenUpgradeTest, AFailureOfTheUpgradeIsIgnored) {
+    {
+        const FailCall fault("rmdir", EBUSY);
+        const int fd = OpenStream(0);
+        ASSERT_LE(0, fd);
+        ExpectOnly(0x3900, "ea_upgrade");
+        ExpectStreamOn(fd, values_);
+        ::close(fd);
+    }
+    {
+        const FailCall fault("rename", EIO);
+        ExpectFailedAfter(0x2800, ENOENT, Open(1, object_.c_str(), kResource, 0));
+    }
+    {
+        const FailCall fault("rename", EIO);
+        const Fd fd(Open(1, object_.c_str(), kResource, O_RDWR | O_CREAT));
+        ExpectOnly(0x2800, "ea_upgrade");
+        EXPECT_EQ("", fd.Read());
+        EXPECT_EQ(Ascii("resource"), ReadFile(legacy_));
+    }
+    const Fd fd(Open(1, object_.c_str(), "kind", O_RDWR | O_CREAT));
+    ExpectOnly(0xD00, "ea_upgrade");
+    EXPECT_TRUE(fd.ok());
 }
 
 // ---- As another user ------------------------------------------------------------------------
@@ -501,6 +704,18 @@ TEST_F(EaOpenAppleDoubleTest, NothingButTheTwoOpensIsCalled) {
     TakeCallNames();
     ExpectFailed(ENOENT, Open(0));
     EXPECT_THAT(TakeCallNames(), ElementsAre("open", "open"));
+}
+
+TEST_F(EaOpenAppleDoubleTest, NoUpgradeIsTried) {
+    std::filesystem::create_directories(folder_);
+    WriteFile(folder_ + "/color", Ascii("blue"));
+    TakeCallNames();
+    ExpectFailed(ENOENT, Open(0));
+    const Fd fd(Open(O_RDWR | O_CREAT));
+    EXPECT_TRUE(fd.ok());
+    EXPECT_THAT(TakeCallNames(), ElementsAre("open", "open", "open", "open"));
+    EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("a.txt"));
+    EXPECT_EQ(Ascii("blue"), ReadFile(folder_ + "/color"));
 }
 
 TEST_F(EaOpenAppleDoubleTest, TheUmaskNarrowsTheFile) {

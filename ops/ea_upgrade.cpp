@@ -1,0 +1,390 @@
+// Converts the metadata that earlier versions kept, in a folder per object or in a "._" file, into
+// the current layout, one object and kind at a time.
+
+#include <errno.h>
+#include <string.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cstdint>
+#include <optional>
+#include <string_view>
+
+#include "format/apple_double.h"
+#include "include/mavoea.h"
+#include "platform/file_status.h"
+#include "platform/include/mavocore.h"
+#include "platform/marks.h"
+#include "util/file_io.h"
+#include "util/owned.h"
+#include "util/path_text.h"
+#include "util/unit.h"
+
+namespace mavoea {
+namespace {
+
+constexpr Unit unit("ea_upgrade");
+
+constexpr int kConverted = 0;
+constexpr int kCurrent = 1;  // already in the current layout
+constexpr int kNothing = 2;  // no metadata of that kind in any layout
+constexpr int kFailure = -1;
+
+constexpr std::string_view kReserved = "MAVO";
+constexpr mode_t kMode = 0777;
+constexpr mode_t kWritable = 0222;
+constexpr mode_t kPermissions = 07777;
+
+// Only what is known to be missing is: what cannot be looked at is not written over.
+bool Exists(const char* path) {
+    return kernel::Access(path, F_OK) == 0 ||
+           (errno != ENOENT && errno != ENOTDIR && errno != ENAMETOOLONG);
+}
+
+// Removes a legacy folder that has become empty; one that has not, stays. `result`, or kFailure.
+int RemoveFolder(const char* folder, int result, int line = __builtin_LINE()) {
+    const ErrnoKeeper keep;
+    if (kernel::Rmdir(folder) == 0 || errno == ENOTEMPTY || errno == ENOENT) return result;
+    return unit.Fail(Err::kRemove, line);
+}
+
+// ---- Attribute files ----------------------------------------------------------------------------
+
+// A directory that is read entry by entry.
+class Folder {
+ public:
+    explicit Folder(const char* path) : dir_(kernel::Opendir(path)) {}
+    ~Folder() { Close(); }
+    Folder(const Folder&) = delete;
+    Folder& operator=(const Folder&) = delete;
+
+    explicit operator bool() const { return dir_ != nullptr; }
+    int fd() const { return kernel::Dirfd(dir_); }
+    void Rewind() { kernel::Rewinddir(dir_); }
+
+    // The next entry's name, valid until the next call; nullptr at the end.
+    const char* Next() {
+        while (const dirent* const entry = kernel::Readdir(dir_)) {
+            const std::string_view name = entry->d_name;
+            if (name != "." && name != "..") return entry->d_name;
+        }
+        return nullptr;
+    }
+
+    // The next attribute file's name: not one of the reserved ones.
+    const char* NextAttribute() {
+        while (const char* const name = Next()) {
+            if (!std::string_view(name).starts_with(kReserved) && strchr(name, ':') == nullptr) {
+                return name;
+            }
+        }
+        return nullptr;
+    }
+
+    void Close() {
+        const ErrnoKeeper keep;
+        if (dir_ != nullptr) (void)kernel::Closedir(dir_);
+        dir_ = nullptr;
+    }
+
+ private:
+    DIR* dir_;
+};
+
+// The process in another directory, until Return().
+class WorkingDirectory {
+ public:
+    // Whether there is a way back to the present one.
+    bool Remember() {
+        former_.Reset(kernel::Open(".", O_PATH | O_DIRECTORY | O_CLOEXEC, 0));
+        return former_ && kernel::Fchdir(former_.get()) == 0;
+    }
+
+    bool Enter(int dir) { return kernel::Fchdir(dir) == 0; }
+
+    // Should the way back have closed meanwhile, the process is left in the root directory, which
+    // nobody removes.
+    bool Return() {
+        if (kernel::Fchdir(former_.get()) == 0) return true;
+        const ErrnoKeeper keep;
+        (void)kernel::Chdir("/");
+        return false;
+    }
+
+ private:
+    UniqueFd former_;
+};
+
+// When a file was last read, in seconds; 0 when it cannot be told.
+std::int64_t AccessTime(const char* path) {
+    struct stat info;
+    if (kernel::Stat(path, &info) != 0) return 0;
+    return std::max<std::int64_t>(info.st_atime, 0);
+}
+
+// When the attribute files of a legacy folder were last read: the latest counts, 0 when there are
+// none. Fails when the process cannot come back from the folder.
+std::optional<std::int64_t> LatestAccess(Folder* folder) {
+    WorkingDirectory directory;
+    if (!directory.Remember()) {
+        unit.Fail(Err::kSystemCall);
+        return std::nullopt;
+    }
+    std::int64_t latest = 0;
+    if (directory.Enter(folder->fd())) {
+        while (const char* const name = folder->NextAttribute()) {
+            latest = std::max(latest, AccessTime(name));
+        }
+        if (!directory.Return()) {
+            unit.Fail(Err::kSystemCall);
+            return std::nullopt;
+        }
+    }
+    return latest;
+}
+
+// Attribute files on their way into a stream.
+class AttributeImport {
+ public:
+    AttributeImport(const char* object, EASHandle* stream) : object_(object), stream_(stream) {}
+
+    // The attribute file `name`: into the stream and off the disk. One that fails stays where it
+    // is, with a code.
+    void Move(const char* name) {
+        char path[kPathBufferSize];
+        if (MAVOEAPath(EA_FORM_FOLDER, object_, name, path, kDerivedPathMax, EA_PLACE_EADIR) != 0) {
+            unit.Log("%s:%d cannot EAPath[%s][%s] MavoErr=[0x%04X %s:%d]", object_, name,
+                     MLIBCErrGet(), MLIBCErrorGetFile(), MLIBCErrorGetLine());
+            return;
+        }
+        std::uint32_t size = 0;
+        if (Read(path, &size) != 0) return;
+        if (MAVOEASWrite(stream_, name, value_.get(), size, 0, EAS_WRITE_OVERWRITE) < 0) {
+            unit.Log("%s:%d MAVOEASWrite error, MavoErr=[0x%04X %s:%d]", MLIBCErrGet(),
+                     MLIBCErrorGetFile(), MLIBCErrorGetLine());
+            return;
+        }
+        (void)kernel::Unlink(path);
+    }
+
+ private:
+    // The file's bytes into value_. 0, or -1 after recording why.
+    int Read(const char* path, std::uint32_t* size) {
+        struct stat info;
+        if (kernel::Stat(path, &info) != 0) return unit.Fail(Err::kSystemCall);
+        // A named pipe must not keep the caller waiting.
+        const UniqueFd fd(kernel::Open(path, O_RDONLY | O_NONBLOCK | O_CLOEXEC, 0));
+        if (fd.get() <= 0) return unit.Fail(Err::kOpen);
+        *size = static_cast<std::uint32_t>(info.st_size);
+        if (!Reach(*size)) return unit.Fail(Err::kBufferMemory);
+        return ReadAt(fd.get(), {value_.get(), *size}, 0) == *size ? 0 : unit.Fail(Err::kRead);
+    }
+
+    bool Reach(std::uint32_t size) {
+        if (size <= room_) return true;
+        if (size > kValueMax) return false;
+        void* const larger = kernel::Reallocate(value_.get(), size);
+        if (larger == nullptr) return false;
+        (void)value_.Release();
+        value_ = Owned<std::uint8_t>(static_cast<std::uint8_t*>(larger));
+        room_ = size;
+        return true;
+    }
+
+    // No stream takes more, whatever memory there is.
+    static constexpr std::uint32_t kValueMax = 0x7FFFFFFF;
+
+    const char* object_;
+    EASHandle* stream_;
+    Owned<std::uint8_t> value_;
+    std::uint32_t room_ = 0;
+};
+
+int ImportAttributeFiles(const char* szPath, const char* stream_path, Folder* folder) {
+    const UniqueFd fd(kernel::Open(stream_path, O_RDWR | O_CREAT | O_CLOEXEC, kMode));
+    if (!fd) return unit.Fail(Err::kOpen);
+    EASHandle* const stream = MAVOEASOpen(fd.get(), F_WRLCK);
+    if (stream == nullptr) return kFailure;
+    folder->Rewind();
+    {
+        AttributeImport import(szPath, stream);
+        while (const char* const name = folder->NextAttribute()) import.Move(name);
+    }
+    (void)MAVOEASClose(stream);
+    return kConverted;
+}
+
+// ---- Streams ------------------------------------------------------------------------------------
+
+// The "._" file becomes the stream as it is.
+int AdoptAppleDouble(const char* szPath, const char* apple_double, const char* stream_path) {
+    char dir[kPathBufferSize];
+    if (MAVOEADirPath(EA_FORM_FILE, szPath, dir, kDerivedPathMax) != 0) return kFailure;
+    if (MAVOEAMKDir(0, dir) != 0) return kFailure;
+    return kernel::Rename(apple_double, stream_path) == 0 ? kConverted : unit.Fail(Err::kRename);
+}
+
+int ConvertStream(const char* szPath, const char* stream_path, Folder* folder) {
+    std::int64_t folder_time = 0;
+    if (*folder) {
+        const auto latest = LatestAccess(folder);
+        if (!latest) return kFailure;
+        folder_time = *latest;
+    }
+    char apple_double[kPathBufferSize];
+    if (MAVOEAADPath(szPath, apple_double, kDerivedPathMax) != 0) {
+        // Names that are too long for one have none.
+        return MLIBCErrGet() == MAVOEA_ERR_NAME_TOO_LONG ? kConverted : kFailure;
+    }
+    // Its time first: looking into it is an access.
+    std::int64_t file_time = AccessTime(apple_double);
+    if (file_time != 0 && MAVOEACheckADFile(apple_double) != 0) file_time = 0;
+    if (folder_time == 0 && file_time == 0) return kNothing;
+    // Deliberately the time of the last access, not that of the last change.
+    return file_time < folder_time ? ImportAttributeFiles(szPath, stream_path, folder)
+                                   : AdoptAppleDouble(szPath, apple_double, stream_path);
+}
+
+int UpgradeStream(const char* szPath) {
+    char stream_path[kPathBufferSize];
+    char folder_path[kPathBufferSize];
+    if (MAVOEAPath(EA_FORM_FILE, szPath, MAVOEA_KIND_STREAM, stream_path, kDerivedPathMax,
+                   EA_PLACE_EADIR) != 0 ||
+        MAVOEADirPath(EA_FORM_FOLDER, szPath, folder_path, kDerivedPathMax) != 0) {
+        return kFailure;
+    }
+    if (Exists(stream_path)) return kCurrent;
+
+    errno = 0;
+    Folder folder(folder_path);
+    const bool missing = !folder && errno == ENOENT;
+    const int result = ConvertStream(szPath, stream_path, &folder);
+    folder.Close();
+    return missing ? result : RemoveFolder(folder_path, result);
+}
+
+// ---- Resource files -----------------------------------------------------------------------------
+
+// What a resource file says that the object itself shows on other volumes.
+struct Marks {
+    bool read_only = false;
+    bool invisible = false;
+};
+
+// The 16 bits at `offset`. 0, or -1 after recording that they are not there.
+int ReadBits(int fd, std::uint64_t offset, std::uint16_t* bits, int line = __builtin_LINE()) {
+    std::uint8_t bytes[2];
+    if (ReadAt(fd, bytes, offset) != std::int64_t{sizeof bytes}) {
+        return unit.Fail(Err::kRead, line);
+    }
+    *bits = LoadBe16(bytes);
+    return 0;
+}
+
+// Where a resource file has its AFP attributes and Finder flags; at least one of them.
+struct MarkOffsets {
+    std::optional<std::uint64_t> afp_attributes;
+    std::optional<std::uint64_t> finder_flags;
+};
+
+int FindMarks(int fd, MarkOffsets* found) {
+    std::uint8_t bytes[AppleDoubleHeader::kSize];
+    if (ReadAt(fd, bytes, 0) != std::int64_t{sizeof bytes}) return unit.Fail(Err::kRead);
+    BeReader in(bytes);
+    const AppleDoubleHeader header = DecodeAppleDoubleHeader(in);
+    if (header.version != kAppleDoubleVersion2) return unit.Fail(Err::kBadAppleDouble);
+
+    for (std::uint16_t i = 0; i < header.entry_count; ++i) {
+        std::uint8_t descriptor[EntryDescriptor::kSize];
+        if (ReadAt(fd, descriptor, DescriptorsEnd(i)) != std::int64_t{sizeof descriptor}) {
+            return unit.Fail(Err::kRead);
+        }
+        BeReader fields(descriptor);
+        const EntryDescriptor entry = DecodeEntryDescriptor(fields);
+        const std::uint64_t offset = entry.data.offset;
+        if (entry.id == EntryId::kFinderInfo) found->finder_flags = offset + kFinderFlagsOffset;
+        if (entry.id == EntryId::kAfpFileInfo) {
+            found->afp_attributes = offset + kAfpAttributesOffset;
+        }
+    }
+    return found->finder_flags || found->afp_attributes ? 0 : unit.Fail(Err::kBadAppleDouble);
+}
+
+int ReadMarks(const char* resource_file, Marks* marks) {
+    const UniqueFd fd(kernel::Open(resource_file, O_RDONLY | O_CLOEXEC, 0));
+    if (!fd) return unit.Fail(Err::kOpen);
+    MarkOffsets offsets;
+    if (FindMarks(fd.get(), &offsets) != 0) return -1;
+    if (offsets.afp_attributes) {
+        std::uint16_t attributes = 0;
+        if (ReadBits(fd.get(), *offsets.afp_attributes, &attributes) != 0) return -1;
+        marks->read_only = (attributes & kAfpNoWrite) != 0;
+        marks->invisible = (attributes & kAfpInvisible) != 0;
+    }
+    if (offsets.finder_flags) {
+        std::uint16_t flags = 0;
+        if (ReadBits(fd.get(), *offsets.finder_flags, &flags) != 0) return -1;
+        if ((flags & kFinderInvisible) != 0) marks->invisible = true;
+    }
+    return 0;
+}
+
+// Gives the object the marks of its resource file, beside those that it has. Best effort.
+void CarryMarks(const char* resource_file, const char* szPath) {
+    Marks marks;
+    if (ReadMarks(resource_file, &marks) != 0) return;
+    FileStatus status;
+    if (ReadFileStatus(szPath, &status)) {
+        if ((status.mode & kWritable) == 0) marks.read_only = true;
+        if ((status.attributes & MLIBC_ATTRIBUTE_HIDDEN) != 0) marks.invisible = true;
+        const mode_t mode = status.mode & kPermissions;
+        (void)kernel::Chmod(szPath, marks.read_only ? mode & ~kWritable : mode | kWritable);
+    }
+    (void)kernel::FileCommand(szPath, marks.invisible ? marks::kSetHidden : marks::kClearHidden);
+}
+
+int UpgradeResourceFile(const char* szPath) {
+    char legacy[kPathBufferSize];
+    char current[kPathBufferSize];
+    if (MAVOEAPath(EA_FORM_FOLDER, szPath, MAVOEA_KIND_LEGACY_RESOURCE, legacy, kDerivedPathMax,
+                   EA_PLACE_EADIR) != 0 ||
+        MAVOEAPath(EA_FORM_FILE, szPath, MAVOEA_KIND_RESOURCE, current, kDerivedPathMax,
+                   EA_PLACE_EADIR) != 0) {
+        return kFailure;
+    }
+    if (Exists(current)) return kCurrent;
+    if (!Exists(legacy)) return kNothing;
+    if (kernel::Rename(legacy, current) != 0) return unit.Fail(Err::kRename);
+    CarryMarks(current, szPath);
+    *strrchr(legacy, '/') = '\0';
+    return RemoveFolder(legacy, kConverted);
+}
+
+// ---- Other reserved names -----------------------------------------------------------------------
+
+int UpgradeReserved(const char* szPath, const char* szName) {
+    char legacy[kPathBufferSize];
+    if (MAVOEAPath(EA_FORM_FOLDER, szPath, szName, legacy, kDerivedPathMax, EA_PLACE_EADIR) != 0) {
+        return kFailure;
+    }
+    char current[kPathBufferSize];
+    memcpy(current, legacy, sizeof legacy);
+    if (char* const colon = strrchr(current, ':'); colon != nullptr) *colon = '@';
+    if (Exists(current)) return kCurrent;
+    if (!Exists(legacy)) return kNothing;
+    return MLIBCExec("/bin/mv", legacy, current, nullptr) == -1 ? kFailure : kConverted;
+}
+
+}  // namespace
+}  // namespace mavoea
+
+using namespace mavoea;
+
+int MAVOEAUpgrade(const char* szPath, const char* szName) {
+    if (szName == nullptr) return unit.Fail(Err::kBadArgument);
+    const std::string_view kind = szName;
+    if (kind == MAVOEA_KIND_STREAM) return UpgradeStream(szPath);
+    if (kind == MAVOEA_KIND_RESOURCE) return UpgradeResourceFile(szPath);
+    if (kind.starts_with(kReserved)) return UpgradeReserved(szPath, szName);
+    return unit.Fail(Err::kBadArgument);
+}
