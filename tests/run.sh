@@ -43,7 +43,7 @@ echo "no findings"
 step "static analysis: cppcheck"
 cppcheck --quiet --error-exitcode=1 --std=c++20 --language=c++ --inline-suppr \
     --enable=warning,performance,portability --suppress=missingInclude \
-    -I . adouble path stream xattr format util platform
+    -I . adouble ops path stream xattr format util platform
 echo "no findings"
 
 step "all passed"

@@ -15,9 +15,17 @@ constexpr const char* kExamples = R"(Examples:
   mavoea get letter.txt com.apple.FinderInfo --hex
   mavoea list -l letter.txt
   mavoea remove letter.txt com.example.colour
+  mavoea lock letter.txt
+  mavoea import ._letter.txt letter.txt
+  mavoea upgrade -r /srv/share
+  mavoea repair -r /srv/share
   mavoea dump @eaDir/letter.txt@MavoEAStream
+  mavoea dump --record letter.txt
 
 Volume types: a number from 0 to 12, or appledouble (0), eadir (1), fileea (2), xattr (7).
+Names like any other: com.apple.FinderInfo, com.apple.ResourceFork, and mavoea.locked, which is 1
+for a file that Macs may not write, rename or delete.
+Recursive work goes on after a failure, and tells at its end what failed.
 Exit status: 0 done; 1 not found, the object or the attribute; 2 anything else that went wrong.
 A NAME or VALUE that begins with '-' stands behind "--". Control characters in names are shown as
 "\x0A", backslashes doubled; --json has names as they are.)";
@@ -46,6 +54,15 @@ void AddPath(CLI::App* sub, Options* options, const char* what) {
     sub->add_option_function<std::string>(
            "PATH", [=](const std::string& path) { options->paths = {path}; }, what)
         ->required();
+}
+
+void AddPaths(CLI::App* sub, Options* options) {
+    sub->add_option("PATH", options->paths, "Files and directories")->required();
+}
+
+void AddRecursive(CLI::App* sub, Options* options) {
+    sub->add_flag("-r,--recursive", options->recursive,
+                  "With all that is below directories; symbolic links are not followed");
 }
 
 void AddName(CLI::App* sub, Options* options) {
@@ -79,7 +96,7 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
     CLI::App* const list =
         AddCommand(app, "list", "List attribute names, one a line", Command::kList, &options);
     list->add_flag("-l", options.details, "With size, kind and the file that holds it");
-    list->add_option("PATH", options.paths, "Files and directories")->required();
+    AddPaths(list, &options);
 
     CLI::App* const get =
         AddCommand(app, "get", "Write a value to standard output", Command::kGet, &options);
@@ -106,9 +123,34 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
     AddPath(remove, &options, "A file or directory");
     AddName(remove, &options);
 
+    AddPaths(AddCommand(app, "lock", "Lock files: Macs may not write, rename or delete them",
+                        Command::kLock, &options),
+             &options);
+    AddPaths(AddCommand(app, "unlock", "Unlock files", Command::kUnlock, &options), &options);
+
+    CLI::App* const import =
+        AddCommand(app, "import",
+                   "Give an object the attributes, Finder info and resource fork of a \"._\" file",
+                   Command::kImport, &options);
+    import->add_option("APPLEDOUBLE", options.apple_double, "An AppleDouble file")->required();
+    AddPath(import, &options, "A file or directory");
+
+    CLI::App* const upgrade =
+        AddCommand(app, "upgrade", "Convert what earlier versions kept into the current layout",
+                   Command::kUpgrade, &options);
+    AddRecursive(upgrade, &options);
+    AddPaths(upgrade, &options);
+
+    CLI::App* const repair =
+        AddCommand(app, "repair", "Move what resource files wrongly hold into EA streams",
+                   Command::kRepair, &options);
+    AddRecursive(repair, &options);
+    AddPaths(repair, &options);
+
     CLI::App* const dump =
         AddCommand(app, "dump", "Show and check every field of an EA stream or AppleDouble file",
                    Command::kDump, &options);
+    dump->add_flag("--record", options.record, "FILE is an object, whose netatalk record is shown");
     dump->add_option_function<std::string>(
             "FILE", [&](const std::string& path) { options.paths = {path}; }, "A metadata file")
         ->required();
@@ -127,6 +169,7 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
     for (std::string& path : options.paths) path = Unguarded(std::move(path));
     for (std::string& volume : options.volumes) volume = Unguarded(std::move(volume));
     options.name = Unguarded(std::move(options.name));
+    options.apple_double = Unguarded(std::move(options.apple_double));
     if (options.value) options.value = Unguarded(*std::move(options.value));
     if (options.file) options.file = Unguarded(*std::move(options.file));
     return options;

@@ -9,16 +9,31 @@
 
 namespace mavoea::tool {
 
-enum class Command { kWhere, kList, kGet, kSet, kRemove, kDump };
+enum class Command {
+    kWhere,
+    kList,
+    kGet,
+    kSet,
+    kRemove,
+    kLock,
+    kUnlock,
+    kImport,
+    kUpgrade,
+    kRepair,
+    kDump
+};
 
 struct Options {
     Command command = Command::kWhere;
     std::vector<std::string> volumes;  // PATH=TYPE
     bool json = false;
 
-    std::vector<std::string> paths;  // one, but for list
+    std::vector<std::string> paths;  // one, but for list, lock, unlock, upgrade and repair
     std::string name;
+    std::string apple_double;          // import
     bool details = false;              // list -l
+    bool recursive = false;            // upgrade, repair
+    bool record = false;               // dump: the record of an object
     bool hex = false;                  // get, set
     std::optional<std::string> value;  // set: none of the two means standard input
     std::optional<std::string> file;

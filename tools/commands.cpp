@@ -10,8 +10,14 @@
 #include "format/ea_stream.h"
 #include "tools/dump.h"
 #include "tools/file.h"
+#include "tools/import.h"
+#include "tools/lock.h"
+#include "tools/output.h"
+#include "tools/record.h"
+#include "tools/repair.h"
 #include "tools/store.h"
 #include "tools/text.h"
+#include "tools/upgrade.h"
 #include "tools/volume.h"
 
 namespace mavoea::tool {
@@ -25,14 +31,12 @@ const char* KindName(Kind kind) {
             return "Finder info";
         case Kind::kResourceFork:
             return "resource fork";
+        case Kind::kLocked:
+            return "locked state";
         case Kind::kAttribute:
             break;
     }
     return "attribute";
-}
-
-void Print(const Json& json) {
-    std::cout << json.dump(2, ' ', false, Json::error_handler_t::replace) << '\n';
 }
 
 void CheckName(const Options& options) {
@@ -226,9 +230,65 @@ ExitStatus Remove(const Options& options) {
     return kSuccess;
 }
 
+// ---- lock, unlock -------------------------------------------------------------------------------
+
+ExitStatus Lock(const Options& options, bool locked) {
+    ExitStatus status = kSuccess;
+    Json json = Json::array();
+    for (const std::string& path : options.paths) {
+        try {
+            const Object object = FindObject(path);
+            SetLocked(object, locked);
+            Json entry;
+            SetText(entry, "path", object.path);
+            entry["locked"] = locked;
+            json.push_back(std::move(entry));
+        } catch (const Failure& failure) {
+            Report(failure.what());
+            status = std::max(status, failure.status());
+        }
+    }
+    if (options.json) Print(json);
+    return status;
+}
+
 // ---- dump ---------------------------------------------------------------------------------------
 
+// The two places of an object's record; the head of a resource file that is too short for one is
+// none.
+ExitStatus DumpRecord(const Options& options) {
+    const Object object = FindObject(options.paths.front());
+    Json json = Json::array();
+    std::size_t violations = 0;
+    bool found = false;
+    for (const RecordPlace place : {RecordPlace::kAttribute, RecordPlace::kResourceFile}) {
+        const auto stored = ReadStoredRecord(object, place);
+        if (!stored) continue;
+        const Layout layout = ReadLayout(stored->block);
+        const Findings findings = CheckRecord(layout, place);
+        const char* const kind = place == RecordPlace::kAttribute
+                                     ? "netatalk record, attribute user.netatalk.Metadata"
+                                     : "netatalk record, head of a resource file";
+        violations += findings.violations.size();
+        if (options.json) {
+            json.push_back(DumpJson(stored->file, layout, findings, kind));
+        } else {
+            std::cout << (found ? "\n" : "") << DumpText(stored->file, layout, findings, kind);
+        }
+        found = true;
+    }
+    if (options.json) Print(json);
+    if (!found) {
+        throw Failure(kNotFound, options.paths.front(), "no netatalk record",
+                      "mavoea where PATH has the files in which metadata may be");
+    }
+    if (violations == 0) return kSuccess;
+    throw Failure(kFailed, options.paths.front(), "its netatalk record is damaged",
+                  "let the AFP service write it anew, or remove it");
+}
+
 ExitStatus Dump(const Options& options) {
+    if (options.record) return DumpRecord(options);
     const std::string& path = options.paths.front();
     const Layout layout = ReadLayout(File::OpenToRead(path));
     const Findings findings = CheckLayout(layout);
@@ -252,6 +312,7 @@ ExitStatus Run(const Options& options) {
     for (const std::string& volume : options.volumes) {
         declarations.push_back(DeclareVolume(volume));
     }
+    const TreeOptions tree = {options.paths, options.recursive, options.json};
     switch (options.command) {
         case Command::kWhere:
             return Where(options, declarations);
@@ -263,15 +324,20 @@ ExitStatus Run(const Options& options) {
             return Set(options);
         case Command::kRemove:
             return Remove(options);
+        case Command::kLock:
+            return Lock(options, true);
+        case Command::kUnlock:
+            return Lock(options, false);
+        case Command::kImport:
+            return Import(options.apple_double, options.paths.front(), options.json);
+        case Command::kUpgrade:
+            return Upgrade(tree);
+        case Command::kRepair:
+            return Repair(tree);
         case Command::kDump:
             break;
     }
     return Dump(options);
-}
-
-void Report(std::string_view message) {
-    std::cout.flush();  // What was found before comes first.
-    std::cerr << "mavoea: " << message << '\n';
 }
 
 }  // namespace mavoea::tool

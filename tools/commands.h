@@ -2,8 +2,6 @@
 #ifndef MAVOEA_TOOLS_COMMANDS_H_
 #define MAVOEA_TOOLS_COMMANDS_H_
 
-#include <string_view>
-
 #include "tools/command_line.h"
 #include "tools/messages.h"
 
@@ -12,9 +10,6 @@ namespace mavoea::tool {
 // Throws Failure for whatever ends the work; what ends it for one of several paths is reported
 // instead, and the others are still looked at.
 ExitStatus Run(const Options& options);
-
-// "mavoea: MESSAGE", on standard error.
-void Report(std::string_view message);
 
 }  // namespace mavoea::tool
 

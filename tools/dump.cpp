@@ -1,5 +1,6 @@
 #include "tools/dump.h"
 
+#include "tools/entry_text.h"
 #include "tools/text.h"
 
 namespace mavoea::tool {
@@ -16,6 +17,12 @@ std::string TextOf(ByteView bytes) { return {bytes.begin(), bytes.end()}; }
 
 std::string RangeText(Range range) {
     return "offset " + std::to_string(range.offset) + "  length " + std::to_string(range.length);
+}
+
+// Private ids are known by their hexadecimal digits.
+std::string IdText(EntryId id) {
+    const auto number = static_cast<std::uint32_t>(id);
+    return number > 0xFFFF ? HexNumber(number) : std::to_string(number);
 }
 
 // One field a line, its name padded to the widest.
@@ -43,11 +50,14 @@ void AddHeader(const Layout& layout, Fields* out) {
     out->Add("entries", std::to_string(header.entry_count));
     for (std::size_t i = 0; i < layout.entries.size(); ++i) {
         const EntryDescriptor& entry = layout.entries[i];
-        out->Line("  " + std::to_string(i) + "  id " +
-                  std::to_string(static_cast<std::uint32_t>(entry.id)) + " (" +
+        out->Line("  " + std::to_string(i) + "  id " + IdText(entry.id) + " (" +
                   EntryName(entry.id) + ")  " + RangeText(entry.data));
     }
     if (!layout.finder_info.empty()) out->Add("Finder info", HexDigits(layout.finder_info));
+    for (const auto& [index, bytes] : layout.contents) {
+        const EntryId id = layout.entries[index].id;
+        out->Add(EntryName(id), EntryText(id, bytes));
+    }
 }
 
 void AddAttributes(const Layout& layout, Fields* out) {
@@ -74,10 +84,11 @@ Json RangeJson(Range range) { return {{"offset", range.offset}, {"length", range
 
 }  // namespace
 
-std::string DumpText(const std::string& path, const Layout& layout, const Findings& findings) {
+std::string DumpText(const std::string& path, const Layout& layout, const Findings& findings,
+                     const char* kind) {
     Fields out;
-    out.Line(Printable(path) + ": " + FileKind(layout) + ", " + std::to_string(layout.file_size) +
-             " bytes");
+    out.Line(Printable(path) + ": " + (kind == nullptr ? FileKind(layout) : kind) + ", " +
+             std::to_string(layout.file_size) + " bytes");
     if (layout.header) AddHeader(layout, &out);
     if (layout.attributes) AddAttributes(layout, &out);
     if (const auto fork = layout.FindEntry(EntryId::kResourceFork)) {
@@ -89,10 +100,11 @@ std::string DumpText(const std::string& path, const Layout& layout, const Findin
     return out.Take();
 }
 
-Json DumpJson(const std::string& path, const Layout& layout, const Findings& findings) {
+Json DumpJson(const std::string& path, const Layout& layout, const Findings& findings,
+              const char* kind) {
     Json json;
     SetText(json, "file", path);
-    json["kind"] = FileKind(layout);
+    json["kind"] = kind == nullptr ? FileKind(layout) : kind;
     json["size"] = layout.file_size;
     if (layout.header) {
         const AppleDoubleHeader& header = *layout.header;
@@ -101,11 +113,16 @@ Json DumpJson(const std::string& path, const Layout& layout, const Findings& fin
                           {"filler", HexDigits(header.filler)},
                           {"entryCount", header.entry_count}};
         json["entries"] = Json::array();
-        for (const EntryDescriptor& entry : layout.entries) {
-            json["entries"].push_back({{"id", static_cast<std::uint32_t>(entry.id)},
-                                       {"name", EntryName(entry.id)},
-                                       {"offset", entry.data.offset},
-                                       {"length", entry.data.length}});
+        for (std::size_t i = 0; i < layout.entries.size(); ++i) {
+            const EntryDescriptor& entry = layout.entries[i];
+            Json item = {{"id", static_cast<std::uint32_t>(entry.id)},
+                         {"name", EntryName(entry.id)},
+                         {"offset", entry.data.offset},
+                         {"length", entry.data.length}};
+            if (const auto contents = layout.contents.find(i); contents != layout.contents.end()) {
+                AddEntryJson(entry.id, contents->second, &item);
+            }
+            json["entries"].push_back(std::move(item));
         }
     }
     if (!layout.finder_info.empty()) json["finderInfo"] = HexDigits(layout.finder_info);

@@ -8,8 +8,11 @@
 
 namespace mavoea::tool {
 
-std::string DumpText(const std::string& path, const Layout& layout, const Findings& findings);
-Json DumpJson(const std::string& path, const Layout& layout, const Findings& findings);
+// `kind` says what it is; null: what its layout says.
+std::string DumpText(const std::string& path, const Layout& layout, const Findings& findings,
+                     const char* kind = nullptr);
+Json DumpJson(const std::string& path, const Layout& layout, const Findings& findings,
+              const char* kind = nullptr);
 
 }  // namespace mavoea::tool
 

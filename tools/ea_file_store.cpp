@@ -1,5 +1,6 @@
 // Volumes that keep metadata in files beside the object: one "._" file, or the EA stream and the
-// resource file in the EA directory.
+// resource file in the EA directory. File-EA volumes have the Finder info in the object's netatalk
+// record too, and there first.
 
 #include <algorithm>
 
@@ -7,8 +8,10 @@
 #include "include/mavoea.h"
 #include "tools/apple_double_file.h"
 #include "tools/messages.h"
+#include "tools/record.h"
 #include "tools/store.h"
 #include "tools/stream_file.h"
+#include "util/volume_kind.h"
 
 namespace mavoea::tool {
 namespace {
@@ -19,7 +22,8 @@ bool IsAllZero(const Bytes& bytes) {
 
 class EaFileStore final : public Store {
  public:
-    explicit EaFileStore(const Object& object) {
+    explicit EaFileStore(const Object& object)
+        : has_record_(VolumeKindOf(object.type) == VolumeKind::kFileEA) {
         const int place =
             object.keeping() == Keeping::kAppleDouble ? EA_PLACE_APPLEDOUBLE : EA_PLACE_EADIR;
         stream_ = {object.path, MAVOEA_KIND_STREAM, place};
@@ -38,6 +42,11 @@ class EaFileStore final : public Store {
         }
         bool has_finder_info = false;
         bool has_fork = false;
+        if (const auto record = ReadRecord(); record && record->FinderInfo()) {
+            has_finder_info = true;
+            list.push_back(
+                {std::string(kFinderInfoName), kFinderInfoSize, Kind::kFinderInfo, stream_.object});
+        }
         for (const Sidecar& holder : holders_) {
             const auto file = AppleDoubleFile::Open(holder, Access::kRead);
             if (!file) continue;
@@ -61,6 +70,10 @@ class EaFileStore final : public Store {
             const auto stream = StreamFile::Open(stream_, Access::kRead);
             return stream ? stream->Get(name) : std::nullopt;
         }
+        if (kind == Kind::kFinderInfo) {
+            const auto record = ReadRecord();
+            if (auto value = record ? record->FinderInfo() : std::nullopt) return value;
+        }
         for (const Sidecar& holder : holders_) {
             const auto file = AppleDoubleFile::Open(holder, Access::kRead);
             if (!file) continue;
@@ -73,6 +86,7 @@ class EaFileStore final : public Store {
     void Set(const std::string& name, const Bytes& value) override {
         switch (KindOf(name)) {
             case Kind::kAttribute:
+            case Kind::kLocked:
                 StreamFile::Open(stream_, Access::kCreate)->Set(name, value);
                 return;
             case Kind::kFinderInfo:
@@ -81,7 +95,7 @@ class EaFileStore final : public Store {
                 if (IsAllZero(value)) {
                     Remove(name);
                 } else {
-                    AppleDoubleFile::Open(holders_.front(), Access::kCreate)->SetFinderInfo(value);
+                    SetFinderInfo(value);
                 }
                 return;
             case Kind::kResourceFork:
@@ -101,6 +115,8 @@ class EaFileStore final : public Store {
             return stream && stream->Remove(name);
         }
         bool removed = false;
+        std::optional<Record> record;
+        if (kind == Kind::kFinderInfo) record = ReadRecord();
         for (const Sidecar& holder : holders_) {
             const auto file = AppleDoubleFile::Open(holder, Access::kWrite);
             if (!file) continue;
@@ -113,10 +129,48 @@ class EaFileStore final : public Store {
                 removed = true;
             }
         }
+        if (record && record->FinderInfo()) {
+            record->SetFinderInfo(Bytes(kFinderInfoSize));
+            record->Flush();
+            removed = true;
+        }
+        if (removed && kind == Kind::kFinderInfo) Stamp();
         return removed;
     }
 
  private:
+    std::optional<Record> ReadRecord() const {
+        if (!has_record_) return std::nullopt;
+        return Record::Read(stream_.object, RecordPlace::kAttribute);
+    }
+
+    // Into the first holder, then into the record: a record that is there keeps its other entries,
+    // one that is missing is made.
+    void SetFinderInfo(const Bytes& value) const {
+        std::optional<Record> record = ReadRecord();
+        if (record) record->SetFinderInfo(value);
+        AppleDoubleFile::Open(holders_.front(), Access::kCreate)->SetFinderInfo(value);
+        if (record) {
+            record->Flush();
+            Stamp();
+        } else if (has_record_) {
+            const ErrorMark mark;
+            if (MAVOEAFileEAFSFinfoEASync(stream_.object.c_str(), 0) != 0) {
+                throw LibraryFailure(stream_.object, mark.Get());
+            }
+        }
+    }
+
+    // The time at which the metadata of an object on a file-EA volume changed.
+    void Stamp() const {
+        if (!has_record_) return;
+        const ErrorMark mark;
+        if (MAVOEAFileEAWriteFlushTime(stream_.object.c_str(), 0) != 0) {
+            throw LibraryFailure(stream_.object, mark.Get());
+        }
+    }
+
+    bool has_record_;
     Sidecar stream_{};
     // Of Finder info and resource fork: the first that has them is believed, and written.
     std::vector<Sidecar> holders_;

@@ -89,6 +89,11 @@ void File::Sync() const {
     if (::fsync(fd_) != 0) throw SystemFailure(path_, errno);
 }
 
+bool Exists(const std::string& path) {
+    struct stat info;
+    return ::lstat(path.c_str(), &info) == 0;
+}
+
 Bytes ReadToEnd(int fd, const std::string& name, std::uint64_t most) {
     constexpr std::size_t kStep = std::size_t{1} << 16;
     Bytes bytes;

@@ -45,6 +45,9 @@ class File {
     std::string path_;
 };
 
+// Whether anything has that name, be it a dangling symbolic link.
+bool Exists(const std::string& path);
+
 // All that a descriptor has to give, such as standard input. Failure when it is more than `most`.
 Bytes ReadToEnd(int fd, const std::string& name, std::uint64_t most);
 

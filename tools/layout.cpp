@@ -1,6 +1,7 @@
 #include "tools/layout.h"
 
 #include <algorithm>
+#include <functional>
 
 namespace mavoea::tool {
 namespace {
@@ -8,10 +9,13 @@ namespace {
 // The largest record there is, for the bound on the table.
 constexpr std::uint64_t kRecordSizeMax = RecordSize(kNameSizeMax);
 
-void ReadEntries(const File& file, Layout* layout) {
+// Gives what there is of `size` bytes at `offset`.
+using Source = std::function<Bytes(std::uint64_t offset, std::uint64_t size)>;
+
+void ReadEntries(const Source& read, Layout* layout) {
     const std::uint16_t count = layout->header->entry_count;
     const Bytes bytes =
-        file.Read(AppleDoubleHeader::kSize, DescriptorsEnd(count) - AppleDoubleHeader::kSize);
+        read(AppleDoubleHeader::kSize, DescriptorsEnd(count) - AppleDoubleHeader::kSize);
     BeReader in(bytes);
     for (std::uint16_t i = 0; i < count; ++i) {
         const EntryDescriptor entry = DecodeEntryDescriptor(in);
@@ -20,9 +24,9 @@ void ReadEntries(const File& file, Layout* layout) {
     }
 }
 
-void ReadRecords(const File& file, Layout* layout) {
+void ReadRecords(const Source& read, Layout* layout) {
     const std::uint16_t count = layout->attributes->count;
-    const Bytes table = file.Read(kStreamHeaderSize, count * kRecordSizeMax);
+    const Bytes table = read(kStreamHeaderSize, count * kRecordSizeMax);
     const ByteView bytes(table);
     std::uint64_t at = 0;
     for (std::uint16_t i = 0; i < count && at < bytes.size(); ++i) {
@@ -37,6 +41,59 @@ void ReadRecords(const File& file, Layout* layout) {
         at += RecordSize(record.fixed.name_size);
         layout->records.push_back(std::move(record));
     }
+}
+
+// What ReadLayout() shows of an entry's bytes.
+bool IsShown(EntryId id) {
+    switch (static_cast<std::uint32_t>(id)) {
+        case 3:
+        case 4:
+        case 8:
+        case 13:
+        case 14:
+            return true;
+        default:
+            return SlotOf(static_cast<std::uint32_t>(id)) >= Slot::kPrivateDevice;
+    }
+}
+
+void ReadContents(const Source& read, Layout* layout) {
+    constexpr std::uint32_t kMost = 256;
+    for (std::size_t i = 0; i < layout->entries.size() && i < Layout::kContentsMax; ++i) {
+        const EntryDescriptor& entry = layout->entries[i];
+        if (entry.data.length == 0 || !IsShown(entry.id)) continue;
+        layout->contents[i] = read(entry.data.offset, std::min(entry.data.length, kMost));
+    }
+}
+
+Layout ReadLayout(const Source& read, std::uint64_t size) {
+    Layout layout;
+    layout.file_size = size;
+    const Bytes head = read(0, AppleDoubleHeader::kSize);
+    BeReader in(head);
+    const AppleDoubleHeader header = DecodeAppleDoubleHeader(in);
+    if (!in.ok()) return layout;
+    layout.header = header;
+    if (!layout.IsAppleDouble()) return layout;
+
+    ReadEntries(read, &layout);
+    ReadContents(read, &layout);
+    const auto finder_info = layout.FindEntry(EntryId::kFinderInfo);
+    if (!finder_info) return layout;
+    const Range range = layout.entries[*finder_info].data;
+    if (range.length >= kFinderInfoSize) {
+        Bytes bytes = read(range.offset, kFinderInfoSize);
+        if (bytes.size() == kFinderInfoSize) layout.finder_info = std::move(bytes);
+    }
+    if (!layout.HasAttributeArea()) return layout;
+
+    AttributeHeader attributes;
+    if (!DecodeAttributeHeader(read(kAttributeHeaderOffset, kAttributeHeaderSize), &attributes)) {
+        return layout;
+    }
+    layout.attributes = attributes;
+    if (attributes.magic == kAttributeMagic) ReadRecords(read, &layout);
+    return layout;
 }
 
 }  // namespace
@@ -75,33 +132,22 @@ std::uint64_t Layout::EndBeforeFork() const {
 }
 
 Layout ReadLayout(const File& file) {
-    Layout layout;
-    layout.file_size = file.Size();
-    const Bytes head = file.Read(0, AppleDoubleHeader::kSize);
-    BeReader in(head);
-    const AppleDoubleHeader header = DecodeAppleDoubleHeader(in);
-    if (!in.ok()) return layout;
-    layout.header = header;
-    if (!layout.IsAppleDouble()) return layout;
+    return ReadLayout(
+        [&](std::uint64_t offset, std::uint64_t size) { return file.Read(offset, size); },
+        file.Size());
+}
 
-    ReadEntries(file, &layout);
-    const auto finder_info = layout.FindEntry(EntryId::kFinderInfo);
-    if (!finder_info) return layout;
-    const Range range = layout.entries[*finder_info].data;
-    if (range.length >= kFinderInfoSize) {
-        Bytes bytes = file.Read(range.offset, kFinderInfoSize);
-        if (bytes.size() == kFinderInfoSize) layout.finder_info = std::move(bytes);
-    }
-    if (!layout.HasAttributeArea()) return layout;
-
-    AttributeHeader attributes;
-    if (!DecodeAttributeHeader(file.Read(kAttributeHeaderOffset, kAttributeHeaderSize),
-                               &attributes)) {
-        return layout;
-    }
-    layout.attributes = attributes;
-    if (attributes.magic == kAttributeMagic) ReadRecords(file, &layout);
-    return layout;
+Layout ReadLayout(ByteView bytes) {
+    return ReadLayout(
+        [&](std::uint64_t offset, std::uint64_t size) {
+            if (offset >= bytes.size()) return Bytes();
+            const auto from = static_cast<std::size_t>(offset);
+            const auto count =
+                static_cast<std::size_t>(std::min<std::uint64_t>(size, bytes.size() - from));
+            const ByteView part = bytes.subspan(from, count);
+            return Bytes(part.begin(), part.end());
+        },
+        bytes.size());
 }
 
 const char* EntryName(EntryId id) {
@@ -134,6 +180,18 @@ const char* EntryName(EntryId id) {
             return "AFP file info";
         case 15:
             return "AFP directory id";
+        default:
+            break;
+    }
+    switch (SlotOf(static_cast<std::uint32_t>(id))) {
+        case Slot::kPrivateDevice:
+            return "private device";
+        case Slot::kPrivateInode:
+            return "private inode";
+        case Slot::kPrivateSync:
+            return "private sync";
+        case Slot::kPrivateId:
+            return "private id";
         default:
             return "unknown";
     }

@@ -3,12 +3,15 @@
 #define MAVOEA_TOOLS_LAYOUT_H_
 
 #include <cstdint>
+#include <map>
 #include <optional>
 #include <string>
 #include <vector>
 
 #include "format/ea_stream.h"
+#include "format/netatalk_record.h"
 #include "tools/file.h"
+#include "tools/record.h"
 
 namespace mavoea::tool {
 
@@ -26,8 +29,14 @@ struct Layout {
 
     std::uint64_t file_size = 0;
     std::optional<AppleDoubleHeader> header;
-    std::vector<EntryDescriptor> entries;       // up to header->entry_count
-    Bytes finder_info;                          // 32 bytes, or none
+    std::vector<EntryDescriptor> entries;  // up to header->entry_count
+    Bytes finder_info;                     // 32 bytes, or none
+
+    // The first bytes of names, comment, dates, AFP file info and netatalk's private entries, by
+    // the index of the entry. Of more entries than a header should have, those of the first.
+    static constexpr std::size_t kContentsMax = 64;
+    std::map<std::size_t, Bytes> contents;
+
     std::optional<AttributeHeader> attributes;  // none in a plain AppleDouble file
     std::vector<Record> records;                // up to attributes->count
 
@@ -49,6 +58,7 @@ struct Layout {
 // Whatever the file holds, it is read without failing and in memory bounded by the largest table;
 // only a failing disk throws.
 Layout ReadLayout(const File& file);
+Layout ReadLayout(ByteView bytes);
 
 struct Findings {
     std::vector<std::string> violations;  // of the layout's invariants
@@ -56,7 +66,11 @@ struct Findings {
 };
 Findings CheckLayout(const Layout& layout);
 
-// "Finder info", "resource fork", ...; "unknown" for what Apple gave no meaning.
+// What keeps the library from taking the block for a netatalk record.
+Findings CheckRecord(const Layout& block, RecordPlace place);
+
+// "Finder info", "resource fork", ...; "unknown" for what neither Apple nor netatalk gave a
+// meaning.
 const char* EntryName(EntryId id);
 
 }  // namespace mavoea::tool

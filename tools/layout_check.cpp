@@ -249,8 +249,74 @@ class Checker {
     Findings findings_;
 };
 
+void CheckRecordEntries(const Layout& block, Findings* findings) {
+    std::set<EntryId> seen;
+    for (std::size_t i = 0; i < block.entries.size(); ++i) {
+        const EntryDescriptor& entry = block.entries[i];
+        const std::string name = "entry " + Number(i) + " (" + EntryName(entry.id) + ")";
+        const Slot slot = SlotOf(static_cast<std::uint32_t>(entry.id));
+        if (slot == Slot::kNone) {
+            findings->violations.push_back(name + ": the id " +
+                                           HexNumber(static_cast<std::uint32_t>(entry.id)) +
+                                           " has no place in a record");
+        } else if (!AcceptableEntry(slot, entry.data)) {
+            findings->violations.push_back(name + ": it passes the record's " +
+                                           Number(kRecordDataSize) + " bytes");
+        }
+        if (!seen.insert(entry.id).second) {
+            findings->violations.push_back(name +
+                                           ": the same kind a second time, which hides the first");
+        }
+        if (entry.id == EntryId::kFinderInfo && entry.data.length < kFinderInfoSize) {
+            findings->violations.push_back(name + ": " + Number(entry.data.length) +
+                                           " bytes, fewer than " + Number(kFinderInfoSize));
+        }
+    }
+}
+
+// The record of an attribute has all entries that a fresh one has, and no other.
+void CheckComplete(const Layout& block, Findings* findings) {
+    if (block.header->entry_count != kFreshRecord.size()) {
+        findings->violations.push_back(Number(block.header->entry_count) +
+                                       " entries are declared, not " + Number(kFreshRecord.size()));
+    }
+    for (const RecordEntry& entry : kFreshRecord) {
+        const auto id = static_cast<EntryId>(entry.id);
+        const auto index = block.FindEntry(id);
+        if (!index || block.entries[*index].data.offset == 0) {
+            findings->violations.push_back(std::string("no ") + EntryName(id) + " entry");
+        }
+    }
+}
+
 }  // namespace
 
 Findings CheckLayout(const Layout& layout) { return Checker(layout).Run(); }
+
+Findings CheckRecord(const Layout& block, RecordPlace place) {
+    Findings findings;
+    const std::size_t size =
+        place == RecordPlace::kAttribute ? kAttributeBlockSize : kResourceHeadSize;
+    if (block.file_size != size) {
+        findings.violations.push_back("it has " + Number(block.file_size) + " bytes, not " +
+                                      Number(size));
+    }
+    if (!block.IsAppleDouble()) {
+        findings.violations.push_back("no AppleDouble block");
+        return findings;
+    }
+    if (block.header->version != kAppleDoubleVersion2) {
+        findings.violations.push_back("the version is " + HexNumber(block.header->version) +
+                                      ", not " + HexNumber(kAppleDoubleVersion2));
+    }
+    if (block.entries.size() < block.header->entry_count) {
+        findings.violations.push_back(
+            "it ends inside its descriptors: " + Number(block.entries.size()) + " of " +
+            Number(block.header->entry_count) + " are there");
+    }
+    CheckRecordEntries(block, &findings);
+    if (place == RecordPlace::kAttribute) CheckComplete(block, &findings);
+    return findings;
+}
 
 }  // namespace mavoea::tool

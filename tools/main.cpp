@@ -7,6 +7,7 @@
 #include "tools/command_line.h"
 #include "tools/commands.h"
 #include "tools/messages.h"
+#include "tools/output.h"
 
 namespace {
 

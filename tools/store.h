@@ -1,5 +1,5 @@
-// An object's attributes, wherever its volume keeps them. "com.apple.FinderInfo" and
-// "com.apple.ResourceFork" are names like any other.
+// An object's attributes, wherever its volume keeps them. "com.apple.FinderInfo",
+// "com.apple.ResourceFork" and "mavoea.locked" are names like any other.
 #ifndef MAVOEA_TOOLS_STORE_H_
 #define MAVOEA_TOOLS_STORE_H_
 
@@ -19,11 +19,16 @@ namespace mavoea::tool {
 inline constexpr std::string_view kFinderInfoName = "com.apple.FinderInfo";
 inline constexpr std::string_view kResourceForkName = "com.apple.ResourceFork";
 
-enum class Kind { kAttribute, kFinderInfo, kResourceFork };
+// The Mac locked state: "1" or "0". It is in the list of what is locked only, and nowhere in a file
+// under this name.
+inline constexpr std::string_view kLockedName = "mavoea.locked";
+
+enum class Kind { kAttribute, kFinderInfo, kResourceFork, kLocked };
 
 constexpr Kind KindOf(std::string_view name) {
     if (name == kFinderInfoName) return Kind::kFinderInfo;
     if (name == kResourceForkName) return Kind::kResourceFork;
+    if (name == kLockedName) return Kind::kLocked;
     return Kind::kAttribute;
 }
 
@@ -48,7 +53,7 @@ class Store {
 // Finder info of another size than its own is a Failure.
 void CheckFinderInfoSize(const std::string& path, const Bytes& value);
 
-// Types 0 and 5, and types 1, 2, 3, 6 and 10.
+// These two know nothing of the locked state. Types 0 and 5, and types 1, 2, 3, 6 and 10.
 std::unique_ptr<Store> MakeEaFileStore(const Object& object);
 // Type 7.
 std::unique_ptr<Store> MakeXattrStore(const Object& object);
@@ -56,6 +61,9 @@ std::unique_ptr<Store> MakeXattrStore(const Object& object);
 // The one for the object's volume. Failure for a volume whose type has none.
 std::unique_ptr<Store> OpenStore(const Object& object);
 Failure NoStore(const Object& object);
+
+// Metadata beside the object takes a directory in which it is.
+void RequireParent(const Object& object);
 
 }  // namespace mavoea::tool
 

@@ -20,7 +20,7 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
     const std::string& object = volume.object();
     const struct {
         Arguments arguments;
-        const char* message;
+        std::string message;
     } cases[] = {
         {{}, "A subcommand is required"},
         {{"bogus"}, "A subcommand is required"},
@@ -29,7 +29,17 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
         {{"get", object}, "NAME is required"},
         {{"set", object}, "NAME is required"},
         {{"remove", object}, "NAME is required"},
+        {{"lock"}, "PATH is required"},
+        {{"unlock"}, "PATH is required"},
+        {{"import"}, "APPLEDOUBLE is required"},
+        {{"import", object}, "PATH is required"},
+        {{"import", object, object, object}, "The following argument was not expected: " + object},
+        {{"upgrade", "-r"}, "PATH is required"},
+        {{"upgrade", "--record", object}, "The following argument was not expected: --record"},
+        {{"repair"}, "PATH is required"},
+        {{"lock", "-r", object}, "The following argument was not expected: -r"},
         {{"dump"}, "FILE is required"},
+        {{"dump", "--record"}, "FILE is required"},
         {{"get", object, "a", "b"}, "The following argument was not expected: b"},
         {{"get", "--bogus", object, "a"}, "The following argument was not expected: --bogus"},
         {{"set", object, "a", "value", "--file", "f"}, "VALUE excludes --file"},
@@ -38,7 +48,7 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
     };
     for (const auto& [arguments, message] : cases) {
         const ToolResult result = RunTool(arguments);
-        EXPECT_THAT(result, Failed(2, std::string(message) + "; mavoea --help has the usage"));
+        EXPECT_THAT(result, Failed(2, message + "; mavoea --help has the usage"));
         EXPECT_EQ("", result.out);
     }
     EXPECT_EQ(std::vector<std::string>{"file.txt"}, NamesIn(volume.path()));
@@ -47,11 +57,13 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
 TEST(CommandLineTest, HelpAndVersionAreWrittenToStandardOutput) {
     const ToolResult help = RunTool({"--help"});
     EXPECT_THAT(help, Succeeded());
-    for (const char* text : {"where", "list", "get", "set", "remove", "dump", "--volume PATH=TYPE",
-                             "--json", "Examples:", "Exit status:", "Volume types:"}) {
+    for (const char* text :
+         {"where", "list", "get", "set", "remove", "lock", "unlock", "import", "upgrade", "repair",
+          "dump", "--volume PATH=TYPE", "--json", "Examples:", "Exit status:", "Volume types:"}) {
         EXPECT_THAT(help.out, HasSubstr(text));
     }
-    for (const char* command : {"where", "list", "get", "set", "remove", "dump"}) {
+    for (const char* command : {"where", "list", "get", "set", "remove", "lock", "unlock", "import",
+                                "upgrade", "repair", "dump"}) {
         EXPECT_THAT(RunTool({command, "--help"}), Succeeded());
     }
     const ToolResult version = RunTool({"--version"});

@@ -136,11 +136,11 @@ TEST_P(FinderAndForkTest, ALongListSaysWhatTheyAre) {
     ASSERT_THAT(volume_->Set("a", Ascii("123")), Succeeded());
     ASSERT_THAT(volume_->Set(kFinderInfo, SomeFinderInfo()), Succeeded());
     ASSERT_THAT(volume_->Set(kFork, Pattern(4321)), Succeeded());
-    EXPECT_EQ("         3  attribute      a                       " + volume_->attribute_file() +
-                  "\n        32  Finder info    com.apple.FinderInfo    " + volume_->finder_file() +
-                  "\n      4321  resource fork  com.apple.ResourceFork  " + volume_->finder_file() +
-                  "\n",
-              volume_->Run({"list", "-l", volume_->object()}).out);
+    EXPECT_EQ(
+        "         3  attribute      a                       " + volume_->attribute_file() +
+            "\n        32  Finder info    com.apple.FinderInfo    " + volume_->finder_info_file() +
+            "\n      4321  resource fork  com.apple.ResourceFork  " + volume_->finder_file() + "\n",
+        volume_->Run({"list", "-l", volume_->object()}).out);
     const auto json = volume_->Run({"list", "--json", volume_->object()}).json();
     EXPECT_EQ("Finder info", json[0]["attributes"][1]["kind"]);
     EXPECT_EQ("resource fork", json[0]["attributes"][2]["kind"]);

@@ -59,10 +59,14 @@ class Volume {
     std::string attribute_file() const {
         return type_ == "0" || type_ == "5" ? apple_double() : stream();
     }
+    // Where Finder info is looked for first.
+    std::string finder_info_file() const { return type_ == "2" ? object() : finder_file(); }
     // Where Finder info and resource fork go.
     std::string finder_file() const {
         return type_ == "0" || type_ == "5" ? apple_double() : resource();
     }
+
+    int type() const { return std::stoi(type_); }
 
     // The tool with the volume declared.
     ToolResult Run(Arguments arguments, const std::string& input = {}, Limits limits = {}) const {
@@ -84,6 +88,12 @@ class Volume {
 
 // Whether files in that directory keep extended attributes of users.
 bool KeepsUserAttributes(const std::string& directory);
+
+// Records, marks and flush times of files are attributes of users.
+#define MAVOEA_SKIP_WITHOUT_ATTRIBUTES(directory)                                            \
+    if (!KeepsUserAttributes(directory)) {                                                   \
+        GTEST_SKIP() << "files in " << directory << " keep no extended attributes of users"; \
+    }
 
 // Making EA directories takes the superuser.
 #define MAVOEA_SKIP_UNLESS_ROOT()                                                         \

@@ -1,0 +1,187 @@
+// Resource files that wrongly hold attributes.
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <filesystem>
+
+#include "tests/support/mac_files.h"
+#include "tests/support/stream_builder.h"
+#include "tests/tool/tool.h"
+
+namespace mavoea::test {
+namespace {
+
+using ::testing::HasSubstr;
+
+const std::string kFinderInfo = "com.apple.FinderInfo";
+const std::string kFork = "com.apple.ResourceFork";
+
+std::string Counts(int repaired, int nothing, int failed) {
+    return std::to_string(repaired) + " repaired, " + std::to_string(nothing) +
+           " with nothing to repair, " + std::to_string(failed) + " failed\n";
+}
+
+class RepairTest : public ::testing::TestWithParam<int> {
+ protected:
+    void SetUp() override {
+        MAVOEA_SKIP_UNLESS_ROOT();
+        std::filesystem::create_directory(volume_.path() + "/@eaDir");
+    }
+
+    ToolResult Repair() const { return volume_.Run({"repair", volume_.object()}); }
+
+    Volume volume_{GetParam()};
+};
+
+INSTANTIATE_TEST_SUITE_P(VolumeTypes, RepairTest, ::testing::Values(1, 2, 3, 6, 10),
+                         [](const auto& tested) { return "Type" + std::to_string(tested.param); });
+
+TEST_P(RepairTest, AttributesGoIntoTheStreamAndTheRestStays) {
+    for (const MacFile& file : AllMacFiles()) {
+        SCOPED_TRACE(file.layout);
+        const bool holds = !file.contents.attributes.empty();
+        WriteFile(volume_.resource(), file.bytes);
+        const ToolResult result = Repair();
+        EXPECT_THAT(result, Succeeded());
+        EXPECT_EQ(holds ? Counts(1, 0, 0) : Counts(0, 1, 0), result.out);
+        if (!holds) {
+            EXPECT_EQ(file.bytes, ReadFile(volume_.resource()));
+            continue;
+        }
+        for (const auto& [name, value] : file.contents.attributes) {
+            EXPECT_EQ(value, volume_.Get(name).bytes()) << name;
+        }
+        const auto left = ReadMacFile(ReadFile(volume_.resource()));
+        ASSERT_TRUE(left);
+        EXPECT_EQ((MacContents{{}, file.contents.finder_info, file.ForkInUse()}), *left);
+        EXPECT_EQ(Counts(0, 1, 0), Repair().out);
+    }
+}
+
+TEST_P(RepairTest, AValueThatWasLongerInTheStreamDoesNotKeepItsEnd) {
+    ASSERT_THAT(volume_.Set("a", Ascii("a long value")), Succeeded());
+    ASSERT_THAT(volume_.Set("other", Ascii("stays")), Succeeded());
+    WriteFile(volume_.resource(), StreamImage{.attributes = {{"a", Ascii("new")}}}.Build());
+    EXPECT_EQ(Counts(1, 0, 0), Repair().out);
+    EXPECT_EQ("new", volume_.Get("a").out);
+    EXPECT_EQ("stays", volume_.Get("other").out);
+}
+
+TEST_P(RepairTest, ObjectsWithoutAResourceFileHaveNothingToRepair) {
+    EXPECT_THAT(Repair(), Succeeded());
+    EXPECT_EQ(Counts(0, 1, 0), Repair().out);
+    WriteFile(volume_.resource(), {});
+    EXPECT_EQ(Counts(0, 1, 0), Repair().out);
+    EXPECT_EQ(Bytes(), ReadFile(volume_.resource()));
+    EXPECT_FALSE(Exists(volume_.stream()));
+}
+
+TEST_P(RepairTest, AFileThatWouldLoseAnEntryIsNotChanged) {
+    // The attribute header is where it always is; Finder info at 240, a comment at 280.
+    Bytes file =
+        Hex("00 05 16 07  00 02 00 00  00*16  00 03 "
+            "00 00 00 09  00 00 00 F0  00 00 00 28 "
+            "00 00 00 02  00 00 01 1F  00 00 00 04 "
+            "00 00 00 04  00 00 01 18  00 00 00 07 "
+            "00*20 00 00 'ATTR' 00 00 00 00 "
+            "00 00 00 8B  00 00 00 88  00 00 00 03  00*12  00 00 00 01 "
+            "00 00 00 88  00 00 00 03  00 00  02  'a' 00  00 00 00 'xyz'");
+    file.resize(240);
+    file = file + Pattern(40) + Ascii("commentfork");
+    WriteFile(volume_.resource(), file);
+    const ToolResult result = Repair();
+    EXPECT_EQ(2, result.status);
+    EXPECT_EQ(Counts(0, 0, 1), result.out);
+    EXPECT_EQ("mavoea: " + volume_.resource() +
+                  ": a repair would lose its comment; move the file away if that is no loss\n",
+              result.err);
+    EXPECT_EQ(file, ReadFile(volume_.resource()));
+    EXPECT_FALSE(Exists(volume_.stream()));
+
+    // Without any bytes the comment is no loss, but then there are still three entries.
+    PutU32(file, 58, 0);
+    WriteFile(volume_.resource(), file);
+    EXPECT_THAT(Repair().err,
+                HasSubstr(": it has 3 entries; only files of 2 or 13 can be repaired; "));
+    EXPECT_EQ(file, ReadFile(volume_.resource()));
+}
+
+TEST_P(RepairTest, DamageChangesNothing) {
+    const StreamImage image{.attributes = {{"a", Ascii("one")}, {"b", Pattern(50)}},
+                            .fork = Pattern(100)};
+    const Bytes whole = image.Build();
+    Bytes file = whole;
+    PutU32(file, image.RecordAt(1), 0x7FFFFFFF);
+    WriteFile(volume_.resource(), file);
+    EXPECT_THAT(Repair().err, HasSubstr(": damaged: attribute \"b\" passes the end of the file; "));
+    EXPECT_EQ(file, ReadFile(volume_.resource()));
+    for (std::size_t size = 121; size < whole.size(); size += 11) {
+        file.assign(whole.begin(), whole.begin() + static_cast<std::ptrdiff_t>(size));
+        WriteFile(volume_.resource(), file);
+        EXPECT_EQ(2, Repair().status) << size;
+        EXPECT_EQ(file, ReadFile(volume_.resource())) << size;
+    }
+    EXPECT_FALSE(Exists(volume_.stream()));
+    WriteFile(volume_.resource(), Ascii("no AppleDouble file, but text"));
+    EXPECT_THAT(Repair().err, HasSubstr(": no AppleDouble file; "));
+}
+
+TEST_P(RepairTest, ALinkInTheResourceFilesPlaceIsNotFollowed) {
+    const std::string target = volume_.path() + "/target";
+    const Bytes file = StreamImage{.attributes = {{"a", Ascii("secret")}}}.Build();
+    WriteFile(target, file);
+    std::filesystem::create_symlink(target, volume_.resource());
+    EXPECT_EQ("mavoea: " + volume_.resource() + ": not a regular file; move it away\n",
+              Repair().err);
+    EXPECT_EQ(file, ReadFile(target));
+    EXPECT_EQ("", volume_.List().out);
+}
+
+TEST_P(RepairTest, ATreeIsRepairedThoughSomeOfItFails) {
+    namespace fs = std::filesystem;
+    const std::string sub = volume_.path() + "/sub";
+    fs::create_directories(sub + "/@eaDir");
+    const Bytes file =
+        StreamImage{.attributes = {{"a", Ascii("1")}}, .fork = Ascii("fork")}.Build();
+    for (const char* name : {"bad", "good"}) WriteFile(sub + "/" + name, {});
+    WriteFile(sub + "/@eaDir/bad@MavoResource", Ascii("text"));
+    WriteFile(sub + "/@eaDir/good@MavoResource", file);
+    WriteFile(volume_.path() + "/@eaDir/sub@MavoResource", file);
+    WriteFile(volume_.resource(), file);
+    const ToolResult result = volume_.Run({"--json", "repair", "-r", volume_.path()});
+    EXPECT_EQ(2, result.status);
+    const auto json = result.json();
+    EXPECT_EQ("repairing", json["task"]);
+    EXPECT_EQ(3, json["done"]);
+    EXPECT_EQ(1, json["nothing"]);
+    EXPECT_EQ(1, json["failed"]);
+    EXPECT_FALSE(json.contains("current"));
+    EXPECT_EQ(sub + "/bad", json["failures"][0]["path"]);
+    EXPECT_EQ("mavoea: " + json["failures"][0]["message"].get<std::string>() + "\n", result.err);
+    EXPECT_EQ("1", volume_.Run({"get", sub + "/good", "a"}).out);
+    EXPECT_EQ("1", volume_.Run({"get", sub, "a"}).out);
+    EXPECT_EQ("1", volume_.Get("a").out);
+}
+
+TEST(RepairElsewhereTest, OtherVolumesAreToldSo) {
+    for (const int type : {0, 5, 7}) {
+        const Volume volume(type);
+        const ToolResult result = volume.Run({"repair", volume.object()});
+        EXPECT_EQ(2, result.status);
+        EXPECT_THAT(result.err, HasSubstr(": volumes of type " + std::to_string(type)));
+        EXPECT_THAT(result.err, HasSubstr(", keep no EA directory; "));
+    }
+    for (const int type : {4, 8, 9, 11, 12}) {
+        const Volume volume(type);
+        const ToolResult result = volume.Run({"repair", "-r", volume.path()});
+        EXPECT_EQ(2, result.status);
+        EXPECT_EQ(Counts(0, 0, 1), result.out) << "once, not for everything below";
+        EXPECT_THAT(result.err,
+                    HasSubstr("volumes of type " + std::to_string(type) + " keep no metadata"));
+    }
+}
+
+}  // namespace
+}  // namespace mavoea::test

@@ -1,0 +1,257 @@
+#include "tools/tree.h"
+
+#include <dirent.h>
+#include <sys/ioctl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <chrono>
+#include <cstdint>
+#include <iostream>
+#include <memory>
+
+#include "include/mavoea.h"
+#include "tools/file.h"
+#include "tools/output.h"
+#include "tools/text.h"
+
+namespace mavoea::tool {
+namespace {
+
+// ---- Progress -----------------------------------------------------------------------------------
+
+// One line on a terminal, rewritten now and then; nothing anywhere else.
+class Progress {
+ public:
+    explicit Progress(const char* doing) : doing_(doing), on_(::isatty(STDERR_FILENO) == 1) {}
+    ~Progress() { Clear(); }
+    Progress(const Progress&) = delete;
+    Progress& operator=(const Progress&) = delete;
+
+    void Show(std::uint64_t done, std::uint64_t failed, const std::string& path) {
+        using std::chrono::steady_clock;
+        constexpr std::chrono::milliseconds kInterval(100);
+        if (!on_) return;
+        const auto now = steady_clock::now();
+        if (shown_ && now - last_ < kInterval) return;
+        last_ = now;
+        shown_ = true;
+        std::string line = std::string(doing_) + ": " + std::to_string(done) + " done, ";
+        if (failed > 0) line += std::to_string(failed) + " failed, ";
+        Write('\r' + Cut(line + Printable(path)) + kEraseRest);
+    }
+
+    void Clear() {
+        if (shown_) Write(std::string("\r") + kEraseRest);
+        shown_ = false;
+    }
+
+ private:
+    static constexpr const char* kEraseRest = "\x1b[K";
+
+    // To the terminal's width, whole characters of UTF-8.
+    static std::string Cut(std::string line) {
+        constexpr std::size_t kUsual = 80;
+        winsize size{};
+        const bool known = ::ioctl(STDERR_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 1;
+        std::size_t room = (known ? size.ws_col : kUsual) - 1;
+        if (line.size() <= room) return line;
+        while (room > 0 && (static_cast<unsigned char>(line[room]) & 0xC0) == 0x80) --room;
+        line.resize(room);
+        return line;
+    }
+
+    static void Write(const std::string& text) { std::cerr << text << std::flush; }
+
+    const char* doing_;
+    bool on_;
+    bool shown_ = false;
+    std::chrono::steady_clock::time_point last_{};
+};
+
+// ---- Directories --------------------------------------------------------------------------------
+
+// A symbolic link is none, wherever it points.
+bool IsDirectory(const std::string& path) {
+    struct stat info;
+    return ::lstat(path.c_str(), &info) == 0 && S_ISDIR(info.st_mode);
+}
+
+// Whether what lies in a directory under that name is an object.
+bool IsObject(const std::string& name, const struct stat& info) {
+    if (S_ISLNK(info.st_mode)) return false;
+    if (MAVOEAIsHiddenDirName(name.c_str()) != 0 || MAVOEAIsHiddenName(name.c_str()) != 0) {
+        return false;
+    }
+    return S_ISDIR(info.st_mode) || !name.starts_with("._");
+}
+
+// All names in it, sorted, before anything in it changes.
+std::vector<std::string> NamesIn(const std::string& directory) {
+    const std::unique_ptr<DIR, int (*)(DIR*)> dir(::opendir(directory.c_str()), ::closedir);
+    if (!dir) throw SystemFailure(directory, errno);
+    std::vector<std::string> names;
+    for (;;) {
+        errno = 0;
+        const dirent* const entry = ::readdir(dir.get());
+        if (entry == nullptr) break;
+        const std::string_view name = entry->d_name;
+        if (name != "." && name != "..") names.emplace_back(name);
+    }
+    if (errno != 0) throw SystemFailure(directory, errno);
+    std::sort(names.begin(), names.end());
+    return names;
+}
+
+// ---- The work -----------------------------------------------------------------------------------
+
+class Walk {
+ public:
+    explicit Walk(const Task& task) : task_(task), progress_(task.doing) {}
+
+    void Do(const std::string& path, bool recursive) {
+        Object object;
+        try {
+            object = FindObject(path);
+        } catch (const Failure& failure) {
+            Add(path, failure);
+            return;
+        }
+        if (!recursive || !IsDirectory(object.path)) {
+            (void)DoObject(object);
+            return;
+        }
+        // The root has no directory to keep metadata in.
+        if (object.path == "/" || DoObject(object)) DoTree(object.path);
+    }
+
+    ExitStatus Summarize(bool json) {
+        progress_.Clear();
+        if (json) {
+            PrintJson();
+        } else {
+            PrintText();
+        }
+        return status_;
+    }
+
+ private:
+    struct FailedObject {
+        std::string path;
+        std::string message;
+    };
+
+    // Everything below a directory, which is done already. No depth takes more than the heap.
+    void DoTree(const std::string& top) {
+        std::vector<std::string> pending = {top};
+        while (!pending.empty()) {
+            const std::string directory = std::move(pending.back());
+            pending.pop_back();
+            try {
+                const std::size_t first = pending.size();
+                DoDirectory(directory, &pending);
+                std::reverse(pending.begin() + static_cast<std::ptrdiff_t>(first), pending.end());
+            } catch (const Failure& failure) {
+                AddIfThere(directory, failure);
+            }
+        }
+    }
+
+    void DoDirectory(const std::string& directory, std::vector<std::string>* pending) {
+        const std::string prefix = directory == "/" ? directory : directory + '/';
+        for (const std::string& name : NamesIn(directory)) {
+            const std::string path = prefix + name;
+            try {
+                struct stat info;
+                if (::lstat(path.c_str(), &info) != 0) throw SystemFailure(path, errno);
+                if (!IsObject(name, info)) continue;
+                if (DoObject(FindObject(path)) && S_ISDIR(info.st_mode)) pending->push_back(path);
+            } catch (const Failure& failure) {
+                AddIfThere(path, failure);
+            }
+        }
+    }
+
+    // False when what is below it would fail for the same reason.
+    bool DoObject(const Object& object) {
+        progress_.Show(Total(), failures_.size(), object.path);
+        bool suits = false;
+        try {
+            task_.check(object);
+            suits = true;
+            ++counts_[static_cast<std::size_t>(task_.work(object, &notes_))];
+        } catch (const Failure& failure) {
+            Add(object.path, failure);
+        }
+        return suits;
+    }
+
+    // Nothing is wrong with what has gone since its directory was read.
+    void AddIfThere(const std::string& path, const Failure& failure) {
+        if (failure.status() != kNotFound || Exists(path)) Add(path, failure);
+    }
+
+    void Add(const std::string& path, const Failure& failure) {
+        failures_.push_back({path, failure.what()});
+        status_ = std::max(status_, failure.status());
+    }
+
+    std::uint64_t Total() const { return counts_[0] + counts_[1] + counts_[2]; }
+
+    // The words of the outcomes that can be, in the order of Outcome.
+    std::array<const char*, 3> Words() const { return {task_.done, task_.current, task_.nothing}; }
+
+    void PrintText() const {
+        for (std::size_t i = 0; i < counts_.size(); ++i) {
+            if (Words()[i] != nullptr) std::cout << counts_[i] << ' ' << Words()[i] << ", ";
+        }
+        std::cout << failures_.size() << " failed\n";
+        for (const std::string& note : notes_) Note(note);
+        for (const FailedObject& failed : failures_) Report(failed.message);
+    }
+
+    void PrintJson() const {
+        constexpr std::array<const char*, 3> kKeys = {"done", "current", "nothing"};
+        Json json;
+        json["task"] = task_.doing;
+        for (std::size_t i = 0; i < counts_.size(); ++i) {
+            if (Words()[i] != nullptr) json[kKeys[i]] = counts_[i];
+        }
+        json["failed"] = failures_.size();
+        json["notes"] = Json::array();
+        for (const std::string& note : notes_) {
+            Json item;
+            SetText(item, "message", note);
+            json["notes"].push_back(std::move(item));
+        }
+        json["failures"] = Json::array();
+        for (const FailedObject& failed : failures_) {
+            Json item;
+            SetText(item, "path", failed.path);
+            SetText(item, "message", failed.message);
+            json["failures"].push_back(std::move(item));
+        }
+        Print(json);
+        for (const FailedObject& failed : failures_) Report(failed.message);
+    }
+
+    const Task& task_;
+    Progress progress_;
+    std::array<std::uint64_t, 3> counts_{};  // by Outcome
+    Notes notes_;
+    std::vector<FailedObject> failures_;
+    ExitStatus status_ = kSuccess;
+};
+
+}  // namespace
+
+ExitStatus RunOnTree(const TreeOptions& options, const Task& task) {
+    Walk walk(task);
+    for (const std::string& path : options.paths) walk.Do(path, options.recursive);
+    return walk.Summarize(options.json);
+}
+
+}  // namespace mavoea::tool
