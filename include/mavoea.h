@@ -426,6 +426,43 @@ MAVOEA_API int MAVOEAFixErrorAD(const char* path);
  * 0xA00, 0x4000 no AppleDouble file, or one without them. */
 MAVOEA_API int MAVOEAUpgrade(const char* szPath, const char* szName);
 
+/* ---- Remove and rename ----------------------------------------------------------------------- */
+/* For a file service to call with what it does to the object itself. `fsType` is a volume's type as
+ * MAVOGetFSType() gives it, or -1 to have it asked; the platform's indexes are told of the change.
+ */
+
+/* Removes the metadata of szPath's object and, should nothing else be in it, its EA directory. On
+ * types 0 and 5 that is the "._" file, on 1, 2, 3, 6 and 10 what is in the EA directory in both
+ * forms (and the object's archive bit is set), on 7 nothing; other types do nothing at all. 0, or
+ * -1, with all done that could be: 0xD00 NULL; 0x2A00 the type (of the parent directory's volume)
+ * could not be told; 0x3900 something could not be removed; the path functions' codes. */
+MAVOEA_API int MAVOEARemove(const char* szPath, int fsType, EAIndexFlags* pFlags);
+
+/* The same, for both indexes, but the EA stream stays. */
+MAVOEA_API int MAVOEARemoveWithoutEAStream(const char* szPath, int fsType);
+
+/* Removes what one form of the EA directory holds for the object: the legacy folder with its files,
+ * or resource file and stream; then the EA directory if nothing is left in it. 0, also when there
+ * was nothing; -1: 0x3900, or logged; the path functions' codes. A folder that cannot be opened is
+ * left, with 0x900 and result 0. */
+MAVOEA_API int EARemove(int form, const char* szPath);
+
+/* Removes the EA directory in or at szMetaPath (up to its first "@eaDir") if nothing but a regular
+ * file ".cover" is left in it. 0 when it is gone, or was not there; -1 when it stays. No codes. */
+MAVOEA_API int EARemoveEADir(const char* szMetaPath);
+
+/* Removes the EA directory, with all that is in it, of a directory that holds nothing else. */
+MAVOEA_API void MAVOEARemoveDanglingEADir(const char* szDir);
+
+/* Moves the metadata of an object that has been renamed from szOldPath to szNewPath, over what is
+ * there; legacy layouts become current ones on the way. The type is that of szNewPath, which must
+ * be absolute for it to be asked. Types 0 and 5: 0, whatever became of the "._" file. Types 1, 2,
+ * 3, 6, 7 and 10: the sum of three moves, each 0, -1 or the exit status of "/bin/mv" where it takes
+ * that to reach another volume; the archive bit is set at szNewPath. Other types do nothing.
+ * Negative: 0xD00 NULL; 0x2800 rename; the codes of paths, EA directories and the upgrade. */
+MAVOEA_API int MAVOEARename(const char* szOldPath, const char* szNewPath, int fsType,
+                            EAIndexFlags* pFlags);
+
 #ifdef __cplusplus
 }
 #endif

@@ -12,6 +12,7 @@
 
 #include "format/apple_double.h"
 #include "include/mavoea.h"
+#include "ops/folder.h"
 #include "platform/file_status.h"
 #include "platform/include/mavocore.h"
 #include "platform/marks.h"
@@ -50,46 +51,15 @@ int RemoveFolder(const char* folder, int result, int line = __builtin_LINE()) {
 
 // ---- Attribute files ----------------------------------------------------------------------------
 
-// A directory that is read entry by entry.
-class Folder {
- public:
-    explicit Folder(const char* path) : dir_(kernel::Opendir(path)) {}
-    ~Folder() { Close(); }
-    Folder(const Folder&) = delete;
-    Folder& operator=(const Folder&) = delete;
-
-    explicit operator bool() const { return dir_ != nullptr; }
-    int fd() const { return kernel::Dirfd(dir_); }
-    void Rewind() { kernel::Rewinddir(dir_); }
-
-    // The next entry's name, valid until the next call; nullptr at the end.
-    const char* Next() {
-        while (const dirent* const entry = kernel::Readdir(dir_)) {
-            const std::string_view name = entry->d_name;
-            if (name != "." && name != "..") return entry->d_name;
+// The next attribute file of a legacy folder: not one of the reserved names. nullptr at the end.
+const char* NextAttribute(Folder* folder) {
+    while (const char* const name = folder->Next()) {
+        if (!std::string_view(name).starts_with(kReserved) && strchr(name, ':') == nullptr) {
+            return name;
         }
-        return nullptr;
     }
-
-    // The next attribute file's name: not one of the reserved ones.
-    const char* NextAttribute() {
-        while (const char* const name = Next()) {
-            if (!std::string_view(name).starts_with(kReserved) && strchr(name, ':') == nullptr) {
-                return name;
-            }
-        }
-        return nullptr;
-    }
-
-    void Close() {
-        const ErrnoKeeper keep;
-        if (dir_ != nullptr) (void)kernel::Closedir(dir_);
-        dir_ = nullptr;
-    }
-
- private:
-    DIR* dir_;
-};
+    return nullptr;
+}
 
 // The process in another directory, until Return().
 class WorkingDirectory {
@@ -132,7 +102,7 @@ std::optional<std::int64_t> LatestAccess(Folder* folder) {
     }
     std::int64_t latest = 0;
     if (directory.Enter(folder->fd())) {
-        while (const char* const name = folder->NextAttribute()) {
+        while (const char* const name = NextAttribute(folder)) {
             latest = std::max(latest, AccessTime(name));
         }
         if (!directory.Return()) {
@@ -208,7 +178,7 @@ int ImportAttributeFiles(const char* szPath, const char* stream_path, Folder* fo
     folder->Rewind();
     {
         AttributeImport import(szPath, stream);
-        while (const char* const name = folder->NextAttribute()) import.Move(name);
+        while (const char* const name = NextAttribute(folder)) import.Move(name);
     }
     (void)MAVOEASClose(stream);
     return kConverted;

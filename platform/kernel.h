@@ -40,10 +40,12 @@ int GetLock(int fd, struct flock64* lock);        // F_GETLK, 64-bit
 int MkdirAt(int dir, const char* path, mode_t mode);
 int Unlink(const char* path);
 int Rmdir(const char* path);
+int Remove(const char* path);
 int Rename(const char* from, const char* to);
 int Chmod(const char* path, mode_t mode);
 int Fchmod(int fd, mode_t mode);
 
+char* Getcwd(char* buffer, size_t size);
 int Chdir(const char* path);
 int Fchdir(int dir);
 DIR* Opendir(const char* path);

@@ -325,6 +325,10 @@ int Rmdir(const char* path) {
     return Call("rmdir", Text(path), -1, [&] { return ::rmdir(path); });
 }
 
+int Remove(const char* path) {
+    return Call("remove", Text(path), -1, [&] { return ::remove(path); });
+}
+
 int Rename(const char* from, const char* to) {
     return Call("rename", Text(from) + ", " + Text(to), -1, [&] { return ::rename(from, to); });
 }
@@ -336,6 +340,11 @@ int Chmod(const char* path, mode_t mode) {
 
 int Fchmod(int fd, mode_t mode) {
     return Call("fchmod", Octal(mode), -1, [&] { return ::fchmod(fd, mode); });
+}
+
+char* Getcwd(char* buffer, size_t size) {
+    return Call("getcwd", Number(static_cast<long long>(size)), static_cast<char*>(nullptr),
+                [&] { return ::getcwd(buffer, size); });
 }
 
 int Chdir(const char* path) {

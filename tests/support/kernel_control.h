@@ -3,10 +3,11 @@
 //
 // Call names are the C library's in lower case: "open", "close", "pread", "preadv", "pwrite",
 // "pwritev", "lseek", "ftruncate", "fsync", "sync", "fstat", "stat", "lstat", "access",
-// "setlock", "getlock", "mkdir", "unlink", "rmdir", "rename", "chmod", "fchmod", "chdir", "fchdir",
-// "opendir", "readdir", "rewinddir", "closedir", "geteuid", "seteuid", "getpid", "time", "system",
-// "listxattr", "getxattr", "setxattr", "removexattr", "fopen", "fread", "fwrite", "fclose",
-// "archive", "command" (the platform's system call 403), "malloc" (every allocation).
+// "setlock", "getlock", "mkdir", "unlink", "rmdir", "remove", "rename", "chmod", "fchmod",
+// "getcwd", "chdir", "fchdir", "opendir", "readdir", "rewinddir", "closedir", "geteuid", "seteuid",
+// "getpid", "time", "system", "listxattr", "getxattr", "setxattr", "removexattr", "fopen", "fread",
+// "fwrite", "fclose", "archive", "command" (the platform's system call 403), "malloc" (every
+// allocation).
 #ifndef MAVOEA_TESTS_SUPPORT_KERNEL_CONTROL_H_
 #define MAVOEA_TESTS_SUPPORT_KERNEL_CONTROL_H_
 

@@ -1,0 +1,52 @@
+// A directory that is read entry by entry.
+#ifndef MAVOEA_OPS_FOLDER_H_
+#define MAVOEA_OPS_FOLDER_H_
+
+#include <string_view>
+
+#include "platform/kernel.h"
+#include "util/unit.h"
+
+namespace mavoea {
+
+class Folder {
+ public:
+    // Empty, with errno, when it cannot be opened.
+    explicit Folder(const char* path) : dir_(kernel::Opendir(path)) {}
+    ~Folder() { Close(); }
+    Folder(const Folder&) = delete;
+    Folder& operator=(const Folder&) = delete;
+
+    explicit operator bool() const { return dir_ != nullptr; }
+    int fd() const { return kernel::Dirfd(dir_); }
+    void Rewind() { kernel::Rewinddir(dir_); }
+
+    // The next entry, "." and ".." among them; nullptr at the end.
+    const dirent* NextOfAll() { return kernel::Readdir(dir_); }
+
+    // The next entry other than "." and "..", valid until the next call; nullptr at the end.
+    const dirent* NextEntry() {
+        while (const dirent* const entry = NextOfAll()) {
+            const std::string_view name = entry->d_name;
+            if (name != "." && name != "..") return entry;
+        }
+        return nullptr;
+    }
+    const char* Next() {
+        const dirent* const entry = NextEntry();
+        return entry == nullptr ? nullptr : entry->d_name;
+    }
+
+    void Close() {
+        const ErrnoKeeper keep;
+        if (dir_ != nullptr) (void)kernel::Closedir(dir_);
+        dir_ = nullptr;
+    }
+
+ private:
+    DIR* dir_;
+};
+
+}  // namespace mavoea
+
+#endif  // MAVOEA_OPS_FOLDER_H_
