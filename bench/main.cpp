@@ -84,6 +84,7 @@ std::vector<Row> AllRows(const Options& options) {
     AddListRows(tmpfs, &rows);
     for (const Place& place : {disk, tmpfs}) AddStreamRows(place, tmpfs, &rows);
     for (const Place& place : {disk, tmpfs}) AddForkRows(place, &rows);
+    for (const Place& place : {disk, tmpfs}) AddObjectRows(place, &rows);
     return rows;
 }
 

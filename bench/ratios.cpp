@@ -37,8 +37,17 @@ struct Pair {
     double floor = 0;
 };
 
+Pair MeasureConsumed(const Row& row, bool library_first) {
+    Pair pair;
+    if (library_first) pair.library = Time(row, row.library(), row.batch);
+    pair.floor = Time(row, row.floor(), row.batch);
+    if (!library_first) pair.library = Time(row, row.library(), row.batch);
+    return pair;
+}
+
 Pair MeasurePair(const Row& row, const Work& library, const Work& floor, std::int64_t batch,
                  bool library_first) {
+    if (row.consumes) return MeasureConsumed(row, library_first);
     Pair pair;
     for (int i = 0; i < row.goes; ++i) {
         if (library_first) pair.library += Time(row, library, batch);
@@ -94,8 +103,8 @@ void PrintRow(const Row& row, const std::vector<Pair>& pairs, double times) {
 }
 
 void MeasureRow(const Row& row) {
-    const Work library = row.library();
-    const Work floor = row.floor();
+    const Work library = row.consumes ? Work() : row.library();
+    const Work floor = row.consumes ? Work() : row.floor();
     const std::int64_t batch = row.batch != 0 ? row.batch : BatchFor(row, library, floor);
 
     std::vector<Pair> pairs;

@@ -33,6 +33,8 @@ struct Row {
     std::int64_t batch = 0;
     // How many such goes make one measurement, where doing it later costs more than at first.
     int goes = 1;
+    // The work uses up what it was prepared for: every go gets its own, of one batch.
+    bool consumes = false;
 };
 
 // A directory on a filesystem to measure on.
@@ -50,6 +52,7 @@ void AddNameRows(std::vector<Row>* rows);
 void AddListRows(const Place& fast, std::vector<Row>* rows);
 void AddStreamRows(const Place& place, const Place& fast, std::vector<Row>* rows);
 void AddForkRows(const Place& place, std::vector<Row>* rows);
+void AddObjectRows(const Place& place, std::vector<Row>* rows);
 
 // Throws std::runtime_error, which names `what` and errno, unless `held`.
 void Require(bool held, const std::string& what);

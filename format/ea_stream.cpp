@@ -39,6 +39,21 @@ StreamHeader NewStreamHeader() {
     return header;
 }
 
+std::array<std::uint8_t, kNewResourceSize> EncodeResourceHead(std::uint32_t fork_length) {
+    std::array<std::uint8_t, kNewResourceSize> bytes{};
+    BeWriter out(bytes);
+    EncodeAppleDoubleHeader(
+        {.magic = kAppleDoubleMagic,
+         .version = kAppleDoubleVersion2,
+         .filler = {'M', 'A', 'V', 'O', 'N', 'I', 'C', 'S', ' ', ' ', ' ', ' ', ' ', ' ', ' ', ' '},
+         .entry_count = 2},
+        out);
+    EncodeEntryDescriptor({EntryId::kFinderInfo, {kFinderInfoOffset, kFinderInfoSize}}, out);
+    EncodeEntryDescriptor(
+        {EntryId::kResourceFork, {kFinderInfoOffset + kFinderInfoSize, fork_length}}, out);
+    return bytes;
+}
+
 StreamHeader DecodeStreamHeader(std::span<const std::uint8_t, kStreamHeaderSize> bytes) {
     BeReader in(bytes);
     StreamHeader header;

@@ -65,6 +65,12 @@ struct StreamHeader {
 // What a stream without attributes, Finder info and fork has.
 StreamHeader NewStreamHeader();
 
+// The head of a resource file that is made from attributes: the AppleDouble header, the descriptors
+// of Finder info and of a fork of that length, and the places for the Finder info and the fork's
+// first two bytes.
+inline constexpr std::size_t kNewResourceSize = 84;
+std::array<std::uint8_t, kNewResourceSize> EncodeResourceHead(std::uint32_t fork_length);
+
 // The attribute header of an AppleDouble file that has no attribute area.
 AttributeHeader NoAttributes();
 

@@ -426,7 +426,7 @@ MAVOEA_API int MAVOEAFixErrorAD(const char* path);
  * 0xA00, 0x4000 no AppleDouble file, or one without them. */
 MAVOEA_API int MAVOEAUpgrade(const char* szPath, const char* szName);
 
-/* ---- Remove and rename ----------------------------------------------------------------------- */
+/* ---- Remove, rename and copy ----------------------------------------------------------------- */
 /* For a file service to call with what it does to the object itself. `fsType` is a volume's type as
  * MAVOGetFSType() gives it, or -1 to have it asked; the platform's indexes are told of the change.
  */
@@ -462,6 +462,29 @@ MAVOEA_API void MAVOEARemoveDanglingEADir(const char* szDir);
  * Negative: 0xD00 NULL; 0x2800 rename; the codes of paths, EA directories and the upgrade. */
 MAVOEA_API int MAVOEARename(const char* szOldPath, const char* szNewPath, int fsType,
                             EAIndexFlags* pFlags);
+
+/* Carries the metadata of szSrc's object to szDst, where the caller has copied its data, or moved
+ * it when `move` is not 0: attributes, resource fork, Finder info, netatalk record, the other files
+ * that the EA directory holds for the object and the Mac lock. What was moved is removed at the
+ * source; on types 7 only a `move` of exactly 1 removes the source's resource file.
+ *
+ * szDst is written to for a moment where its type is asked (of its parent directory). copyEADir not
+ * 0 carries the other files of the EA directory; between volumes none of which keeps "._" files
+ * they always are, and replace those at the destination. copyFn copies single metadata files and
+ * returns a negative value on failure; NULL runs "/bin/cp" and "/bin/mv". updateFileIndex and
+ * updateIndex tell the two indexes, also of what failed.
+ *
+ * 0 when it is done, also when the destination's type takes no metadata and when only what follows
+ * the copy failed, which is logged; -1 or less: -1 failed, -3 the name is too long for a "._" file,
+ * -4 the source's type has no metadata, -32 and -33 a "._" name that clients do not take. What has
+ * been done stays done. */
+MAVOEA_API int MAVOEACopyEx(const char* szSrc, char* szDst, int move, int copyEADir, int srcFSType,
+                            int dstFSType, int updateFileIndex, int updateIndex,
+                            int (*copyFn)(const char* from, const char* to));
+
+/* The same with the external commands. */
+MAVOEA_API int MAVOEACopy(const char* szSrc, char* szDst, int move, int copyEADir, int srcFSType,
+                          int dstFSType, int updateFileIndex, int updateIndex);
 
 #ifdef __cplusplus
 }

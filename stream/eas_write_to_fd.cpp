@@ -6,7 +6,7 @@
 #include "include/mavoea.h"
 #include "stream/internal.h"
 #include "util/file_io.h"
-#include "util/owned.h"
+#include "util/growing_buffer.h"
 #include "util/unit.h"
 
 namespace mavoea {
@@ -17,9 +17,7 @@ constexpr Unit unit("eas_write_to_fd");
 // Values one after the other, in a buffer that grows to the longest.
 class ValueReader {
  public:
-    explicit ValueReader(int fd) : fd_(fd), file_size_(kernel::Lseek(fd, 0, SEEK_END)) {
-        Grow(kSizeAtFirst);
-    }
+    explicit ValueReader(int fd) : fd_(fd), file_size_(kernel::Lseek(fd, 0, SEEK_END)) {}
 
     // 0, or -1 after recording why.
     int Read(Range value) {
@@ -27,30 +25,19 @@ class ValueReader {
         if (value.length != 0 && std::cmp_greater(value.end(), file_size_)) {
             return unit.Fail(Err::kRead);
         }
-        if (value.length > size_ && !Grow(value.length)) return unit.Fail(Err::kBufferMemory);
-        if (ReadAt(fd_, {buffer_.get(), value.length}, value.offset) != value.length) {
+        if (!buffer_.Reach(value.length)) return unit.Fail(Err::kBufferMemory);
+        if (ReadAt(fd_, buffer_.First(value.length), value.offset) != value.length) {
             return unit.Fail(Err::kRead);
         }
         return 0;
     }
 
-    const std::uint8_t* bytes() const { return buffer_.get(); }
+    const std::uint8_t* bytes() const { return buffer_.data(); }
 
  private:
-    static constexpr std::uint32_t kSizeAtFirst = 1024;
-
-    // The old bytes are of no use: nothing is kept when there is no memory for more.
-    bool Grow(std::uint32_t size) {
-        buffer_ = Owned<std::uint8_t>();
-        buffer_ = Owned<std::uint8_t>::Allocate(size);
-        size_ = buffer_ ? size : 0;
-        return size_ != 0;
-    }
-
     int fd_;
     off_t file_size_;
-    Owned<std::uint8_t> buffer_;
-    std::uint32_t size_ = 0;
+    GrowingBuffer buffer_;
 };
 
 int CopyAttributes(const EASHandle& from, EASHandle* to) {

@@ -115,6 +115,15 @@ class Unit {
         Write(format.text(), format.line(), args...);
     }
 
+    // The same about a failure that another unit has recorded: the three arguments behind the first
+    // two are that record, the error stack's top.
+    template <class... Args>
+    void LogWrapped(LogFormat<int, const char*, int, std::type_identity_t<Args>...> format,
+                    Args... args) const {
+        Write(format.text(), format.line(), MLIBCErrGet(), MLIBCErrorGetFile(), MLIBCErrorGetLine(),
+              args...);
+    }
+
     // The same for a helper that logs in the name of the unit's line that called it.
     template <class... Args>
     void LogAt(int line, LogFormat<std::type_identity_t<Args>...> format, Args... args) const {
