@@ -648,6 +648,17 @@ TEST_F(EaRemoveTest, FilesOfEveryNameInTheLegacyFolderGo) {
     ExpectNothingReported();
 }
 
+TEST_F(EaRemoveTest, OfALinkInTheFoldersPlaceOnlyTheLinkGoes) {
+    const std::string elsewhere = dir_ / "elsewhere";
+    MakeDir(elsewhere);
+    WriteFile(elsewhere + "/precious", Ascii("another's"));
+    MakeDir(file_.ea_dir());
+    ASSERT_EQ(0, ::symlink(elsewhere.c_str(), file_.folder().c_str()));
+    EXPECT_EQ(0, RemoveForm(0));
+    EXPECT_THAT(Left(), ElementsAre("@eaDir/", "a.txt", "elsewhere/", "elsewhere/precious"));
+    ExpectNothingReported();
+}
+
 TEST_F(EaRemoveTest, AnEmptyLegacyFolderGoesAndTheEaDirectoryStays) {
     file_.MakeFolder();
     EXPECT_EQ(0, RemoveForm(0));
