@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
+#include <utility>
 
 #include "format/ea_stream.h"
 #include "include/mavoea.h"
@@ -91,12 +92,12 @@ int SetAttributes(int fd, const char* dst, GrowingBuffer* value) {
     for (unsigned i = 0; i < count; ++i) {
         const EASEntry& entry = stream->entries[i];
         const Range place = {entry.offset, entry.length};
+        // What the file cannot have takes no memory.
+        const bool here = place.length == 0 || std::cmp_less_equal(place.end(), file_size);
         Err code{};
-        if (place.length != 0 && std::cmp_greater(place.end(), file_size)) {
-            code = Err::kRead;  // takes no memory
-        } else if (!value->Reach(place.length)) {
+        if (here && !value->Reach(place.length)) {
             code = Err::kBufferMemory;
-        } else if (ReadAt(fd, value->First(place.length), place.offset) != place.length) {
+        } else if (!here || ReadAt(fd, value->First(place.length), place.offset) != place.length) {
             code = Err::kRead;
         } else if (MAVOEAXattrSet(dst, entry.name, value->data(), static_cast<int>(place.length),
                                   0) != 0) {

@@ -11,8 +11,8 @@ step() {
 }
 
 step packages
-sh tests/packages.sh g++ cmake ninja-build pkg-config libacl1-dev libcli11-dev nlohmann-json3-dev \
-    libgtest-dev libgmock-dev libbenchmark-dev acl attr binutils \
+sh tests/packages.sh g++ cmake ninja-build pkg-config libacl1-dev libattr1-dev libcli11-dev \
+    nlohmann-json3-dev libgtest-dev libgmock-dev libbenchmark-dev acl attr binutils \
     e2fsprogs xfsprogs btrfs-progs clang-format clang-tidy clang cppcheck git python3
 
 for preset in release sanitize; do

@@ -17,8 +17,13 @@ constexpr const char* kExamples = R"(Examples:
   mavoea remove letter.txt com.example.colour
   mavoea lock letter.txt
   mavoea import ._letter.txt letter.txt
+  mavoea cp -r /srv/share/letters /mnt/share
+  mavoea mv letter.txt /mnt/share
+  mavoea rm -r /srv/share/letters
   mavoea upgrade -r /srv/share
   mavoea repair -r /srv/share
+  mavoea clean -r /srv/share
+  mavoea convert -r --to appledouble /srv/share /mnt/share
   mavoea dump @eaDir/letter.txt@MavoEAStream
   mavoea dump --record letter.txt
 
@@ -26,7 +31,8 @@ Volume types: a number from 0 to 12, or appledouble (0), eadir (1), fileea (2), 
 Names like any other: com.apple.FinderInfo, com.apple.ResourceFork, and mavoea.locked, which is 1
 for a file that Macs may not write, rename or delete.
 Recursive work goes on after a failure, and tells at its end what failed.
-Exit status: 0 done; 1 not found, the object or the attribute; 2 anything else that went wrong.
+Exit status: 0 done; 1 not found, the object or the attribute; 2 anything else that went wrong;
+130 and 143: cp, mv or rm was interrupted, after the object in hand.
 A NAME or VALUE that begins with '-' stands behind "--". Control characters in names are shown as
 "\x0A", backslashes doubled; --json has names as they are.)";
 
@@ -63,6 +69,37 @@ void AddPaths(CLI::App* sub, Options* options) {
 void AddRecursive(CLI::App* sub, Options* options) {
     sub->add_flag("-r,--recursive", options->recursive,
                   "With all that is below directories; symbolic links are not followed");
+}
+
+// Of two that contradict each other the last counts.
+void AddConsent(CLI::App* sub, const char* flag, Consent consent, Options* options,
+                const char* what) {
+    sub->add_flag_callback(
+           flag, [=] { options->consent = consent; }, what)
+        ->trigger_on_parse();
+}
+
+// What cp, mv and rm share.
+void AddHabits(CLI::App* sub, Options* options) {
+    AddConsent(sub, "-i,--interactive", Consent::kAsk, options, "Ask before anything is lost");
+    AddConsent(sub, "-f,--force", Consent::kForce, options, "Never ask");
+    sub->add_flag("-v,--verbose", options->verbose, "Say what is done");
+}
+
+// What cp and mv share.
+void AddDestination(CLI::App* sub, Options* options) {
+    AddHabits(sub, options);
+    AddConsent(sub, "-n,--no-clobber", Consent::kNever, options, "Leave alone what is there");
+    CLI::Option* const directory =
+        sub->add_option_function<std::string>(
+               "-t,--target-directory",
+               [=](const std::string& path) { options->target_directory = path; },
+               "The directory to put all of them into")
+            ->type_name("DIR");
+    sub->add_flag("-T,--no-target-directory", options->no_target_directory,
+                  "DST is the new object itself, never the directory to put it into")
+        ->excludes(directory);
+    sub->add_option("PATH", options->paths, "SRC... DST, or SRC... with -t")->required();
 }
 
 void AddName(CLI::App* sub, Options* options) {
@@ -135,6 +172,26 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
     import->add_option("APPLEDOUBLE", options.apple_double, "An AppleDouble file")->required();
     AddPath(import, &options, "A file or directory");
 
+    CLI::App* const copy =
+        AddCommand(app, "cp", "Copy objects with data, permissions, times and metadata",
+                   Command::kCopy, &options);
+    copy->add_flag("-r,-R,-a,--recursive", options.recursive,
+                   "With all that is below directories; symbolic links are copied as such");
+    copy->add_flag_callback(
+        "-p,--preserve", [] {}, "Keep mode, owner and times, as is always done");
+    AddDestination(copy, &options);
+
+    CLI::App* const move = AddCommand(app, "mv", "Move or rename objects with their metadata",
+                                      Command::kMove, &options);
+    AddDestination(move, &options);
+
+    CLI::App* const del =
+        AddCommand(app, "rm", "Remove objects with their metadata", Command::kDelete, &options);
+    del->add_flag("-r,-R,--recursive", options.recursive,
+                  "With all that is in directories; symbolic links are not followed");
+    AddHabits(del, &options);
+    AddPaths(del, &options);
+
     CLI::App* const upgrade =
         AddCommand(app, "upgrade", "Convert what earlier versions kept into the current layout",
                    Command::kUpgrade, &options);
@@ -146,6 +203,32 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
                    Command::kRepair, &options);
     AddRecursive(repair, &options);
     AddPaths(repair, &options);
+
+    CLI::App* const clean =
+        AddCommand(app, "clean", "List metadata whose object is gone, and remove it with --yes",
+                   Command::kClean, &options);
+    AddRecursive(clean, &options);
+    clean->add_flag("--yes", options.yes, "Remove what is listed");
+    clean->add_flag("--all", options.all,
+                    "With what other services keep in EA directories for objects that are gone");
+    clean->add_option("DIR", options.paths, "Directories")->required();
+
+    CLI::App* const convert = AddCommand(
+        app, "convert", "Copy an object or a tree to a volume of another type, and compare the two",
+        Command::kConvert, &options);
+    AddRecursive(convert, &options);
+    convert->add_option("--to", options.to, "The type of DST's volume")
+        ->type_name("TYPE")
+        ->required();
+    convert->add_flag("--compare-only", options.compare_only, "Copy nothing, only compare");
+    convert
+        ->add_option_function<std::string>(
+            "SRC", [&](const std::string& path) { options.paths = {path}; }, "What to copy")
+        ->required();
+    convert
+        ->add_option("DST", options.destination,
+                     "The copy's own path, not that of the directory around it")
+        ->required();
 
     CLI::App* const dump =
         AddCommand(app, "dump", "Show and check every field of an EA stream or AppleDouble file",
@@ -170,6 +253,11 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
     for (std::string& volume : options.volumes) volume = Unguarded(std::move(volume));
     options.name = Unguarded(std::move(options.name));
     options.apple_double = Unguarded(std::move(options.apple_double));
+    options.destination = Unguarded(std::move(options.destination));
+    options.to = Unguarded(std::move(options.to));
+    if (options.target_directory) {
+        options.target_directory = Unguarded(*std::move(options.target_directory));
+    }
     if (options.value) options.value = Unguarded(*std::move(options.value));
     if (options.file) options.file = Unguarded(*std::move(options.file));
     return options;

@@ -7,6 +7,8 @@
 #include <variant>
 #include <vector>
 
+#include "tools/job.h"
+
 namespace mavoea::tool {
 
 enum class Command {
@@ -18,8 +20,13 @@ enum class Command {
     kLock,
     kUnlock,
     kImport,
+    kCopy,
+    kMove,
+    kDelete,
     kUpgrade,
     kRepair,
+    kClean,
+    kConvert,
     kDump
 };
 
@@ -30,12 +37,21 @@ struct Options {
 
     std::vector<std::string> paths;  // one, but for list, lock, unlock, upgrade and repair
     std::string name;
-    std::string apple_double;          // import
-    bool details = false;              // list -l
-    bool recursive = false;            // upgrade, repair
-    bool record = false;               // dump: the record of an object
-    bool hex = false;                  // get, set
-    std::optional<std::string> value;  // set: none of the two means standard input
+    std::string apple_double;                     // import
+    bool details = false;                         // list -l
+    bool recursive = false;                       // upgrade, repair, clean, convert
+    bool yes = false;                             // clean: what is listed is removed
+    bool all = false;                             // clean: things of other services, too
+    std::string to;                               // convert: the destination's volume type
+    std::string destination;                      // convert
+    bool compare_only = false;                    // convert
+    Consent consent = Consent::kUsual;            // cp, mv, rm: the last of -i, -f and -n
+    bool verbose = false;                         // cp, mv, rm
+    std::optional<std::string> target_directory;  // cp, mv
+    bool no_target_directory = false;             // cp, mv
+    bool record = false;                          // dump: the record of an object
+    bool hex = false;                             // get, set
+    std::optional<std::string> value;             // set: none of the two means standard input
     std::optional<std::string> file;
 };
 

@@ -8,6 +8,10 @@
 #include <iostream>
 
 #include "format/ea_stream.h"
+#include "tools/clean.h"
+#include "tools/convert.h"
+#include "tools/copy.h"
+#include "tools/delete.h"
 #include "tools/dump.h"
 #include "tools/file.h"
 #include "tools/import.h"
@@ -313,6 +317,9 @@ ExitStatus Run(const Options& options) {
         declarations.push_back(DeclareVolume(volume));
     }
     const TreeOptions tree = {options.paths, options.recursive, options.json};
+    const JobOptions job = {options.paths, options.recursive, options.consent, options.verbose,
+                            options.json};
+    const CopyOptions copy = {job, options.target_directory, options.no_target_directory};
     switch (options.command) {
         case Command::kWhere:
             return Where(options, declarations);
@@ -330,10 +337,29 @@ ExitStatus Run(const Options& options) {
             return Lock(options, false);
         case Command::kImport:
             return Import(options.apple_double, options.paths.front(), options.json);
+        case Command::kCopy:
+            return Copy(copy);
+        case Command::kMove:
+            return Move(copy);
+        case Command::kDelete:
+            return Delete(job);
         case Command::kUpgrade:
             return Upgrade(tree);
         case Command::kRepair:
             return Repair(tree);
+        case Command::kClean:
+            return Clean({.directories = options.paths,
+                          .recursive = options.recursive,
+                          .remove = options.yes,
+                          .others = options.all,
+                          .json = options.json});
+        case Command::kConvert:
+            return Convert({.source = options.paths.front(),
+                            .destination = options.destination,
+                            .type = options.to,
+                            .recursive = options.recursive,
+                            .compare_only = options.compare_only,
+                            .json = options.json});
         case Command::kDump:
             break;
     }

@@ -10,12 +10,6 @@ namespace {
 
 constexpr const char* kLook = "look at it with: mavoea dump FILE";
 
-bool IsBlank(const Bytes& fork) {
-    if (fork.size() <= kBlankForkTextOffset + kBlankForkText.size()) return false;
-    return std::equal(
-        kBlankForkText.begin(), kBlankForkText.end(), fork.begin() + kBlankForkTextOffset,
-        [](char c, std::uint8_t byte) { return static_cast<std::uint8_t>(c) == byte; });
-}
 
 class ContentsReader {
  public:
@@ -97,7 +91,7 @@ class ContentsReader {
         const auto index = layout_.FindEntry(EntryId::kResourceFork);
         if (!index) return;
         Bytes bytes = ReadRange(layout_.entries[*index].data, "its resource fork");
-        if (!bytes.empty() && !IsBlank(bytes)) contents_.fork = std::move(bytes);
+        if (!bytes.empty() && !IsBlankFork(bytes)) contents_.fork = std::move(bytes);
     }
 
     void NameOthers() {
@@ -119,6 +113,13 @@ class ContentsReader {
 };
 
 }  // namespace
+
+bool IsBlankFork(const Bytes& fork) {
+    if (fork.size() <= kBlankForkTextOffset + kBlankForkText.size()) return false;
+    return std::equal(
+        kBlankForkText.begin(), kBlankForkText.end(), fork.begin() + kBlankForkTextOffset,
+        [](char c, std::uint8_t byte) { return static_cast<std::uint8_t>(c) == byte; });
+}
 
 Contents ReadContents(const File& file, const Layout& layout) {
     return ContentsReader(file, layout).Read();

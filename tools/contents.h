@@ -23,6 +23,9 @@ struct Contents {
     std::vector<std::string> others;
 };
 
+// Whether the fork is the words that stand for none.
+bool IsBlankFork(const Bytes& fork);
+
 // Reads the whole file, whose layout that is. Failure when it is no AppleDouble file of version 2,
 // or when anything in it lies outside of it.
 Contents ReadContents(const File& file, const Layout& layout);

@@ -1,10 +1,11 @@
 #!/bin/sh
 # Builds the tool and shows its main job on a real file: named attributes, a resource fork and Finder
 # info, stored beside the file, listed, read back and removed; then a "._" file imported, a file
-# locked and an earlier layout converted. Installs what the build takes.
+# locked, an earlier layout converted, and a file carried from one kind of volume to the next.
+# Installs what the build takes.
 set -eu
 cd "$(dirname "$0")/.."
-sh tests/packages.sh g++ cmake ninja-build libacl1-dev libcli11-dev nlohmann-json3-dev
+sh tests/packages.sh g++ cmake ninja-build libacl1-dev libattr1-dev libcli11-dev nlohmann-json3-dev
 cmake --preset release -DMAVOEA_TESTS=OFF -DMAVOEA_BENCH=OFF -B build/demo
 cmake --build build/demo
 
@@ -72,3 +73,31 @@ run upgrade -r old
 run list -l old/report.txt
 run get old/report.txt com.example.colour
 echo
+
+echo
+echo "A file and its metadata go from an EA-directory volume to a file-EA volume, on to an"
+echo "AppleDouble volume and back:"
+mkdir eadir fileea appledouble
+run() {
+    echo
+    echo "\$ mavoea $*"
+    "$mavoea" --volume "$share/eadir=eadir" --volume "$share/fileea=fileea" \
+        --volume "$share/appledouble=appledouble" "$@"
+}
+echo "Dear reader" > eadir/book.txt
+run set eadir/book.txt com.example.colour red
+printf 'a fork' | run set eadir/book.txt com.apple.ResourceFork
+run set eadir/book.txt com.apple.FinderInfo --hex \
+    5445585474747874000000000000000000000000000000000000000000000000
+run list -l eadir/book.txt
+run mv eadir/book.txt fileea || {
+    echo "A file-EA volume takes a file system that keeps extended attributes of users."
+    exit 0
+}
+run list -l fileea/book.txt
+run mv fileea/book.txt appledouble
+run list -l appledouble/book.txt
+run mv appledouble/book.txt eadir
+run list -l eadir/book.txt
+echo
+echo "Left behind on the two others: $(ls -A fileea appledouble | tr '\n' ' ')"

@@ -1,14 +1,11 @@
 #include "tools/tree.h"
 
 #include <dirent.h>
-#include <sys/ioctl.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <chrono>
 #include <cstdint>
 #include <iostream>
 #include <memory>
@@ -16,61 +13,11 @@
 #include "include/mavoea.h"
 #include "tools/file.h"
 #include "tools/output.h"
+#include "tools/progress.h"
 #include "tools/text.h"
 
 namespace mavoea::tool {
 namespace {
-
-// ---- Progress -----------------------------------------------------------------------------------
-
-// One line on a terminal, rewritten now and then; nothing anywhere else.
-class Progress {
- public:
-    explicit Progress(const char* doing) : doing_(doing), on_(::isatty(STDERR_FILENO) == 1) {}
-    ~Progress() { Clear(); }
-    Progress(const Progress&) = delete;
-    Progress& operator=(const Progress&) = delete;
-
-    void Show(std::uint64_t done, std::uint64_t failed, const std::string& path) {
-        using std::chrono::steady_clock;
-        constexpr std::chrono::milliseconds kInterval(100);
-        if (!on_) return;
-        const auto now = steady_clock::now();
-        if (shown_ && now - last_ < kInterval) return;
-        last_ = now;
-        shown_ = true;
-        std::string line = std::string(doing_) + ": " + std::to_string(done) + " done, ";
-        if (failed > 0) line += std::to_string(failed) + " failed, ";
-        Write('\r' + Cut(line + Printable(path)) + kEraseRest);
-    }
-
-    void Clear() {
-        if (shown_) Write(std::string("\r") + kEraseRest);
-        shown_ = false;
-    }
-
- private:
-    static constexpr const char* kEraseRest = "\x1b[K";
-
-    // To the terminal's width, whole characters of UTF-8.
-    static std::string Cut(std::string line) {
-        constexpr std::size_t kUsual = 80;
-        winsize size{};
-        const bool known = ::ioctl(STDERR_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 1;
-        std::size_t room = (known ? size.ws_col : kUsual) - 1;
-        if (line.size() <= room) return line;
-        while (room > 0 && (static_cast<unsigned char>(line[room]) & 0xC0) == 0x80) --room;
-        line.resize(room);
-        return line;
-    }
-
-    static void Write(const std::string& text) { std::cerr << text << std::flush; }
-
-    const char* doing_;
-    bool on_;
-    bool shown_ = false;
-    std::chrono::steady_clock::time_point last_{};
-};
 
 // ---- Directories --------------------------------------------------------------------------------
 
@@ -177,7 +124,7 @@ class Walk {
 
     // False when what is below it would fail for the same reason.
     bool DoObject(const Object& object) {
-        progress_.Show(Total(), failures_.size(), object.path);
+        progress_.Show(StatusText(), object.path);
         bool suits = false;
         try {
             task_.check(object);
@@ -200,6 +147,12 @@ class Walk {
     }
 
     std::uint64_t Total() const { return counts_[0] + counts_[1] + counts_[2]; }
+
+    std::string StatusText() const {
+        const std::string done = std::to_string(Total()) + " done";
+        return failures_.empty() ? done
+                                 : done + ", " + std::to_string(failures_.size()) + " failed";
+    }
 
     // The words of the outcomes that can be, in the order of Outcome.
     std::array<const char*, 3> Words() const { return {task_.done, task_.current, task_.nothing}; }

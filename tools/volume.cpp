@@ -95,19 +95,29 @@ Declaration DeclareVolume(std::string_view declaration) {
         throw Failure(kFailed, subject, "not of the form PATH=TYPE",
                       "for example --volume /srv/share=eadir");
     }
-    const std::string type_name(declaration.substr(equals + 1));
-    Declaration result{Absolute(std::string(declaration.substr(0, equals))),
-                       MAVOVolumeTypeFromName(type_name.c_str())};
+    return DeclareVolume(std::string(declaration.substr(0, equals)),
+                         std::string(declaration.substr(equals + 1)), subject);
+#else
+    throw Failure(kFailed, subject, "this system knows its volumes", "leave the option out");
+#endif
+}
+
+Declaration DeclareVolume(const std::string& directory, const std::string& type_name,
+                          const std::string& option) {
+#if MAVOEA_HOST_PLATFORM
+    Declaration result{Absolute(directory), MAVOVolumeTypeFromName(type_name.c_str())};
     if (result.type < 0) {
-        throw Failure(kFailed, subject, "unknown volume type \"" + type_name + "\"",
+        throw Failure(kFailed, option, "unknown volume type \"" + type_name + "\"",
                       "take a number from 0 to 12, appledouble, eadir, fileea or xattr");
     }
     if (MAVOVolumeDeclare(result.directory.c_str(), result.type) != 0) {
-        throw SystemFailure(subject, errno);
+        throw SystemFailure(option, errno);
     }
     return result;
 #else
-    throw Failure(kFailed, subject, "this system knows its volumes", "leave the option out");
+    (void)directory;
+    (void)type_name;
+    throw Failure(kFailed, option, "this system knows its volumes", "leave the option out");
 #endif
 }
 

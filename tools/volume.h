@@ -31,6 +31,9 @@ struct Declaration {
     int type = -1;
 };
 Declaration DeclareVolume(std::string_view declaration);
+// The same for a type as TYPE names it; `option` is what a Failure is about.
+Declaration DeclareVolume(const std::string& directory, const std::string& type_name,
+                          const std::string& option);
 
 // Where the type of `object` came from, as far as `declarations` tell.
 std::string TypeSource(const Object& object, const std::vector<Declaration>& declarations);

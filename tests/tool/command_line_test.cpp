@@ -37,6 +37,11 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
         {{"upgrade", "-r"}, "PATH is required"},
         {{"upgrade", "--record", object}, "The following argument was not expected: --record"},
         {{"repair"}, "PATH is required"},
+        {{"clean", "-r"}, "DIR is required"},
+        {{"convert", object, object}, "--to is required"},
+        {{"convert", "--to", "0", object}, "DST is required"},
+        {{"convert", "--to", "0", object, object, object},
+         "The following argument was not expected: " + object},
         {{"lock", "-r", object}, "The following argument was not expected: -r"},
         {{"dump"}, "FILE is required"},
         {{"dump", "--record"}, "FILE is required"},
@@ -57,13 +62,31 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
 TEST(CommandLineTest, HelpAndVersionAreWrittenToStandardOutput) {
     const ToolResult help = RunTool({"--help"});
     EXPECT_THAT(help, Succeeded());
-    for (const char* text :
-         {"where", "list", "get", "set", "remove", "lock", "unlock", "import", "upgrade", "repair",
-          "dump", "--volume PATH=TYPE", "--json", "Examples:", "Exit status:", "Volume types:"}) {
+    for (const char* text : {"where",
+                             "list",
+                             "get",
+                             "set",
+                             "remove",
+                             "cp",
+                             "mv",
+                             "rm",
+                             "lock",
+                             "unlock",
+                             "import",
+                             "upgrade",
+                             "repair",
+                             "clean",
+                             "convert",
+                             "dump",
+                             "--volume PATH=TYPE",
+                             "--json",
+                             "Examples:",
+                             "Exit status:",
+                             "Volume types:"}) {
         EXPECT_THAT(help.out, HasSubstr(text));
     }
     for (const char* command : {"where", "list", "get", "set", "remove", "lock", "unlock", "import",
-                                "upgrade", "repair", "dump"}) {
+                                "upgrade", "repair", "clean", "convert", "dump"}) {
         EXPECT_THAT(RunTool({command, "--help"}), Succeeded());
     }
     const ToolResult version = RunTool({"--version"});

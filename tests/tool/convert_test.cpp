@@ -1,0 +1,679 @@
+// Trees from one kind of volume to another through the tool, and the comparison behind it.
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/xattr.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <map>
+
+#include "tests/support/object_files.h"
+#include "tests/support/record_builder.h"
+#include "tests/support/stream_builder.h"
+#include "tests/tool/tool.h"
+
+namespace mavoea::test {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+
+const std::string kFinderInfo = "com.apple.FinderInfo";
+const std::string kFork = "com.apple.ResourceFork";
+const std::string kLost =
+    "; between these volumes only the Finder info and the resource fork of a header are copied";
+
+const char* NameOf(int type) {
+    switch (type) {
+        case 0:
+            return "appledouble";
+        case 1:
+            return "eadir";
+        case 2:
+            return "fileea";
+        default:
+            return "xattr";
+    }
+}
+
+// All that is in a directory: the bytes of files, and what else there is.
+std::map<std::string, Bytes> Snapshot(const std::string& directory) {
+    std::map<std::string, Bytes> all;
+    for (const std::string& name : Tree(directory)) {
+        const std::filesystem::path path = directory + '/' + name;
+        const bool is_file =
+            std::filesystem::is_regular_file(std::filesystem::symlink_status(path));
+        all[name] = is_file ? ReadFile(path) : Bytes();
+    }
+    return all;
+}
+
+// Volumes beside each other, each a directory that is declared to be of a type.
+class Volumes {
+ public:
+    const std::string& path() const { return dir_.path(); }
+
+    std::string Declare(const std::string& name, int type) {
+        const std::string volume = dir_ / name;
+        declared_.insert(declared_.end(), {"--volume", volume + '=' + std::to_string(type)});
+        return volume;
+    }
+
+    std::string Make(const std::string& name, int type) {
+        const std::string volume = Declare(name, type);
+        MakeDir(volume);
+        return volume;
+    }
+
+    ToolResult Run(Arguments arguments, const std::string& input = {}) const {
+        arguments.insert(arguments.begin(), declared_.begin(), declared_.end());
+        return RunTool(arguments, input);
+    }
+
+    void Set(const std::string& path, const std::string& name, const Bytes& value) const {
+        ASSERT_THAT(Run({"set", path, name}, std::string(value.begin(), value.end())), Succeeded());
+    }
+
+    ToolResult Convert(const std::string& from, const std::string& to, const std::string& type,
+                       Arguments options = {"-r"}) const {
+        options.insert(options.begin(), "convert");
+        options.insert(options.end(), {"--to", type, from, to});
+        return Run(options);
+    }
+
+ private:
+    TempDir dir_;
+    Arguments declared_;
+};
+
+// ---- Every pair ---------------------------------------------------------------------------------
+
+class ConvertPairTest : public ::testing::TestWithParam<std::tuple<int, int>> {
+ protected:
+    void SetUp() override {
+        MAVOEA_SKIP_UNLESS_ROOT();
+        MAVOEA_SKIP_WITHOUT_ATTRIBUTES(volumes_.path());
+    }
+
+    int from() const { return std::get<0>(GetParam()); }
+    int to() const { return std::get<1>(GetParam()); }
+
+    // The file systems at hand keep no Finder info and no fork as attributes.
+    bool HasMacAttributes() const { return from() != 7 && to() != 7; }
+
+    struct Value {
+        std::string path;
+        std::string name;
+        Bytes value;
+    };
+    std::vector<Value> Values() const {
+        std::vector<Value> values = {
+            {"letter.txt", "user.colour", Ascii("blue")},
+            {"letter.txt", "user.empty", {}},
+            {"letter.txt", "user.large", Pattern(3000)},
+            {"folder", "user.colour", Ascii("red")},
+            {"folder/it's \"quoted\"\n\xC3\xA4", "user.colour", Ascii("green")},
+            {"folder/deep/inner", "user.name\xC3\xA4", Pattern(10, 7)},
+        };
+        if (HasMacAttributes()) {
+            values.insert(values.end(), {{"letter.txt", kFinderInfo, Pattern(32, 0x40)},
+                                         {"letter.txt", kFork, Pattern(70000, 3)},
+                                         {"folder", kFinderInfo, Pattern(32, 0x50)},
+                                         {"folder/fork only", kFork, Pattern(100, 5)},
+                                         {"folder/info only", kFinderInfo, Pattern(32, 0x60)}});
+        }
+        return values;
+    }
+
+    void MakeTree(const std::string& top) {
+        for (const char* name : {"folder", "folder/deep"}) MakeDir(top + '/' + name);
+        WriteFile(top + "/plain", Pattern(200000));
+        WriteFile(top + "/locked", Ascii("locked"));
+        for (const auto& [path, name, value] : Values()) {
+            if (path != "folder") WriteFile(top + '/' + path, Ascii(path));
+            chmod((top + '/' + path).c_str(), path == "folder" ? 0755 : 0644);
+        }
+        for (const auto& [path, name, value] : Values())
+            volumes_.Set(top + '/' + path, name, value);
+        ASSERT_THAT(volumes_.Run({"lock", top + "/locked"}), Succeeded());
+        ASSERT_EQ(0, symlink("letter.txt", (top + "/link").c_str()));
+        ASSERT_EQ(0, mkfifo((top + "/pipe").c_str(), 0644));
+    }
+
+    void CheckTree(const std::string& top) {
+        for (const auto& [path, name, value] : Values()) {
+            const ToolResult result = volumes_.Run({"get", top + '/' + path, name});
+            EXPECT_THAT(result, Succeeded()) << path << ' ' << name;
+            EXPECT_EQ(value, result.bytes()) << path << ' ' << name;
+            if (path == "folder") continue;
+            EXPECT_EQ(Ascii(path), ReadFile(top + '/' + path));
+        }
+        EXPECT_EQ(Pattern(200000), ReadFile(top + "/plain"));
+        EXPECT_EQ("1", volumes_.Run({"get", top + "/locked", "mavoea.locked"}).out);
+        EXPECT_EQ("0", volumes_.Run({"get", top + "/plain", "mavoea.locked"}).out);
+        EXPECT_EQ("letter.txt", std::filesystem::read_symlink(top + "/link"));
+        EXPECT_TRUE(std::filesystem::is_fifo(top + "/pipe"));
+    }
+
+    // Attribute volumes need a file system that takes every name, the Finder info's in any case;
+    // and of an object with neither Finder info nor fork, nothing makes an AppleDouble file.
+    static bool MayLose(int from, int to) {
+        return (to == 7 && (from == 0 || from == 2)) || (from == 7 && to == 0);
+    }
+
+    // That everything which is not at the destination is on the list.
+    void ExpectTold(const std::string& source, const std::string& there, const ToolResult& result) {
+        EXPECT_EQ(2, result.status);
+        EXPECT_NE("", result.err);
+        for (const auto& [path, name, value] : Values()) {
+            const ToolResult found = volumes_.Run({"get", there + '/' + path, name});
+            if (found.status == 0 && found.bytes() == value) continue;
+            const std::string odd = "\n\xC3\xA4";
+            std::string shown = source + '/' + path;
+            if (const auto at = shown.find(odd); at != std::string::npos) {
+                shown.replace(at, 1, "\\x0A");
+            }
+            EXPECT_THAT(result.out, HasSubstr(shown + ": \"" + name + "\": "));
+        }
+    }
+
+    Volumes volumes_;
+};
+
+INSTANTIATE_TEST_SUITE_P(Types, ConvertPairTest,
+                         ::testing::Combine(::testing::Values(0, 1, 2, 7),
+                                            ::testing::Values(0, 1, 2, 7)),
+                         [](const auto& tested) {
+                             return "From" + std::to_string(std::get<0>(tested.param)) + "To" +
+                                    std::to_string(std::get<1>(tested.param));
+                         });
+
+TEST_P(ConvertPairTest, ATreeGoesThereAndBackAndIsTheSame) {
+    const std::string source = volumes_.Make("source", from());
+    MakeTree(source);
+    const auto before = Snapshot(source);
+    const std::string all = HasMacAttributes() ? "12" : "10";
+
+    const std::string there = volumes_.path() + "/there";
+    const ToolResult forth = volumes_.Convert(source, there, NameOf(to()));
+    volumes_.Declare("there", to());
+    EXPECT_EQ(before, Snapshot(source));
+    if (MayLose(from(), to()) && forth.status != 0) return ExpectTold(source, there, forth);
+    EXPECT_THAT(forth, Succeeded());
+    EXPECT_EQ(all + " converted, " + all + " compared, 0 differences, 0 failed\n", forth.out);
+    CheckTree(there);
+
+    const std::string back = volumes_.path() + "/back";
+    const ToolResult result = volumes_.Convert(there, back, std::to_string(from()));
+    volumes_.Declare("back", from());
+    if (MayLose(to(), from()) && result.status != 0) return ExpectTold(there, back, result);
+    EXPECT_THAT(result, Succeeded());
+    CheckTree(back);
+    const ToolResult same =
+        volumes_.Convert(source, back, NameOf(from()), {"-r", "--compare-only"});
+    EXPECT_THAT(same, Succeeded());
+    EXPECT_EQ(all + " compared, 0 differences, 0 failed\n", same.out);
+}
+
+TEST_P(ConvertPairTest, WhatIsAtTheDestinationIsReplaced) {
+    const std::string source = volumes_.Make("source", from());
+    WriteFile(source + "/file", Ascii("new"));
+    volumes_.Set(source + "/file", "user.colour", Ascii("blue"));
+    const std::string there = volumes_.Make("there", to());
+    WriteFile(there + "/file", Ascii("older and longer"));
+    volumes_.Set(there + "/file", "user.colour", Ascii("red as it was"));
+    volumes_.Set(there + "/file", "user.shape", Ascii("round"));
+    const ToolResult result = volumes_.Convert(source, there, NameOf(to()));
+    EXPECT_EQ(Ascii("new"), ReadFile(there + "/file"));
+    EXPECT_EQ(1, volumes_.Run({"get", there + "/file", "user.shape"}).status);
+    if (MayLose(from(), to()) && result.status != 0) return;
+    EXPECT_THAT(result, Succeeded());
+    EXPECT_EQ("blue", volumes_.Run({"get", there + "/file", "user.colour"}).out);
+}
+
+// ---- The comparison -----------------------------------------------------------------------------
+
+// A tree on an EA-directory volume and its copy on an AppleDouble volume, which are the same.
+class CompareTest : public ::testing::Test {
+ protected:
+    void SetUp() override {
+        MAVOEA_SKIP_UNLESS_ROOT();
+        MAVOEA_SKIP_WITHOUT_ATTRIBUTES(volumes_.path());
+        source_ = volumes_.Make("source", 1);
+        copy_ = volumes_.Declare("copy", 0);
+        MakeDir(source_ + "/folder");
+        WriteFile(source_ + "/file", Pattern(1100000));
+        volumes_.Set(source_ + "/file", "colour", Ascii("blue"));
+        volumes_.Set(source_ + "/file", "shape", Ascii("round"));
+        volumes_.Set(source_ + "/file", kFinderInfo, Pattern(32, 0x40));
+        volumes_.Set(source_ + "/file", kFork, Pattern(100));
+        WriteFile(source_ + "/folder/plain", Ascii("data"));
+        ASSERT_EQ(0, symlink("file", (source_ + "/link").c_str()));
+        ASSERT_THAT(volumes_.Convert(source_, copy_, "appledouble"), Succeeded());
+        ASSERT_EQ("5 compared, 0 differences, 0 failed\n", Compare().out);
+    }
+
+    ToolResult Compare(const std::string& option = "-r") const {
+        return volumes_.Convert(source_, copy_, "appledouble", {option, "--compare-only"});
+    }
+
+    // That the comparison finds this, and nothing else; and changes nothing.
+    void ExpectFound(const std::string& line, int compared = 5) const {
+        const auto before = std::pair(Snapshot(source_), Snapshot(copy_));
+        const ToolResult result = Compare();
+        EXPECT_EQ(2, result.status);
+        EXPECT_EQ("", result.err);
+        EXPECT_EQ(line + '\n' + std::to_string(compared) + " compared, 1 difference, 0 failed\n",
+                  result.out);
+        EXPECT_EQ(before, std::pair(Snapshot(source_), Snapshot(copy_)));
+    }
+
+    void Change(const std::string& name, const Bytes& value) const {
+        volumes_.Set(copy_ + "/file", name, value);
+    }
+
+    Volumes volumes_;
+    std::string source_;
+    std::string copy_;
+};
+
+TEST_F(CompareTest, AByteOfTheDataIsFoundWhereverItIs) {
+    for (const std::size_t at : {0U, 1048575U, 1048576U, 1099999U}) {
+        Bytes data = Pattern(1100000);
+        data[at] ^= 1;
+        WriteFile(copy_ + "/file", data);
+        ExpectFound(source_ + "/file: data: different at byte " + std::to_string(at));
+    }
+}
+
+TEST_F(CompareTest, DataOfAnotherLengthIsFound) {
+    Bytes data = Pattern(1100000);
+    data.pop_back();
+    WriteFile(copy_ + "/file", data);
+    ExpectFound(source_ + "/file: data: different at byte 1099999");
+    WriteFile(copy_ + "/file", Pattern(1100000) + Ascii("x"));
+    ExpectFound(source_ + "/file: data: different at byte 1100000");
+    WriteFile(copy_ + "/file", {});
+    ExpectFound(source_ + "/file: data: different at byte 0");
+}
+
+TEST_F(CompareTest, AValueThatDiffersIsFoundByItsName) {
+    Change("colour", Ascii("blUe"));
+    ExpectFound(source_ + "/file: \"colour\": different at byte 2");
+}
+
+TEST_F(CompareTest, AValueThatGoesOnIsFound) {
+    Change("colour", Ascii("blueish"));
+    ExpectFound(source_ + "/file: \"colour\": different at byte 4");
+}
+
+TEST_F(CompareTest, AnAttributeThatIsMissingIsFound) {
+    ASSERT_THAT(volumes_.Run({"remove", copy_ + "/file", "colour"}), Succeeded());
+    ExpectFound(source_ + "/file: \"colour\": missing");
+}
+
+TEST_F(CompareTest, AnExtraAttributeIsFoundWhateverIsInItsName) {
+    Change("two\nlines", {});
+    ExpectFound(source_ + "/file: \"two\\x0Alines\": extra");
+}
+
+TEST_F(CompareTest, AByteOfTheFinderInfoIsFound) {
+    Bytes info = Pattern(32, 0x40);
+    info[31] ^= 0x80;
+    Change(kFinderInfo, info);
+    ExpectFound(source_ + "/file: \"com.apple.FinderInfo\": different at byte 31");
+    Change(kFinderInfo, Bytes(32));
+    ExpectFound(source_ + "/file: \"com.apple.FinderInfo\": missing");
+}
+
+TEST_F(CompareTest, AByteOfTheResourceForkIsFound) {
+    Bytes fork = Pattern(100);
+    fork[50] ^= 1;
+    Change(kFork, fork);
+    ExpectFound(source_ + "/file: \"com.apple.ResourceFork\": different at byte 50");
+    Change(kFork, {});
+    ExpectFound(source_ + "/file: \"com.apple.ResourceFork\": missing");
+}
+
+TEST_F(CompareTest, TheLockIsFoundBothWays) {
+    ASSERT_THAT(volumes_.Run({"lock", copy_ + "/file"}), Succeeded());
+    ExpectFound(source_ + "/file: \"mavoea.locked\": extra");
+    ASSERT_THAT(volumes_.Run({"unlock", copy_ + "/file"}), Succeeded());
+    ASSERT_THAT(volumes_.Run({"lock", source_ + "/file"}), Succeeded());
+    ExpectFound(source_ + "/file: \"mavoea.locked\": missing");
+}
+
+TEST_F(CompareTest, AnObjectThatIsMissingOrExtraIsFound) {
+    WriteFile(copy_ + "/folder/another", {});
+    ExpectFound(copy_ + "/folder/another: extra");
+    ASSERT_EQ(0, unlink((copy_ + "/folder/another").c_str()));
+    ASSERT_EQ(0, unlink((copy_ + "/folder/plain").c_str()));
+    ExpectFound(source_ + "/folder/plain: missing", 4);
+}
+
+TEST_F(CompareTest, AnObjectOfAnotherTypeIsFound) {
+    ASSERT_EQ(0, unlink((copy_ + "/folder/plain").c_str()));
+    MakeDir(copy_ + "/folder/plain");
+    ExpectFound(source_ + "/folder/plain: type: different");
+}
+
+TEST_F(CompareTest, ALinkThatLeadsElsewhereIsFound) {
+    ASSERT_EQ(0, unlink((copy_ + "/link").c_str()));
+    ASSERT_EQ(0, symlink("filter", (copy_ + "/link").c_str()));
+    ExpectFound(source_ + "/link: target: different at byte 3");
+}
+
+TEST_F(CompareTest, WithoutRecursionOnlyTheObjectItselfIsCompared) {
+    ASSERT_EQ(0, unlink((copy_ + "/folder/plain").c_str()));
+    const ToolResult result = volumes_.Convert(source_, copy_, "appledouble", {"--compare-only"});
+    EXPECT_THAT(result, Succeeded());
+    EXPECT_EQ("1 compared, 0 differences, 0 failed\n", result.out);
+}
+
+TEST_F(CompareTest, WhatCannotBeReadIsAFailureAndTheRestIsCompared) {
+    WriteFile(source_ + "/@eaDir/file@MavoEAStream", Hex("00 05 16 07  00 02"));
+    Bytes data = Pattern(1100000);
+    data[7] ^= 1;
+    WriteFile(copy_ + "/file", data);
+    const ToolResult result = Compare();
+    EXPECT_EQ(2, result.status);
+    EXPECT_EQ(source_ +
+                  "/file: data: different at byte 7\n"
+                  "5 compared, 1 difference, 1 failed\n",
+              result.out);
+    EXPECT_THAT(result.err, HasSubstr("mavoea: " + source_ + "/@eaDir/file@MavoEAStream: "));
+}
+
+TEST_F(CompareTest, ACopyThatIsNotThereIsNotFound) {
+    const std::string nowhere = volumes_.path() + "/nowhere";
+    EXPECT_THAT(volumes_.Convert(source_, nowhere, "0", {"--compare-only"}),
+                Failed(1, nowhere + ": No such file or directory; check the path"));
+}
+
+TEST_F(CompareTest, JsonHasEveryDifference) {
+    WriteFile(copy_ + "/file", Ascii("data"));
+    Change(
+        "sh\xFF"
+        "ape",
+        Ascii("x"));
+    const ToolResult all =
+        volumes_.Convert(source_, copy_, "appledouble", {"--json", "-r", "--compare-only"});
+    EXPECT_EQ(2, all.status);
+    const nlohmann::json json = all.json();
+    EXPECT_EQ(0, json["converted"]);
+    EXPECT_EQ(5, json["compared"]);
+    EXPECT_EQ(0, json["failed"]);
+    EXPECT_EQ(false, json["interrupted"]);
+    ASSERT_EQ(2U, json["differences"].size());
+    EXPECT_EQ(source_ + "/file", json["differences"][0]["path"]);
+    EXPECT_EQ("data", json["differences"][0]["aspect"]);
+    EXPECT_EQ("different", json["differences"][0]["what"]);
+    EXPECT_EQ(0, json["differences"][0]["offset"]);
+    EXPECT_EQ("attribute", json["differences"][1]["aspect"]);
+    EXPECT_EQ("extra", json["differences"][1]["what"]);
+    EXPECT_EQ("7368ff617065", json["differences"][1]["nameHex"]);
+}
+
+// ---- What copies lose, and what only looks like it ----------------------------------------------
+
+class ConvertTest : public ::testing::Test {
+ protected:
+    void SetUp() override {
+        MAVOEA_SKIP_UNLESS_ROOT();
+        MAVOEA_SKIP_WITHOUT_ATTRIBUTES(volumes_.path());
+    }
+
+    std::string there() const { return volumes_.path() + "/there"; }
+
+    Volumes volumes_;
+};
+
+TEST_F(ConvertTest, WhatARecordHasBesideTheFinderInfoIsToldToBeLost) {
+    const std::string source = volumes_.Make("source", 2);
+    WriteFile(source + "/file", {});
+    Bytes record = AttributeRecord();
+    constexpr std::size_t kAfpAttributesAt = 372;
+    PutU16(record, kAfpAttributesAt, 0x0001);
+    ASSERT_EQ(0, setxattr((source + "/file").c_str(), "user.netatalk.Metadata", record.data(),
+                          record.size(), 0));
+    for (const char* type : {"0", "1", "2", "7"}) {
+        SCOPED_TRACE(type);
+        const ToolResult result = volumes_.Convert(source, there() + type, type);
+        EXPECT_EQ(2, result.status);
+        EXPECT_THAT(result.out,
+                    HasSubstr(source + "/file: AppleDouble AFP file info: missing" + kLost + '\n'));
+        EXPECT_THAT(result.out,
+                    HasSubstr(source + "/file: AppleDouble file dates: missing" + kLost + '\n'));
+    }
+}
+
+TEST_F(ConvertTest, ARecordThatOnlyLocksLosesNothing) {
+    const std::string source = volumes_.Make("source", 2);
+    WriteFile(source + "/file", {});
+    ASSERT_THAT(volumes_.Run({"set", source + "/file", kFinderInfo, "--hex", std::string(64, '1')}),
+                Succeeded());
+    ASSERT_THAT(volumes_.Run({"lock", source + "/file"}), Succeeded());
+    for (const char* type : {"0", "1", "2"}) {
+        EXPECT_THAT(volumes_.Convert(source, there() + type, type), Succeeded()) << type;
+    }
+}
+
+TEST_F(ConvertTest, AForkThatStandsForNoneIsNotMissed) {
+    const std::string source = volumes_.Make("source", 1);
+    WriteFile(source + "/file", {});
+    Bytes fork = Hex("00 00 01 00  00 00 01 00  00 00 00 00  00 00 00 1E") +
+                 Ascii("This resource fork intentionally left blank   ");
+    fork.resize(286);
+    MakeDir(source + "/@eaDir");
+    WriteFile(source + "/@eaDir/file@MavoResource", PlainAppleDouble(Pattern(32, 0x40), fork));
+    EXPECT_THAT(volumes_.Convert(source, there(), "0"), Succeeded());
+    volumes_.Declare("there", 0);
+    EXPECT_EQ(kFinderInfo + "\n", volumes_.Run({"list", there() + "/file"}).out);
+}
+
+TEST_F(ConvertTest, FilesThatKeepAttributesOfTheirOwnGetNoExtraOnes) {
+    const std::string source = volumes_.Make("source", 1);
+    WriteFile(source + "/file", {});
+    ASSERT_EQ(0, setxattr((source + "/file").c_str(), "user.own", "x", 1, 0));
+    EXPECT_THAT(volumes_.Convert(source, there(), "7"), Succeeded());
+    ASSERT_EQ(0, setxattr((there() + "/file").c_str(), "user.own", "y", 1, 0));
+    EXPECT_EQ(source + "/file: \"user.own\": extra\n2 compared, 1 difference, 0 failed\n",
+              volumes_.Convert(source, there(), "7", {"-r", "--compare-only"}).out);
+}
+
+TEST_F(ConvertTest, AVolumeThatIsOnlyCopiedToIsComparedByItsEaDirectory) {
+    const std::string source = volumes_.Make("source", 1);
+    WriteFile(source + "/file", {});
+    volumes_.Set(source + "/file", "colour", Ascii("blue"));
+    EXPECT_THAT(volumes_.Convert(source, there(), "12"), Succeeded());
+    EXPECT_TRUE(Exists(there() + "/@eaDir/file@MavoEAStream"));
+    ASSERT_EQ(0, unlink((there() + "/@eaDir/file@MavoEAStream").c_str()));
+    EXPECT_EQ(source + "/file: \"colour\": missing\n2 compared, 1 difference, 0 failed\n",
+              volumes_.Convert(source, there(), "12", {"-r", "--compare-only"}).out);
+}
+
+TEST_F(ConvertTest, WhatTheFileSystemDoesNotTakeIsAFailureAndADifference) {
+    const std::string source = volumes_.Make("source", 1);
+    if (setxattr(source.c_str(), kFinderInfo.c_str(), "x", 1, 0) == 0) {
+        GTEST_SKIP() << "this file system takes attributes of every name";
+    }
+    WriteFile(source + "/file", Ascii("data"));
+    volumes_.Set(source + "/file", kFinderInfo, Pattern(32, 0x40));
+    volumes_.Set(source + "/file", "user.colour", Ascii("blue"));
+    const ToolResult result = volumes_.Convert(source, there(), "xattr");
+    EXPECT_EQ(2, result.status);
+    EXPECT_THAT(result.err, HasSubstr("mavoea: " + source + "/file: "));
+    EXPECT_EQ(source +
+                  "/file: \"com.apple.FinderInfo\": missing\n"
+                  "1 converted, 2 compared, 1 difference, 1 failed\n",
+              result.out);
+    EXPECT_EQ(Ascii("data"), ReadFile(there() + "/file"));
+}
+
+// ---- Odd things in a tree -----------------------------------------------------------------------
+
+TEST_F(ConvertTest, WithoutRecursionOneObjectIsCarried) {
+    const std::string source = volumes_.Make("source", 1);
+    MakeDir(source + "/folder");
+    WriteFile(source + "/folder/file", Ascii("data"));
+    volumes_.Set(source + "/folder", "colour", Ascii("red"));
+    volumes_.Set(source + "/folder/file", "colour", Ascii("blue"));
+
+    const ToolResult file = volumes_.Convert(source + "/folder/file", there(), "0", {});
+    EXPECT_THAT(file, Succeeded());
+    EXPECT_EQ("1 converted, 1 compared, 0 differences, 0 failed\n", file.out);
+    EXPECT_TRUE(Exists(volumes_.path() + "/._there"));
+
+    const std::string folder = volumes_.path() + "/folder";
+    EXPECT_THAT(volumes_.Convert(source + "/folder", folder, "0", {}), Succeeded());
+    EXPECT_TRUE(NamesIn(folder).empty());
+    volumes_.Declare("folder", 0);
+    EXPECT_EQ("red", volumes_.Run({"get", folder, "colour"}).out);
+}
+
+TEST_F(ConvertTest, WhatFailsInATreeDoesNotKeepTheRestFromIt) {
+    const std::string source = volumes_.Make("source", 1);
+    const std::string long_name(254, 'n');
+    for (const std::string& name : {std::string("a"), std::string("bad"), long_name,
+                                    std::string(254, 'p'), std::string("z")}) {
+        WriteFile(source + '/' + name, Ascii("data"));
+    }
+    volumes_.Set(source + "/a", "colour", Ascii("blue"));
+    volumes_.Set(source + "/z", "colour", Ascii("green"));
+    volumes_.Set(source + '/' + long_name, "colour", Ascii("red"));
+    WriteFile(source + "/@eaDir/bad@MavoEAStream", Hex("00 05 16 07  00 02"));
+
+    const ToolResult result = volumes_.Convert(source, there(), "appledouble");
+    EXPECT_EQ(2, result.status);
+    EXPECT_THAT(result.err, HasSubstr("mavoea: " + source + "/bad: "));
+    EXPECT_THAT(result.err, HasSubstr("mavoea: " + there() + '/' + long_name +
+                                      ": its name or path is too long to have metadata there; use "
+                                      "a shorter name\n"));
+    EXPECT_THAT(result.out, HasSubstr(source + '/' + long_name + ": missing\n"));
+    EXPECT_THAT(result.out, HasSubstr("4 converted, 5 compared, 1 difference, 3 failed\n"));
+    volumes_.Declare("there", 0);
+    EXPECT_EQ("blue", volumes_.Run({"get", there() + "/a", "colour"}).out);
+    EXPECT_EQ("green", volumes_.Run({"get", there() + "/z", "colour"}).out);
+    EXPECT_EQ(Ascii("data"), ReadFile(there() + '/' + std::string(254, 'p')));
+}
+
+TEST_F(ConvertTest, ADirectoryThatCannotBeMadeLeavesOutWhatIsBelowItOnly) {
+    const std::string source = volumes_.Make("source", 1);
+    MakeDir(source + "/folder");
+    WriteFile(source + "/folder/file", {});
+    WriteFile(source + "/other", {});
+    MakeDir(there());
+    WriteFile(there() + "/folder", Ascii("in the way"));
+    const ToolResult result = volumes_.Convert(source, there(), "0");
+    EXPECT_EQ(2, result.status);
+    EXPECT_EQ("mavoea: " + there() + "/folder: Not a directory; check the path\n", result.err);
+    EXPECT_EQ(source +
+                  "/folder: type: different\n"
+                  "2 converted, 3 compared, 1 difference, 1 failed\n",
+              result.out);
+    EXPECT_EQ(Ascii("in the way"), ReadFile(there() + "/folder"));
+}
+
+TEST_F(ConvertTest, AppleDoubleFilesThatNothingTakesAlongAreToldOf) {
+    const std::string because =
+        ": missing; this AppleDouble file belongs to no object that it could go with\n";
+    const Bytes apple_double = Hex("00 05 16 07  00 02 00 00  00*16  00 00");
+    const std::string source = volumes_.Make("source", 1);
+    WriteFile(source + "/._gone", apple_double);
+    WriteFile(source + "/._text", Ascii("not what its name says"));
+    const ToolResult result = volumes_.Convert(source, there(), "2");
+    EXPECT_EQ(2, result.status);
+    ASSERT_EQ(source + "/._gone" + because + "2 converted, 2 compared, 1 difference, 0 failed\n",
+              result.out);
+    EXPECT_EQ(Ascii("not what its name says"), ReadFile(there() + "/._text"));
+    EXPECT_THAT(Tree(source), ElementsAre("._gone", "._text"));
+
+    const std::string attributes = volumes_.Make("attributes", 7);
+    WriteFile(attributes + "/file", {});
+    WriteFile(attributes + "/._file", apple_double);
+    EXPECT_THAT(volumes_.Convert(attributes, volumes_.path() + "/from7", "1").out,
+                HasSubstr(attributes + "/._file" + because));
+}
+
+TEST_F(ConvertTest, NamesOfOneFileStayNamesOfOneFile) {
+    const std::string source = volumes_.Make("source", 1);
+    WriteFile(source + "/one", Ascii("data"));
+    ASSERT_EQ(0, link((source + "/one").c_str(), (source + "/two").c_str()));
+    volumes_.Set(source + "/two", "colour", Ascii("blue"));
+    EXPECT_THAT(volumes_.Convert(source, there(), "0"), Succeeded());
+    EXPECT_TRUE(std::filesystem::equivalent(there() + "/one", there() + "/two"));
+    EXPECT_THAT(Tree(there()), ElementsAre("._two", "one", "two"));
+}
+
+// ---- The command line ---------------------------------------------------------------------------
+
+TEST_F(ConvertTest, TypesThatCannotBeAreRefused) {
+    const std::string source = volumes_.Make("source", 1);
+    for (const char* type : {"bogus", "13", "-1"}) {
+        const ToolResult result =
+            volumes_.Run({"convert", "--to=" + std::string(type), source, there()});
+        EXPECT_EQ(2, result.status);
+        EXPECT_THAT(result.err, HasSubstr("mavoea: --to")) << type;
+    }
+    EXPECT_EQ(
+        "mavoea: --to bogus: unknown volume type \"bogus\"; take a number from 0 to 12, "
+        "appledouble, eadir, fileea or xattr\n",
+        volumes_.Convert(source, there(), "bogus").err);
+    for (const char* type : {"4", "8", "9", "11"}) {
+        const ToolResult result = volumes_.Convert(source, there(), type);
+        EXPECT_EQ(2, result.status);
+        EXPECT_THAT(result.err,
+                    HasSubstr(there() + ": volumes of type " + type + " keep no metadata; "));
+    }
+    EXPECT_FALSE(Exists(there()));
+}
+
+TEST_F(ConvertTest, ASourceWhoseVolumeKeepsNoMetadataIsRefused) {
+    const std::string source = volumes_.Make("source", 4);
+    const ToolResult result = volumes_.Convert(source, there(), "0");
+    EXPECT_EQ(2, result.status);
+    EXPECT_THAT(result.err, HasSubstr(source + ": volumes of type 4 keep no metadata; "));
+    EXPECT_FALSE(Exists(there()));
+}
+
+TEST_F(ConvertTest, TheTwoPlacesLieApart) {
+    const std::string source = volumes_.Make("source", 1);
+    MakeDir(source + "/folder");
+    WriteFile(source + "/folder/file", Ascii("data"));
+    ASSERT_EQ(0, symlink(source.c_str(), (volumes_.path() + "/link").c_str()));
+    const struct {
+        std::string from;
+        std::string to;
+    } cases[] = {
+        {source, source},
+        {source, source + "/copy"},
+        {source, source + "/folder/../copy"},
+        {source, volumes_.path() + "/link/copy"},
+        {source + "/folder", source},
+        {source + "/folder/file", source + "/folder/file"},
+    };
+    const std::vector<std::string> before = Tree(volumes_.path());
+    for (const auto& [from, to] : cases) {
+        EXPECT_THAT(volumes_.Convert(from, to, "0"),
+                    Failed(2, to + ": it and the source are not apart; name a place outside of "
+                                   "the source"));
+    }
+    EXPECT_EQ(before, Tree(volumes_.path()));
+    // Beside the source is apart from it.
+    EXPECT_THAT(volumes_.Convert(source + "/folder", source + "/folder 2", "1"), Succeeded());
+}
+
+TEST_F(ConvertTest, ASourceOrAParentThatIsNotThereIsTold) {
+    const std::string source = volumes_.Make("source", 1);
+    EXPECT_THAT(volumes_.Convert(source + "/none", there(), "0"),
+                Failed(1, source + "/none: No such file or directory; check the path"));
+    const ToolResult result = volumes_.Convert(source, there() + "/below", "0");
+    EXPECT_EQ(2, result.status);
+    EXPECT_EQ("mavoea: " + there() + "/below: No such file or directory; check the path\n",
+              result.err);
+    EXPECT_EQ("2", std::to_string(volumes_.Convert(source, "", "0").status));
+}
+
+}  // namespace
+}  // namespace mavoea::test

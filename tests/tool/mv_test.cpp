@@ -1,0 +1,335 @@
+// mavoea mv, on real files.
+
+#include "tests/tool/travel.h"
+
+namespace mavoea::test {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+
+struct Way {
+    int from;
+    int to;
+    bool across;  // from one file system to another
+};
+std::string NameOf(const ::testing::TestParamInfo<Way>& info) {
+    return "From" + std::to_string(info.param.from) + "To" + std::to_string(info.param.to) +
+           (info.param.across ? "Across" : "");
+}
+std::vector<Way> AllWays() {
+    std::vector<Way> ways;
+    for (const bool across : {false, true}) {
+        for (const int from : {kAppleDouble, kEaDirectory, kFileEa, kXattr}) {
+            for (const int to : {kAppleDouble, kEaDirectory, kFileEa, kXattr}) {
+                ways.push_back({from, to, across});
+            }
+        }
+    }
+    return ways;
+}
+
+class MvWayTest : public ::testing::TestWithParam<Way> {
+ protected:
+    void SetUp() override {
+        MAVOEA_SKIP_UNLESS_ROOT();
+        MAVOEA_SKIP_WITHOUT_ATTRIBUTES("/tmp");
+        if (GetParam().across) {
+            second_.emplace();
+            MAVOEA_SKIP_WITHOUT_SECOND(*second_);
+            MAVOEA_SKIP_WITHOUT_ATTRIBUTES(second_->path());
+        }
+        travel_.emplace(GetParam().from, GetParam().to, second_ ? second_->path() : std::string());
+    }
+    const Travel& travel() const { return *travel_; }
+
+ private:
+    std::optional<SecondVolume> second_;
+    std::optional<Travel> travel_;
+};
+INSTANTIATE_TEST_SUITE_P(EveryWay, MvWayTest, ::testing::ValuesIn(AllWays()), NameOf);
+
+TEST_P(MvWayTest, FilesGoWithMetadataAndLeaveNothing) {
+    travel().MakeFile(travel().From("a"));
+    travel().GiveMetadata(travel().From("a"));
+    EXPECT_THAT(travel().Run({"mv", travel().From("a"), travel().To("b")}), Succeeded());
+    EXPECT_EQ("data", TextOf(travel().To("b")));
+    travel().ExpectMetadata(travel().To("b"));
+    EXPECT_THAT(NamesIn(travel().source()), ElementsAre());
+    EXPECT_THAT(Travel::ObjectsIn(travel().target()), ElementsAre("b"));
+}
+
+TEST_P(MvWayTest, DirectoriesGoWithAllThatIsInThem) {
+    mkdir(travel().From("tree").c_str(), 0750);
+    mkdir(travel().From("tree/sub").c_str(), 0705);
+    travel().MakeFile(travel().From("tree/sub/file"));
+    travel().GiveMetadata(travel().From("tree"), "white");
+    travel().GiveMetadata(travel().From("tree/sub"), "black");
+    travel().GiveMetadata(travel().From("tree/sub/file"), "green");
+    // Below a directory that is renamed all stays as it is, on volumes of one kind.
+    EXPECT_THAT(travel().Run({"mv", travel().From("tree"), travel().target()}), Succeeded());
+    EXPECT_EQ("data", TextOf(travel().To("tree/sub/file")));
+    EXPECT_EQ(0750, ModeOf(travel().To("tree")));
+    EXPECT_EQ(0705, ModeOf(travel().To("tree/sub")));
+    travel().ExpectMetadata(travel().To("tree"), "white");
+    travel().ExpectMetadata(travel().To("tree/sub"), "black");
+    travel().ExpectMetadata(travel().To("tree/sub/file"), "green");
+    EXPECT_THAT(NamesIn(travel().source()), ElementsAre());
+}
+
+TEST_P(MvWayTest, DifficultNamesAreNamesLikeAnyOther) {
+    for (const std::string& name : DifficultNames()) {
+        SCOPED_TRACE(name);
+        travel().MakeFile(travel().From(name), name);
+        travel().GiveMetadata(travel().From(name));
+        EXPECT_THAT(travel().Run({"mv", travel().From(name), travel().target()}), Succeeded());
+        EXPECT_EQ(name, TextOf(travel().To(name)));
+        travel().ExpectMetadata(travel().To(name));
+    }
+    EXPECT_THAT(NamesIn(travel().source()), ElementsAre());
+}
+
+TEST_P(MvWayTest, TheMetadataOfWhatIsOverwrittenGoesWithIt) {
+    travel().MakeFile(travel().From("a"), "new");
+    travel().MakeFile(travel().To("a"), "old");
+    travel().GiveMetadata(travel().To("a"));
+    EXPECT_THAT(travel().Run({"mv", travel().From("a"), travel().To("a")}), Succeeded());
+    EXPECT_EQ("new", TextOf(travel().To("a")));
+    travel().ExpectNoMetadata(travel().To("a"));
+}
+
+class MvTest : public ::testing::Test {
+ protected:
+    void SetUp() override {
+        MAVOEA_SKIP_UNLESS_ROOT();
+        MAVOEA_SKIP_WITHOUT_ATTRIBUTES("/tmp");
+    }
+    const Travel travel_{kEaDirectory, kEaDirectory};
+};
+
+TEST_F(MvTest, ARenameKeepsTheFileItself) {
+    travel_.MakeFile(travel_.From("a"));
+    const ino_t inode = StatusOf(travel_.From("a")).st_ino;
+    EXPECT_THAT(travel_.Run({"mv", travel_.From("a"), travel_.To("a")}), Succeeded());
+    EXPECT_EQ(inode, StatusOf(travel_.To("a")).st_ino);
+}
+
+TEST_F(MvTest, LinksAndSpecialFilesMoveToo) {
+    const SecondVolume second;
+    MAVOEA_SKIP_WITHOUT_SECOND(second);
+    const Travel travel(kEaDirectory, kEaDirectory, second.path());
+    ASSERT_EQ(0, symlink("nowhere", travel.From("link").c_str()));
+    ASSERT_EQ(0, mkfifo(travel.From("fifo").c_str(), 0600));
+    ASSERT_EQ(0, travel.Run({"set", travel.From("link"), Colour(), "blue"}).status);
+    EXPECT_THAT(travel.Run({"mv", travel.From("link"), travel.From("fifo"), travel.target()}),
+                Succeeded());
+    EXPECT_EQ("nowhere", std::filesystem::read_symlink(travel.To("link")));
+    EXPECT_EQ("blue", travel.Run({"get", travel.To("link"), Colour()}).out);
+    EXPECT_TRUE(S_ISFIFO(StatusOf(travel.To("fifo")).st_mode));
+    EXPECT_THAT(NamesIn(travel.source()), ElementsAre());
+}
+
+TEST_F(MvTest, TwoNamesOfOneFileBecomeOne) {
+    travel_.MakeFile(travel_.From("a"));
+    ASSERT_EQ(0, link(travel_.From("a").c_str(), travel_.From("b").c_str()));
+    travel_.GiveMetadata(travel_.From("a"));
+    EXPECT_THAT(travel_.Run({"mv", travel_.From("a"), travel_.From("b")}), Succeeded());
+    EXPECT_THAT(Travel::ObjectsIn(travel_.source()), ElementsAre("b"));
+    travel_.ExpectMetadata(travel_.From("b"));
+}
+
+TEST_F(MvTest, AskingAndForcingAndNeverTheLastCounts) {
+    const auto text_after = [&](Arguments flags, const std::string& answer) {
+        travel_.MakeFile(travel_.From("a"), "new");
+        travel_.MakeFile(travel_.To("a"), "old");
+        flags.insert(flags.begin(), "mv");
+        flags.insert(flags.end(), {travel_.From("a"), travel_.To("a")});
+        EXPECT_EQ(0, travel_.Run(flags, answer).status);
+        return TextOf(travel_.To("a")) + (Exists(travel_.From("a")) ? "" : ", moved");
+    };
+    EXPECT_EQ("new, moved", text_after({}, "n\n"));
+    EXPECT_EQ("old", text_after({"-i"}, "n\n"));
+    EXPECT_EQ("new, moved", text_after({"-i"}, "y\n"));
+    EXPECT_EQ("old", text_after({"-n"}, "y\n"));
+    EXPECT_EQ("new, moved", text_after({"-n", "-f"}, "n\n"));
+    EXPECT_EQ("old", text_after({"-f", "-i"}, "n\n"));
+}
+
+TEST_F(MvTest, ACopyAsksOnceOnly) {
+    const SecondVolume second;
+    MAVOEA_SKIP_WITHOUT_SECOND(second);
+    const Travel travel(kEaDirectory, kEaDirectory, second.path());
+    travel.MakeFile(travel.From("a"), "new");
+    travel.MakeFile(travel.To("a"), "old");
+    const ToolResult result = travel.Run({"mv", "-i", travel.From("a"), travel.To("a")}, "y\nn\n");
+    EXPECT_EQ("mavoea: overwrite '" + travel.To("a") + "'? ", result.err);
+    EXPECT_EQ("new", TextOf(travel.To("a")));
+    EXPECT_FALSE(Exists(travel.From("a")));
+}
+
+TEST_F(MvTest, WhatMakesNoSenseIsRefused) {
+    const std::string file = travel_.From("file");
+    const std::string tree = travel_.From("tree");
+    travel_.MakeFile(file);
+    mkdir(tree.c_str(), 0755);
+    mkdir(travel_.To("tree").c_str(), 0755);
+    travel_.MakeFile(travel_.To("tree/inside"));
+    const struct {
+        Arguments arguments;
+        int status;
+        std::string message;
+    } cases[] = {
+        {{file, file},
+         2,
+         file + ": it and '" + file + "' are the same file; name another destination"},
+        {{tree, tree + "/deep"},
+         2,
+         tree + ": a directory cannot be moved into itself, '" + tree +
+             "/deep'; name another destination"},
+        {{"-T", tree, file},
+         2,
+         tree + ": a directory cannot overwrite the non-directory '" + file + "'; move that away"},
+        {{"-T", file, tree},
+         2,
+         file + ": a non-directory cannot overwrite the directory '" + tree + "'; move that away"},
+        {{tree, travel_.target()},
+         2,
+         travel_.To("tree") + ": Directory not empty; try again, or check the volume"},
+        {{tree + "/.", travel_.target()},
+         2,
+         tree + "/.: the directories \".\" and \"..\" are not moved; name it from the directory "
+                "above it"},
+        {{travel_.From("none"), travel_.target()},
+         1,
+         travel_.From("none") + ": No such file or directory; check the path"},
+    };
+    for (auto [arguments, status, message] : cases) {
+        arguments.insert(arguments.begin(), "mv");
+        EXPECT_THAT(travel_.Run(arguments), Failed(status, message)) << message;
+    }
+    EXPECT_THAT(NamesIn(travel_.source()), ElementsAre("file", "tree"));
+}
+
+TEST_F(MvTest, AnEmptyDirectoryIsReplacedWithItsMetadata) {
+    mkdir(travel_.From("tree").c_str(), 0755);
+    travel_.MakeFile(travel_.From("tree/a"));
+    mkdir(travel_.To("tree").c_str(), 0755);
+    mkdir(travel_.To("tree/@eaDir").c_str(), 0777);
+    travel_.GiveMetadata(travel_.To("tree"));
+    EXPECT_THAT(travel_.Run({"mv", travel_.From("tree"), travel_.target()}), Succeeded());
+    EXPECT_THAT(NamesIn(travel_.To("tree")), ElementsAre("a"));
+    travel_.ExpectNoMetadata(travel_.To("tree"));
+}
+
+TEST_F(MvTest, WhenNotAllOfATreeArrivesTheSourceIsKeptWhole) {
+    const SecondVolume small("size=64k", true);
+    MAVOEA_SKIP_WITHOUT_SECOND(small);
+    const Travel travel(kEaDirectory, kEaDirectory, small.path());
+    mkdir(travel.From("tree").c_str(), 0755);
+    travel.MakeFile(travel.From("tree/a"));
+    travel.MakeFile(travel.From("tree/b"), std::string(100000, 'b'));
+    travel.GiveMetadata(travel.From("tree/a"));
+    const ToolResult result = travel.Run({"mv", travel.From("tree"), travel.target()});
+    EXPECT_EQ(2, result.status);
+    EXPECT_THAT(result.err, HasSubstr(travel.To("tree/b") + ": No space left on device"));
+    EXPECT_EQ("data", TextOf(travel.From("tree/a")));
+    EXPECT_EQ(100000U, ReadFile(travel.From("tree/b")).size());
+    travel.ExpectMetadata(travel.From("tree/a"));
+    EXPECT_THAT(Travel::ObjectsIn(travel.To("tree")), ElementsAre("a"));
+}
+
+TEST_F(MvTest, MetadataThatDoesNotArriveKeepsTheSourceWhole) {
+    const SecondVolume small("size=64k", true);
+    MAVOEA_SKIP_WITHOUT_SECOND(small);
+    const Travel travel(kEaDirectory, kEaDirectory, small.path());
+    travel.MakeFile(travel.From("a"));
+    travel.GiveMetadata(travel.From("a"));
+    mkdir(travel.From("@eaDir/a").c_str(), 0777);
+    travel.MakeFile(travel.From("@eaDir/a/MAVOPHOTO:BIG"), std::string(100000, 'x'));
+    const ToolResult result = travel.Run({"mv", travel.From("a"), travel.To("a")});
+    EXPECT_EQ(2, result.status);
+    EXPECT_THAT(result.err, HasSubstr("its metadata could not be copied"));
+    EXPECT_EQ("data", TextOf(travel.From("a")));
+    travel.ExpectMetadata(travel.From("a"));
+    EXPECT_EQ(100000U, ReadFile(travel.From("@eaDir/a/MAVOPHOTO:BIG")).size());
+}
+
+TEST_F(MvTest, ARenameWhoseMetadataCannotFollowIsTakenBack) {
+    const Travel travel(kAppleDouble, kAppleDouble);
+    travel.MakeFile(travel.From("a"));
+    travel.GiveMetadata(travel.From("a"));
+    mkdir(travel.To("._a").c_str(), 0755);
+    travel.MakeFile(travel.To("._a/in the way"));
+    const ToolResult result = travel.Run({"mv", travel.From("a"), travel.To("a")});
+    EXPECT_EQ(2, result.status);
+    EXPECT_THAT(result.err, HasSubstr("it could not be removed: Is a directory"));
+    EXPECT_EQ("data", TextOf(travel.From("a")));
+    travel.ExpectMetadata(travel.From("a"));
+    EXPECT_FALSE(Exists(travel.To("a")));
+}
+
+TEST_F(MvTest, WhatIsInTheWayOfMetadataKeepsAllWhereItWas) {
+    travel_.MakeFile(travel_.From("a"));
+    travel_.GiveMetadata(travel_.From("a"));
+    mkdir(travel_.From("@eaDir/a").c_str(), 0777);
+    travel_.MakeFile(travel_.From("@eaDir/a/MAVOPHOTO:THUMB"), "thumbnail");
+    mkdir(travel_.To("@eaDir").c_str(), 0777);
+    travel_.MakeFile(travel_.To("@eaDir/a"), "no folder");
+    EXPECT_EQ(2, travel_.Run({"mv", travel_.From("a"), travel_.To("a")}).status);
+    EXPECT_FALSE(Exists(travel_.To("a")));
+    ASSERT_TRUE(Exists(travel_.From("a")));
+    travel_.ExpectMetadata(travel_.From("a"));
+    EXPECT_TRUE(Exists(travel_.From("@eaDir/a/MAVOPHOTO:THUMB")));
+    EXPECT_THAT(NamesIn(travel_.To("@eaDir")), ElementsAre("a"));
+}
+
+TEST_F(MvTest, MetadataOfNoObjectIsNotLostWithItsDirectory) {
+    const SecondVolume second;
+    MAVOEA_SKIP_WITHOUT_SECOND(second);
+    const Travel travel(kEaDirectory, kEaDirectory, second.path());
+    mkdir(travel.From("tree").c_str(), 0755);
+    travel.MakeFile(travel.From("tree/a"));
+    travel.MakeFile(travel.From("tree/._gone"), "whose?");
+    const ToolResult result = travel.Run({"mv", travel.From("tree"), travel.target()});
+    EXPECT_EQ(2, result.status);
+    EXPECT_THAT(result.err, HasSubstr("it is metadata of no object, and has not been moved"));
+    EXPECT_EQ("whose?", TextOf(travel.From("tree/._gone")));
+    EXPECT_EQ("data", TextOf(travel.To("tree/a")));
+}
+
+TEST_F(MvTest, AnInterruptLeavesEveryObjectWholeInOnePlace) {
+    const SecondVolume second;
+    MAVOEA_SKIP_WITHOUT_SECOND(second);
+    const Travel travel(kEaDirectory, kFileEa, second.path());
+    for (const char* name : {"a", "b", "c"}) {
+        travel.MakeFile(travel.From(name), std::string("new ") + name);
+        travel.GiveMetadata(travel.From(name), name);
+    }
+    travel.MakeFile(travel.To("b"), "old");
+    RunningTool tool(travel.WithVolumes(
+        {"mv", "-i", travel.From("a"), travel.From("b"), travel.From("c"), travel.target()}));
+    ASSERT_TRUE(tool.WaitFor("overwrite '" + travel.To("b") + "'? "));
+    tool.Signal(SIGINT);
+    EXPECT_EQ(130, tool.Wait());
+    EXPECT_THAT(tool.said(), HasSubstr("interrupted: 1 moved"));
+    EXPECT_EQ("new a", TextOf(travel.To("a")));
+    travel.ExpectMetadata(travel.To("a"), "a");
+    EXPECT_EQ("old", TextOf(travel.To("b")));
+    EXPECT_THAT(Travel::ObjectsIn(travel.source()), ElementsAre("b", "c"));
+    travel.ExpectMetadata(travel.From("b"), "b");
+    travel.ExpectMetadata(travel.From("c"), "c");
+    EXPECT_THAT(Travel::ObjectsIn(travel.target()), ElementsAre("a", "b"));
+}
+
+TEST_F(MvTest, VerboseAndJsonSayWhatWasMoved) {
+    travel_.MakeFile(travel_.From("a"));
+    EXPECT_EQ("renamed '" + travel_.From("a") + "' -> '" + travel_.To("a") + "'\n",
+              travel_.Run({"mv", "-v", travel_.From("a"), travel_.target()}).out);
+    const auto json = travel_.Run({"--json", "mv", travel_.To("a"), travel_.source()}).json();
+    EXPECT_EQ("moving", json["task"]);
+    EXPECT_EQ(1, json["done"]);
+    EXPECT_EQ(0, json["failed"]);
+}
+
+}  // namespace
+}  // namespace mavoea::test

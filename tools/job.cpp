@@ -1,0 +1,157 @@
+#include "tools/job.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <iostream>
+
+#include "tools/interrupt.h"
+#include "tools/output.h"
+#include "tools/text.h"
+
+namespace mavoea::tool {
+
+Job::Job(const char* doing, const char* done, const JobOptions& options)
+    : doing_(doing), done_word_(done), options_(options), progress_(doing) {
+    WatchForInterrupts();
+}
+
+bool Job::Ask(const std::string& question) {
+    constexpr int kWait = 100;  // milliseconds
+    progress_.Clear();
+    std::cout.flush();
+    std::cerr << "mavoea: " << question << ' ' << std::flush;
+    std::string answer;
+    while (!stopped()) {
+        pollfd input = {STDIN_FILENO, POLLIN, 0};
+        const int ready = ::poll(&input, 1, kWait);
+        if (ready == 0 || (ready < 0 && errno == EINTR)) continue;
+        char c = 0;
+        if (::read(STDIN_FILENO, &c, 1) != 1 || c == '\n') {
+            return answer.starts_with('y') || answer.starts_with('Y');
+        }
+        answer.push_back(c);
+    }
+    std::cerr << '\n';
+    return false;
+}
+
+bool Job::MayBeLost(const std::string& path, const std::string& question) {
+    if (options_.consent == Consent::kAsk) return Ask(question);
+    struct stat info;
+    const bool asks = options_.consent == Consent::kUsual && ::isatty(STDIN_FILENO) == 1 &&
+                      ::lstat(path.c_str(), &info) == 0 && !S_ISLNK(info.st_mode) &&
+                      ::faccessat(AT_FDCWD, path.c_str(), W_OK, AT_EACCESS) != 0 && errno == EACCES;
+    return !asks || Ask("it is write-protected: " + question);
+}
+
+void Job::AddDone(const std::string& path, const std::string& line) {
+    ++done_;
+    if (options_.verbose && options_.json) lines_.push_back(line);
+    if (options_.verbose && !options_.json) {
+        progress_.Clear();
+        std::cout << line << '\n';
+    }
+    ShowProgress(path);
+}
+
+void Job::AddBytes(std::uint64_t bytes) {
+    bytes_ += bytes;
+    has_bytes_ = true;
+    ShowProgress(path_);
+}
+
+void Job::AddFailure(const std::string& path, const Failure& failure) {
+    failures_.push_back({path, failure.what()});
+    status_ = std::max(status_, failure.status());
+}
+
+void Job::ShowProgress(const std::string& path) {
+    path_ = path;
+    progress_.Show(Counts(), path);
+}
+
+bool Job::stopped() const { return Interrupted() != 0; }
+
+std::string Job::Counts() const {
+    std::string text = std::to_string(done_) + ' ' + done_word_;
+    if (has_bytes_) text += " (" + std::to_string(bytes_) + " bytes)";
+    if (skipped_ > 0) text += ", " + std::to_string(skipped_) + " skipped";
+    return text + ", " + std::to_string(failures_.size()) + " failed";
+}
+
+ExitStatus Job::Finish() {
+    progress_.Clear();
+    if (options_.json) {
+        PrintJson();
+    } else {
+        PrintText();
+    }
+    for (const FailedObject& failed : failures_) Report(failed.message);
+    if (!stopped()) return status_;
+    Report("interrupted: " + Counts() + "; what is left is as it was, give the command again");
+    constexpr int kSignalled = 128;
+    return static_cast<ExitStatus>(kSignalled + Interrupted());
+}
+
+void Job::PrintText() const {
+    if (options_.recursive || options_.paths.size() > 1) std::cout << Counts() << '\n';
+    for (const std::string& note : notes_) Note(note);
+}
+
+void Job::PrintJson() const {
+    Json json;
+    json["task"] = doing_;
+    json["done"] = done_;
+    json["skipped"] = skipped_;
+    if (has_bytes_) json["bytes"] = bytes_;
+    json["failed"] = failures_.size();
+    json["interrupted"] = stopped();
+    const auto add = [&json](const char* key, const std::vector<std::string>& texts) {
+        json[key] = Json::array();
+        for (const std::string& text : texts) {
+            Json item;
+            SetText(item, "message", text);
+            json[key].push_back(std::move(item));
+        }
+    };
+    if (options_.verbose) add("lines", lines_);
+    add("notes", notes_);
+    json["failures"] = Json::array();
+    for (const FailedObject& failed : failures_) {
+        Json item;
+        SetText(item, "path", failed.path);
+        SetText(item, "message", failed.message);
+        json["failures"].push_back(std::move(item));
+    }
+    Print(json);
+}
+
+std::string Quoted(const std::string& path) { return '\'' + Printable(path) + '\''; }
+
+const char* NameOfType(unsigned mode) {
+    switch (mode & S_IFMT) {
+        case S_IFREG:
+            return "regular file";
+        case S_IFDIR:
+            return "directory";
+        case S_IFLNK:
+            return "symbolic link";
+        case S_IFIFO:
+            return "fifo";
+        case S_IFSOCK:
+            return "socket";
+        case S_IFBLK:
+            return "block special file";
+        case S_IFCHR:
+            return "character special file";
+        default:
+            return "file";
+    }
+}
+
+}  // namespace mavoea::tool
