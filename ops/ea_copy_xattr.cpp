@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <utility>
 
 #include "format/ea_stream.h"
@@ -254,23 +255,26 @@ class XattrImport {
         return strcmp(name, kFinderInfoName) == 0 || strcmp(name, kForkName) == 0;
     }
 
+    // Reads an attribute; none when that failed, which is counted. False when the whole ends with
+    // it, because memory ran out.
+    bool Read(const char* name, std::optional<ByteView>* value) {
+        std::uint32_t length = 0;
+        const Fetched fetched = Fetch(src_, name, &buffer_, &length);
+        if (fetched == Fetched::kValue) *value = buffer_.First(length);
+        if (fetched == Fetched::kFailed) --result_;
+        return fetched != Fetched::kNoMemory;
+    }
+
     // The steps below are false when the whole ends with them.
 
     bool FetchResources() {
         for (int i = 0; const char* const name = names_[i]; ++i) {
             if (!IsResource(name)) continue;
-            std::uint32_t length = 0;
-            switch (Fetch(src_, name, &buffer_, &length)) {
-                case Fetched::kNoMemory:
-                    return false;
-                case Fetched::kFailed:
-                    --result_;
-                    continue;
-                case Fetched::kValue:
-                    break;
-            }
+            std::optional<ByteView> value;
+            if (!Read(name, &value)) return false;
+            if (!value) continue;
             KeptValue* const kept = strcmp(name, kForkName) == 0 ? &fork_ : &finder_info_;
-            if (!kept->Keep(buffer_.First(length))) {
+            if (!kept->Keep(*value)) {
                 unit.Fail(Err::kBufferMemory);
                 --result_;
             }
@@ -303,18 +307,12 @@ class XattrImport {
     bool WriteStream() {
         for (int i = 0; const char* const name = names_[i]; ++i) {
             if (IsResource(name)) continue;
-            std::uint32_t length = 0;
-            switch (Fetch(src_, name, &buffer_, &length)) {
-                case Fetched::kNoMemory:
-                    return false;
-                case Fetched::kFailed:
-                    --result_;
-                    continue;
-                case Fetched::kValue:
-                    break;
-            }
+            std::optional<ByteView> value;
+            if (!Read(name, &value)) return false;
+            if (!value) continue;
             if (stream_ == nullptr && !OpenStream()) return false;
-            if (MAVOEASWrite(stream_, name, buffer_.data(), length, 0, 0) < 0) {
+            if (MAVOEASWrite(stream_, name, value->data(), static_cast<unsigned>(value->size()), 0,
+                             0) < 0) {
                 unit.LogWrapped("%s:%d [0x%04X %s:%d]Fail to write eastream(%s). %m", dst_);
                 return unit.Fail(Err::kWrite) == 0;
             }

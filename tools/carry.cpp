@@ -266,8 +266,9 @@ class AppleDoubleTarget {
         }
         if (from.keeping() != Keeping::kEaDirectory) return;
         std::string name(MAVOEA_PATH_SIZE + 1, '\0');
-        if (MAVOStrReplaceFATReservedChar(path_.c_str(), name.data(), MAVOEA_PATH_SIZE) != 0)
+        if (MAVOStrReplaceFATReservedChar(path_.c_str(), name.data(), MAVOEA_PATH_SIZE) != 0) {
             return;
+        }
         name.resize(name.find('\0'));
         if (name == path_) return;
         fat_path_ = name;
@@ -407,8 +408,8 @@ void RenameMetadata(const Object& from, const Object& to) {
                   "see whether it may be renamed");
 }
 
-void RemoveMetadata(const Object& object, Report report) {
-    const int told = report == Report::kYes ? 1 : 0;
+void RemoveMetadata(const Object& object, IndexReport report) {
+    const int told = report == IndexReport::kYes ? 1 : 0;
     EAIndexFlags flags = {told, told};
     RemoveLinkedFolder(object);
     const ErrorMark mark;

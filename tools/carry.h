@@ -31,11 +31,11 @@ void RenameMetadata(const Object& from, const Object& to);
 void ReportNew(const std::string& path);
 void ReportRenamed(const std::string& from, const std::string& to);
 
-enum class Report { kNo, kYes };
+enum class IndexReport { kNo, kYes };
 
 // Removes what lies beside an object that has gone, or gets other contents; the indexes are told of
 // the first. Throws Failure.
-void RemoveMetadata(const Object& object, Report report);
+void RemoveMetadata(const Object& object, IndexReport report);
 
 // Removes the named attributes and the record that are in the inode itself. Throws Failure.
 void RemoveInodeMetadata(const Object& object);

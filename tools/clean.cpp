@@ -46,16 +46,11 @@ class Cleaning {
                       << (options_.remove ? " removed, " : " to be removed with --yes, ") << kept_
                       << " kept, " << failures_.size() << " failed\n";
         }
-        for (const FailedPath& failed : failures_) Report(failed.message);
+        for (const FailedObject& failed : failures_) Report(failed.message);
         return status_;
     }
 
  private:
-    struct FailedPath {
-        std::string path;
-        std::string message;
-    };
-
     // What is in there is metadata, whatever its name.
     static void RefuseEaDirectory(const std::string& path) {
         for (const std::filesystem::path& component : std::filesystem::path(path)) {
@@ -89,7 +84,7 @@ class Cleaning {
         bool removed = false;
         try {
             if (options_.remove && !kept) {
-                removed = dangling.kind == DanglingKind::kEaDirectory
+                removed = dangling.kind == DanglingKind::kEaDirectory && ea_dir != nullptr
                               ? RemoveEaDirectory(holder, *ea_dir, dangling.name)
                               : holder.Remove(dangling.name);
                 if (!removed) return;
@@ -144,13 +139,7 @@ class Cleaning {
         json["removed"] = removed_;
         json["kept"] = kept_;
         json["failed"] = failures_.size();
-        json["failures"] = Json::array();
-        for (const FailedPath& failed : failures_) {
-            Json entry;
-            SetText(entry, "path", failed.path);
-            SetText(entry, "message", failed.message);
-            json["failures"].push_back(std::move(entry));
-        }
+        SetFailures(json, failures_);
         Print(json);
     }
 
@@ -160,7 +149,7 @@ class Cleaning {
     std::size_t dangling_ = 0;  // neither removed nor kept
     std::size_t removed_ = 0;
     std::size_t kept_ = 0;
-    std::vector<FailedPath> failures_;
+    std::vector<FailedObject> failures_;
     ExitStatus status_ = kSuccess;
 };
 

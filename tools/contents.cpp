@@ -10,7 +10,6 @@ namespace {
 
 constexpr const char* kLook = "look at it with: mavoea dump FILE";
 
-
 class ContentsReader {
  public:
     ContentsReader(const File& file, const Layout& layout) : file_(file), layout_(layout) {}

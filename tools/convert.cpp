@@ -81,13 +81,14 @@ class Conversion {
         };
         std::vector<Step> steps = {{top_, false}};
         while (!steps.empty()) {
-            const auto [pair, finish] = std::move(steps.back());
+            const Step step = std::move(steps.back());
+            const Pair& pair = step.pair;
             steps.pop_back();
             // What was begun is given its attributes all the same.
-            if (Interrupted() != 0 && !finish) continue;
+            if (Interrupted() != 0 && !step.finish) continue;
             Show(pair.from);
             Try(pair.from, [&] {
-                if (finish) {
+                if (step.finish) {
                     transfer.FinishDirectory(pair.from, pair.to);
                 } else if (!IsDirectory(pair.from)) {
                     transfer.CopyObject(pair.from, pair.to);
@@ -136,11 +137,6 @@ class Conversion {
     }
 
  private:
-    struct FailedObject {
-        std::string path;
-        std::string message;
-    };
-
     // Names of objects in a directory, the last first. Each part of the work sees what was left
     // behind, so one of them says so.
     std::vector<std::string> Children(const std::string& path, bool reverse) {
@@ -170,7 +166,7 @@ class Conversion {
             return;
         }
         const Comparison::Receiver receiver = {
-            .differs = [this](Difference difference) { Add(std::move(difference)); },
+            .differs = [this](const Difference& difference) { Add(difference); },
             .fails = [&](const Failure& failure) { AddFailure(pair.from, failure); },
             .give_up = InterruptedAgain};
         Comparison(original, FindObject(pair.to), receiver).Run();
@@ -224,19 +220,8 @@ class Conversion {
         json["differences"] = list_;
         json["failed"] = failures_.size();
         json["interrupted"] = Interrupted() != 0;
-        json["notes"] = Json::array();
-        for (const std::string& note : notes_) {
-            Json item;
-            SetText(item, "message", note);
-            json["notes"].push_back(std::move(item));
-        }
-        json["failures"] = Json::array();
-        for (const FailedObject& failed : failures_) {
-            Json item;
-            SetText(item, "path", failed.path);
-            SetText(item, "message", failed.message);
-            json["failures"].push_back(std::move(item));
-        }
+        SetMessages(json, "notes", notes_);
+        SetFailures(json, failures_);
         Print(json);
     }
 

@@ -23,7 +23,7 @@ struct stat StatusOf(const std::string& path) {
 // Data first: without it, metadata is of no use to anybody.
 void DeleteFile(const Object& object) {
     if (::unlink(object.path.c_str()) != 0) throw SystemFailure(object.path, errno);
-    RemoveMetadata(object, Report::kYes);
+    RemoveMetadata(object, IndexReport::kYes);
 }
 
 bool IsEaDirectory(const Directory::Entry& entry) {
@@ -53,7 +53,7 @@ void DeleteEmptyDirectory(const Object& object, Orphans orphans) {
         for (const Directory::Entry& entry : entries) (void)directory.Remove(entry.name);
     }
     if (::rmdir(object.path.c_str()) != 0) throw SystemFailure(object.path, errno);
-    RemoveMetadata(object, Report::kYes);
+    RemoveMetadata(object, IndexReport::kYes);
 }
 
 // As deep as paths can be: each level takes a '/' and a letter of 4096 bytes.

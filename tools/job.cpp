@@ -111,23 +111,9 @@ void Job::PrintJson() const {
     if (has_bytes_) json["bytes"] = bytes_;
     json["failed"] = failures_.size();
     json["interrupted"] = stopped();
-    const auto add = [&json](const char* key, const std::vector<std::string>& texts) {
-        json[key] = Json::array();
-        for (const std::string& text : texts) {
-            Json item;
-            SetText(item, "message", text);
-            json[key].push_back(std::move(item));
-        }
-    };
-    if (options_.verbose) add("lines", lines_);
-    add("notes", notes_);
-    json["failures"] = Json::array();
-    for (const FailedObject& failed : failures_) {
-        Json item;
-        SetText(item, "path", failed.path);
-        SetText(item, "message", failed.message);
-        json["failures"].push_back(std::move(item));
-    }
+    if (options_.verbose) SetMessages(json, "lines", lines_);
+    SetMessages(json, "notes", notes_);
+    SetFailures(json, failures_);
     Print(json);
 }
 

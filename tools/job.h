@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "tools/messages.h"
+#include "tools/output.h"
 #include "tools/progress.h"
 
 namespace mavoea::tool {
@@ -50,11 +51,6 @@ class Job {
     ExitStatus Finish();
 
  private:
-    struct FailedObject {
-        std::string path;
-        std::string message;
-    };
-
     std::string Counts() const;
     void PrintText() const;
     void PrintJson() const;

@@ -181,7 +181,7 @@ void Transfer::CopyNode(const Leg& leg) {
         ::close(placeholder.MakeFile());
         placeholder.GiveToTarget();
     }
-    if (HasSidecar(leg.to)) RemoveMetadata(leg.to, Report::kNo);
+    if (HasSidecar(leg.to)) RemoveMetadata(leg.to, IndexReport::kNo);
     if (has_sidecar) CopyMetadata(leg.from, leg.to);
 
     TemporaryName temporary(to);
@@ -239,7 +239,7 @@ void Transfer::Finish(const Leg& leg) {
     const std::string& to = leg.to.path;
     std::optional<Failure> failure;
     try {
-        if (HasSidecar(leg.to)) RemoveMetadata(leg.to, Report::kNo);
+        if (HasSidecar(leg.to)) RemoveMetadata(leg.to, IndexReport::kNo);
         CopyMetadata(leg.from, leg.to);
     } catch (const Failure& problem) {
         failure = problem;
@@ -253,7 +253,7 @@ void Transfer::Finish(const Leg& leg) {
     const mode_t mode = failure ? wanted.st_mode & kPermissions : FinalMode(wanted, now, leg.to);
     if ((now.st_mode & kPermissions) != mode) (void)::chmod(to.c_str(), mode);
     CopyTimes(leg.info, to);
-    if (failure) throw *failure;
+    if (failure) throw Failure(*failure);
 }
 
 bool Transfer::MakeDirectory(const std::string& from, const std::string& to) {
@@ -292,7 +292,7 @@ bool Transfer::Rename(const std::string& from, const std::string& to) {
     const auto take_back = [&] { return !replaces && ::rename(to.c_str(), from.c_str()) == 0; };
     try {
         // Nothing of another object may be taken for what belongs to this one.
-        if (HasSidecar(target)) RemoveMetadata(target, Report::kNo);
+        if (HasSidecar(target)) RemoveMetadata(target, IndexReport::kNo);
         if (has_sidecar && HasSidecar(target)) {
             throw Failure(kFailed, from,
                           "something is in the way of its metadata at " + Printable(to),

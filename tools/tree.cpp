@@ -86,11 +86,6 @@ class Walk {
     }
 
  private:
-    struct FailedObject {
-        std::string path;
-        std::string message;
-    };
-
     // Everything below a directory, which is done already. No depth takes more than the heap.
     void DoTree(const std::string& top) {
         std::vector<std::string> pending = {top};
@@ -174,19 +169,8 @@ class Walk {
             if (Words()[i] != nullptr) json[kKeys[i]] = counts_[i];
         }
         json["failed"] = failures_.size();
-        json["notes"] = Json::array();
-        for (const std::string& note : notes_) {
-            Json item;
-            SetText(item, "message", note);
-            json["notes"].push_back(std::move(item));
-        }
-        json["failures"] = Json::array();
-        for (const FailedObject& failed : failures_) {
-            Json item;
-            SetText(item, "path", failed.path);
-            SetText(item, "message", failed.message);
-            json["failures"].push_back(std::move(item));
-        }
+        SetMessages(json, "notes", notes_);
+        SetFailures(json, failures_);
         Print(json);
         for (const FailedObject& failed : failures_) Report(failed.message);
     }

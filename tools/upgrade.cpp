@@ -82,7 +82,7 @@ class ObjectUpgrade {
         for (const std::string& name : reserved) {
             Try([&] { UpgradeReserved(name); });
         }
-        if (failure_) throw *failure_;
+        if (failure_) throw Failure(*failure_);
         return converted_ ? Outcome::kDone : current_ ? Outcome::kCurrent : Outcome::kNothing;
     }
 

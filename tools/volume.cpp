@@ -8,6 +8,7 @@
 #include "include/mavoea.h"
 #include "platform/include/mavocore.h"
 #include "tools/messages.h"
+#include "util/volume_kind.h"
 
 namespace mavoea::tool {
 namespace {
@@ -40,21 +41,19 @@ MetadataPath Derived(const char* id, const char* label, const Object& object, in
 }  // namespace
 
 Keeping Object::keeping() const {
-    switch (type) {
-        case 0:
-        case 5:
+    switch (VolumeKindOf(type)) {
+        case VolumeKind::kAppleDouble:
             return Keeping::kAppleDouble;
-        case 1:
-        case 2:
-        case 3:
-        case 6:
-        case 10:
+        case VolumeKind::kEADir:
+        case VolumeKind::kFileEA:
             return Keeping::kEaDirectory;
-        case 7:
+        case VolumeKind::kAttribute:
             return Keeping::kXattr;
-        default:
-            return Keeping::kNone;
+        case VolumeKind::kDestinationOnly:
+        case VolumeKind::kNone:
+            break;
     }
+    return Keeping::kNone;
 }
 
 Object FindObject(const std::string& path) {
