@@ -8,7 +8,6 @@
 #include <cstddef>
 #include <cstdint>
 #include <optional>
-#include <utility>
 
 #include "format/ea_stream.h"
 #include "include/mavoea.h"
@@ -92,21 +91,13 @@ int SetAttributes(int fd, const char* dst, GrowingBuffer* value) {
     const off_t file_size = kernel::Lseek(fd, 0, SEEK_END);
     for (unsigned i = 0; i < count; ++i) {
         const EASEntry& entry = stream->entries[i];
-        const Range place = {entry.offset, entry.length};
-        // What the file cannot have takes no memory.
-        const bool here = place.length == 0 || std::cmp_less_equal(place.end(), file_size);
-        Err code{};
-        if (here && !value->Reach(place.length)) {
-            code = Err::kBufferMemory;
-        } else if (!here || ReadAt(fd, value->First(place.length), place.offset) != place.length) {
-            code = Err::kRead;
-        } else if (MAVOEAXattrSet(dst, entry.name, value->data(), static_cast<int>(place.length),
-                                  0) != 0) {
-            code = Err::kWrite;
-        } else {
-            continue;
+        std::optional<Err> error = value->Fill(fd, {entry.offset, entry.length}, file_size);
+        if (!error && MAVOEAXattrSet(dst, entry.name, value->data(), static_cast<int>(entry.length),
+                                     0) != 0) {
+            error = Err::kWrite;
         }
-        unit.Fail(code);
+        if (!error) continue;
+        unit.Fail(*error);
         ++failures;
     }
     (void)MAVOEASClose(stream);
@@ -175,11 +166,7 @@ int FindEntries(int fd, ResourceEntries* found) {
 // The bytes at `place` of the file on fd, as an attribute of dst. 0, or -1 after recording why not.
 int SetFromFile(int fd, Range place, const char* dst, const char* name, GrowingBuffer* buffer) {
     const off_t file_size = kernel::Lseek(fd, 0, SEEK_END);
-    if (std::cmp_greater(place.end(), file_size)) return unit.Fail(Err::kRead);
-    if (!buffer->Reach(place.length)) return unit.Fail(Err::kBufferMemory);
-    if (ReadAt(fd, buffer->First(place.length), place.offset) != place.length) {
-        return unit.Fail(Err::kRead);
-    }
+    if (const auto error = buffer->Fill(fd, place, file_size)) return unit.Fail(*error);
     if (MAVOEAXattrSet(dst, name, buffer->data(), static_cast<int>(place.length), 0) != 0) {
         return unit.Fail(Err::kWrite);
     }

@@ -3,9 +3,13 @@
 #define MAVOEA_UTIL_GROWING_BUFFER_H_
 
 #include <cstdint>
+#include <optional>
+#include <utility>
 
 #include "util/bytes.h"
+#include "util/file_io.h"
 #include "util/owned.h"
+#include "util/unit.h"
 
 namespace mavoea {
 
@@ -23,6 +27,16 @@ class GrowingBuffer {
         bytes_ = Owned<std::uint8_t>::Allocate(size);
         size_ = bytes_ ? size : 0;
         return size_ != 0;
+    }
+
+    // The bytes at `from` of the file on fd, which has `file_size` of them (-1: nobody knows), in
+    // data(). None, or why not: kRead, also for what the file cannot have, which takes no memory;
+    // kBufferMemory.
+    std::optional<Err> Fill(int fd, Range from, off_t file_size) {
+        if (from.length != 0 && std::cmp_greater(from.end(), file_size)) return Err::kRead;
+        if (!Reach(from.length)) return Err::kBufferMemory;
+        if (ReadAt(fd, First(from.length), from.offset) != from.length) return Err::kRead;
+        return std::nullopt;
     }
 
     std::uint8_t* data() const { return bytes_.get(); }
