@@ -29,7 +29,7 @@ int MAVOEAEADirAdoubleRead(const char* path, EAAdouble* ad) {
         unit.Log("%s:%d Fail to generate path of %s.", path);
         return -1;
     }
-    const UniqueFd fd(kernel::Open(file, O_RDONLY | O_CLOEXEC, 0));
+    const UniqueFd fd(kernel::OpenRegular(file, O_RDONLY | O_CLOEXEC, 0));
     if (!fd) {
         if (errno == ENOENT) return 1;
         unit.Log("%s:%d Error: open path [%s] %s", path, strerror(errno));

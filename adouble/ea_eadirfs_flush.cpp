@@ -33,14 +33,14 @@ int MAVOEAEADirAdoubleFlush(const void* buf, int len, const char* path) {
     }
     // The descriptor stays open on every way out: closing it would drop the process's record locks
     // on the file, which a caller may hold through a stream handle.
-    int fd = kernel::Open(file, O_RDWR | O_CLOEXEC, 0);
+    int fd = kernel::OpenRegular(file, O_RDWR | O_CLOEXEC, 0);
     bool created = false;
     if (fd < 0) {
         if (errno != ENOENT) {
             unit.Log("%s:%d Error open path [%s] %s", path, strerror(errno));
             return unit.Fail(Err::kOpen);
         }
-        fd = kernel::Open(file, O_RDWR | O_CREAT | O_CLOEXEC, 0777);
+        fd = kernel::OpenRegular(file, O_RDWR | O_CREAT | O_CLOEXEC, 0777);
         if (fd < 0) {
             unit.Log("%s:%d Error open path [%s] %s", path, strerror(errno));
             return unit.Fail(Err::kOpen);

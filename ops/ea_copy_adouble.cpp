@@ -11,6 +11,7 @@
 
 #include "format/apple_double.h"
 #include "util/file_io.h"
+#include "util/metadata_file.h"
 #include "util/owned.h"
 #include "util/unit.h"
 
@@ -81,6 +82,7 @@ class CommandLine {
 int CopyAsItIs(const char* src, const char* dst) {
     CommandLine command;
     command.Add("/bin/cp -f ").AddPath(src).Add(" ").AddPath(dst).Add(" > /dev/null 2>&1");
+    if (!IsMetadataOrMissing(src) || !IsMetadataOrMissing(dst)) return kRefused;
     return command.text() != nullptr && kernel::System(command.text()) == 0 ? kDone : kRefused;
 }
 
@@ -279,14 +281,13 @@ class Rewrite {
     std::uint32_t fork_length_ = 0;
 };
 
-// A named pipe must not keep the caller waiting.
-constexpr int kRead = O_RDONLY | O_NONBLOCK | O_CLOEXEC;
-constexpr int kWrite = O_WRONLY | O_CREAT | O_NONBLOCK | O_CLOEXEC;
+constexpr int kRead = O_RDONLY | O_CLOEXEC;
+constexpr int kWrite = O_WRONLY | O_CREAT | O_CLOEXEC;
 
 // Opens src to see what it is. kDone with *rewrite false when there is nothing to rewrite.
 int Examine(const char* src, bool* rewrite) {
     *rewrite = false;
-    const UniqueFd fd(kernel::Open(src, kRead, 0));
+    const UniqueFd fd(kernel::OpenRegular(src, kRead, 0));
     if (fd.get() == 0) errno = EBADF;  // Standard input's place is no file's.
     if (fd.get() < 1) {
         if (errno == ENOENT) return kDone;
@@ -315,13 +316,13 @@ int RewriteFile(const char* src, const char* dst) {
     const int examined = Examine(src, &rewrite);
     if (!rewrite) return examined;
 
-    const UniqueFd from(kernel::Open(src, kRead, 0));
+    const UniqueFd from(kernel::OpenRegular(src, kRead, 0));
     if (!from) {
         if (errno == ENOENT) return kDone;
         unit.Log("%s:%d(%s) failed to open %s, reason=%s.\n", kFunction, src, strerror(errno));
         return kNotOpened;
     }
-    UniqueFd to(kernel::Open(dst, kWrite, 0600));
+    UniqueFd to(kernel::OpenRegular(dst, kWrite, 0600));
     if (!to) {
         unit.Log("%s:%d(%s) failed to open %s, reason=%s.\n", kFunction, dst, strerror(errno));
         return kNotOpened;

@@ -11,6 +11,7 @@
 #include "ops/ea_copy_adouble.h"
 #include "platform/include/mavocore.h"
 #include "stream/internal.h"
+#include "util/metadata_file.h"
 #include "util/owned.h"
 #include "util/path_text.h"
 #include "util/volume_kind.h"
@@ -42,7 +43,7 @@ int RemoveFile(const char* path) {
 int AttributesFromAppleDouble(const char* src, const char* dst) {
     Path path;
     if (MAVOEAADPath(src, path, kDerivedPathMax) != 0) return -1;
-    const UniqueFd from(kernel::Open(path, O_RDONLY | O_CLOEXEC, 0));
+    const UniqueFd from(kernel::OpenRegular(path, O_RDONLY | O_CLOEXEC, 0));
     if (!from) return errno == ENOENT ? 0 : unit.Fail(Err::kOpen);
     const int count = EASGetEntryCount(from.get());
     if (count <= 0) return count;
@@ -71,8 +72,8 @@ int AttributesToAppleDouble(const char* src, const char* dst) {
     if (MAVOEAADPath(dst, path, kDerivedPathMax) != 0) {
         return errno == ENOENT ? -1 : unit.Fail(Err::kOpen);
     }
-    UniqueFd to(kernel::Open(path, O_RDWR | O_CLOEXEC, kMode));
-    if (!to) to.Reset(kernel::Open(path, O_RDWR | O_CREAT | O_CLOEXEC, kMode));
+    UniqueFd to(kernel::OpenRegular(path, O_RDWR | O_CLOEXEC, kMode));
+    if (!to) to.Reset(kernel::OpenRegular(path, O_RDWR | O_CREAT | O_CLOEXEC, kMode));
     if (!to) return errno == ENOENT ? -1 : unit.Fail(Err::kOpen);
     return EASWriteToFd(from.get(), to.get()) == 0 ? 0 : -2;
 }
@@ -89,7 +90,8 @@ int EACopyADFStoADFS(const char* src, const char* dst, int move) {
         unit.Log("%s:%d filename too long: [%s].", dst);
         return kCopyNameTooLong;
     }
-    if (MLIBCExec("/bin/cp", "-f", from, to, nullptr) < 0) {
+    if (!IsMetadataOrMissing(from) || !IsMetadataOrMissing(to) ||
+        MLIBCExec("/bin/cp", "-f", from, to, nullptr) < 0) {
         unit.Log("%s:%d(%s) Failed to cp -f %s.\n", "EACopyADFStoADFS", from);
         return -1;
     }

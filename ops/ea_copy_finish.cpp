@@ -10,6 +10,7 @@
 #include "ops/ea_copy.h"
 #include "ops/folder.h"
 #include "platform/include/mavocore.h"
+#include "util/metadata_file.h"
 #include "util/path_text.h"
 #include "util/volume_kind.h"
 
@@ -43,6 +44,10 @@ void LogNotCopied(const char* from, const char* to, int line = __builtin_LINE())
 // Without copy_fn, a file that has been moved is then copied, which cannot find it any more: what
 // the copy says, a positive status, is no failure.
 bool CarryFile(const CopyRequest& copy, const char* from, const char* to) {
+    if (!IsMetadataOrMissing(to)) {
+        LogNotCopied(from, to);
+        return false;
+    }
     if (copy.copy_fn != nullptr) {
         if (copy.copy_fn(from, to) >= 0) return true;
         LogNotCopied(from, to);
@@ -64,7 +69,7 @@ void CarryEntry(const CopyRequest& copy, const dirent& entry, const char* src_di
     if (IsRegular(entry, from)) {
         Path to;
         Join(to, dst_dir, entry.d_name);
-        if (CarryFile(copy, from, to)) (void)kernel::Chmod(to, kMode);
+        if (CarryFile(copy, from, to)) SetMetadataMode(to, kMode);
     }
     if (copy.move != 0 && kernel::Access(from, F_OK) == 0) RemoveTree(from);
 }
@@ -83,7 +88,7 @@ void GiveUp(const CopyRequest& copy, const char* src_dir) {
 bool CarryOver(const CopyRequest& copy, Path src_dir) {
     if (MAVOEADirPath(EA_FORM_FOLDER, copy.src, src_dir, kDerivedPathMax) != 0) return false;
     struct stat info;
-    if (kernel::Stat(src_dir, &info) != 0 || !S_ISDIR(info.st_mode)) return true;
+    if (kernel::Lstat(src_dir, &info) != 0 || !S_ISDIR(info.st_mode)) return true;
 
     Path dst_dir;
     if (EAPrepareEADir(EA_FORM_FOLDER, copy.dst, dst_dir, kDerivedPathMax) != 0) {

@@ -9,6 +9,7 @@
 #include "ops/ea_copy.h"
 #include "ops/ea_copy_adouble.h"
 #include "platform/include/mavocore.h"
+#include "util/metadata_file.h"
 #include "util/owned.h"
 #include "util/path_text.h"
 
@@ -48,14 +49,16 @@ int EACopySidecar(const char* src, const char* dst, const char* name, int move, 
     if (MAVOEAPath(EA_FORM_FILE, dst, name, to, kDerivedPathMax, EA_PLACE_EADIR) != 0) return -1;
     if (EAPrepareEADir(1, dst, dir, kDerivedPathMax) != 0) return -1;
 
-    const int copied =
-        copyFn != nullptr ? copyFn(from, to) : MLIBCExec("/bin/cp", "-f", from, to, nullptr);
-    if (copied < 0) {
+    const auto copied = [&] {
+        if (!IsMetadataOrMissing(from) || !IsMetadataOrMissing(to)) return -1;
+        return copyFn != nullptr ? copyFn(from, to) : MLIBCExec("/bin/cp", "-f", from, to, nullptr);
+    };
+    if (copied() < 0) {
         unit.LogWrapped("%s:%d [0x%04X %s:%d]Failed to cp -f %s %s. %m", from, to);
         return -1;
     }
     if (move != 0 && !Removed(from)) return unit.Fail(Err::kSystemCall);
-    (void)kernel::Chmod(to, kMode);
+    SetMetadataMode(to, kMode);
     return 0;
 }
 

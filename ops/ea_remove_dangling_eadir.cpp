@@ -35,7 +35,7 @@ using namespace mavoea;
 
 void MAVOEARemoveDanglingEADir(const char* szDir) {
     if (szDir == nullptr) return;
-    Folder dir(szDir);
+    Folder dir(szDir, Folder::Links::kFollowed);
     if (!dir) {
         unit.Log("%s:%d failed to opendir [%s], errno=%m", szDir);
         return;

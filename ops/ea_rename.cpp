@@ -6,6 +6,7 @@
 
 #include "include/mavoea.h"
 #include "platform/include/mavocore.h"
+#include "util/metadata_file.h"
 #include "util/owned.h"
 #include "util/path_text.h"
 #include "util/unit.h"
@@ -46,6 +47,8 @@ int Move(const char* source, const char* target) {
     }
     if (errno != ENOENT) {
         if (errno != EXDEV) return unit.Fail(Err::kRename);
+        // The program would move into a directory, or through a link to one.
+        if (!IsMetadataOrMissing(target)) return unit.Fail(Err::kRename);
         const int status = MLIBCExec("/bin/mv", source, target, nullptr);
         if (status != 0) {
             unit.Fail(Err::kRename);  // first that it could not be moved, then that it was not

@@ -42,6 +42,15 @@ bool Exists(const char* path) {
            (errno != ENOENT && errno != ENOTDIR && errno != ENAMETOOLONG);
 }
 
+// Whether the folder of the legacy file at `path` is one, and not a symbolic link that somebody put
+// there to have other files moved.
+bool IsInFolder(const char* path) {
+    char folder[kPathBufferSize];
+    CutShort(folder, sizeof folder).Add(WithoutTrailingSlash(SplitObject(path).parent));
+    struct stat info;
+    return kernel::Lstat(folder, &info) == 0 && S_ISDIR(info.st_mode);
+}
+
 // Removes a legacy folder that has become empty; one that has not, stays. `result`, or kFailure.
 int RemoveFolder(const char* folder, int result, int line = __builtin_LINE()) {
     const ErrnoKeeper keep;
@@ -142,8 +151,8 @@ class AttributeImport {
     int Read(const char* path, std::uint32_t* size) {
         struct stat info;
         if (kernel::Stat(path, &info) != 0) return unit.Fail(Err::kSystemCall);
-        // A named pipe must not keep the caller waiting.
-        const UniqueFd fd(kernel::Open(path, O_RDONLY | O_NONBLOCK | O_CLOEXEC, 0));
+        if (S_ISDIR(info.st_mode)) return unit.Fail(Err::kRead);
+        const UniqueFd fd(kernel::OpenRegular(path, O_RDONLY | O_CLOEXEC, 0));
         if (fd.get() <= 0) return unit.Fail(Err::kOpen);
         *size = static_cast<std::uint32_t>(info.st_size);
         if (!Reach(*size)) return unit.Fail(Err::kBufferMemory);
@@ -171,7 +180,7 @@ class AttributeImport {
 };
 
 int ImportAttributeFiles(const char* szPath, const char* stream_path, Folder* folder) {
-    const UniqueFd fd(kernel::Open(stream_path, O_RDWR | O_CREAT | O_CLOEXEC, kMode));
+    const UniqueFd fd(kernel::OpenRegular(stream_path, O_RDWR | O_CREAT | O_CLOEXEC, kMode));
     if (!fd) return unit.Fail(Err::kOpen);
     EASHandle* const stream = MAVOEASOpen(fd.get(), F_WRLCK);
     if (stream == nullptr) return kFailure;
@@ -281,7 +290,7 @@ int FindMarks(int fd, MarkOffsets* found) {
 }
 
 int ReadMarks(const char* resource_file, Marks* marks) {
-    const UniqueFd fd(kernel::Open(resource_file, O_RDONLY | O_CLOEXEC, 0));
+    const UniqueFd fd(kernel::OpenRegular(resource_file, O_RDONLY | O_CLOEXEC, 0));
     if (!fd) return unit.Fail(Err::kOpen);
     MarkOffsets offsets;
     if (FindMarks(fd.get(), &offsets) != 0) return -1;
@@ -324,6 +333,7 @@ int UpgradeResourceFile(const char* szPath) {
     }
     if (Exists(current)) return kCurrent;
     if (!Exists(legacy)) return kNothing;
+    if (!IsInFolder(legacy)) return unit.Fail(Err::kOpen);
     if (kernel::Rename(legacy, current) != 0) return unit.Fail(Err::kRename);
     CarryMarks(current, szPath);
     *strrchr(legacy, '/') = '\0';
@@ -342,6 +352,7 @@ int UpgradeReserved(const char* szPath, const char* szName) {
     if (char* const colon = strrchr(current, ':'); colon != nullptr) *colon = '@';
     if (Exists(current)) return kCurrent;
     if (!Exists(legacy)) return kNothing;
+    if (!IsInFolder(legacy)) return unit.Fail(Err::kOpen);
     return MLIBCExec("/bin/mv", legacy, current, nullptr) == -1 ? kFailure : kConverted;
 }
 

@@ -11,8 +11,13 @@ namespace mavoea {
 
 class Folder {
  public:
+    // A folder in the EA directory, where everybody may put a link in its place: kRefused. The
+    // caller's own directory: kFollowed.
+    enum class Links { kRefused, kFollowed };
+
     // Empty, with errno, when it cannot be opened.
-    explicit Folder(const char* path) : dir_(kernel::Opendir(path)) {}
+    explicit Folder(const char* path, Links links = Links::kRefused)
+        : dir_(links == Links::kFollowed ? kernel::Opendir(path) : kernel::OpendirItself(path)) {}
     ~Folder() { Close(); }
     Folder(const Folder&) = delete;
     Folder& operator=(const Folder&) = delete;

@@ -3,6 +3,7 @@
 #include <errno.h>
 
 #include "include/mavoea.h"
+#include "platform/kernel.h"
 #include "util/path_text.h"
 #include "util/unit.h"
 
@@ -22,9 +23,9 @@ int OpenAppleDouble(int form, const char* szPath, const char* szName, int oflag)
     if (MAVOEAPath(form, szPath, szName, path, MAVOEA_PATH_SIZE, EA_PLACE_APPLEDOUBLE) != 0) {
         return -1;
     }
-    const int fd = kernel::Open(path, oflag & ~O_CREAT, kMode);
+    const int fd = kernel::OpenRegular(path, oflag & ~O_CREAT, kMode);
     if (fd >= 0 || errno != ENOENT) return fd;
-    return kernel::Open(path, oflag, kMode);
+    return kernel::OpenRegular(path, oflag, kMode);
 }
 
 }  // namespace
@@ -45,13 +46,13 @@ int MAVOEAOpenNoADFS(int form, const char* szPath, const char* szName, int oflag
         if (MAVOEADirPath(form, szPath, dir, MAVOEA_PATH_SIZE) != 0) return -1;
         if (MAVOEAMKDir(form == EA_FORM_FOLDER, dir) != 0) return -1;
     }
-    if (form == EA_FORM_FOLDER) return kernel::Open(path, oflag, kMode);
+    if (form == EA_FORM_FOLDER) return kernel::OpenRegular(path, oflag, kMode);
 
-    const int fd = kernel::Open(path, oflag & ~O_CREAT, kMode);
+    const int fd = kernel::OpenRegular(path, oflag & ~O_CREAT, kMode);
     if (fd >= 0 || errno != ENOENT) return fd;
     // Before it is missed, or made empty, it is looked for where earlier versions kept it.
     (void)MAVOEAUpgrade(szPath, szName);
-    return kernel::Open(path, oflag, kMode);
+    return kernel::OpenRegular(path, oflag, kMode);
 }
 
 int MAVOEAOpen(int form, const char* szPath, const char* szName, int oflag, int place) {

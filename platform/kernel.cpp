@@ -9,11 +9,15 @@
 
 #include <utility>
 
+#include "platform/descriptors.h"
 #include "platform/marks.h"
 
 namespace mavoea::kernel {
 
 int Open(const char* path, int flags, mode_t mode) { return ::open(path, flags, mode); }
+int OpenRegular(const char* path, int flags, mode_t mode) {
+    return OpenRegularFile(path, flags, mode);
+}
 int OpenAt(int dir, const char* path, int flags, mode_t mode) {
     return ::openat(dir, path, flags, mode);
 }
@@ -55,6 +59,7 @@ char* Getcwd(char* buffer, size_t size) { return ::getcwd(buffer, size); }
 int Chdir(const char* path) { return ::chdir(path); }
 int Fchdir(int dir) { return ::fchdir(dir); }
 DIR* Opendir(const char* path) { return ::opendir(path); }
+DIR* OpendirItself(const char* path) { return OpenDirectoryItself(path); }
 dirent* Readdir(DIR* dir) { return ::readdir(dir); }
 void Rewinddir(DIR* dir) { ::rewinddir(dir); }
 int Dirfd(DIR* dir) { return ::dirfd(dir); }

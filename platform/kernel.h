@@ -20,6 +20,10 @@ namespace mavoea::kernel {
 static_assert(sizeof(off_t) == 8);
 
 int Open(const char* path, int flags, mode_t mode);
+// open(2) of a regular file, with O_NOFOLLOW and O_NONBLOCK added to `flags`: nothing else is
+// opened, and nobody waited for. ELOOP for a symbolic link, EISDIR for a directory, ENXIO for all
+// else.
+int OpenRegular(const char* path, int flags, mode_t mode);
 int OpenAt(int dir, const char* path, int flags, mode_t mode);
 int Close(int fd);
 ssize_t Pread(int fd, void* buffer, size_t size, off_t offset);
@@ -49,6 +53,7 @@ char* Getcwd(char* buffer, size_t size);
 int Chdir(const char* path);
 int Fchdir(int dir);
 DIR* Opendir(const char* path);
+DIR* OpendirItself(const char* path);  // ENOTDIR when it is a symbolic link
 dirent* Readdir(DIR* dir);
 void Rewinddir(DIR* dir);
 int Dirfd(DIR* dir);

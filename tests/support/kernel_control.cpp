@@ -14,8 +14,10 @@
 #include <algorithm>
 #include <filesystem>
 #include <optional>
+#include <type_traits>
 #include <utility>
 
+#include "platform/descriptors.h"
 #include "platform/kernel.h"
 #include "platform/marks.h"
 
@@ -38,6 +40,7 @@ struct State {
     std::vector<std::string> names;
     std::vector<std::string> calls;
     Allocations allocations;
+    unsigned long long written = 0;
     KernelHooks hooks;
 };
 
@@ -55,7 +58,14 @@ void Arm(Fault fault) {
 void Disarm() { TheState().fault.reset(); }
 
 // True when this call is to fail; errno is then set.
-bool Fails(const std::string& name) {
+bool Fails(const std::string& name, const std::string& call) {
+    if (TheState().hooks.fails) {
+        const int error = TheState().hooks.fails(call);
+        if (error != 0) {
+            errno = error;
+            return true;
+        }
+    }
     auto& fault = TheState().fault;
     if (!fault || fault->error == 0) return false;
     if (!fault->name.empty() && fault->name != name) return false;
@@ -69,6 +79,7 @@ bool Fails(const std::string& name) {
 
 // How much of `size` this transfer may move.
 size_t Granted(const std::string& name, size_t size) {
+    if (TheState().hooks.grants) return TheState().hooks.grants(size);
     auto& fault = TheState().fault;
     if (!fault || fault->error != 0 || fault->name != name) return size;
     ++fault->seen;
@@ -89,18 +100,36 @@ void Note(const std::string& name, const std::string& call) {
 
 template <class Result, class Real>
 Result Call(const std::string& name, const std::string& arguments, Result failure, Real real) {
-    Note(name, name + "(" + arguments + ")");
-    if (Fails(name)) return failure;
-    return real();
+    const std::string call = name + "(" + arguments + ")";
+    Note(name, call);
+    if (Fails(name, call)) return failure;
+    const Result result = real();
+    if constexpr (std::is_integral_v<Result>) {
+        const int saved = errno;
+        if (TheState().hooks.gave) TheState().hooks.gave(static_cast<long long>(result));
+        errno = saved;
+    }
+    return result;
+}
+
+// Tells whoever wants to know what a call has done to the disk, if it succeeded.
+template <class Change>
+void Tell(bool done, Change change) {
+    if (!done || !Hooks().changed) return;
+    const int saved = errno;
+    Hooks().changed(change());
+    errno = saved;
 }
 
 std::string Text(const char* text) { return text == nullptr ? "NULL" : text; }
 std::string Number(long long value) { return std::to_string(value); }
 
+std::string PathOf(int fd) {
+    return std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(fd)).string();
+}
+
 std::string WholePath(int dir, const char* path) {
-    if (dir == AT_FDCWD) return path;
-    const std::string link = "/proc/self/fd/" + std::to_string(dir);
-    return std::filesystem::read_symlink(link).string() + "/" + path;
+    return dir == AT_FDCWD ? path : PathOf(dir) + "/" + path;
 }
 
 std::string Octal(unsigned value) {
@@ -156,11 +185,71 @@ void* HeadOf(void* block) {
     return block == nullptr ? nullptr : static_cast<char*>(block) - kBlockHead;
 }
 
+unsigned long long SizeOf(void* block) {
+    return block == nullptr ? 0 : *static_cast<unsigned long long*>(HeadOf(block));
+}
+
+// A block of `former` bytes has become one of `size`.
+void NoteLiveBytes(unsigned long long former, unsigned long long size) {
+    Allocations& allocations = TheState().allocations;
+    allocations.live_bytes = allocations.live_bytes - former + size;
+    allocations.peak = std::max(allocations.peak, allocations.live_bytes);
+}
+
+int NoteOpened(int fd) {
+    const int saved = errno;
+    if (fd >= 0 && Hooks().opened) Hooks().opened(fd);
+    errno = saved;
+    return fd;
+}
+DIR* NoteOpened(DIR* dir) {
+    if (dir != nullptr) NoteOpened(::dirfd(dir));
+    return dir;
+}
+FILE* NoteOpened(FILE* stream) {
+    if (stream != nullptr) NoteOpened(::fileno(stream));
+    return stream;
+}
+
+// The result of a call that writes.
+template <class Result>
+Result NoteWritten(Result count) {
+    if (count > 0) TheState().written += static_cast<unsigned long long>(count);
+    return count;
+}
+
+// The same of one that writes the first bytes of `parts` to a file.
+ssize_t NoteWritten(int fd, const iovec* parts, int count, off_t offset, ssize_t put) {
+    Tell(put > 0, [&] {
+        FileChange change{.kind = FileChange::kWritten, .fd = fd, .offset = offset};
+        for (const iovec& part : Cut(parts, count, static_cast<size_t>(put))) {
+            const auto* const first = static_cast<const std::uint8_t*>(part.iov_base);
+            change.bytes.insert(change.bytes.end(), first, first + part.iov_len);
+        }
+        return change;
+    });
+    return NoteWritten(put);
+}
+
+// The result of `open`, which opens `path`.
+template <class Real>
+int Opened(const char* path, int flags, Real open) {
+    struct stat info;
+    const bool made =
+        Hooks().changed && (flags & O_CREAT) != 0 && ::lstat(path, &info) != 0 && errno == ENOENT;
+    const int fd = open();
+    Tell(fd >= 0 && made,
+         [&] { return FileChange{.kind = FileChange::kCreated, .fd = fd, .path = path}; });
+    Tell(fd >= 0 && !made && (flags & O_TRUNC) != 0,
+         [&] { return FileChange{.kind = FileChange::kResized, .fd = fd}; });
+    return NoteOpened(fd);
+}
+
 bool AllocationFails(unsigned long long size) {
     Allocations& allocations = TheState().allocations;
     allocations.largest = std::max(allocations.largest, size);
     allocations.total += size;
-    if (Fails("malloc")) return true;
+    if (Fails("malloc", "malloc(" + std::to_string(size) + ")")) return true;
     if (size > SIZE_MAX - kBlockHead) {
         errno = ENOMEM;
         return true;
@@ -199,8 +288,11 @@ std::vector<std::string> TakeCalls() {
 
 Allocations TakeAllocations() {
     Allocations& now = TheState().allocations;
-    return std::exchange(now, Allocations{.live = now.live});
+    return std::exchange(
+        now, Allocations{.live = now.live, .live_bytes = now.live_bytes, .peak = now.live_bytes});
 }
+
+unsigned long long TakeBytesWritten() { return std::exchange(TheState().written, 0); }
 
 KernelHooks& Hooks() { return TheState().hooks; }
 
@@ -209,6 +301,7 @@ void ResetKernel() {
     state.hooks = {};
     state.names.clear();
     state.calls.clear();
+    state.written = 0;
     TakeAllocations();
 }
 
@@ -220,7 +313,13 @@ using namespace mavoea::test;
 
 int Open(const char* path, int flags, mode_t mode) {
     return Call("open", Text(path) + ", " + Flags(flags) + ", " + Octal(mode), -1,
-                [&] { return ::open(path, flags, mode); });
+                [&] { return Opened(path, flags, [&] { return ::open(path, flags, mode); }); });
+}
+
+int OpenRegular(const char* path, int flags, mode_t mode) {
+    return Call(
+        "open", Text(path) + ", " + Flags(flags | kRegularFileFlags) + ", " + Octal(mode), -1,
+        [&] { return Opened(path, flags, [&] { return OpenRegularFile(path, flags, mode); }); });
 }
 
 // Calls that take a directory are logged, and stood in for, under the whole path.
@@ -248,8 +347,11 @@ ssize_t Preadv(int fd, const iovec* parts, int count, off_t offset) {
 }
 
 ssize_t Pwrite(int fd, const void* bytes, size_t size, off_t offset) {
-    return Call("pwrite", Number(static_cast<long long>(size)) + ", " + Number(offset), ssize_t{-1},
-                [&] { return ::pwrite(fd, bytes, Granted("pwrite", size), offset); });
+    return Call(
+        "pwrite", Number(static_cast<long long>(size)) + ", " + Number(offset), ssize_t{-1}, [&] {
+            const iovec part = {const_cast<void*>(bytes), Granted("pwrite", size)};
+            return NoteWritten(fd, &part, 1, offset, ::pwrite(fd, bytes, part.iov_len, offset));
+        });
 }
 
 ssize_t Pwritev(int fd, const iovec* parts, int count, off_t offset) {
@@ -257,7 +359,8 @@ ssize_t Pwritev(int fd, const iovec* parts, int count, off_t offset) {
     return Call("pwritev", Number(static_cast<long long>(size)) + ", " + Number(offset),
                 ssize_t{-1}, [&] {
                     const auto cut = Cut(parts, count, Granted("pwritev", size));
-                    return ::pwritev(fd, cut.data(), count, offset);
+                    return NoteWritten(fd, cut.data(), count, offset,
+                                       ::pwritev(fd, cut.data(), count, offset));
                 });
 }
 
@@ -267,11 +370,20 @@ off_t Lseek(int fd, off_t offset, int whence) {
 }
 
 int Ftruncate(int fd, off_t size) {
-    return Call("ftruncate", Number(size), -1, [&] { return ::ftruncate(fd, size); });
+    return Call("ftruncate", Number(size), -1, [&] {
+        const int result = ::ftruncate(fd, size);
+        Tell(result == 0,
+             [&] { return FileChange{.kind = FileChange::kResized, .fd = fd, .offset = size}; });
+        return result;
+    });
 }
 
 int Fsync(int fd) {
-    return Call("fsync", "", -1, [&] { return Hooks().fsync ? Hooks().fsync(fd) : ::fsync(fd); });
+    return Call("fsync", "", -1, [&] {
+        const int result = Hooks().fsync ? Hooks().fsync(fd) : ::fsync(fd);
+        Tell(result == 0, [&] { return FileChange{.kind = FileChange::kSynced, .fd = fd}; });
+        return result;
+    });
 }
 
 void Sync() {
@@ -281,6 +393,7 @@ void Sync() {
     } else {
         ::sync();
     }
+    Tell(true, [] { return FileChange{.kind = FileChange::kAllSynced}; });
 }
 
 int Fstat(int fd, struct stat* info) {
@@ -313,24 +426,38 @@ int GetLock(int fd, struct flock64* lock) {
 int MkdirAt(int dir, const char* path, mode_t mode) {
     const std::string whole = WholePath(dir, path);
     return Call("mkdir", whole + ", " + Octal(mode), -1, [&] {
-        return Hooks().mkdir ? Hooks().mkdir(whole.c_str(), mode) : ::mkdirat(dir, path, mode);
+        const int result =
+            Hooks().mkdir ? Hooks().mkdir(whole.c_str(), mode) : ::mkdirat(dir, path, mode);
+        Tell(result == 0,
+             [&] { return FileChange{.kind = FileChange::kMadeDirectory, .path = whole}; });
+        return result;
     });
 }
 
+static int Removed(const char* path, int result) {
+    Tell(result == 0, [&] { return FileChange{.kind = FileChange::kRemoved, .path = path}; });
+    return result;
+}
+
 int Unlink(const char* path) {
-    return Call("unlink", Text(path), -1, [&] { return ::unlink(path); });
+    return Call("unlink", Text(path), -1, [&] { return Removed(path, ::unlink(path)); });
 }
 
 int Rmdir(const char* path) {
-    return Call("rmdir", Text(path), -1, [&] { return ::rmdir(path); });
+    return Call("rmdir", Text(path), -1, [&] { return Removed(path, ::rmdir(path)); });
 }
 
 int Remove(const char* path) {
-    return Call("remove", Text(path), -1, [&] { return ::remove(path); });
+    return Call("remove", Text(path), -1, [&] { return Removed(path, ::remove(path)); });
 }
 
 int Rename(const char* from, const char* to) {
-    return Call("rename", Text(from) + ", " + Text(to), -1, [&] { return ::rename(from, to); });
+    return Call("rename", Text(from) + ", " + Text(to), -1, [&] {
+        const int result = ::rename(from, to);
+        Tell(result == 0,
+             [&] { return FileChange{.kind = FileChange::kRenamed, .path = from, .to = to}; });
+        return result;
+    });
 }
 
 int Chmod(const char* path, mode_t mode) {
@@ -339,7 +466,7 @@ int Chmod(const char* path, mode_t mode) {
 }
 
 int Fchmod(int fd, mode_t mode) {
-    return Call("fchmod", Octal(mode), -1, [&] { return ::fchmod(fd, mode); });
+    return Call("fchmod", PathOf(fd) + ", " + Octal(mode), -1, [&] { return ::fchmod(fd, mode); });
 }
 
 char* Getcwd(char* buffer, size_t size) {
@@ -356,7 +483,13 @@ int Fchdir(int dir) {
 }
 
 DIR* Opendir(const char* path) {
-    return Call("opendir", Text(path), static_cast<DIR*>(nullptr), [&] { return ::opendir(path); });
+    return Call("opendir", Text(path), static_cast<DIR*>(nullptr),
+                [&] { return NoteOpened(::opendir(path)); });
+}
+
+DIR* OpendirItself(const char* path) {
+    return Call("opendir", Text(path), static_cast<DIR*>(nullptr),
+                [&] { return NoteOpened(OpenDirectoryItself(path)); });
 }
 
 dirent* Readdir(DIR* dir) {
@@ -421,8 +554,11 @@ int Setxattr(const char* path, const char* name, const void* value, size_t size,
                 Text(path) + ", " + Text(name) + ", " + Number(static_cast<long long>(size)) +
                     ", " + Number(flags),
                 -1, [&] {
-                    return Hooks().setxattr ? Hooks().setxattr(path, name, value, size, flags)
-                                            : ::setxattr(path, name, value, size, flags);
+                    const int result = Hooks().setxattr
+                                           ? Hooks().setxattr(path, name, value, size, flags)
+                                           : ::setxattr(path, name, value, size, flags);
+                    if (result == 0) NoteWritten(size);
+                    return result;
                 });
 }
 
@@ -433,8 +569,9 @@ int Removexattr(const char* path, const char* name) {
 }
 
 FILE* Fopen(const char* path, const char* mode) {
-    return Call("fopen", Text(path) + ", " + mode, static_cast<FILE*>(nullptr),
-                [&] { return Hooks().fopen ? Hooks().fopen(path, mode) : ::fopen(path, mode); });
+    return Call("fopen", Text(path) + ", " + mode, static_cast<FILE*>(nullptr), [&] {
+        return NoteOpened(Hooks().fopen ? Hooks().fopen(path, mode) : ::fopen(path, mode));
+    });
 }
 
 size_t Fread(void* buffer, size_t size, FILE* stream) {
@@ -444,14 +581,14 @@ size_t Fread(void* buffer, size_t size, FILE* stream) {
 
 size_t Fwrite(const void* bytes, size_t size, FILE* stream) {
     return Call("fwrite", Number(static_cast<long long>(size)), size_t{0},
-                [&] { return ::fwrite(bytes, 1, Granted("fwrite", size), stream); });
+                [&] { return NoteWritten(::fwrite(bytes, 1, Granted("fwrite", size), stream)); });
 }
 
 // A close that is made to fail closes all the same, as the C library's does.
 int Fclose(FILE* stream) {
     Note("fclose", "fclose()");
     const int result = ::fclose(stream);
-    return Fails("fclose") ? EOF : result;
+    return Fails("fclose", "fclose()") ? EOF : result;
 }
 
 int SetArchiveBit(int fd) {
@@ -468,27 +605,36 @@ int FileCommand(const char* path, int command) {
 void* Allocate(unsigned long long size) {
     if (AllocationFails(size)) return nullptr;
     void* const head = ::malloc(static_cast<size_t>(size) + kBlockHead);
-    if (head != nullptr) ++TheState().allocations.live;
+    if (head != nullptr) {
+        ++TheState().allocations.live;
+        NoteLiveBytes(0, size);
+    }
     return Adopt(head, size);
 }
 
 void* AllocateZeroed(unsigned long long size) {
     if (AllocationFails(size)) return nullptr;
     void* const head = ::calloc(1, static_cast<size_t>(size) + kBlockHead);
-    if (head != nullptr) ++TheState().allocations.live;
+    if (head != nullptr) {
+        ++TheState().allocations.live;
+        NoteLiveBytes(0, size);
+    }
     return Adopt(head, size);
 }
 
 void* Reallocate(void* block, unsigned long long size) {
     if (AllocationFails(size)) return nullptr;
+    const unsigned long long former = SizeOf(block);
     void* const head = ::realloc(HeadOf(block), static_cast<size_t>(size) + kBlockHead);
     if (head != nullptr && block == nullptr) ++TheState().allocations.live;
+    if (head != nullptr) NoteLiveBytes(former, size);
     return Adopt(head, size);
 }
 
 void Free(void* block) {
     if (block == nullptr) return;
     --TheState().allocations.live;
+    NoteLiveBytes(SizeOf(block), 0);
     ::free(HeadOf(block));
 }
 

@@ -15,6 +15,7 @@
 #include <sys/stat.h>
 #include <sys/types.h>
 
+#include <cstdint>
 #include <functional>
 #include <string>
 #include <vector>
@@ -62,8 +63,8 @@ class ShortCall {
 std::vector<std::string> TakeCallNames();
 
 // The same with the arguments that matter: "open(/v/a, O_RDWR|O_CREAT, 0777)", "pread(16384, 82)"
-// (size, offset), "pwritev(139, 0)", "chmod(/v/a, 0744)", "seteuid(0)", "setxattr(/v/a, user.x, 3,
-// 0)", ...
+// (size, offset), "pwritev(139, 0)", "chmod(/v/a, 0744)", "fchmod(/v/a, 0777)", "seteuid(0)",
+// "setxattr(/v/a, user.x, 3, 0)", ...
 std::vector<std::string> TakeCalls();
 
 // What allocations there have been since the last time: the largest one and all added up, in bytes.
@@ -71,8 +72,33 @@ struct Allocations {
     unsigned long long largest = 0;
     unsigned long long total = 0;
     int live = 0;  // blocks allocated and not freed yet, since the process started
+    unsigned long long live_bytes = 0;  // what those blocks hold
+    unsigned long long peak = 0;        // the most that live_bytes was since the last time
 };
 Allocations TakeAllocations();
+
+// How many bytes "pwrite", "pwritev", "fwrite" and "setxattr" have written since the last time.
+unsigned long long TakeBytesWritten();
+
+// What a call that succeeded has changed on disk.
+struct FileChange {
+    enum Kind {
+        kWritten,        // `bytes` at `offset` of the file on `fd`
+        kResized,        // the file on `fd` has `offset` bytes
+        kSynced,         // the file on `fd`
+        kAllSynced,      // every file
+        kCreated,        // `path`, a file that was not there, open on `fd`
+        kRenamed,        // `path`, which is now `to`
+        kRemoved,        // `path`
+        kMadeDirectory,  // `path`
+    };
+    Kind kind;
+    int fd = -1;
+    off_t offset = 0;
+    std::vector<std::uint8_t> bytes = {};
+    std::string path = {};
+    std::string to = {};
+};
 
 // Stand-ins, used where they are set; all are cleared by ResetKernel(), which fixtures call.
 struct KernelHooks {
@@ -92,11 +118,17 @@ struct KernelHooks {
     std::function<time_t()> time;
     std::function<int(int)> fsync;
     std::function<void()> sync;
-    std::function<void(const std::string& name)> before;  // before every call of any name
+    std::function<void(const std::string& name)> before;    // before every call of any name
+    std::function<void(const FileChange& change)> changed;  // after every call with that effect
+    // An errno for the call, as TakeCalls() tells it ("malloc(80)" is one too), or 0 to let it go.
+    std::function<int(const std::string& call)> fails;
+    std::function<size_t(size_t size)> grants;   // how much of `size` bytes a transfer may move
+    std::function<void(long long result)> gave;  // after every call that was let go
+    std::function<void(int fd)> opened;  // after every "open", "opendir" and "fopen" that succeeded
 };
 KernelHooks& Hooks();
 
-// Clears hooks, call logs and allocation figures (not the count of live blocks).
+// Clears hooks, call logs and figures (not what is live of the heap).
 void ResetKernel();
 
 }  // namespace mavoea::test

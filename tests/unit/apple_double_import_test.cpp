@@ -675,13 +675,14 @@ TEST_F(CheckAdFileTest, WhateverHasTheNameIsACompanion) {
     EXPECT_EQ(0, Check("._._a"));
 }
 
-TEST_F(CheckAdFileTest, ALinkToTheFileWillDo) {
+TEST_F(CheckAdFileTest, ALinkIsNotFollowed) {
     WriteFile("a", {});
     WriteFile("elsewhere", magic_);
     ASSERT_EQ(0, symlink("elsewhere", "._a"));
-    EXPECT_EQ(0, Check("._a"));
-    unlink("elsewhere");
     EXPECT_EQ(-3, Check("._a"));
+    ASSERT_EQ(0, unlink("._a"));
+    ASSERT_EQ(0, rename("elsewhere", "._a"));
+    EXPECT_EQ(0, Check("._a"));
 }
 
 TEST_F(CheckAdFileTest, ANamedPipeDoesNotKeepTheCallerWaiting) {
