@@ -110,7 +110,7 @@ int EACopyADFSToEADirFS(const char* src, const char* dst, int move) {
     };
     Path from;
     if (MAVOEAADPath(src, from, kDerivedPathMax) != 0) return cannot_derive(src);
-    if (kernel::Access(from, F_OK) == 0) {
+    if (kernel::Access(from, F_OK) == 0 || errno != ENOENT) {
         Path dir;
         Path to;
         if (EAPrepareEADir(1, dst, dir, kDerivedPathMax) != 0 ||

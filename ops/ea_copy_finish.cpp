@@ -103,7 +103,8 @@ bool CarryOver(const CopyRequest& copy, Path src_dir) {
     while (const dirent* const entry = folder.NextEntry()) {
         CarryEntry(copy, *entry, src_dir, dst_dir);
     }
-    if (copy.move != 0) RemoveTree(src_dir);
+    // What could not be read has not been carried.
+    if (copy.move != 0 && !folder.failed()) RemoveTree(src_dir);
     return true;
 }
 

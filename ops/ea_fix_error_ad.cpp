@@ -15,6 +15,15 @@
 namespace mavoea {
 namespace {
 
+constexpr Unit unit("ea_fix_error_ad");
+
+// What replaces a file is on disk before. There is nothing of an empty file.
+bool Sync(const char* path) {
+    const UniqueFd fd(kernel::OpenRegular(path, O_RDONLY | O_CLOEXEC, 0));
+    if (!fd && errno == ENOENT) return true;
+    return (fd && kernel::Fsync(fd.get()) == 0) || unit.Fail(Err::kSystemCall) == 0;
+}
+
 // The attributes of the resource file `file` into the stream of the object at `path`.
 bool MoveAttributes(const char* file, const char* path) {
     const UniqueFd from(kernel::OpenRegular(file, O_RDONLY | O_CLOEXEC, 0));
@@ -48,7 +57,8 @@ int MAVOEAFixErrorAD(const char* path) {
 
     // Everybody may make files here: what is in the way is not written through.
     (void)kernel::Unlink(rewritten);
-    if (EACopyAdoubleV2(file, rewritten, kRewrite) != 0 || !MoveAttributes(file, path)) {
+    if (EACopyAdoubleV2(file, rewritten, kRewrite) != 0 || !MoveAttributes(file, path) ||
+        !Sync(rewritten)) {
         const ErrnoKeeper keep;
         (void)kernel::Unlink(rewritten);
         return -1;

@@ -123,7 +123,7 @@ bool OnlyCover(Folder& dir, const char* cover) {
             return false;
         }
     }
-    return true;
+    return !dir.failed();
 }
 
 int RemoveCovered(const char* dir_path, const char* cover) {

@@ -25,7 +25,7 @@ bool OnlyEADir(Folder& dir) {
         if (name != "." && name != ".." && name != kEADir.substr(1)) return false;
         ++count;
     }
-    return count == 3;
+    return !dir.failed() && count == 3;
 }
 
 }  // namespace

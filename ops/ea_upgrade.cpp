@@ -16,6 +16,7 @@
 #include "platform/file_status.h"
 #include "platform/include/mavocore.h"
 #include "platform/marks.h"
+#include "stream/internal.h"
 #include "util/file_io.h"
 #include "util/owned.h"
 #include "util/path_text.h"
@@ -81,10 +82,12 @@ class WorkingDirectory {
 
     bool Enter(int dir) { return kernel::Fchdir(dir) == 0; }
 
-    // Should the way back have closed meanwhile, the process is left in the root directory, which
-    // nobody removes.
+    // Tries more than once: callers rely on where they are. Should the way back have closed
+    // meanwhile, the process is left in the root directory, which nobody removes.
     bool Return() {
-        if (kernel::Fchdir(former_.get()) == 0) return true;
+        for (int attempts = 3; attempts > 0; --attempts) {
+            if (kernel::Fchdir(former_.get()) == 0) return true;
+        }
         const ErrnoKeeper keep;
         (void)kernel::Chdir("/");
         return false;
@@ -125,7 +128,7 @@ std::optional<std::int64_t> LatestAccess(Folder* folder) {
 // Attribute files on their way into a stream.
 class AttributeImport {
  public:
-    AttributeImport(const char* object, EASHandle* stream) : object_(object), stream_(stream) {}
+    AttributeImport(const char* object, EASHandle** stream) : object_(object), stream_(stream) {}
 
     // The attribute file `name`: into the stream and off the disk. One that fails stays where it
     // is, with a code.
@@ -138,7 +141,10 @@ class AttributeImport {
         }
         std::uint32_t size = 0;
         if (Read(path, &size) != 0) return;
-        if (MAVOEASWrite(stream_, name, value_.get(), size, 0, EAS_WRITE_OVERWRITE) < 0) {
+        if (stale_) *stream_ = EASReopen(*stream_);
+        stale_ = *stream_ == nullptr ||
+                 MAVOEASWrite(*stream_, name, value_.get(), size, 0, EAS_WRITE_OVERWRITE) < 0;
+        if (stale_) {
             unit.Log("%s:%d MAVOEASWrite error, MavoErr=[0x%04X %s:%d]", MLIBCErrGet(),
                      MLIBCErrorGetFile(), MLIBCErrorGetLine());
             return;
@@ -174,7 +180,8 @@ class AttributeImport {
     static constexpr std::uint32_t kValueMax = 0x7FFFFFFF;
 
     const char* object_;
-    EASHandle* stream_;
+    EASHandle** stream_;
+    bool stale_ = false;  // a write to the stream has failed
     Owned<std::uint8_t> value_;
     std::uint32_t room_ = 0;
 };
@@ -182,14 +189,14 @@ class AttributeImport {
 int ImportAttributeFiles(const char* szPath, const char* stream_path, Folder* folder) {
     const UniqueFd fd(kernel::OpenRegular(stream_path, O_RDWR | O_CREAT | O_CLOEXEC, kMode));
     if (!fd) return unit.Fail(Err::kOpen);
-    EASHandle* const stream = MAVOEASOpen(fd.get(), F_WRLCK);
+    EASHandle* stream = MAVOEASOpen(fd.get(), F_WRLCK);
     if (stream == nullptr) return kFailure;
     folder->Rewind();
     {
-        AttributeImport import(szPath, stream);
+        AttributeImport import(szPath, &stream);
         while (const char* const name = NextAttribute(folder)) import.Move(name);
     }
-    (void)MAVOEASClose(stream);
+    if (stream != nullptr) (void)MAVOEASClose(stream);
     return kConverted;
 }
 

@@ -2,6 +2,8 @@
 #ifndef MAVOEA_OPS_FOLDER_H_
 #define MAVOEA_OPS_FOLDER_H_
 
+#include <errno.h>
+
 #include <string_view>
 
 #include "platform/kernel.h"
@@ -26,8 +28,17 @@ class Folder {
     int fd() const { return kernel::Dirfd(dir_); }
     void Rewind() { kernel::Rewinddir(dir_); }
 
-    // The next entry, "." and ".." among them; nullptr at the end.
-    const dirent* NextOfAll() { return kernel::Readdir(dir_); }
+    // The next entry, "." and ".." among them; nullptr at the end, and when the folder cannot be
+    // read any further.
+    const dirent* NextOfAll() {
+        errno = 0;
+        const dirent* const entry = kernel::Readdir(dir_);
+        failed_ = entry == nullptr && errno != 0;
+        return entry;
+    }
+
+    // Whether what ended the reading was a failure.
+    bool failed() const { return failed_; }
 
     // The next entry other than "." and "..", valid until the next call; nullptr at the end.
     const dirent* NextEntry() {
@@ -50,6 +61,7 @@ class Folder {
 
  private:
     DIR* dir_;
+    bool failed_ = false;
 };
 
 }  // namespace mavoea

@@ -36,6 +36,9 @@ ssize_t Pwritev(int fd, const iovec* parts, int count, off_t offset) {
 }
 off_t Lseek(int fd, off_t offset, int whence) { return ::lseek(fd, offset, whence); }
 int Ftruncate(int fd, off_t size) { return ::ftruncate(fd, size); }
+int Reserve(int fd, off_t offset, off_t size) {
+    return ::fallocate(fd, FALLOC_FL_KEEP_SIZE, offset, size);
+}
 int Fsync(int fd) { return ::fsync(fd); }
 void Sync() { ::sync(); }
 int Fstat(int fd, struct stat* info) { return ::fstat(fd, info); }

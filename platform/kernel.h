@@ -32,6 +32,7 @@ ssize_t Pwrite(int fd, const void* bytes, size_t size, off_t offset);
 ssize_t Pwritev(int fd, const iovec* parts, int count, off_t offset);
 off_t Lseek(int fd, off_t offset, int whence);
 int Ftruncate(int fd, off_t size);
+int Reserve(int fd, off_t offset, off_t size);  // room on the volume; the file's size stays
 int Fsync(int fd);
 void Sync();
 int Fstat(int fd, struct stat* info);

@@ -101,6 +101,7 @@ class TableReader {
             }
             at += RecordSize(record.name_size);
         }
+        GiveBack(at);
         return 0;
     }
 
@@ -137,6 +138,16 @@ class TableReader {
             size_ += static_cast<std::size_t>(got);
         }
         return size <= size_;
+    }
+
+    // Frees what a header that says too much has had read.
+    void GiveBack(std::uint64_t used) {
+        if (size_ <= used + kStep) return;
+        void* const smaller = kernel::Reallocate(table_.get(), used);
+        if (smaller == nullptr) return;
+        (void)table_.Release();
+        table_ = Owned<std::uint8_t>(static_cast<std::uint8_t*>(smaller));
+        size_ = static_cast<std::size_t>(used);
     }
 
     int Refuse() const { return unit.Fail(out_of_memory_ ? Err::kMemory : Err::kRead); }

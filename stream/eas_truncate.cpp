@@ -39,6 +39,7 @@ int MAVOEASTruncate(EASHandle* h, const char* name, unsigned length) {
     // The image has room for the value as it is, too: it is gathered whole.
     StreamImage image(std::max(total_size, data.end()));
     if (!image.ok()) return unit.Fail(Err::kMemory);
+    if (ReserveRoom(h->fd, data.end(), total_size, unit) != 0) return -1;
     if (GatherValues(h, &survey.header, static_cast<unsigned>(index), image.At(data.offset),
                      false) != 0) {
         return -1;

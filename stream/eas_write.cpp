@@ -48,6 +48,9 @@ int Create(EASHandle* h, const char* name, ByteView value, unsigned offset) {
     memcpy(own_name.get(), name, name_size);
     if (attributes.count == h->capacity && MAVOEASAllocEntry(h, 0) != 0) return -1;
 
+    if (ReserveRoom(h->fd, old_data.end() + fork.length, total_size + fork.length, unit) != 0) {
+        return -1;
+    }
     attributes.data.offset += record_size;
     std::uint8_t* const data = image.At(attributes.data.offset);
     if (ReadAt(h->fd, {data, old_data.length}, old_data.offset) != old_data.length) {
@@ -85,6 +88,8 @@ int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
 
     StreamImage image(total_size);
     if (!image.ok()) return unit.Fail(Err::kMemory);
+    if (ReserveRoom(h->fd, data.end() + fork.length, total_size + fork.length, unit) != 0)
+        return -1;
     if (GatherValues(h, &survey.header, index, image.At(data.offset), false) != 0) return -1;
     std::uint8_t* const at = image.At(data.end() - old_length);
     memset(at + old_length, 0, static_cast<std::size_t>(added));

@@ -1,5 +1,7 @@
 #include "stream/layout.h"
 
+#include <errno.h>
+
 #include <algorithm>
 #include <cstring>
 
@@ -84,6 +86,18 @@ int SurveyFork(EASHandle* h, const Survey& survey, const Unit& unit, Range* fork
     }
     *fork = {start, length};
     return 0;
+}
+
+int ReserveRoom(int fd, std::uint64_t from, std::uint64_t to, const Unit& unit, int line) {
+    // What a volume gives room in; a file that ends within one has all of it.
+    constexpr std::uint64_t kBlock = 512;
+    from += (kBlock - from % kBlock) % kBlock;
+    if (to <= from) return 0;
+    if (kernel::Reserve(fd, static_cast<off_t>(from), static_cast<off_t>(to - from)) == 0 ||
+        (errno != ENOSPC && errno != EDQUOT && errno != EFBIG)) {
+        return 0;
+    }
+    return unit.Fail(Err::kWrite, line);
 }
 
 bool FitsStream(std::uint64_t total_size, std::uint32_t fork_length) {

@@ -48,6 +48,13 @@ inline int SurveyStream(EASHandle* h, const Unit& unit, Survey* survey, Range* f
     return SurveyFork(h, *survey, unit, fork, line);
 }
 
+// Takes the room that the file needs to grow from `from` to `to`, before anything in it changes: a
+// rewrite that a full volume stops half-way would cost what the file had. 0, or -1 after recording
+// 0xB00 for `unit`, with errno ENOSPC, EDQUOT or EFBIG; volumes that cannot reserve are gone on
+// with.
+int ReserveRoom(int fd, std::uint64_t from, std::uint64_t to, const Unit& unit,
+                int line = __builtin_LINE());
+
 // Whether attributes that end there leave a fork of that length within a stream's 32-bit offsets.
 bool FitsStream(std::uint64_t total_size, std::uint32_t fork_length);
 

@@ -29,7 +29,7 @@ class GrowingBuffer {
         return size_ != 0;
     }
 
-    // The bytes at `from` of the file on fd, which has `file_size` of them (-1: nobody knows), in
+    // The bytes at `from` of the file on fd, which has `file_size` of them (-1, unknown: none), in
     // data(). None, or why not: kRead, also for what the file cannot have, which takes no memory;
     // kBufferMemory.
     std::optional<Err> Fill(int fd, Range from, off_t file_size) {

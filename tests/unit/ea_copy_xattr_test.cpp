@@ -319,7 +319,7 @@ TEST_P(SidecarTest, ASourceThatIsGoneAlreadyIsAsGoodAsRemoved) {
 TEST_P(SidecarTest, AModeThatCannotBeSetIsNoFailure) {
     Put(SrcResource(), Ascii("resource"));
     ASSERT_EQ(0, mkdir(EADir(to_).c_str(), 0777));
-    const FailCall fault("chmod", EPERM, 0);
+    const FailCall fault("fchmod", EPERM, 0);
     EXPECT_EQ(0, Copy(0));
     EXPECT_TRUE(fault.fired());
     ExpectNothingReported();

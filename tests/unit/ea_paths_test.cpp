@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "include/mavoea.h"
+#include "tests/support/emulator.h"
 #include "tests/support/fake_platform.h"
 #include "tests/support/kernel_control.h"
 
@@ -1040,7 +1041,7 @@ class Generator {
 
 TEST_F(EaPathPropertyTest, EveryPathIsDerivedAsAStraightforwardDerivationDoes) {
     Generator generate;
-    for (int round = 0; round < 5000; ++round) {
+    for (int round = 0; round < 5000 / kSeriesStep; ++round) {
         SCOPED_TRACE(round);
         const std::string path = generate.Path();
         const std::string kind = generate.Kind();
@@ -1109,7 +1110,7 @@ void ExpectAllInPlace(Generator& generate, std::size_t lead) {
 
 TEST_F(EaPathPropertyTest, PathMayBeReplacedByTheDerivedOne) {
     Generator generate;
-    for (int round = 0; round < 3000 && !HasFatalFailure(); ++round) {
+    for (int round = 0; round < 3000 / kSeriesStep && !HasFatalFailure(); ++round) {
         SCOPED_TRACE(round);
         ExpectAllInPlace(generate, 0);
     }

@@ -96,7 +96,8 @@ Bytes FileWithFinderInfoAt(std::uint32_t at, const Bytes& finder_info) {
     Bytes file = FreshResourceFile(kNone);
     PutU32(file, kFinderOffsetAt, at);
     file.resize(std::max<std::size_t>(file.size(), at + finder_info.size()), 0x77);
-    std::copy(finder_info.begin(), finder_info.end(), file.begin() + at);
+    std::copy(finder_info.begin(), finder_info.end(),
+              file.begin() + static_cast<std::ptrdiff_t>(at));
     return file;
 }
 
