@@ -1,27 +1,48 @@
 #!/bin/sh
-# Builds everything and passes the whole test suite: optimised, under the sanitizers, and through
-# the checks of style. Installs what that takes. Prints what it runs.
+# Builds everything and passes the whole test suite: optimised, under the sanitizers, on an emulated
+# PowerPC, against hostile inputs and against changes of its own code; and the checks of style.
+# Installs what that takes. Prints what it runs.
 set -eu
 cd "$(dirname "$0")/.."
 root=$PWD
+begun=$(date +%s)
 
 step() {
     echo
-    echo "==== $*"
+    echo "==== $* ($(($(date +%s) - begun)) s)"
+}
+
+# build_and_test PRESET
+build_and_test() {
+    step "build: $1"
+    cmake --preset "$1"
+    cmake --build --preset "$1"
+    step "test: $1"
+    ctest --preset "$1" -j 2
 }
 
 step packages
 sh tests/packages.sh g++ cmake ninja-build pkg-config libacl1-dev libattr1-dev libcli11-dev \
     nlohmann-json3-dev libgtest-dev libgmock-dev libbenchmark-dev acl attr binutils \
-    e2fsprogs xfsprogs btrfs-progs clang-format clang-tidy clang cppcheck git python3
+    e2fsprogs xfsprogs btrfs-progs clang-format clang-tidy clang libclang-rt-14-dev cppcheck git \
+    python3 abigail-tools util-linux g++-powerpc-linux-gnu gcc-powerpc-linux-gnu qemu-user \
+    googletest dpkg-dev make
 
-for preset in release sanitize; do
-    step "build: $preset"
-    cmake --preset $preset
-    cmake --build --preset $preset
-    step "test: $preset"
-    ctest --preset $preset -j 2
-done
+build_and_test release
+build_and_test sanitize
+
+step "libraries: powerpc"
+sh tests/powerpc/libraries.sh
+build_and_test powerpc
+
+step "build: fuzz"
+cmake --preset fuzz
+cmake --build --preset fuzz
+step "fuzz targets"
+sh fuzz/run.sh build/fuzz
+
+step "mutants"
+python3 tests/mutation/mutants.py build/release
 
 step "style: formatting"
 files=$(git ls-files '*.c' '*.cpp' '*.h' 2>/dev/null || true)
@@ -41,7 +62,7 @@ run-clang-tidy -quiet -j 2 -p build/release \
 echo "no findings"
 
 step "static analysis: cppcheck"
-cppcheck --quiet --error-exitcode=1 --std=c++20 --language=c++ --inline-suppr \
+cppcheck --quiet --error-exitcode=1 -j 2 --std=c++20 --language=c++ --inline-suppr \
     --enable=warning,performance,portability --suppress=missingInclude \
     -I . adouble ops path stream xattr format util platform
 echo "no findings"

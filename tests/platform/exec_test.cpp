@@ -16,6 +16,7 @@
 
 #include "platform/include/mavocore.h"
 #include "tests/platform/support/allocation_control.h"
+#include "tests/support/emulator.h"
 #include "tests/support/temp_dir.h"
 
 namespace mavoea::test {
@@ -90,6 +91,7 @@ TEST(ExecTest, AProgramThatASignalKilledIsNegativeAndTellsTheSignal) {
 }
 
 TEST(ExecTest, WhatCannotBeRunIsMinus1WithErrno) {
+    MAVOEA_SKIP_IN_EMULATOR(kNoSpawnErrors);
     errno = 0;
     EXPECT_EQ(-1, MLIBCExec("/nowhere/to/be/found", static_cast<char*>(nullptr)));
     EXPECT_EQ(ENOENT, errno);
@@ -99,13 +101,16 @@ TEST(ExecTest, WhatCannotBeRunIsMinus1WithErrno) {
     errno = 0;
     EXPECT_EQ(-1, MLIBCExec((dir / "plain").c_str(), static_cast<char*>(nullptr)));
     EXPECT_EQ(EACCES, errno);
+}
 
+TEST(ExecTest, NoProgramIsMinus1WithEinval) {
     errno = 0;
     EXPECT_EQ(-1, MLIBCExec(nullptr, static_cast<char*>(nullptr)));
     EXPECT_EQ(EINVAL, errno);
 }
 
 TEST(ExecTest, ThePathIsNotSearched) {
+    MAVOEA_SKIP_IN_EMULATOR(kNoSpawnErrors);
     errno = 0;
     EXPECT_EQ(-1, MLIBCExec("true", static_cast<char*>(nullptr)));
     EXPECT_EQ(ENOENT, errno);
@@ -169,7 +174,7 @@ TEST(ExecTest, TheCallersDescriptorsStayAsTheyAre) {
     const int handed_on = open("/dev/null", O_RDONLY);
     const auto before = OpenDescriptors();
     EXPECT_EQ(0, Script("exit 0"));
-    EXPECT_EQ(-1, MLIBCExec("/nowhere", static_cast<char*>(nullptr)));
+    EXPECT_NE(0, MLIBCExec("/nowhere", static_cast<char*>(nullptr)));
     EXPECT_EQ(before, OpenDescriptors());
     EXPECT_EQ(1, Script("test -e /proc/$$/fd/$0", std::to_string(kept)));
     EXPECT_EQ(0, Script("test -e /proc/$$/fd/$0", std::to_string(handed_on)));

@@ -35,7 +35,17 @@ State& TheState() {
 
 std::string Text(const char* text) { return text == nullptr ? "NULL" : text; }
 
-void NoteCall(const std::string& call) { TheState().calls.push_back(call); }
+// What the call is to answer without doing anything; 0 when it goes on.
+int Refusal(const std::string& call) {
+    const auto& fails = TheState().answers.fails;
+    return fails ? fails(call) : 0;
+}
+
+// The same of a call that is noted.
+int NoteCall(const std::string& call) {
+    TheState().calls.push_back(call);
+    return Refusal(call);
+}
 
 // Puts "LINE" for the digits behind the first ':', which the library's formats begin with.
 std::string WithoutLine(std::string text) {
@@ -91,9 +101,12 @@ int MLIBCErrGet(void) { return TheState().top.code; }
 const char* MLIBCErrorGetFile(void) { return TheState().top.unit.c_str(); }
 int MLIBCErrorGetLine(void) { return TheState().top.line; }
 
-MLIBCSzList* MLIBCSzListAlloc(int) { return NewList(); }
+MLIBCSzList* MLIBCSzListAlloc(int) {
+    return Refusal("MLIBCSzListAlloc()") == 0 ? NewList() : nullptr;
+}
 
 int MLIBCSzListPush(MLIBCSzList** list, const char* text) {
+    if (Refusal("MLIBCSzListPush(" + Text(text) + ")") != 0) return -1;
     int& left = TheState().answers.pushes_until_failure;
     if (left == 0) return -1;
     if (left > 0) --left;
@@ -118,7 +131,7 @@ int MLIBCExec(const char* program, ...) {
 
     std::string call = "MLIBCExec(" + argv[0];
     for (size_t i = 1; i < argv.size(); ++i) call += ", " + argv[i];
-    NoteCall(call + ")");
+    if (const int refusal = NoteCall(call + ")")) return refusal;
     if (TheState().answers.exec) return TheState().answers.exec(argv);
 
     std::vector<char*> pointers;
@@ -132,7 +145,9 @@ int MLIBCExec(const char* program, ...) {
 }
 
 int MLIBCFileStat(const char* path, int option, void* info) {
-    NoteCall("MLIBCFileStat(" + Text(path) + ", " + std::to_string(option) + ")");
+    const int refusal =
+        NoteCall("MLIBCFileStat(" + Text(path) + ", " + std::to_string(option) + ")");
+    if (refusal != 0) return refusal;
     auto* const bytes = static_cast<unsigned char*>(info);
     memset(bytes, 0, 128);
     if (TheState().answers.file_stat) return TheState().answers.file_stat(path, bytes);
@@ -144,14 +159,15 @@ int MLIBCFileStat(const char* path, int option, void* info) {
 }
 
 int MAVOGetFSType(const char* path, int flag) {
-    NoteCall("MAVOGetFSType(" + Text(path) + ", " + std::to_string(flag) + ")");
+    const int refusal = NoteCall("MAVOGetFSType(" + Text(path) + ", " + std::to_string(flag) + ")");
+    if (refusal != 0) return refusal;
     return TheState().answers.fs_type ? TheState().answers.fs_type(path, flag) : 1;
 }
 
 int MLIBMavoFileIndexAdd(const char* path, const char* old_path, int op) {
     const std::string call = "MLIBMavoFileIndexAdd(" + Text(path) + ", " + Text(old_path) + ", " +
                              std::to_string(op) + ")";
-    NoteCall(call);
+    if (const int refusal = NoteCall(call)) return refusal;
     return TheState().answers.index ? TheState().answers.index(call) : 0;
 }
 
@@ -160,12 +176,13 @@ int MLIBMavoIndexAddEx(const char* path, const char* old_path, int op, int reser
     const std::string call = "MLIBMavoIndexAddEx(" + Text(path) + ", " + Text(old_path) + ", " +
                              std::to_string(op) + ", " + std::to_string(reserved1) + ", " +
                              std::to_string(reserved2) + ")";
-    NoteCall(call);
+    if (const int refusal = NoteCall(call)) return refusal;
     return TheState().answers.index ? TheState().answers.index(call) : 0;
 }
 
 int MAVOStrReplaceFATReservedChar(const char* in, char* out, int size) {
-    NoteCall("MAVOStrReplaceFATReservedChar(" + Text(in) + ")");
+    const int refusal = NoteCall("MAVOStrReplaceFATReservedChar(" + Text(in) + ")");
+    if (refusal != 0) return refusal;
     const std::string text =
         TheState().answers.fat_replace ? TheState().answers.fat_replace(in) : std::string(in);
     if (std::cmp_greater_equal(text.size(), size)) return -1;
@@ -174,7 +191,7 @@ int MAVOStrReplaceFATReservedChar(const char* in, char* out, int size) {
 }
 
 int MAVOACLSetEADirACL(const char* path) {
-    NoteCall("MAVOACLSetEADirACL(" + Text(path) + ")");
+    if (const int refusal = NoteCall("MAVOACLSetEADirACL(" + Text(path) + ")")) return refusal;
     return TheState().answers.acl ? TheState().answers.acl(path) : 0;
 }
 

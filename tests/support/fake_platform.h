@@ -54,6 +54,11 @@ struct FakePlatform {
     std::function<int(const std::string& path, unsigned char info[128])> file_stat;
     std::function<std::string(const std::string& path)> fat_replace;
     int pushes_until_failure = -1;  // below 0: list pushes never fail
+
+    // Asked by every call that can fail, those of string lists included ("MLIBCSzListPush(a)",
+    // "MLIBCSzListAlloc()"), before it does anything: what it answers instead, below 0 where it
+    // answers with a pointer or a count; 0 when it is to go on.
+    std::function<int(const std::string& call)> fails;
 };
 FakePlatform& Platform();
 

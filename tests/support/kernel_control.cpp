@@ -378,6 +378,11 @@ int Ftruncate(int fd, off_t size) {
     });
 }
 
+int Reserve(int fd, off_t offset, off_t size) {
+    return Call("fallocate", Number(offset) + ", " + Number(size), -1,
+                [&] { return ::fallocate(fd, FALLOC_FL_KEEP_SIZE, offset, size); });
+}
+
 int Fsync(int fd) {
     return Call("fsync", "", -1, [&] {
         const int result = Hooks().fsync ? Hooks().fsync(fd) : ::fsync(fd);

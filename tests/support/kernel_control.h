@@ -2,12 +2,12 @@
 // stand-ins, a log of the calls made.
 //
 // Call names are the C library's in lower case: "open", "close", "pread", "preadv", "pwrite",
-// "pwritev", "lseek", "ftruncate", "fsync", "sync", "fstat", "stat", "lstat", "access",
-// "setlock", "getlock", "mkdir", "unlink", "rmdir", "remove", "rename", "chmod", "fchmod",
-// "getcwd", "chdir", "fchdir", "opendir", "readdir", "rewinddir", "closedir", "geteuid", "seteuid",
-// "getpid", "time", "system", "listxattr", "getxattr", "setxattr", "removexattr", "fopen", "fread",
-// "fwrite", "fclose", "archive", "command" (the platform's system call 403), "malloc" (every
-// allocation).
+// "pwritev", "lseek", "ftruncate", "fallocate", "fsync", "sync", "fstat", "stat", "lstat",
+// "access", "setlock", "getlock", "mkdir", "unlink", "rmdir", "remove", "rename", "chmod",
+// "fchmod", "getcwd", "chdir", "fchdir", "opendir", "readdir", "rewinddir", "closedir", "geteuid",
+// "seteuid", "getpid", "time", "system", "listxattr", "getxattr", "setxattr", "removexattr",
+// "fopen", "fread", "fwrite", "fclose", "archive", "command" (the platform's system call 403),
+// "malloc" (every allocation).
 #ifndef MAVOEA_TESTS_SUPPORT_KERNEL_CONTROL_H_
 #define MAVOEA_TESTS_SUPPORT_KERNEL_CONTROL_H_
 

@@ -149,13 +149,13 @@ class StreamTest : public ::testing::Test {
     }
     void Fill(const StreamImage& image) const { Fill(image.Build()); }
 
-    std::size_t FileSize() const {
+    std::uint64_t FileSize() const {
         struct stat info;
         if (fstat(fd_, &info) != 0) abort();
-        return static_cast<std::size_t>(info.st_size);
+        return static_cast<std::uint64_t>(info.st_size);
     }
 
-    Bytes Contents(std::size_t size, std::size_t at = 0) const {
+    Bytes Contents(std::size_t size, std::uint64_t at = 0) const {
         Bytes bytes(size);
         std::size_t done = 0;
         while (done < size) {
@@ -167,7 +167,7 @@ class StreamTest : public ::testing::Test {
         bytes.resize(done);
         return bytes;
     }
-    Bytes Contents() const { return Contents(FileSize()); }
+    Bytes Contents() const { return Contents(static_cast<std::size_t>(FileSize())); }
 
     Handle Open(int lock_type = F_WRLCK) const { return Handle(MAVOEASOpen(fd_, lock_type)); }
 

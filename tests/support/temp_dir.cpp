@@ -88,7 +88,13 @@ void WriteFile(const std::string& path, const Bytes& bytes) {
 Bytes ReadFile(const std::string& path) {
     std::ifstream in(path, std::ios::binary);
     if (!in) Die("cannot read " + path);
-    return Bytes(std::istreambuf_iterator<char>(in), {});
+    Bytes bytes;
+    char part[16384];
+    do {
+        in.read(part, sizeof part);
+        bytes.insert(bytes.end(), part, part + in.gcount());
+    } while (in);
+    return bytes;
 }
 
 bool Exists(const std::string& path) {

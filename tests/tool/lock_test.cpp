@@ -172,8 +172,8 @@ TEST(LockRecordTest, ManyFilesTakeNoMoreDescriptorsThanOne) {
     const Volume volume(1);
     MAVOEA_SKIP_WITHOUT_ATTRIBUTES(volume.path());
     ASSERT_THAT(volume.Set("com.apple.ResourceFork", Ascii("make the directory")), Succeeded());
-    std::string command = "ulimit -n 16; " + std::string(MAVOEA_TOOL_PATH) + " --volume " +
-                          volume.path() + "=1 unlock";
+    std::string command =
+        "ulimit -n 16; " + ToolCommand() + " --volume " + volume.path() + "=1 unlock";
     for (int i = 0; i < 40; ++i) {
         const std::string name = "f" + std::to_string(i);
         WriteFile(volume.path() + "/" + name, {});

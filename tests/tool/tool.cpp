@@ -8,6 +8,8 @@
 #include <unistd.h>
 
 #include <cstdlib>
+#include <iterator>
+#include <sstream>
 
 namespace mavoea::test {
 namespace {
@@ -28,16 +30,20 @@ void PrintTo(const ToolResult& result, std::ostream* out) {
     *out << "exit status " << result.status << "\nout: " << result.out << "\nerr: " << result.err;
 }
 
+ToolStart::ToolStart(const Arguments& arguments) {
+    std::istringstream emulator(MAVOEA_EMULATOR);
+    words_.assign(std::istream_iterator<std::string>(emulator), {});
+    words_.push_back(MAVOEA_TOOL_PATH);
+    words_.insert(words_.end(), arguments.begin(), arguments.end());
+    for (std::string& word : words_) argv_.push_back(word.data());
+    argv_.push_back(nullptr);
+}
+
 ToolResult RunTool(const Arguments& arguments, const std::string& input, Limits limits) {
     // Files, not pipes: neither side can wait for the other.
     const TempDir dir;
     WriteFile(dir / "in", Ascii(input));
-    std::vector<std::string> words = arguments;
-    words.insert(words.begin(), "mavoea");
-    std::vector<char*> argv;
-    for (std::string& word : words) argv.push_back(word.data());
-    argv.push_back(nullptr);
-
+    ToolStart tool(arguments);
     const std::string in = dir / "in";
     const std::string out = dir / "out";
     const std::string err = dir / "err";
@@ -56,7 +62,7 @@ ToolResult RunTool(const Arguments& arguments, const std::string& input, Limits 
             signal(SIGXFSZ, SIG_IGN);  // the write fails instead
             Limit(RLIMIT_FSIZE, limits.file_size);
         }
-        execv(MAVOEA_TOOL_PATH, argv.data());
+        tool.Exec();
         _exit(127);
     }
     int status = 0;

@@ -3,6 +3,7 @@
 #define MAVOEA_TESTS_TOOL_TOOL_H_
 
 #include <gmock/gmock.h>
+#include <unistd.h>
 
 #include <nlohmann/json.hpp>
 #include <string>
@@ -25,10 +26,31 @@ void PrintTo(const ToolResult& result, std::ostream* out);
 using Arguments = std::vector<std::string>;
 
 // What the tool may use, in bytes, 0 for as much as it likes. A limit on memory has no effect under
-// a sanitizer, which needs much of its own.
+// a sanitizer, which needs much of its own, nor in an emulator, which does not pass it on.
 struct Limits {
     std::size_t memory = 0;
     std::size_t file_size = 0;  // of every file that it writes, its output too
+};
+
+// The words of a shell's command line that start the tool.
+inline std::string ToolCommand() {
+    const std::string emulator = MAVOEA_EMULATOR;
+    return emulator + (emulator.empty() ? "" : " ") + MAVOEA_TOOL_PATH;
+}
+
+// What starts the tool in place of a process; made before a fork, so that the child need not
+// allocate.
+class ToolStart {
+ public:
+    explicit ToolStart(const Arguments& arguments);
+    ToolStart(const ToolStart&) = delete;
+    ToolStart& operator=(const ToolStart&) = delete;
+
+    void Exec() { execvp(argv_[0], argv_.data()); }  // returns only when it cannot be started
+
+ private:
+    Arguments words_;
+    std::vector<char*> argv_;
 };
 
 ToolResult RunTool(const Arguments& arguments, const std::string& input = {}, Limits limits = {});

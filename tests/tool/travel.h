@@ -131,11 +131,7 @@ class RunningTool {
         int in[2];
         int err[2];
         if (pipe(in) != 0 || pipe(err) != 0) abort();
-        std::vector<std::string> words = arguments;
-        words.insert(words.begin(), "mavoea");
-        std::vector<char*> argv;
-        for (std::string& word : words) argv.push_back(word.data());
-        argv.push_back(nullptr);
+        ToolStart tool(arguments);
         child_ = fork();
         if (child_ < 0) abort();
         if (child_ == 0) {
@@ -144,7 +140,7 @@ class RunningTool {
             dup2(open("/dev/null", O_WRONLY), 1);
             dup2(err[1], 2);
             for (const int fd : {in[0], in[1], err[0], err[1]}) close(fd);
-            execv(MAVOEA_TOOL_PATH, argv.data());
+            tool.Exec();
             _exit(127);
         }
         close(in[0]);
