@@ -88,8 +88,9 @@ int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
 
     StreamImage image(total_size);
     if (!image.ok()) return unit.Fail(Err::kMemory);
-    if (ReserveRoom(h->fd, data.end() + fork.length, total_size + fork.length, unit) != 0)
+    if (ReserveRoom(h->fd, data.end() + fork.length, total_size + fork.length, unit) != 0) {
         return -1;
+    }
     if (GatherValues(h, &survey.header, index, image.At(data.offset), false) != 0) return -1;
     std::uint8_t* const at = image.At(data.end() - old_length);
     memset(at + old_length, 0, static_cast<std::size_t>(added));

@@ -488,9 +488,9 @@ TEST(StreamTruncateFaults, ATruncatedValueIsWrittenOrTheFailureRecorded) {
         const char* name;
         unsigned length;
     };
-    for (const auto& [name, length] : {Length{"shorten a value", 350}, {"lengthen a value", 900}}) {
-        FaultCase c = OnHandle(name, ThreeAttributes(0).Build(), [length](FaultWorld& w) {
-            return MAVOEASTruncate(w.handle, "second", length);
+    for (const Length& to : {Length{"shorten a value", 350}, {"lengthen a value", 900}}) {
+        FaultCase c = OnHandle(to.name, ThreeAttributes(0).Build(), [to](FaultWorld& w) {
+            return MAVOEASTruncate(w.handle, "second", to.length);
         });
         c.rules = Rules{Refused("malloc", {0x200, "eas_truncate"}), TakenUpAgain("preadv", 0),
                         Refused("preadv", {0xA00, "eas_update_entry"}),

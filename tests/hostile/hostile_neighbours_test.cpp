@@ -1145,12 +1145,17 @@ TEST_F(HostileFileTest, CleaningRemovesALinkInTheEADirectorysPlaceAndNothingBehi
 }
 
 TEST_F(HostileFileTest, ARenameMovesTheLinkItself) {
-    for (const auto& [from, to] :
-         {std::pair{kFromStream, kToStream}, std::pair{kFromResource, kToResource},
-          std::pair{kFromFolder, kToFolder}}) {
+    struct Ends {
+        const char* from;
+        const char* to;
+    };
+    for (const Ends& ends : {Ends{kFromStream, kToStream}, Ends{kFromResource, kToResource},
+                             Ends{kFromFolder, kToFolder}}) {
         for (const Kind kind : {Kind::kLinkToFile, Kind::kLinkToFolder, Kind::kFifo}) {
             WithoutWaiting([&] {
-                SCOPED_TRACE(std::string(from) + " is a " + NameOf(kind));
+                const std::string from = ends.from;
+                const std::string to = ends.to;
+                SCOPED_TRACE(from + " is a " + NameOf(kind));
                 Share share;
                 share.PutInTheWay(from, kind);
                 const std::string before = share.LookAt(from);
