@@ -220,7 +220,7 @@ class Rewrite {
         // What a file that ends too soon has no bytes for is no Finder info.
         static constexpr std::uint8_t kNothing[kFinderInfoSize] = {};
         if (result == kDone && written_ < kForkOffset &&
-            !Append(ByteView(kNothing).first(kForkOffset - written_))) {
+            !Append(ByteView(kNothing).first(static_cast<std::size_t>(kForkOffset - written_)))) {
             result = CannotWriteArea();
         }
         if (result == kDone) result = CopyArea({offsets.fork, fork_length_});

@@ -38,7 +38,8 @@ int GatherValues(EASHandle* h, StreamHeader* header, unsigned index, std::uint8_
         return unit.Fail(Err::kRead);
     }
 
-    std::rotate(attributes.begin() + index, attributes.begin() + index + 1, attributes.end());
+    const auto at = attributes.begin() + static_cast<std::ptrdiff_t>(index);
+    std::rotate(at, at + 1, attributes.end());
     EASEntry& last = attributes.back();
     for (std::size_t i = index; i + 1 < attributes.size(); ++i) {
         attributes[i].offset -= moved.length;

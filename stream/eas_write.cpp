@@ -81,7 +81,8 @@ int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
     // A value never shrinks.
     Range& data = survey.header.attributes.data;
     const std::uint32_t old_length = h->entries[index].length;
-    const std::uint64_t length = std::max<std::uint64_t>(old_length, offset + value.size());
+    const std::uint64_t length =
+        std::max(std::uint64_t{old_length}, std::uint64_t{offset} + value.size());
     const std::uint64_t added = length - old_length;
     const std::uint64_t total_size = data.end() + added;
     if (!FitsStream(total_size, fork.length)) return unit.Fail(Err::kBadArgument);
