@@ -35,19 +35,15 @@ int MAVOEAEADirAdoubleFlush(const void* buf, int len, const char* path) {
     // on the file, which a caller may hold through a stream handle.
     int fd = kernel::OpenRegular(file, O_RDWR | O_CLOEXEC, 0);
     bool created = false;
-    if (fd < 0) {
-        if (errno != ENOENT) {
-            unit.Log("%s:%d Error open path [%s] %s", path, strerror(errno));
-            return unit.Fail(Err::kOpen);
-        }
+    if (fd < 0 && errno == ENOENT) {
         fd = kernel::OpenRegular(file, O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, 0777);
         created = fd >= 0;
         // Another process may have made it meanwhile: then it is not removed below.
         if (fd < 0 && errno == EEXIST) fd = kernel::OpenRegular(file, O_RDWR | O_CLOEXEC, 0);
-        if (fd < 0) {
-            unit.Log("%s:%d Error open path [%s] %s", path, strerror(errno));
-            return unit.Fail(Err::kOpen);
-        }
+    }
+    if (fd < 0) {
+        unit.Log("%s:%d Error open path [%s] %s", path, strerror(errno));
+        return unit.Fail(Err::kOpen);
     }
     if (WriteAt(fd, {static_cast<const std::uint8_t*>(buf), size}, 0) != size) {
         unit.Log("%s:%d Error: write path [%s] %s", path, strerror(errno));

@@ -82,7 +82,7 @@ class CommandLine {
 int CopyAsItIs(const char* src, const char* dst) {
     CommandLine command;
     command.Add("/bin/cp -f ").AddPath(src).Add(" ").AddPath(dst).Add(" > /dev/null 2>&1");
-    if (!IsMetadataOrMissing(src) || !IsMetadataOrMissing(dst)) return kRefused;
+    if (!AreMetadataOrMissing(src, dst)) return kRefused;
     return command.text() != nullptr && kernel::System(command.text()) == 0 ? kDone : kRefused;
 }
 

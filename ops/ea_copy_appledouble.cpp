@@ -90,8 +90,7 @@ int EACopyADFStoADFS(const char* src, const char* dst, int move) {
         unit.Log("%s:%d filename too long: [%s].", dst);
         return kCopyNameTooLong;
     }
-    if (!IsMetadataOrMissing(from) || !IsMetadataOrMissing(to) ||
-        MLIBCExec("/bin/cp", "-f", from, to, nullptr) < 0) {
+    if (!AreMetadataOrMissing(from, to) || MLIBCExec("/bin/cp", "-f", from, to, nullptr) < 0) {
         unit.Log("%s:%d(%s) Failed to cp -f %s.\n", "EACopyADFStoADFS", from);
         return -1;
     }

@@ -50,7 +50,7 @@ int EACopySidecar(const char* src, const char* dst, const char* name, int move, 
     if (EAPrepareEADir(1, dst, dir, kDerivedPathMax) != 0) return -1;
 
     const auto copied = [&] {
-        if (!IsMetadataOrMissing(from) || !IsMetadataOrMissing(to)) return -1;
+        if (!AreMetadataOrMissing(from, to)) return -1;
         return copyFn != nullptr ? copyFn(from, to) : MLIBCExec("/bin/cp", "-f", from, to, nullptr);
     };
     if (copied() < 0) {

@@ -16,7 +16,7 @@
 #include "platform/file_status.h"
 #include "platform/include/mavocore.h"
 #include "platform/marks.h"
-#include "stream/internal.h"
+#include "stream/attribute_writer.h"
 #include "util/file_io.h"
 #include "util/owned.h"
 #include "util/path_text.h"
@@ -128,7 +128,8 @@ std::optional<std::int64_t> LatestAccess(Folder* folder) {
 // Attribute files on their way into a stream.
 class AttributeImport {
  public:
-    AttributeImport(const char* object, EASHandle** stream) : object_(object), stream_(stream) {}
+    AttributeImport(const char* object, AttributeWriter* stream)
+        : object_(object), stream_(stream) {}
 
     // The attribute file `name`: into the stream and off the disk. One that fails stays where it
     // is, with a code.
@@ -141,10 +142,7 @@ class AttributeImport {
         }
         std::uint32_t size = 0;
         if (Read(path, &size) != 0) return;
-        if (stale_) *stream_ = EASReopen(*stream_);
-        stale_ = *stream_ == nullptr ||
-                 MAVOEASWrite(*stream_, name, value_.get(), size, 0, EAS_WRITE_OVERWRITE) < 0;
-        if (stale_) {
+        if (!stream_->Write(name, value_.get(), size)) {
             unit.Log("%s:%d MAVOEASWrite error, MavoErr=[0x%04X %s:%d]", MLIBCErrGet(),
                      MLIBCErrorGetFile(), MLIBCErrorGetLine());
             return;
@@ -180,8 +178,7 @@ class AttributeImport {
     static constexpr std::uint32_t kValueMax = 0x7FFFFFFF;
 
     const char* object_;
-    EASHandle** stream_;
-    bool stale_ = false;  // a write to the stream has failed
+    AttributeWriter* stream_;
     Owned<std::uint8_t> value_;
     std::uint32_t room_ = 0;
 };
@@ -189,14 +186,11 @@ class AttributeImport {
 int ImportAttributeFiles(const char* szPath, const char* stream_path, Folder* folder) {
     const UniqueFd fd(kernel::OpenRegular(stream_path, O_RDWR | O_CREAT | O_CLOEXEC, kMode));
     if (!fd) return unit.Fail(Err::kOpen);
-    EASHandle* stream = MAVOEASOpen(fd.get(), F_WRLCK);
-    if (stream == nullptr) return kFailure;
+    AttributeWriter stream(fd.get());
+    if (!stream) return kFailure;
     folder->Rewind();
-    {
-        AttributeImport import(szPath, &stream);
-        while (const char* const name = NextAttribute(folder)) import.Move(name);
-    }
-    if (stream != nullptr) (void)MAVOEASClose(stream);
+    AttributeImport import(szPath, &stream);
+    while (const char* const name = NextAttribute(folder)) import.Move(name);
     return kConverted;
 }
 

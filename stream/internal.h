@@ -28,11 +28,6 @@ int EASShiftRFork(EASHandle* h, unsigned newStart, unsigned oldStart, unsigned l
 // no code.
 int EASMoveRFork(int fd, unsigned length, unsigned newStart, unsigned oldStart, int backwards);
 
-// For after a write that failed, when the memory of `h` may be ahead of the file and must not be
-// written from: the stream opened anew for writing, `h` closed. nullptr for nullptr, and as
-// MAVOEASOpen() gives it. errno stays.
-EASHandle* EASReopen(EASHandle* h);
-
 // Copies every attribute of the stream on srcFd into the one on dstFd, one rewrite and fsync each.
 // Attributes of the same name are overwritten (a longer value keeps its end), others, Finder info
 // and fork are kept. 0; -1 when a stream could not be opened (codes of MAVOEASOpen(), none for a

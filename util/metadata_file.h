@@ -14,6 +14,11 @@ void SetMetadataMode(const char* path, mode_t mode);
 // missing. Otherwise false, with errno as kernel::OpenRegular() sets it.
 bool IsMetadataOrMissing(const char* path);
 
+// The same of both ends of a copy.
+inline bool AreMetadataOrMissing(const char* from, const char* to) {
+    return IsMetadataOrMissing(from) && IsMetadataOrMissing(to);
+}
+
 }  // namespace mavoea
 
 #endif  // MAVOEA_UTIL_METADATA_FILE_H_
