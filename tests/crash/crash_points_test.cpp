@@ -29,6 +29,7 @@
 #include "tests/support/emulator.h"
 #include "tests/support/fake_platform.h"
 #include "tests/support/kernel_control.h"
+#include "tests/support/mac_attributes.h"
 #include "tests/support/mac_files.h"
 #include "tests/support/object_files.h"
 #include "tests/support/process.h"
@@ -79,9 +80,6 @@ void Append(Stage stage, std::vector<Stage>* stages) {
 constexpr char kRecordItem[] = "record";
 // Files of other services in the object's folder.
 constexpr const char* kOthers[] = {"MAVOPreview", "MAVOThumb"};
-constexpr char kFinderInfoName[] = "com.apple.FinderInfo";
-constexpr char kHiddenName[] = "user.test.hidden";  // what the platform's system call is told
-constexpr char kForkName[] = "com.apple.ResourceFork";
 
 // What the object of these tests has.
 const Items& Wanted() {
@@ -135,7 +133,7 @@ class World {
             for (const Attribute& attribute : stream.attributes) {
                 SetAttribute(src_.object(), attribute.name, attribute.value);
             }
-            SetAttribute(src_.object(), kFinderInfoName, wanted.at(kFinderItem));
+            SetAttribute(src_.object(), kMacFinderInfo, wanted.at(kFinderItem));
             WriteFile(ForkFile(src_.object()), wanted.at(kForkItem));
             return;
         }
@@ -165,7 +163,9 @@ class World {
         Items items;
         if (type == 7) {
             for (const std::string& name : NamesOf(object.object())) {
-                const std::string item = name == kFinderInfoName ? kFinderItem : name;
+                const std::string item = name == kMacFinderInfo ? kFinderItem
+                                         : name == kMacFork     ? kForkItem
+                                                                : name;
                 items[item] = AttributeOf(object.object(), name);
             }
             items[kForkItem] = ReadFile(ForkFile(object.object()));
@@ -208,78 +208,16 @@ class World {
         return all;
     }
 
-    static std::string ForkFile(const std::string& object) { return object + ".fork"; }
-
  private:
-    static std::string RealName(const std::string& name) {
-        return name == kFinderInfoName ? "user.test.FinderInfo" : name;
-    }
-    static std::string Viewed(const std::string& path) {
-        constexpr std::string_view kView = "/rsrc";
-        if (!path.ends_with(kView)) return path;
-        return ForkFile(path.substr(0, path.size() - kView.size()));
-    }
-    static void SetAttribute(const std::string& path, const std::string& name, const Bytes& value) {
-        if (::setxattr(path.c_str(), RealName(name).c_str(), value.data(), value.size(), 0) != 0) {
-            FAIL() << strerror(errno);
-        }
-    }
-    static Bytes AttributeOf(const std::string& path, const std::string& name) {
-        Bytes value(65536);
-        const ssize_t size =
-            ::getxattr(path.c_str(), RealName(name).c_str(), value.data(), value.size());
-        value.resize(size < 0 ? 0 : static_cast<std::size_t>(size));
-        return value;
-    }
-    // Sorted, so that no filesystem's order matters.
-    static std::vector<std::string> NamesOf(const std::string& path) {
-        char names[4096];
-        const ssize_t size = ::listxattr(path.c_str(), names, sizeof names);
-        std::vector<std::string> all;
-        for (const char* name = names; name < names + size; name += strlen(name) + 1) {
-            if (strncmp(name, "user.", 5) != 0 || strcmp(name, kHiddenName) == 0) continue;
-            const bool finder_info = strcmp(name, "user.test.FinderInfo") == 0;
-            all.emplace_back(finder_info ? kFinderInfoName : name);
-        }
-        std::sort(all.begin(), all.end());
-        return all;
-    }
-
     static void StandIn() {
         KernelHooks& hooks = Hooks();
         hooks.fsync = [](int) { return 0; };
         hooks.sync = [] {};
         hooks.geteuid = [] { return uid_t{0}; };
-        hooks.stat = [](const char* path, struct stat* info) {
-            return ::stat(Viewed(path).c_str(), info);
-        };
-        hooks.fopen = [](const char* path, const char* mode) {
-            return ::fopen(Viewed(path).c_str(), mode);
-        };
-        hooks.getxattr = [](const char* path, const char* name, void* value, size_t size) {
-            return ::getxattr(path, RealName(name).c_str(), value, size);
-        };
-        hooks.setxattr = [](const char* path, const char* name, const void* value, size_t size,
-                            int flags) {
-            return ::setxattr(path, RealName(name).c_str(), value, size, flags);
-        };
-        hooks.listxattr = [](const char* path, char* names, size_t size) -> ssize_t {
-            std::string all;
-            for (const std::string& name : NamesOf(path)) all += name + '\0';
-            if (Exists(ForkFile(path)) && !ReadFile(ForkFile(path)).empty()) {
-                all += std::string(kForkName) + '\0';
-            }
-            if (size == 0) return static_cast<ssize_t>(all.size());
-            if (all.size() > size) {
-                errno = ERANGE;
-                return -1;
-            }
-            memcpy(names, all.data(), all.size());
-            return static_cast<ssize_t>(all.size());
-        };
+        StandInForMacAttributes();
         hooks.archive = [](int) { return 0; };
         hooks.command = [](const char* path, int command) {
-            return ::setxattr(path, kHiddenName, &command, sizeof command, 0);
+            return ::setxattr(path, kHiddenMark, &command, sizeof command, 0);
         };
         // What the commands say of files that are not there is no matter here.
         Platform().exec = RunCommand;
@@ -561,9 +499,9 @@ TEST(CrashPointsTest, ACopyLeavesItsSourceWholeAndIsCompletedByAnother) {
          false,
          {{"", "src all; dst none"},
           {"setxattr", "src all; dst Finder info"},
-          {"setxattr", "src all; dst Finder info, user.one"},
-          {"setxattr", "src all; dst Finder info, user.one, user.two"},
-          {"fclose", "src all; dst all"}}},
+          {"fclose", "src all; dst Finder info, fork"},
+          {"setxattr", "src all; dst Finder info, fork, user.one"},
+          {"setxattr", "src all; dst all"}}},
     });
 }
 
@@ -950,7 +888,7 @@ TEST(CrashPointsTest, AnUpgradeOfOneFileIsDoneOrNot) {
                   [](const World& world) {
                       const std::string object = world.src().object();
                       const bool mode = (ModeOf(object) & 0222) == 0222;
-                      const bool hidden = getxattr(object.c_str(), kHiddenName, nullptr, 0) > 0;
+                      const bool hidden = getxattr(object.c_str(), kHiddenMark, nullptr, 0) > 0;
                       return CostOfMoving({{"folder", FoundLegacy(world.src())},
                                            {"current", World::Found(world.src(), 1)}},
                                           ResourceOnly()) +
@@ -1118,7 +1056,7 @@ TEST(CrashPointsTest, AnEADirectoryThatWasJustMadeMayNotBeOpenToEverybody) {
 // ---- The fork on an attribute volume ------------------------------------------------------------
 
 std::string CostOfFork(const World& world) {
-    const Bytes fork = ReadFile(World::ForkFile(world.src().object()));
+    const Bytes fork = ReadFile(ForkFile(world.src().object()));
     const std::string text = fork == Wanted().at(kForkItem) ? "old"
                              : fork == Pattern(6000, 9)     ? "new"
                              : fork.empty()                 ? "LOST fork"
@@ -1134,7 +1072,7 @@ TEST(CrashPointsTest, AForkOnAnAttributeVolumeIsEmptiedBeforeItIsWritten) {
         .run =
             [](const World& world) {
                 const Bytes fork = Pattern(6000, 9);
-                return MAVOEAXattrSet(world.src().object().c_str(), kForkName, fork.data(),
+                return MAVOEAXattrSet(world.src().object().c_str(), kMacFork, fork.data(),
                                       static_cast<int>(fork.size()), 0);
             },
         .cost = CostOfFork,

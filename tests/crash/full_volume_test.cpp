@@ -27,6 +27,7 @@
 #include "stream/internal.h"
 #include "tests/support/fake_platform.h"
 #include "tests/support/kernel_control.h"
+#include "tests/support/mac_attributes.h"
 #include "tests/support/mac_files.h"
 #include "tests/support/object_files.h"
 #include "tests/support/process.h"
@@ -46,8 +47,6 @@ constexpr char kNoAttributes[] = "this kernel's tmpfs has no attributes of users
 // More steps than any call here needs pages: a sweep that reaches it never succeeded.
 constexpr int kStepsMax = 80;
 
-constexpr char kFinderInfo[] = "com.apple.FinderInfo";
-constexpr char kFork[] = "com.apple.ResourceFork";
 constexpr char kRecord[] = "user.netatalk.Metadata";
 
 // ---- Volumes ------------------------------------------------------------------------------------
@@ -799,60 +798,11 @@ class CopyOnFullVolumeTest : public FullVolumeTest {
         Hooks().time = [] { return time_t{0x41424344}; };
         Hooks().archive = [](int) { return 0; };
         Hooks().command = [](const char*, int) { return 0; };
-        // The names that Macs use stand under a user's, "<object>/rsrc" beside the object.
-        Hooks().stat = [](const char* path, struct stat* info) {
-            return ::stat(Viewed(path).c_str(), info);
-        };
-        Hooks().fopen = [](const char* path, const char* mode) {
-            return ::fopen(Viewed(path).c_str(), mode);
-        };
-        Hooks().getxattr = [](const char* path, const char* name, void* value, size_t size) {
-            return ::getxattr(path, RealName(name).c_str(), value, size);
-        };
-        Hooks().setxattr = [](const char* path, const char* name, const void* value, size_t size,
-                              int flags) {
-            return ::setxattr(path, RealName(name).c_str(), value, size, flags);
-        };
-        Hooks().listxattr = [](const char* path, char* names, size_t size) -> ssize_t {
-            std::string all;
-            for (const auto& [name, value] : AttributesOf(path)) all += name + '\0';
-            if (size != 0) memcpy(names, all.data(), all.size());
-            return static_cast<ssize_t>(all.size());
-        };
+        StandInForMacAttributes();
         Platform().exec = Run;
     }
 
     // ---- Both ends ----
-
-    static std::string RealName(const std::string& name) {
-        return name == kFinderInfo ? "user.mac.FinderInfo" : name;
-    }
-    static std::string ForkFile(const std::string& object) { return object + ".fork"; }
-    static std::string Viewed(const std::string& path) {
-        constexpr std::string_view kView = "/rsrc";
-        if (!path.ends_with(kView)) return path;
-        return ForkFile(path.substr(0, path.size() - kView.size()));
-    }
-    static std::map<std::string, Bytes> AttributesOf(const std::string& object) {
-        std::map<std::string, Bytes> found;
-        char names[4096];
-        const ssize_t size = ::listxattr(object.c_str(), names, sizeof names);
-        for (const char* name = names; name < names + size; name += strlen(name) + 1) {
-            if (strncmp(name, "user.", 5) != 0) continue;
-            Bytes value(65536);
-            const ssize_t length = ::getxattr(object.c_str(), name, value.data(), value.size());
-            value.resize(length < 0 ? 0 : static_cast<size_t>(length));
-            found[strcmp(name, "user.mac.FinderInfo") == 0 ? kFinderInfo : name] = value;
-        }
-        const std::string fork = ForkFile(object);
-        if (Exists(fork) && !ReadFile(fork).empty()) found[kFork] = ReadFile(fork);
-        return found;
-    }
-    static void Set(const std::string& object, const std::string& name, const Bytes& value) {
-        ASSERT_EQ(0,
-                  ::setxattr(object.c_str(), RealName(name).c_str(), value.data(), value.size(), 0))
-            << strerror(errno);
-    }
 
     // An object with all that a volume of its type keeps for it, and a neighbour's stream.
     static void Fill(const End& end) {
@@ -874,9 +824,9 @@ class CopyOnFullVolumeTest : public FullVolumeTest {
                 break;
             case 7:
                 for (const Attribute& attribute : attributes) {
-                    Set(end.object(), attribute.name, attribute.value);
+                    SetAttribute(end.object(), attribute.name, attribute.value);
                 }
-                Set(end.object(), kFinderInfo, finder_info);
+                SetAttribute(end.object(), kMacFinderInfo, finder_info);
                 WriteFile(ForkFile(end.object()), fork);
                 break;
             default:
@@ -884,7 +834,7 @@ class CopyOnFullVolumeTest : public FullVolumeTest {
                 WriteFile(files.resource(), NetatalkFile(finder_info, fork).bytes);
                 WriteFile(files.stream(), StreamImage{.attributes = attributes}.Build());
                 WriteFile(files.folder() + "/MAVOThumb", Pattern(5000, 5));
-                if (end.type == 2) Set(end.object(), kRecord, AttributeRecord());
+                if (end.type == 2) SetAttribute(end.object(), kRecord, AttributeRecord());
         }
     }
     // The destination as it is before: the object's data, and a neighbour.
@@ -905,7 +855,7 @@ class CopyOnFullVolumeTest : public FullVolumeTest {
             all[name] = entry.is_directory() ? Bytes() : ReadFile(entry.path().string());
         }
         for (const auto& [name, value] : AttributesOf(end.object())) {
-            if (name != kFork) all["attribute " + name] = value;
+            if (name != kMacFork) all["attribute " + name] = value;
         }
         return all;
     }
@@ -925,9 +875,9 @@ class CopyOnFullVolumeTest : public FullVolumeTest {
             if (!contents->fork.empty()) pieces.emplace("fork", contents->fork);
         }
         for (const auto& [name, value] : AttributesOf(end.object())) {
-            if (name == kFinderInfo) {
+            if (name == kMacFinderInfo) {
                 pieces.emplace("Finder info", value);
-            } else if (name == kFork) {
+            } else if (name == kMacFork) {
                 pieces.emplace("fork", value);
             } else if (name != kRecord) {
                 pieces.emplace("attribute " + name, value);

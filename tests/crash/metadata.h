@@ -170,13 +170,6 @@ inline std::string Share(const std::set<std::string>& names, const Items& wanted
     return names.size() == wanted.size() ? "all" : Listed(names);
 }
 
-// In memory where there is a place for that which has attributes of users.
-inline std::string FastDirectory() {
-    constexpr char kMemory[] = "/dev/shm";
-    return access(kMemory, W_OK | X_OK) == 0 ? kMemory
-                                             : std::filesystem::temp_directory_path().string();
-}
-
 }  // namespace mavoea::test
 
 #endif  // MAVOEA_TESTS_CRASH_METADATA_H_

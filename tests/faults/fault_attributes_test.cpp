@@ -21,13 +21,6 @@
 namespace mavoea::test {
 namespace {
 
-using Rules = std::vector<FaultRule>;
-
-Rules operator+(Rules left, const Rules& right) {
-    left.insert(left.end(), right.begin(), right.end());
-    return left;
-}
-
 // Nothing is recorded of the attribute calls: their errno tells.
 const Outcome kErrnoTells = {.result = -1, .error = kInjectedErrno};
 

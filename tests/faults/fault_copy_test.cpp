@@ -22,6 +22,7 @@
 
 #include "include/mavoea.h"
 #include "tests/support/fault_sweep.h"
+#include "tests/support/mac_attributes.h"
 #include "tests/support/mac_files.h"
 #include "tests/support/object_files.h"
 #include "tests/support/record_builder.h"
@@ -30,8 +31,6 @@
 namespace mavoea::test {
 namespace {
 
-constexpr char kFinderInfo[] = "com.apple.FinderInfo";
-constexpr char kFork[] = "com.apple.ResourceFork";
 constexpr char kRecord[] = "user.netatalk.Metadata";
 
 // ---- The two ends -------------------------------------------------------------------------------
@@ -48,38 +47,6 @@ struct Way {
 
 ObjectFiles Source(const FaultWorld& w) { return {w / "src", "a"}; }
 ObjectFiles Destination(const FaultWorld& w) { return {w / "dst", "b"}; }
-
-// The names that Macs use stand under a user's, and "<object>/rsrc" for a file beside the object.
-std::string RealName(const std::string& name) {
-    return name == kFinderInfo ? "user.mac.FinderInfo" : name;
-}
-std::string ForkFile(const std::string& object) { return object + ".fork"; }
-std::string Viewed(const std::string& path) {
-    constexpr std::string_view kView = "/rsrc";
-    if (!path.ends_with(kView)) return path;
-    return ForkFile(path.substr(0, path.size() - kView.size()));
-}
-
-std::map<std::string, Bytes> AttributesOf(const std::string& object) {
-    std::map<std::string, Bytes> found;
-    char names[4096];
-    const ssize_t size = ::listxattr(object.c_str(), names, sizeof names);
-    for (const char* name = names; name < names + size; name += strlen(name) + 1) {
-        if (strncmp(name, "user.", 5) != 0) continue;
-        Bytes value(4096);
-        const ssize_t length = ::getxattr(object.c_str(), name, value.data(), value.size());
-        value.resize(length < 0 ? 0 : static_cast<size_t>(length));
-        found[strcmp(name, "user.mac.FinderInfo") == 0 ? kFinderInfo : name] = value;
-    }
-    const std::string fork = ForkFile(object);
-    if (Exists(fork) && !ReadFile(fork).empty()) found[kFork] = ReadFile(fork);
-    return found;
-}
-
-void SetAttribute(const std::string& object, const std::string& name, const Bytes& value) {
-    ASSERT_EQ(0, ::setxattr(object.c_str(), RealName(name).c_str(), value.data(), value.size(), 0))
-        << strerror(errno);
-}
 
 // The commands, in this process, with the exit statuses that they have.
 int Run(const std::vector<std::string>& argv) {
@@ -121,25 +88,7 @@ void Prepare(FaultWorld& w, const Way& way) {
     Hooks().archive = [](int) { return 0; };
     Hooks().command = [](const char*, int) { return 0; };
     Hooks().time = [] { return time_t{0x41424344}; };
-    Hooks().stat = [](const char* path, struct stat* info) {
-        return ::stat(Viewed(path).c_str(), info);
-    };
-    Hooks().fopen = [](const char* path, const char* mode) {
-        return ::fopen(Viewed(path).c_str(), mode);
-    };
-    Hooks().getxattr = [](const char* path, const char* name, void* value, size_t size) {
-        return ::getxattr(path, RealName(name).c_str(), value, size);
-    };
-    Hooks().setxattr = [](const char* path, const char* name, const void* value, size_t size,
-                          int flags) {
-        return ::setxattr(path, RealName(name).c_str(), value, size, flags);
-    };
-    Hooks().listxattr = [](const char* path, char* names, size_t size) -> ssize_t {
-        std::string all;
-        for (const auto& [name, value] : AttributesOf(path)) all += name + '\0';
-        if (size != 0) memcpy(names, all.data(), all.size());
-        return static_cast<ssize_t>(all.size());
-    };
+    StandInForMacAttributes();
     Platform().exec = RunOrCallBack;
 
     const ObjectFiles src = Source(w);
@@ -164,7 +113,7 @@ void Prepare(FaultWorld& w, const Way& way) {
             break;
         case 7:
             SetAttribute(src.object(), "user.k", Value());
-            SetAttribute(src.object(), kFinderInfo, FinderInfoBytes());
+            SetAttribute(src.object(), kMacFinderInfo, FinderInfoBytes());
             if (!way.directory) WriteFile(ForkFile(src.object()), ForkBytes());
             break;
         default:
@@ -204,9 +153,9 @@ Pieces PiecesAt(const ObjectFiles& files) {
     }
     if (Exists(files.object())) {
         for (const auto& [name, value] : AttributesOf(files.object())) {
-            pieces.emplace(name == kFinderInfo ? "Finder info"
-                           : name == kFork     ? "fork"
-                                               : "attribute " + name,
+            pieces.emplace(name == kMacFinderInfo ? "Finder info"
+                           : name == kMacFork     ? "fork"
+                                                  : "attribute " + name,
                            value);
         }
     }
@@ -300,7 +249,6 @@ void ExpectKept(FaultWorld& w, const Way& way, const FaultRun& run) {
 
 // ---- Rules --------------------------------------------------------------------------------------
 
-using Rules = std::vector<FaultRule>;
 using Lines = std::vector<std::string>;
 using Records = std::vector<ExpectedRecord>;
 
@@ -1326,13 +1274,13 @@ TEST(FaultCopyTest, BetweenRealAttributes) {
                     lines.push_back(Pair("Failed to cp", {}));
                     return Failed({}, lines);
                 };
-                Outcome first = unset(kFinderInfo);
+                Outcome first = unset(kMacFinderInfo);
                 first.any_log = true;  // another one is set behind it
                 table->Add("setxattr", "com.apple.FinderInfo", {}, first);
                 AddExact(table, "setxattr", "user.k", unset("user.k"));
                 const auto fork = [&](const char* what, const char* path) {
-                    return unset(kFork, {std::string("ea_xattr_set:LINE Fail to ") + what + "(" +
-                                         path + "). {error}"});
+                    return unset(kMacFork, {std::string("ea_xattr_set:LINE Fail to ") + what + "(" +
+                                            path + "). {error}"});
                 };
                 AddExact(table, "stat", "{dir}/dst/b)", fork("stat", kD), 1);
                 AddExact(table, "stat", "{dir}/dst/b/rsrc", fork("stat", "{dir}/dst/b/rsrc"));

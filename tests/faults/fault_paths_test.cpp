@@ -17,13 +17,6 @@
 namespace mavoea::test {
 namespace {
 
-using Rules = std::vector<FaultRule>;
-
-Rules operator+(Rules left, const Rules& right) {
-    left.insert(left.end(), right.begin(), right.end());
-    return left;
-}
-
 constexpr ExpectedRecord kNoMemory = {0x100, "ea_mkdir.c"};
 constexpr ExpectedRecord kNotMade = {0x3C00, "ea_mkdir.c"};
 constexpr ExpectedRecord kNotOpened = {0x2A00, "ea_mkdir.c"};

@@ -25,28 +25,11 @@
 namespace mavoea::test {
 namespace {
 
-using Rules = std::vector<FaultRule>;
-
 constexpr char kRecord[] = "user.netatalk.Metadata";
 constexpr char kFlushTime[] = "user.mavo.filea.flushtime";
 constexpr char kResource[] = "@eaDir/a@MavoResource";
 constexpr char kOther[] = "@eaDir/b@MavoResource";
 constexpr time_t kNow = 0x65432100;
-
-// A path that is derived on the heap, and found to be too long.
-const std::string kLongPath(4095, 'a');
-
-using test::operator+;
-
-Rules operator+(Rules left, const Rules& right) {
-    left.insert(left.end(), right.begin(), right.end());
-    return left;
-}
-
-// Transfers that are interrupted, or cut short with the rest to come, are taken up again.
-Rules TakenUpAgain(const char* call) {
-    return {{.call = call, .errors = {EINTR, kShortOnce}, .outcome = {.files = Files::kDone}}};
-}
 
 // The 741 bytes at the head of a resource file, whose AFP attributes are `attributes`.
 Bytes ResourceHead(std::uint16_t attributes) {
@@ -72,17 +55,6 @@ void MakeResource(FaultWorld& w, const Bytes& bytes, const char* file = kResourc
     MakeDir(w / "@eaDir");
     WriteFile(w / file, bytes);
 }
-
-// A process that is nobody's superuser, in which every seteuid() succeeds that is not made to fail.
-void BeUser(FaultWorld& w) {
-    w.number = 1000;
-    Hooks().geteuid = [&w] { return static_cast<uid_t>(w.number); };
-    Hooks().seteuid = [&w](uid_t uid) {
-        w.number = static_cast<int>(uid);
-        return 0;
-    };
-}
-std::string UserOf(FaultWorld& w) { return "uid " + std::to_string(w.number); }
 
 // The record that a run reads into.
 EAAdouble* RecordOfRun(FaultWorld& w) {
@@ -154,7 +126,7 @@ TEST(FaultRecordsTest, ReadingTheRecordOfAResourceFile) {
             [](FaultWorld& w) { return MAVOEAEADirAdoubleRead((w / "a").c_str(), RecordOfRun(w)); },
         .check = [](FaultWorld& w,
                     const FaultRun& run) { ExpectWholeRecord(w, run, ResourceHead(0x20)); },
-        .rules = TakenUpAgain("pread") +
+        .rules = Rules{TakenUpAgain("pread")} +
                  Rules{
                      {.call = "open", .errors = {ENOENT}, .outcome = {.result = 1}},
                      {.call = "open",
@@ -329,7 +301,7 @@ TEST(FaultRecordsTest, FlushingARecordOverTheHeadOfAResourceFile) {
                 EXPECT_EQ(Pattern(4259), Bytes(file.begin() + 741, file.end())) << run.call;
             },
         .rules =
-            TakenUpAgain("pwrite") +
+            Rules{TakenUpAgain("pwrite")} +
             Rules{
                 // It is opened once more, to be created.
                 {.call = "open", .errors = {ENOENT}, .outcome = {.files = Files::kDone}},
@@ -377,7 +349,7 @@ TEST(FaultRecordsTest, FlushingARecordIntoANewResourceFileLeavesNoneWhenItFails)
                 EXPECT_EQ(run.result == 0, Exists(w / kResource)) << run.call;
             },
         .rules =
-            TakenUpAgain("pwrite") +
+            Rules{TakenUpAgain("pwrite")} +
             Rules{
                 // There is none: as it is.
                 {.call = "open",
@@ -490,7 +462,7 @@ TEST(FaultRecordsTest, BringingFinderInfoFromTheResourceFileIntoTheAttribute) {
                 }
             },
         .rules =
-            SettingBothAttributes() + TakenUpAgain("pread") +
+            SettingBothAttributes() + Rules{TakenUpAgain("pread")} +
             Rules{
                 // A type that is not told is none on which there is anything to do.
                 {.call = "MAVOGetFSType"},
@@ -592,7 +564,7 @@ TEST(FaultRecordsTest, WritingFinderInfoIntoANewResourceFileLeavesNoEmptyOneWhen
             },
         .state = UserOf,
         .rules =
-            TakenUpAgain("pwrite") +
+            Rules{TakenUpAgain("pwrite")} +
             Rules{
                 {.call = "seteuid",
                  .ordinal = 1,
@@ -672,7 +644,7 @@ TEST(FaultRecordsTest, WritingFinderInfoOnAnAttributeVolumeHidesTheNewDirectory)
                 }
             },
         .rules =
-            TakenUpAgain("pwrite") +
+            Rules{TakenUpAgain("pwrite")} +
             Rules{
                 {.call = "malloc",
                  .ordinal = 1,
@@ -730,7 +702,7 @@ TEST(FaultRecordsTest, WritingFinderInfoOverThatOfAResourceFile) {
                 EXPECT_EQ(former, file) << run.call;
             },
         .rules =
-            TakenUpAgain("pread") + TakenUpAgain("pwrite") +
+            Rules{TakenUpAgain("pread")} + Rules{TakenUpAgain("pwrite")} +
             Rules{
                 {.call = "malloc",
                  .ordinal = 1,
@@ -799,7 +771,7 @@ TEST(FaultRecordsTest, WritingTheFinderInfoOfAHandle) {
                 ::close(w.fd);
             },
         .rules =
-            TakenUpAgain("pwrite") +
+            Rules{TakenUpAgain("pwrite")} +
             Rules{
                 {.call = "lseek",
                  .outcome = {.result = -1,

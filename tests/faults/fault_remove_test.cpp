@@ -17,8 +17,6 @@
 namespace mavoea::test {
 namespace {
 
-using Rules = std::vector<FaultRule>;
-
 constexpr char kUnit[] = "ea_remove";
 
 // What there is of an object "a" that has metadata in both forms of the EA directory.
@@ -27,14 +25,6 @@ constexpr char kColor[] = "@eaDir/a/color";
 constexpr char kTags[] = "@eaDir/a/tags";
 constexpr char kStream[] = "@eaDir/a@MavoEAStream";
 constexpr char kResource[] = "@eaDir/a@MavoResource";
-
-// A path that is derived on the heap, and found to be too long.
-const std::string kLongPath(4095, 'a');
-
-Rules operator+(Rules left, const Rules& right) {
-    left.insert(left.end(), right.begin(), right.end());
-    return left;
-}
 
 void MakeMetadata(FaultWorld& w) {
     const ObjectFiles files{w.dir, "a"};

@@ -19,29 +19,9 @@
 namespace mavoea::test {
 namespace {
 
-using Rules = std::vector<FaultRule>;
 using Names = std::vector<const char*>;
 
 constexpr char kUnit[] = "ea_rename.c";
-
-// A path that is derived on the heap, and found to be too long.
-const std::string kLongPath(4095, 'a');
-
-Rules operator+(Rules left, const Rules& right) {
-    left.insert(left.end(), right.begin(), right.end());
-    return left;
-}
-
-// A process that is nobody's superuser, in which every seteuid() succeeds that is not made to fail.
-void BeUser(FaultWorld& w) {
-    w.number = 1000;
-    Hooks().geteuid = [&w] { return static_cast<uid_t>(w.number); };
-    Hooks().seteuid = [&w](uid_t uid) {
-        w.number = static_cast<int>(uid);
-        return 0;
-    };
-}
-std::string UserOf(FaultWorld& w) { return "uid " + std::to_string(w.number); }
 
 // Whether the platform's indexes were told that `from` has become `to`, and of nothing else.
 void ExpectIndexesTold(const std::string& from, const std::string& to, const FaultRun& run,

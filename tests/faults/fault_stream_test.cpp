@@ -21,13 +21,7 @@
 namespace mavoea::test {
 namespace {
 
-using Rules = std::vector<FaultRule>;
 using Names = std::vector<const char*>;
-
-Rules operator+(Rules left, const Rules& right) {
-    left.insert(left.end(), right.begin(), right.end());
-    return left;
-}
 
 // ---- Streams and handles ----
 
@@ -90,13 +84,6 @@ FaultCase OnHandle(const char* name, const Bytes& bytes,
 // Any failure of `call` that is not taken up again: the record, and nothing changed.
 FaultRule Refused(const char* call, ExpectedRecord record, int ordinal = 0) {
     return {.call = call, .ordinal = ordinal, .outcome = {.result = -1, .records = {record}}};
-}
-
-// Transfers that are interrupted, or cut short with the rest to come, are taken up again.
-FaultRule TakenUpAgain(const char* call, long long result) {
-    return {.call = call,
-            .errors = {EINTR, kShortOnce},
-            .outcome = {.result = result, .files = Files::kDone}};
 }
 
 // ---- Open, close, lock, flush ----

@@ -18,22 +18,12 @@
 namespace mavoea::test {
 namespace {
 
-using Rules = std::vector<FaultRule>;
-
 constexpr char kUnit[] = "ea_upgrade";
 constexpr char kFolder[] = "@eaDir/a";
 constexpr char kColor[] = "@eaDir/a/color";
 constexpr char kTags[] = "@eaDir/a/tags";
 constexpr char kStream[] = "@eaDir/a@MavoEAStream";
 constexpr char kResource[] = "@eaDir/a@MavoResource";
-
-// A path that is derived on the heap, and found to be too long.
-const std::string kLongPath(4095, 'a');
-
-Rules operator+(Rules left, const Rules& right) {
-    left.insert(left.end(), right.begin(), right.end());
-    return left;
-}
 
 // A line about a value that could not be written, which quotes the record of the cause.
 #define WRITE_LINE(record) "ea_upgrade:LINE MAVOEASWrite error, MavoErr=[" record ":LINE]"
@@ -42,17 +32,6 @@ void MakeObject(FaultWorld& w) {
     WriteFile(w / "a", Ascii("data"));
     ASSERT_EQ(0, chmod((w / "a").c_str(), 0644));
 }
-
-// A process that is nobody's superuser, in which every seteuid() succeeds that is not made to fail.
-void BeUser(FaultWorld& w) {
-    w.number = 1000;
-    Hooks().geteuid = [&w] { return static_cast<uid_t>(w.number); };
-    Hooks().seteuid = [&w](uid_t uid) {
-        w.number = static_cast<int>(uid);
-        return 0;
-    };
-}
-std::string UserOf(FaultWorld& w) { return "uid " + std::to_string(w.number); }
 
 // An attribute's value in the stream, if there is a stream that has it. Closes the stream again,
 // and with it drops the process's locks on it.

@@ -131,12 +131,6 @@ Bytes SomeResource() {
     return bytes;
 }
 
-// In memory where there is a place for that.
-std::string ScratchParent() {
-    constexpr char kMemory[] = "/dev/shm";
-    return access(kMemory, W_OK | X_OK) == 0 ? kMemory : fs::temp_directory_path().string();
-}
-
 void MakeDir(const std::string& path) {
     if (mkdir(path.c_str(), 0777) != 0 || chmod(path.c_str(), 0777) != 0) abort();
 }
@@ -231,7 +225,7 @@ class Outside {
         }
     }
 
-    TempDir dir_{ScratchParent()};
+    TempDir dir_{FastDirectory()};
     std::map<std::string, std::string> state_;
 };
 
@@ -460,7 +454,7 @@ class Share : private Identity {
 
     static inline Share* current_ = nullptr;
     static inline std::unique_ptr<Outside> outside_;
-    TempDir top_{ScratchParent()};
+    TempDir top_{FastDirectory()};
     std::vector<std::string> opened_outside_;
     std::vector<std::string> handed_over_;
 };

@@ -146,14 +146,6 @@ struct Operation {
     bool result_tells = false;  // its failures have no code, by design
 };
 
-// In memory where there is a place for that.
-std::string ScratchParent() {
-    constexpr char kMemoryParent[] = "/dev/shm";
-    return access(kMemoryParent, W_OK | X_OK) == 0
-               ? kMemoryParent
-               : std::filesystem::temp_directory_path().string();
-}
-
 class SweepTest : public ::testing::Test, protected Identity {
  protected:
     SweepTest() {
@@ -559,7 +551,7 @@ class ObjectSweepTest : public SweepTest {
     std::string DstDouble() const { return dir_.path() + "/to/._b"; }
     std::string Out() const { return dir_.path() + "/out"; }
 
-    TempDir dir_{ScratchParent()};
+    TempDir dir_{FastDirectory()};
     const std::string src_ = dir_ / "from/a";
     const std::string dst_ = dir_ / "to/b";
     Bytes attribute_;  // "user.netatalk.Metadata" of every object; empty: none

@@ -7,12 +7,9 @@
 #include <gtest/gtest.h>
 #include <string.h>
 #include <sys/stat.h>
-#include <sys/xattr.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <functional>
-#include <map>
 #include <optional>
 #include <regex>
 #include <string>
@@ -21,16 +18,13 @@
 #include "include/mavoea.h"
 #include "tests/support/fake_platform.h"
 #include "tests/support/kernel_control.h"
+#include "tests/support/mac_attributes.h"
 #include "tests/support/process.h"
 #include "tests/support/stream_builder.h"
 #include "tests/support/temp_dir.h"
 
 namespace mavoea::test {
 
-using Attributes = std::map<std::string, Bytes>;
-
-// No filesystem here has the names that Macs use: "com.apple.FinderInfo" stands under a user name,
-// and "<object>/rsrc" for a file elsewhere. Every other attribute is a real one.
 class CopyTest : public ::testing::Test {
  protected:
     CopyTest() {
@@ -70,29 +64,9 @@ class CopyTest : public ::testing::Test {
         Hooks().geteuid = [] { return uid_t{0}; };  // so that nobody needs to become the superuser
         Hooks().fsync = [](int) { return 0; };
         Hooks().sync = [this] { ++syncs_; };
-        Hooks().stat = [](const char* path, struct stat* info) {
-            return ::stat(Viewed(path).c_str(), info);
-        };
-        Hooks().fopen = [](const char* path, const char* mode) {
-            return ::fopen(Viewed(path).c_str(), mode);
-        };
-        Hooks().getxattr = [](const char* path, const char* name, void* value, size_t size) {
-            return ::getxattr(path, RealName(name).c_str(), value, size);
-        };
-        Hooks().setxattr = [](const char* path, const char* name, const void* value, size_t size,
-                              int flags) {
-            return ::setxattr(path, RealName(name).c_str(), value, size, flags);
-        };
-        Hooks().listxattr = [this](const char* path, char* names, size_t size) -> ssize_t {
-            std::string all;
-            for (const std::string& name : listed_ ? *listed_ : NamesOf(path)) all += name + '\0';
-            if (size == 0) return static_cast<ssize_t>(all.size());
-            if (all.size() > size) {
-                errno = ERANGE;
-                return -1;
-            }
-            memcpy(names, all.data(), all.size());
-            return static_cast<ssize_t>(all.size());
+        StandInForMacAttributes();
+        Hooks().listxattr = [this](const char* path, char* names, size_t size) {
+            return ListNames(listed_ ? *listed_ : NamesOf(path), names, size);
         };
     }
 
@@ -127,62 +101,6 @@ class CopyTest : public ::testing::Test {
     // What there is, or "(none)".
     static Bytes Content(const std::string& path) {
         return Exists(path) ? ReadFile(path) : Ascii("(none)");
-    }
-
-    // ---- Attributes -----------------------------------------------------------------------------
-
-    static std::string RealName(const std::string& name) {
-        return name == "com.apple.FinderInfo" ? "user.test.FinderInfo" : name;
-    }
-    static std::string ForkFile(const std::string& object) { return object + ".fork"; }
-    static std::string Viewed(const std::string& path) {
-        constexpr std::string_view kView = "/rsrc";
-        if (!path.ends_with(kView)) return path;
-        return ForkFile(path.substr(0, path.size() - kView.size()));
-    }
-
-    static void SetAttribute(const std::string& object, const std::string& name,
-                             const Bytes& value) {
-        if (name == "com.apple.ResourceFork") {
-            WriteFile(ForkFile(object), value);
-            return;
-        }
-        ASSERT_EQ(0,
-                  ::setxattr(object.c_str(), RealName(name).c_str(), value.data(), value.size(), 0))
-            << name << ": " << strerror(errno);
-    }
-
-    // The real ones, sorted, and the fork where it is not empty.
-    static std::vector<std::string> NamesOf(const std::string& object) {
-        char names[4096];
-        const ssize_t size = ::listxattr(object.c_str(), names, sizeof names);
-        std::vector<std::string> all;
-        for (const char* name = names; name < names + size; name += strlen(name) + 1) {
-            if (strncmp(name, "user.", 5) != 0) continue;
-            const bool finder_info = strcmp(name, "user.test.FinderInfo") == 0;
-            all.emplace_back(finder_info ? "com.apple.FinderInfo" : name);
-        }
-        if (Exists(ForkFile(object)) && !ReadFile(ForkFile(object)).empty()) {
-            all.emplace_back("com.apple.ResourceFork");
-        }
-        std::sort(all.begin(), all.end());
-        return all;
-    }
-
-    static Attributes AttributesOf(const std::string& object) {
-        Attributes found;
-        for (const std::string& name : NamesOf(object)) {
-            if (name == "com.apple.ResourceFork") {
-                found[name] = ReadFile(ForkFile(object));
-                continue;
-            }
-            Bytes value(65536);
-            const ssize_t size =
-                ::getxattr(object.c_str(), RealName(name).c_str(), value.data(), value.size());
-            value.resize(size < 0 ? 0 : static_cast<size_t>(size));
-            found[name] = value;
-        }
-        return found;
     }
 
     // ---- What was reported ----------------------------------------------------------------------

@@ -324,14 +324,8 @@ class CopyWorld : private Identity {
 
     static inline CopyWorld* current_ = nullptr;
 
-    // In memory where there is a place for that: the tables build thousands of these.
-    static std::string Parent() {
-        constexpr char kMemory[] = "/dev/shm";
-        return access(kMemory, W_OK | X_OK) == 0 ? kMemory
-                                                 : std::filesystem::temp_directory_path().string();
-    }
-
-    TempDir dir_{Parent()};
+    // The tables build thousands of these.
+    TempDir dir_{FastDirectory()};
     std::string src_ = dir_ / "src/object";
     std::string dst_ = dir_ / "dst/object";
     std::map<std::string, std::vector<std::pair<std::string, Bytes>>> attributes_;

@@ -639,8 +639,7 @@ class Sweep {
  public:
     explicit Sweep(const FaultCase& fault_case)
         : case_(fault_case),
-          root_(access("/dev/shm", W_OK | X_OK) == 0 ? "/dev/shm"
-                                                     : std::filesystem::temp_directory_path()),
+          root_(FastDirectory()),
           used_(fault_case.rules.size()),
           unreserved_(fault_case.clean) {
         unreserved_.files = Files::kDone;
@@ -814,6 +813,27 @@ bool HoldsLock(const std::string& path) {
     close(fd);
     return held;
 }
+
+Rules operator+(Rules left, const Rules& right) {
+    left.insert(left.end(), right.begin(), right.end());
+    return left;
+}
+
+FaultRule TakenUpAgain(const char* call, long long result) {
+    return {.call = call,
+            .errors = {EINTR, kShortOnce},
+            .outcome = {.result = result, .files = Files::kDone}};
+}
+
+void BeUser(FaultWorld& w) {
+    w.number = 1000;
+    Hooks().geteuid = [&w] { return static_cast<uid_t>(w.number); };
+    Hooks().seteuid = [&w](uid_t uid) {
+        w.number = static_cast<int>(uid);
+        return 0;
+    };
+}
+std::string UserOf(FaultWorld& w) { return "uid " + std::to_string(w.number); }
 
 void SweepFaults(const FaultCase& fault_case) { Sweep(fault_case).Run(); }
 

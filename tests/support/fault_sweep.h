@@ -119,6 +119,10 @@ struct FaultRun {
     int CountAfter(std::string_view prefix) const;
 };
 
+// The rules of a case are often those of its first half and its second.
+using Rules = std::vector<FaultRule>;
+Rules operator+(Rules left, const Rules& right);
+
 struct FaultCase {
     const char* name;
     // Fills the folder, sets the platform's answers, opens what the call needs.
@@ -138,6 +142,17 @@ struct FaultCase {
     // Also failing pairs: each failing call together with each later one.
     bool pairs = true;
 };
+
+// Transfers that are interrupted, or cut short with the rest to come, are taken up again.
+FaultRule TakenUpAgain(const char* call, long long result = 0);
+
+// A path that is derived on the heap, and found to be too long.
+inline const std::string kLongPath(4095, 'a');
+
+// Makes the process nobody's superuser, uid 1000, in `w.number`; every seteuid() succeeds that is
+// not made to fail. UserOf() is a FaultCase's `state`.
+void BeUser(FaultWorld& w);
+std::string UserOf(FaultWorld& w);
 
 // Runs it all, reports what differs, and prints how many calls failed; with MAVOEA_FAULT_CALLS in
 // the environment, also the calls of the run in which nothing fails.

@@ -2,6 +2,7 @@
 
 #include <stdlib.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <charconv>
@@ -60,6 +61,12 @@ Bytes operator+(Bytes left, const Bytes& right) {
 
 Bytes Repeat(std::uint8_t byte, std::size_t count) { return Bytes(count, byte); }
 Bytes Ascii(std::string_view text) { return Bytes(text.begin(), text.end()); }
+
+std::string FastDirectory() {
+    constexpr char kMemory[] = "/dev/shm";
+    return access(kMemory, W_OK | X_OK) == 0 ? kMemory
+                                             : std::filesystem::temp_directory_path().string();
+}
 
 TempDir::TempDir() : TempDir(std::filesystem::temp_directory_path().string()) {}
 

@@ -19,6 +19,9 @@ Bytes operator+(Bytes left, const Bytes& right);
 Bytes Repeat(std::uint8_t byte, std::size_t count);
 Bytes Ascii(std::string_view text);
 
+// Where temporary directories are quickest: in memory where there is a place for that.
+std::string FastDirectory();
+
 // Removed, with all that it holds, at the end of its scope.
 class TempDir {
  public:
