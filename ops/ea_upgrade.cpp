@@ -235,11 +235,9 @@ int UpgradeStream(const char* szPath) {
     }
     if (Exists(stream_path)) return kCurrent;
 
-    errno = 0;
     Folder folder(folder_path);
     const bool missing = !folder && errno == ENOENT;
     const int result = ConvertStream(szPath, stream_path, &folder);
-    folder.Close();
     return missing ? result : RemoveFolder(folder_path, result);
 }
 

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <filesystem>
 #include <iostream>
+#include <nlohmann/json.hpp>
 
 #include "include/mavoea.h"
 #include "tools/dangling.h"

@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <iomanip>
 #include <iostream>
+#include <nlohmann/json.hpp>
 
 #include "format/ea_stream.h"
 #include "tools/clean.h"

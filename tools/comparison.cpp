@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <climits>
 #include <map>
+#include <nlohmann/json.hpp>
 #include <set>
 #include <string_view>
 

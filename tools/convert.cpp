@@ -7,6 +7,7 @@
 #include <cstdint>
 #include <filesystem>
 #include <iostream>
+#include <nlohmann/json.hpp>
 #include <set>
 #include <vector>
 

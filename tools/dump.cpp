@@ -1,5 +1,7 @@
 #include "tools/dump.h"
 
+#include <nlohmann/json.hpp>
+
 #include "tools/entry_text.h"
 #include "tools/text.h"
 

@@ -3,6 +3,7 @@
 #include <array>
 #include <cstdint>
 #include <ctime>
+#include <nlohmann/json.hpp>
 #include <vector>
 
 #include "util/bytes.h"

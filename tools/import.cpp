@@ -2,6 +2,7 @@
 
 #include <iostream>
 #include <memory>
+#include <nlohmann/json.hpp>
 
 #include "format/ea_stream.h"
 #include "tools/contents.h"

@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <iostream>
+#include <nlohmann/json.hpp>
 
 #include "tools/interrupt.h"
 #include "tools/output.h"

@@ -1,6 +1,7 @@
 #include "tools/output.h"
 
 #include <iostream>
+#include <nlohmann/json.hpp>
 
 namespace mavoea::tool {
 

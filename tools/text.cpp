@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <nlohmann/json.hpp>
 
 namespace mavoea::tool {
 namespace {

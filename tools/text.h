@@ -3,7 +3,7 @@
 #define MAVOEA_TOOLS_TEXT_H_
 
 #include <cstdint>
-#include <nlohmann/json.hpp>
+#include <nlohmann/json_fwd.hpp>
 #include <optional>
 #include <string>
 #include <string_view>

@@ -9,6 +9,7 @@
 #include <cstdint>
 #include <iostream>
 #include <memory>
+#include <nlohmann/json.hpp>
 
 #include "include/mavoea.h"
 #include "tools/file.h"

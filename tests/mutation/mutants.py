@@ -263,18 +263,21 @@ def run(program, environment, limit):
         return False
 
 
-def survey(programs, out):
+def survey(programs, out, jobs):
     """The programs that come upon each mutant, the quickest first."""
-    seen = {}
-    for program in programs:
+    def reached_by(program):
         reached = out / (program.name + ".reached")
         reached.unlink(missing_ok=True)
         started = time.monotonic()
         if not run(program, {"MAVOEA_REACHED": str(reached)}, 300):
             sys.exit(f"{program.name} fails without any mutant")
-        seconds = time.monotonic() - started
-        for number in reached.read_text().split():
-            seen.setdefault(int(number), []).append((seconds, program))
+        return time.monotonic() - started, program, reached.read_text().split()
+
+    seen = {}
+    with concurrent.futures.ThreadPoolExecutor(jobs) as pool:
+        for seconds, program, numbers in pool.map(reached_by, programs):
+            for number in numbers:
+                seen.setdefault(int(number), []).append((seconds, program))
     return {number: sorted(found) for number, found in seen.items()}
 
 
@@ -304,13 +307,9 @@ def main():
     workshop = Workshop(options.build, options.jobs)
     # Some are refused by the compiler: more are compiled than wanted.
     compiled = workshop.make(list(chosen(candidates, options.count * 5 // 4)))
-    mutants = dict(list(compiled.items())[:0])
-    for number in sorted(compiled):
-        if len(mutants) == options.count:
-            break
-        mutants[number] = compiled[number]
+    mutants = dict(sorted(compiled.items())[:options.count])
     programs = workshop.programs()
-    seen = survey(programs, workshop.out)
+    seen = survey(programs, workshop.out, options.jobs)
 
     def killer(number):
         if mutants[number].name() in known and not options.again:

@@ -466,6 +466,18 @@ TEST_F(CopyFinishTest, AFailedMvIsLoggedAndTheFileIsLost) {
     }
 }
 
+TEST_F(CopyFinishTest, AFileIsNotCopiedThroughALinkAndTheLineSaysSo) {
+    const std::string link = world_ / "dst/@eaDir/object/MAVOThumb";
+    Hooks().before = [&link](const std::string& call) {
+        if (call == "readdir") (void)!symlink("elsewhere", link.c_str());
+    };
+    EXPECT_EQ(0, Copy());
+    EXPECT_THAT(world_.TakeLines(), ElementsAre(Line(kCpThumb, ELOOP)));
+    EXPECT_EQ("elsewhere", std::filesystem::read_symlink(link));
+    EXPECT_FALSE(world_.Has("dst/@eaDir/object/elsewhere"));
+    ExpectFinished();
+}
+
 TEST_F(CopyFinishTest, AFailedCpIsLoggedAndTheOthersGoOn) {
     world_.Put("src/@eaDir/object/another", Ascii("another"));
     FailExec("/bin/cp", -1, "MAVOThumb");

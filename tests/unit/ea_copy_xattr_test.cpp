@@ -1554,6 +1554,19 @@ TEST_F(FromXattrTest, AnAttributeThatTheStreamRefusesStopsThePassAndLaterOnesAre
     }
 }
 
+// Between volumes that both have attributes nothing ends with one that finds no room.
+TEST_F(FromXattrTest, AnAttributeWithoutBytesIsCopiedBehindOneThatFoundNoRoom) {
+    SetAttribute(src_, "user.long", Pattern(2000));
+    SetAttribute(src_, "user.empty", {});
+    listed_ = {"user.long", "user.empty"};
+    const FailCall fault("malloc", ENOMEM, kThirdAllocation);
+    EXPECT_EQ(-1, CopyXattrs(src_.c_str(), dst_.c_str()));
+    EXPECT_TRUE(fault.fired());
+    EXPECT_THAT(Codes(), ElementsAre(0x100));
+    EXPECT_EQ((Attributes{{"user.empty", {}}}), AttributesOf(dst_));
+    ExpectNothingHeld();
+}
+
 TEST_F(FromXattrTest, NoLockIsLeftOnTheStream) {
     SetAll();
     EXPECT_EQ(0, Copy());

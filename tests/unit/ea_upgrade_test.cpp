@@ -20,6 +20,7 @@
 
 #include "include/mavoea.h"
 #include "tests/support/fake_platform.h"
+#include "tests/support/freed_descriptor.h"
 #include "tests/support/identity.h"
 #include "tests/support/kernel_control.h"
 #include "tests/support/mac_files.h"
@@ -874,16 +875,14 @@ TEST_F(EaUpgradeBadFileTest, OneThatTheUserMayNotRead) {
 TEST_F(EaUpgradeBadFileTest, OneThatIsOpenedAsDescriptor0) {
     const auto make = [this] { MakeFolder({{"bad", Ascii("value")}}); };
     const int nth = WhichCall("open", bad_, make);
-    const int standard_input = fcntl(0, F_DUPFD_CLOEXEC, 10);
-    ASSERT_LE(0, standard_input) << strerror(errno);
     int opens = 0;
+    std::optional<FreedDescriptor> standard_input;
     Hooks().before = [&](const std::string& name) {
-        if (name == "open" && ++opens == nth) ::close(0);
+        if (name == "open" && ++opens == nth) standard_input.emplace(0);
     };
     const int result = UpgradeStream();
     Hooks().before = nullptr;
-    dup2(standard_input, 0);
-    ::close(standard_input);
+    standard_input.reset();
     EXPECT_LE(nth, opens);
     EXPECT_EQ(0, result);
     ExpectOnly(0x900, kUnit);

@@ -325,6 +325,16 @@ TEST_F(XattrEnumTest, NamesThatVanishBetweenTheTwoCallsAreNotListed) {
     EXPECT_THAT(list.strings(), ElementsAre("user.b"));
 }
 
+TEST_F(XattrEnumTest, NoneMayBeLeftAtTheSecondCall) {
+    Hooks().listxattr = [](const char*, char*, size_t size) -> ssize_t {
+        return size == 0 ? 7 : 0;
+    };
+    List list;
+    EXPECT_EQ(0, MAVOEAXattrEnum(object_.c_str(), list.out()));
+    EXPECT_THAT(list.strings(), IsEmpty());
+    ExpectNothingReported();
+}
+
 TEST_F(XattrEnumTest, TheResourceForkIsNotListed) {
     OfferNames("");
     Hooks().stat = [this](const char*, struct stat* info) { return ::stat(object_.c_str(), info); };

@@ -378,6 +378,27 @@ TEST_F(EasEntriesTest, WriteRefusesMissingArguments) {
     EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
+TEST_F(EasEntriesTest, TheLongestSizeThatAResultCanTellIsNoWrongArgument) {
+    OpenThree();
+    errno = 0;
+    EXPECT_EQ(-1, MAVOEASWrite(h(), "absent", "x", 0x7FFFFFFF, 0, EAS_WRITE_MUST_EXIST));
+    EXPECT_EQ(ENOENT, errno);
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+// What errno was before is no reason to read on behind the end of the file.
+TEST_F(EasEntriesTest, ValuesThatTheFileEndsBeforeCannotBeMoved) {
+    OpenThree();
+    const Bytes before = Contents();
+    const ShortCall file_ends("preadv", 1, 0, true);
+    errno = EINTR;
+    EXPECT_EQ(-1, Write(handle_, "a", "longer"));
+    EXPECT_TRUE(file_ends.fired());
+    EXPECT_EQ(EIO, errno);
+    EXPECT_THAT(TakeCodes(), ElementsAre(0xA00));
+    EXPECT_EQ(before, Contents());
+}
+
 TEST_F(EasEntriesTest, ChangesNeedTheWriteLock) {
     OpenThree();
     for (const int lock_type : {F_RDLCK, F_UNLCK}) {

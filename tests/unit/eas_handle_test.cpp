@@ -12,6 +12,7 @@
 #include "include/mavoea.h"
 #include "stream/internal.h"
 #include "tests/support/fake_platform.h"
+#include "tests/support/freed_descriptor.h"
 #include "tests/support/kernel_control.h"
 #include "tests/support/stream_builder.h"
 #include "tests/support/stream_fixture.h"
@@ -73,6 +74,31 @@ TEST_F(EasHandleTest, ANegativeDescriptorIsRefused) {
     EXPECT_EQ(nullptr, MAVOEASOpen(-100, F_UNLCK));
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_open")));
     EXPECT_THAT(TakeCallNames(), IsEmpty());
+}
+
+TEST_F(EasHandleTest, Descriptor0IsAsGoodAsAnyOther) {
+    Fill(Image());
+    const FreedDescriptor standard_input(0);
+    ASSERT_EQ(0, ::open(path_.c_str(), O_RDWR));
+    EXPECT_EQ(3, EASGetEntryCount(0));
+    {
+        const Handle handle(MAVOEASOpen(0, F_WRLCK));
+        ASSERT_NE(nullptr, handle);
+        EXPECT_EQ(3, Write(handle, "a", "ONE"));
+        EXPECT_EQ(0, MAVOEASTruncate(handle.get(), "c", 5));
+        EXPECT_EQ(0, MAVOEASWriteHeader(handle.get()));
+        EXPECT_EQ(Ascii("ONE"), Read(handle, "a"));
+        EXPECT_EQ(Pattern(5), Read(handle, "c"));
+        EXPECT_EQ(0, MAVOEASRemove(handle.get(), "a"));
+    }
+    const TempDir dir;
+    const int other = ::open((dir / "other").c_str(), O_RDWR | O_CREAT, 0666);
+    EXPECT_EQ(0, EASWriteToFd(0, other));
+    EXPECT_EQ(2, EASGetEntryCount(other));
+    EXPECT_EQ(0, EASWriteToFd(other, 0));
+    EXPECT_EQ(2, EASGetEntryCount(0));
+    ::close(other);
+    EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
 TEST_F(EasHandleTest, ClosingLeavesTheDescriptorOpen) {
@@ -504,6 +530,46 @@ TEST_F(EasHandleTest, AttributesAreCountedWithoutTheTable) {
     }
     EXPECT_EQ(-1, EASGetEntryCount(-1));
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_open")));
+}
+
+// ---- Tables of any size -------------------------------------------------------------------------
+
+// Reading goes on in steps of 64 KiB where the header does not tell how long the table is: the last
+// record may begin in one step and end the file in the next.
+TEST_F(EasHandleTest, ATableThatTheHeaderDoesNotMeasureIsReadToTheFilesEnd) {
+    StreamImage image;
+    while (image.TableSize() + RecordSize(205) <= 64u << 10) {
+        const std::size_t number = 1000 + image.attributes.size();
+        image.attributes.push_back({std::string(200, 'n') + std::to_string(number), {}});
+    }
+    for (std::size_t length = 1; length < 254; ++length) {
+        StreamImage whole = image;
+        whole.attributes.push_back({std::string(length, 'x'), {}});
+        Bytes bytes = whole.Build();
+        bytes.resize(whole.RecordAt(whole.attributes.size() - 1) + 11 + length + 1);
+        PutU32(bytes, kDataStartAt, 0);
+        Fill(bytes);
+        const Handle handle = Open(F_RDLCK);
+        ASSERT_NE(nullptr, handle) << length;
+        EXPECT_EQ(static_cast<int>(whole.attributes.size()) - 1,
+                  MAVOEASSearch(handle.get(), std::string(length, 'x').c_str()));
+    }
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasHandleTest, WhatAHeaderThatSaysTooMuchHasHadReadIsGivenBack) {
+    Bytes bytes = Image().Build();
+    PutU32(bytes, kDataStartAt, 1 << 20);
+    bytes.resize(2 << 20);
+    Fill(bytes);
+    const Allocations before = TakeAllocations();
+    const Handle handle = Open(F_RDLCK);
+    ASSERT_NE(nullptr, handle);
+    EXPECT_THAT(Names(handle), ElementsAre("a", "b", "c"));
+    const Allocations after = TakeAllocations();
+    EXPECT_LT(1'000'000u, after.largest);
+    EXPECT_GT(before.live_bytes + 4096, after.live_bytes);
+    EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
 TEST_F(EasHandleTest, CountingHoldsAReadLockMeanwhile) {
