@@ -1,7 +1,7 @@
 #!/bin/sh
 # Builds everything and passes the whole test suite: optimised, under the sanitizers, on an emulated
-# PowerPC, against hostile inputs; and the checks of style. Installs what that takes. Prints what it
-# runs.
+# PowerPC, against hostile inputs, and against changes of the library that they must notice; and the
+# checks of style. Installs what that takes. Prints what it runs.
 set -eu
 cd "$(dirname "$0")/.."
 root=$PWD
@@ -40,6 +40,9 @@ cmake --preset fuzz
 cmake --build --preset fuzz
 step "fuzz targets"
 sh fuzz/run.sh build/fuzz
+
+step "mutants"
+python3 tests/mutation/mutants.py build/release
 
 step "style: formatting"
 files=$(git ls-files '*.c' '*.cpp' '*.h' 2>/dev/null || true)
