@@ -1,7 +1,10 @@
 #include "tools/command_line.h"
 
 #include <CLI/CLI.hpp>
+#include <algorithm>
 #include <iostream>
+#include <span>
+#include <string_view>
 
 #include "tools/messages.h"
 
@@ -47,13 +50,6 @@ std::string Guarded(const char* argument) {
 std::string Unguarded(std::string argument) {
     if (!argument.empty() && argument.front() == kGuard) argument.erase(0, 1);
     return argument;
-}
-
-CLI::App* AddCommand(CLI::App& app, const char* name, const char* what, Command command,
-                     Options* options) {
-    CLI::App* const sub = app.add_subcommand(name, what);
-    sub->callback([=] { options->command = command; });
-    return sub;
 }
 
 void AddPath(CLI::App* sub, Options* options, const char* what) {
@@ -106,6 +102,113 @@ void AddName(CLI::App* sub, Options* options) {
     sub->add_option("NAME", options->name, "The attribute's name")->required();
 }
 
+struct Syntax {
+    Command command;
+    const char* name;
+    const char* what;
+    void (*add_arguments)(CLI::App* sub, Options* options);
+};
+
+constexpr Syntax kCommands[] = {
+    {Command::kWhere, "where", "Show the volume's type and every place where metadata may lie",
+     [](CLI::App* sub, Options* options) { AddPath(sub, options, "A file or directory"); }},
+    {Command::kList, "list", "List attribute names, one a line",
+     [](CLI::App* sub, Options* options) {
+         sub->add_flag("-l", options->details, "With size, kind and the file that holds it");
+         AddPaths(sub, options);
+     }},
+    {Command::kGet, "get", "Write a value to standard output",
+     [](CLI::App* sub, Options* options) {
+         sub->add_flag("--hex", options->hex, "As a hex dump");
+         AddPath(sub, options, "A file or directory");
+         AddName(sub, options);
+     }},
+    {Command::kSet, "set", "Set an attribute to VALUE, a file's bytes or standard input",
+     [](CLI::App* sub, Options* options) {
+         AddPath(sub, options, "A file or directory");
+         AddName(sub, options);
+         CLI::Option* const value = sub->add_option_function<std::string>(
+             "VALUE", [=](const std::string& text) { options->value = text; }, "The value's bytes");
+         sub->add_option_function<std::string>(
+                "--file", [=](const std::string& file) { options->file = file; },
+                "Take the value from a file")
+             ->type_name("FILE")
+             ->excludes(value);
+         sub->add_flag("--hex", options->hex, "VALUE is hexadecimal digits")->needs(value);
+     }},
+    {Command::kRemove, "remove", "Remove an attribute",
+     [](CLI::App* sub, Options* options) {
+         AddPath(sub, options, "A file or directory");
+         AddName(sub, options);
+     }},
+    {Command::kLock, "lock", "Lock files: Macs may not write, rename or delete them", AddPaths},
+    {Command::kUnlock, "unlock", "Unlock files", AddPaths},
+    {Command::kImport, "import",
+     "Give an object the attributes, Finder info and resource fork of a \"._\" file",
+     [](CLI::App* sub, Options* options) {
+         sub->add_option("APPLEDOUBLE", options->apple_double, "An AppleDouble file")->required();
+         AddPath(sub, options, "A file or directory");
+     }},
+    {Command::kCopy, "cp", "Copy objects with data, permissions, times and metadata",
+     [](CLI::App* sub, Options* options) {
+         sub->add_flag("-r,-R,-a,--recursive", options->recursive,
+                       "With all that is below directories; symbolic links are copied as such");
+         sub->add_flag_callback(
+             "-p,--preserve", [] {}, "Keep mode, owner and times, as is always done");
+         AddDestination(sub, options);
+     }},
+    {Command::kMove, "mv", "Move or rename objects with their metadata", AddDestination},
+    {Command::kDelete, "rm", "Remove objects with their metadata",
+     [](CLI::App* sub, Options* options) {
+         sub->add_flag("-r,-R,--recursive", options->recursive,
+                       "With all that is in directories; symbolic links are not followed");
+         AddHabits(sub, options);
+         AddPaths(sub, options);
+     }},
+    {Command::kUpgrade, "upgrade", "Convert what earlier versions kept into the current layout",
+     [](CLI::App* sub, Options* options) {
+         AddRecursive(sub, options);
+         AddPaths(sub, options);
+     }},
+    {Command::kRepair, "repair", "Move what resource files wrongly hold into EA streams",
+     [](CLI::App* sub, Options* options) {
+         AddRecursive(sub, options);
+         AddPaths(sub, options);
+     }},
+    {Command::kClean, "clean", "List metadata whose object is gone, and remove it with --yes",
+     [](CLI::App* sub, Options* options) {
+         AddRecursive(sub, options);
+         sub->add_flag("--yes", options->yes, "Remove what is listed");
+         sub->add_flag("--all", options->all,
+                       "With what other services keep in EA directories for objects that are gone");
+         sub->add_option("DIR", options->paths, "Directories")->required();
+     }},
+    {Command::kConvert, "convert",
+     "Copy an object or a tree to a volume of another type, and compare the two",
+     [](CLI::App* sub, Options* options) {
+         AddRecursive(sub, options);
+         sub->add_option("--to", options->to, "The type of DST's volume")
+             ->type_name("TYPE")
+             ->required();
+         sub->add_flag("--compare-only", options->compare_only, "Copy nothing, only compare");
+         sub->add_option_function<std::string>(
+                "SRC", [=](const std::string& path) { options->paths = {path}; }, "What to copy")
+             ->required();
+         sub->add_option("DST", options->destination,
+                         "The copy's own path, not that of the directory around it")
+             ->required();
+     }},
+    {Command::kDump, "dump", "Show and check every field of an EA stream or AppleDouble file",
+     [](CLI::App* sub, Options* options) {
+         sub->add_flag("--record", options->record,
+                       "FILE is an object, whose netatalk record is shown");
+         sub->add_option_function<std::string>(
+                "FILE", [=](const std::string& path) { options->paths = {path}; },
+                "A metadata file")
+             ->required();
+     }},
+};
+
 }  // namespace
 
 std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
@@ -125,118 +228,19 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
         ->allow_extra_args(false)
         ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
 
-    CLI::App* const where =
-        AddCommand(app, "where", "Show the volume's type and every place where metadata may lie",
-                   Command::kWhere, &options);
-    AddPath(where, &options, "A file or directory");
-
-    CLI::App* const list =
-        AddCommand(app, "list", "List attribute names, one a line", Command::kList, &options);
-    list->add_flag("-l", options.details, "With size, kind and the file that holds it");
-    AddPaths(list, &options);
-
-    CLI::App* const get =
-        AddCommand(app, "get", "Write a value to standard output", Command::kGet, &options);
-    get->add_flag("--hex", options.hex, "As a hex dump");
-    AddPath(get, &options, "A file or directory");
-    AddName(get, &options);
-
-    CLI::App* const set =
-        AddCommand(app, "set", "Set an attribute to VALUE, a file's bytes or standard input",
-                   Command::kSet, &options);
-    AddPath(set, &options, "A file or directory");
-    AddName(set, &options);
-    CLI::Option* const value = set->add_option_function<std::string>(
-        "VALUE", [&](const std::string& text) { options.value = text; }, "The value's bytes");
-    set->add_option_function<std::string>(
-           "--file", [&](const std::string& file) { options.file = file; },
-           "Take the value from a file")
-        ->type_name("FILE")
-        ->excludes(value);
-    set->add_flag("--hex", options.hex, "VALUE is hexadecimal digits")->needs(value);
-
-    CLI::App* const remove =
-        AddCommand(app, "remove", "Remove an attribute", Command::kRemove, &options);
-    AddPath(remove, &options, "A file or directory");
-    AddName(remove, &options);
-
-    AddPaths(AddCommand(app, "lock", "Lock files: Macs may not write, rename or delete them",
-                        Command::kLock, &options),
-             &options);
-    AddPaths(AddCommand(app, "unlock", "Unlock files", Command::kUnlock, &options), &options);
-
-    CLI::App* const import =
-        AddCommand(app, "import",
-                   "Give an object the attributes, Finder info and resource fork of a \"._\" file",
-                   Command::kImport, &options);
-    import->add_option("APPLEDOUBLE", options.apple_double, "An AppleDouble file")->required();
-    AddPath(import, &options, "A file or directory");
-
-    CLI::App* const copy =
-        AddCommand(app, "cp", "Copy objects with data, permissions, times and metadata",
-                   Command::kCopy, &options);
-    copy->add_flag("-r,-R,-a,--recursive", options.recursive,
-                   "With all that is below directories; symbolic links are copied as such");
-    copy->add_flag_callback(
-        "-p,--preserve", [] {}, "Keep mode, owner and times, as is always done");
-    AddDestination(copy, &options);
-
-    CLI::App* const move = AddCommand(app, "mv", "Move or rename objects with their metadata",
-                                      Command::kMove, &options);
-    AddDestination(move, &options);
-
-    CLI::App* const del =
-        AddCommand(app, "rm", "Remove objects with their metadata", Command::kDelete, &options);
-    del->add_flag("-r,-R,--recursive", options.recursive,
-                  "With all that is in directories; symbolic links are not followed");
-    AddHabits(del, &options);
-    AddPaths(del, &options);
-
-    CLI::App* const upgrade =
-        AddCommand(app, "upgrade", "Convert what earlier versions kept into the current layout",
-                   Command::kUpgrade, &options);
-    AddRecursive(upgrade, &options);
-    AddPaths(upgrade, &options);
-
-    CLI::App* const repair =
-        AddCommand(app, "repair", "Move what resource files wrongly hold into EA streams",
-                   Command::kRepair, &options);
-    AddRecursive(repair, &options);
-    AddPaths(repair, &options);
-
-    CLI::App* const clean =
-        AddCommand(app, "clean", "List metadata whose object is gone, and remove it with --yes",
-                   Command::kClean, &options);
-    AddRecursive(clean, &options);
-    clean->add_flag("--yes", options.yes, "Remove what is listed");
-    clean->add_flag("--all", options.all,
-                    "With what other services keep in EA directories for objects that are gone");
-    clean->add_option("DIR", options.paths, "Directories")->required();
-
-    CLI::App* const convert = AddCommand(
-        app, "convert", "Copy an object or a tree to a volume of another type, and compare the two",
-        Command::kConvert, &options);
-    AddRecursive(convert, &options);
-    convert->add_option("--to", options.to, "The type of DST's volume")
-        ->type_name("TYPE")
-        ->required();
-    convert->add_flag("--compare-only", options.compare_only, "Copy nothing, only compare");
-    convert
-        ->add_option_function<std::string>(
-            "SRC", [&](const std::string& path) { options.paths = {path}; }, "What to copy")
-        ->required();
-    convert
-        ->add_option("DST", options.destination,
-                     "The copy's own path, not that of the directory around it")
-        ->required();
-
-    CLI::App* const dump =
-        AddCommand(app, "dump", "Show and check every field of an EA stream or AppleDouble file",
-                   Command::kDump, &options);
-    dump->add_flag("--record", options.record, "FILE is an object, whose netatalk record is shown");
-    dump->add_option_function<std::string>(
-            "FILE", [&](const std::string& path) { options.paths = {path}; }, "A metadata file")
-        ->required();
+    const std::span<const char* const> arguments(argv + 1, argv + std::max(argc, 1));
+    for (const Syntax& syntax : kCommands) {
+        CLI::App* const sub = app.add_subcommand(syntax.name, syntax.what);
+        sub->callback([&options, &syntax] { options.command = syntax.command; });
+        // Whoever does not name a command does without its arguments, which take longer to set up
+        // than many a command to run.
+        const auto named = [&](const char* argument) {
+            return argument == std::string_view(syntax.name);
+        };
+        if (std::any_of(arguments.begin(), arguments.end(), named)) {
+            syntax.add_arguments(sub, &options);
+        }
+    }
 
     app.footer(kExamples);
     try {
