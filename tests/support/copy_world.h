@@ -9,6 +9,7 @@
 #include <stdio.h>
 #include <string.h>
 #include <sys/stat.h>
+#include <time.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -36,6 +37,8 @@ inline constexpr char kFolder[] = "@eaDir/object/";
 inline constexpr char kThumb[] = "@eaDir/object/MAVOThumb";
 inline constexpr char kSub[] = "@eaDir/object/sub/";
 inline constexpr char kInner[] = "@eaDir/object/sub/inner";
+
+inline constexpr time_t kWorldTime = 0x41424344;
 
 inline constexpr char kFinderInfoAttribute[] = "com.apple.FinderInfo";
 inline constexpr char kForkAttribute[] = "com.apple.ResourceFork";
@@ -261,9 +264,12 @@ class CopyWorld : private Identity {
         KernelHooks& hooks = Hooks();
         hooks.sync = [] {};
         hooks.fsync = [](int) { return 0; };
-        hooks.time = [] { return time_t{0x41424344}; };
+        hooks.time = [] { return kWorldTime; };
+        // An upgrade asks what was read last: all at the same time.
         hooks.stat = [this](const char* path, struct stat* info) {
-            return ::stat(Real(path).c_str(), info);
+            const int result = ::stat(Real(path).c_str(), info);
+            if (result == 0) info->st_atim = {.tv_sec = kWorldTime, .tv_nsec = 0};
+            return result;
         };
         hooks.fopen = [this](const char* path, const char* mode) {
             return ::fopen(Real(path).c_str(), mode);
