@@ -4,6 +4,9 @@
 
 #include <gtest/gtest.h>
 
+#include <cstddef>
+#include <vector>
+
 namespace mavoea::test {
 
 // Whether the programs of this build are started with another one: MAVOEA_EMULATOR is its name and
@@ -13,6 +16,19 @@ inline constexpr bool kEmulated = sizeof MAVOEA_EMULATOR > 1;
 // Of the longest series only each seventh step is taken in an emulator, which takes some thirty
 // times as long; 7 has no factor in common with the sizes of fields.
 inline constexpr int kSeriesStep = kEmulated ? 7 : 1;
+
+template <class T>
+std::vector<T> Thinned(const std::vector<T>& all) {
+    std::vector<T> some;
+    for (std::size_t i = 0; i < all.size(); i += kSeriesStep) some.push_back(all[i]);
+    return some;
+}
+
+// Volume types; in an emulator only the first of those that keep metadata in the same way.
+inline std::vector<int> Types(std::vector<int> all) {
+    if (kEmulated) std::erase_if(all, [](int type) { return type > 2 && type != 7; });
+    return all;
+}
 
 // qemu makes a fork of what is to share its parent's memory.
 inline constexpr char kNoSpawnErrors[] =

@@ -21,6 +21,8 @@
 #include <set>
 #include <sstream>
 
+#include "tests/support/emulator.h"
+
 namespace mavoea::test {
 namespace {
 
@@ -656,13 +658,14 @@ class Sweep {
         CompareReports(case_.clean, 0, clean_, &wrong);
         if (!wrong.empty()) return Report(clean_, {}, wrong);
 
+        int number = 0;
         for (size_t at = 0; at < clean_.calls.size(); ++at) {
             std::set<std::string> roads;
             for (const Injection& injection : InjectionsFor(at, clean_.calls[at])) {
-                RunSingle(injection, &roads);
+                if (number++ % kSeriesStep == 0) RunSingle(injection, &roads);
             }
         }
-        for (size_t i = 0; i < used_.size(); ++i) {
+        for (size_t i = 0; i < used_.size() && !kEmulated; ++i) {
             if (used_[i]) continue;
             const FaultRule& rule = case_.rules[i];
             ADD_FAILURE() << case_.name << ": no failure needs rule " << i + 1 << ", " << rule.call

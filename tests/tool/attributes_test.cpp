@@ -7,6 +7,7 @@
 #include <filesystem>
 #include <memory>
 
+#include "tests/support/emulator.h"
 #include "tests/support/process.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/tool.h"
@@ -37,7 +38,8 @@ class AttributesTest : public ::testing::TestWithParam<int> {
     std::unique_ptr<Volume> volume_;
 };
 
-INSTANTIATE_TEST_SUITE_P(VolumeTypes, AttributesTest, ::testing::Values(0, 1, 2, 3, 5, 6, 7, 10),
+INSTANTIATE_TEST_SUITE_P(VolumeTypes, AttributesTest,
+                         ::testing::ValuesIn(Types({0, 1, 2, 3, 5, 6, 7, 10})),
                          [](const auto& tested) { return "Type" + std::to_string(tested.param); });
 
 TEST_P(AttributesTest, AValueOfAnyBytesComesBackAsItWas) {

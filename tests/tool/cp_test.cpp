@@ -2,6 +2,7 @@
 
 #include <sys/acl.h>
 
+#include "tests/support/emulator.h"
 #include "tests/tool/travel.h"
 
 namespace mavoea::test {
@@ -35,7 +36,7 @@ class CpPairTest : public ::testing::TestWithParam<Pair> {
         MAVOEA_SKIP_WITHOUT_ATTRIBUTES("/tmp");
     }
 };
-INSTANTIATE_TEST_SUITE_P(EveryPair, CpPairTest, ::testing::ValuesIn(AllPairs()), NameOf);
+INSTANTIATE_TEST_SUITE_P(EveryPair, CpPairTest, ::testing::ValuesIn(Thinned(AllPairs())), NameOf);
 
 TEST_P(CpPairTest, FilesGoWithDataAndMetadata) {
     const Travel travel(GetParam().from, GetParam().to);

@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "tests/support/emulator.h"
 #include "tests/support/mac_files.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/tool.h"
@@ -64,7 +65,8 @@ class ImportTest : public ::testing::TestWithParam<int> {
     TempDir sources_;
 };
 
-INSTANTIATE_TEST_SUITE_P(VolumeTypes, ImportTest, ::testing::Values(0, 1, 2, 3, 5, 6, 10),
+INSTANTIATE_TEST_SUITE_P(VolumeTypes, ImportTest,
+                         ::testing::ValuesIn(Types({0, 1, 2, 3, 5, 6, 10})),
                          [](const auto& tested) { return "Type" + std::to_string(tested.param); });
 
 TEST_P(ImportTest, EveryLayoutIsTakenOverWhole) {

@@ -8,6 +8,7 @@
 
 #include <memory>
 
+#include "tests/support/emulator.h"
 #include "tests/support/record_builder.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/tool.h"
@@ -46,7 +47,8 @@ class LockTest : public ::testing::TestWithParam<int> {
     Volume volume_{GetParam()};
 };
 
-INSTANTIATE_TEST_SUITE_P(VolumeTypes, LockTest, ::testing::Values(0, 1, 2, 3, 5, 6, 7, 10),
+INSTANTIATE_TEST_SUITE_P(VolumeTypes, LockTest,
+                         ::testing::ValuesIn(Types({0, 1, 2, 3, 5, 6, 7, 10})),
                          [](const auto& tested) { return "Type" + std::to_string(tested.param); });
 
 TEST_P(LockTest, LockingAndUnlockingAreSeenUnderTheNameOfTheState) {

@@ -1,5 +1,6 @@
 // mavoea mv, on real files.
 
+#include "tests/support/emulator.h"
 #include "tests/tool/travel.h"
 
 namespace mavoea::test {
@@ -47,7 +48,7 @@ class MvWayTest : public ::testing::TestWithParam<Way> {
     std::optional<SecondVolume> second_;
     std::optional<Travel> travel_;
 };
-INSTANTIATE_TEST_SUITE_P(EveryWay, MvWayTest, ::testing::ValuesIn(AllWays()), NameOf);
+INSTANTIATE_TEST_SUITE_P(EveryWay, MvWayTest, ::testing::ValuesIn(Thinned(AllWays())), NameOf);
 
 TEST_P(MvWayTest, FilesGoWithMetadataAndLeaveNothing) {
     travel().MakeFile(travel().From("a"));

@@ -6,6 +6,7 @@
 
 #include <filesystem>
 
+#include "tests/support/emulator.h"
 #include "tests/support/mac_files.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/tool.h"
@@ -35,7 +36,7 @@ class RepairTest : public ::testing::TestWithParam<int> {
     Volume volume_{GetParam()};
 };
 
-INSTANTIATE_TEST_SUITE_P(VolumeTypes, RepairTest, ::testing::Values(1, 2, 3, 6, 10),
+INSTANTIATE_TEST_SUITE_P(VolumeTypes, RepairTest, ::testing::ValuesIn(Types({1, 2, 3, 6, 10})),
                          [](const auto& tested) { return "Type" + std::to_string(tested.param); });
 
 TEST_P(RepairTest, AttributesGoIntoTheStreamAndTheRestStays) {

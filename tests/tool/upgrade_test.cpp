@@ -9,6 +9,7 @@
 
 #include <filesystem>
 
+#include "tests/support/emulator.h"
 #include "tests/support/mac_files.h"
 #include "tests/support/record_builder.h"
 #include "tests/support/stream_builder.h"
@@ -52,7 +53,7 @@ class UpgradeTest : public ::testing::TestWithParam<int> {
     Volume volume_{GetParam()};
 };
 
-INSTANTIATE_TEST_SUITE_P(VolumeTypes, UpgradeTest, ::testing::Values(1, 2, 3, 6, 10),
+INSTANTIATE_TEST_SUITE_P(VolumeTypes, UpgradeTest, ::testing::ValuesIn(Types({1, 2, 3, 6, 10})),
                          [](const auto& tested) { return "Type" + std::to_string(tested.param); });
 
 TEST_P(UpgradeTest, AttributeFilesBecomeAStream) {
