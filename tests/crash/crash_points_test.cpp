@@ -768,7 +768,7 @@ TEST(CrashPointsTest, ARenameHasEveryItemUnderOneOfTheNamesAndIsCompletedByAnoth
 }
 
 TEST(CrashPointsTest, ARenameToAnotherVolumeHasEveryItemUnderOneOfTheNames) {
-    const SecondVolume volume;
+    const SecondVolume volume("", true);
     if (!volume.ok()) GTEST_SKIP() << "there is no second volume";
     KillEverywhere(RenameOf("rename to another volume, type 1", 1, true,
                             {{"", "old all; new none"},
