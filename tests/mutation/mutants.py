@@ -24,6 +24,7 @@ import os
 import pathlib
 import re
 import shlex
+import shutil
 import subprocess
 import sys
 import time
@@ -169,6 +170,7 @@ class Workshop:
     def __init__(self, build, jobs):
         self.build = build.resolve()
         self.out = self.build / "mutants"
+        (self.out / "tmp").mkdir(parents=True, exist_ok=True)
         self.jobs = jobs
         commands = json.loads((self.build / "compile_commands.json").read_text())
         self.commands = {os.path.relpath(c["file"], ROOT): shlex.split(c["command"])
@@ -205,7 +207,6 @@ class Workshop:
             mutants = kept
 
     def make(self, mutants):
-        (self.out / "tmp").mkdir(parents=True, exist_ok=True)
         (self.out / "switch.h").write_text(SWITCH_HEADER)
         (self.out / "switch.c").write_text(SWITCH_SOURCE % (len(mutants) + 1))
         subprocess.run(["cc", "-O1", "-c", str(self.out / "switch.c"), "-o",
@@ -250,11 +251,11 @@ SANDBOX = ["unshare", "--mount", "--pid", "--fork", "--kill-child", "--mount-pro
            'ulimit -v 4000000 && "$@"', "sandbox"]
 
 
-def run(program, environment, limit):
-    """Whether the program ends well in time."""
+def run(program, environment, limit, folder=None):
+    """Whether the program ends well in time, with `folder` as all that it can change."""
     try:
-        done = subprocess.run([*SANDBOX, str(program.parent), str(program), "--gtest_brief=1",
-                               "--gtest_fail_fast"],
+        done = subprocess.run([*SANDBOX, str(folder or program.parent), str(program),
+                               "--gtest_brief=1", "--gtest_fail_fast"],
                               env={**os.environ, **environment}, timeout=limit,
                               stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL,
                               start_new_session=True)
@@ -302,9 +303,12 @@ def main():
     parser.add_argument("--again", action="store_true", help="known survivors too")
     options = parser.parse_args()
     known = known_survivors()
+    workshop = Workshop(options.build, options.jobs)
+    if not run(pathlib.Path(shutil.which("true")), {}, 60, workshop.out):
+        print("mutants: none tried: this machine gives them no namespace of their own")
+        return
 
     candidates = [m for m in all_mutants() if options.only in m.name()]
-    workshop = Workshop(options.build, options.jobs)
     # Some are refused by the compiler: more are compiled than wanted.
     compiled = workshop.make(list(chosen(candidates, options.count * 5 // 4)))
     mutants = dict(sorted(compiled.items())[:options.count])

@@ -24,12 +24,6 @@ std::vector<T> Thinned(const std::vector<T>& all) {
     return some;
 }
 
-// Volume types; in an emulator only the first of those that keep metadata in the same way.
-inline std::vector<int> Types(std::vector<int> all) {
-    if (kEmulated) std::erase_if(all, [](int type) { return type > 2 && type != 7; });
-    return all;
-}
-
 // qemu makes a fork of what is to share its parent's memory.
 inline constexpr char kNoSpawnErrors[] =
     "the emulator does not bring back from posix_spawn() why a program cannot be started";

@@ -7,7 +7,6 @@
 #include <filesystem>
 #include <memory>
 
-#include "tests/support/emulator.h"
 #include "tests/support/process.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/tool.h"

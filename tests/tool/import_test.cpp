@@ -5,7 +5,6 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "tests/support/emulator.h"
 #include "tests/support/mac_files.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/tool.h"

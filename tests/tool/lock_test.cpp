@@ -8,7 +8,6 @@
 
 #include <memory>
 
-#include "tests/support/emulator.h"
 #include "tests/support/record_builder.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/tool.h"

@@ -6,7 +6,6 @@
 
 #include <filesystem>
 
-#include "tests/support/emulator.h"
 #include "tests/support/mac_files.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/tool.h"

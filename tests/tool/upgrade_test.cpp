@@ -9,7 +9,6 @@
 
 #include <filesystem>
 
-#include "tests/support/emulator.h"
 #include "tests/support/mac_files.h"
 #include "tests/support/record_builder.h"
 #include "tests/support/stream_builder.h"
