@@ -8,9 +8,12 @@ sh tests/packages.sh g++ cmake ninja-build pkg-config libacl1-dev libattr1-dev l
 cmake --preset coverage
 cmake --build --preset coverage
 find build/coverage -name '*.gcda' -delete
-ctest --preset coverage -j 2
+# Counting takes a library of its own, and the tool as another user complains that it cannot write
+# its counts.
+GTEST_FILTER=-CpTest.WhatMayNotBeWrittenIsToldAndLeft:CpTest.AnotherUsersProgramLosesItsRights \
+    ctest --preset coverage -j 2 -E '^abi:needs$'
 mkdir -p build/coverage/report
 gcovr --root . --object-directory build/coverage --exclude-throw-branches \
-    --exclude-unreachable-branches --html-details build/coverage/report/index.html --txt-summary \
+    --exclude-unreachable-branches --html-details build/coverage/report/index.html \
     --print-summary --filter '(adouble|format|ops|path|stream|util|xattr)/' build/coverage
 echo "build/coverage/report/index.html"
