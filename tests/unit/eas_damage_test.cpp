@@ -62,6 +62,11 @@ class EasDamageTest : public StreamTest {
         return kinds;
     }
 
+    // The memory that an operation on a file may take.
+    void CheckMemory(const std::string& what) const {
+        EXPECT_LE(TakeAllocations().total, 8 * file_size_ + 65536) << what;
+    }
+
     // What a stream holds that can be read: the last value of each name.
     static std::map<std::string, Bytes> ValuesOf(const Handle& handle) {
         std::map<std::string, Bytes> values;
@@ -93,6 +98,7 @@ class EasDamageTest : public StreamTest {
                 }
             }
         }
+        CheckMemory("reading");
         EXPECT_THAT(TakeRecords(), IsEmpty());
     }
 
@@ -108,8 +114,10 @@ class EasDamageTest : public StreamTest {
         std::map<std::string, Bytes> values = ValuesOf(handle);
         const HandleState before = StateOf(*handle);
         TakeRecords();
+        TakeAllocations();
 
         const int result = change(handle.get());
+        CheckMemory(what);
         const std::vector<int> codes = TakeCodes();
         EXPECT_THAT(TakeLog(), IsEmpty());
         if (result < 0) {
@@ -165,9 +173,12 @@ class EasDamageTest : public StreamTest {
 
     // Opens the stream `bytes` and, when that goes, tries every operation on it.
     void TryAll(const Bytes& bytes) {
+        file_size_ = bytes.size();
         Fill(bytes);
+        TakeAllocations();
         TakeCalls();
         const int count = EASGetEntryCount(fd_);
+        CheckMemory("count");
         if (count < 0) {
             EXPECT_THAT(TakeCodes(), ElementsAre(AnyOf(0xA00, 0xD00)));
         }
@@ -175,6 +186,7 @@ class EasDamageTest : public StreamTest {
         std::vector<std::string> names;
         {
             const Handle handle = Open();
+            CheckMemory("open");
             if (handle == nullptr) {
                 EXPECT_THAT(TakeCodes(), ElementsAre(AnyOf(0xA00, 0xD00)));
                 EXPECT_EQ("setlock(2)", TakeCalls().back());
@@ -184,6 +196,7 @@ class EasDamageTest : public StreamTest {
             EXPECT_GE(count, 0);
             names = Names(handle);
             EXPECT_EQ(static_cast<std::size_t>(std::max(count, 0)), names.size());
+            TakeAllocations();
             ReadAll(handle);
             EXPECT_EQ(bytes, Contents());
         }
@@ -224,6 +237,8 @@ class EasDamageTest : public StreamTest {
         }
         EXPECT_THAT(TakeRecords(), IsEmpty());
     }
+
+    std::size_t file_size_ = 0;
 };
 
 TEST_F(EasDamageTest, EveryTruncationIsHarmless) {
