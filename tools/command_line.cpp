@@ -234,10 +234,8 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
         sub->callback([&options, &syntax] { options.command = syntax.command; });
         // Whoever does not name a command does without its arguments, which take longer to set up
         // than many a command to run.
-        const auto named = [&](const char* argument) {
-            return argument == std::string_view(syntax.name);
-        };
-        if (std::any_of(arguments.begin(), arguments.end(), named)) {
+        const std::string_view name = syntax.name;
+        if (std::find(arguments.begin(), arguments.end(), name) != arguments.end()) {
             syntax.add_arguments(sub, &options);
         }
     }
