@@ -126,24 +126,25 @@ TEST(FaultRecordsTest, ReadingTheRecordOfAResourceFile) {
             [](FaultWorld& w) { return MAVOEAEADirAdoubleRead((w / "a").c_str(), RecordOfRun(w)); },
         .check = [](FaultWorld& w,
                     const FaultRun& run) { ExpectWholeRecord(w, run, ResourceHead(0x20)); },
-        .rules = Rules{TakenUpAgain("pread")} +
-                 Rules{
-                     {.call = "open", .errors = {ENOENT}, .outcome = {.result = 1}},
-                     {.call = "open",
-                      .outcome = {.result = -1,
-                                  .records = {{0x900, kUnit}},
-                                  .log = {"ea_eadirfs_adouble_read:LINE Error: open path [{dir}/a] "
-                                          "{error}"},
-                                  .error = kInjectedErrno}},
-                     // A file that ends early is one in another layout.
-                     {.call = "pread", .errors = {kShort}, .outcome = {.result = 1}},
-                     {.call = "pread",
-                      .outcome = {.result = -1,
-                                  .records = {{0xA00, kUnit}},
-                                  .log = {"ea_eadirfs_adouble_read:LINE Error: read path [{dir}/a] "
-                                          "{error}"},
-                                  .error = kInjectedErrno}},
-                 },
+        .rules =
+            Rules{
+                TakenUpAgain("pread"),
+                {.call = "open", .errors = {ENOENT}, .outcome = {.result = 1}},
+                {.call = "open",
+                 .outcome = {.result = -1,
+                             .records = {{0x900, kUnit}},
+                             .log = {"ea_eadirfs_adouble_read:LINE Error: open path [{dir}/a] "
+                                     "{error}"},
+                             .error = kInjectedErrno}},
+                // A file that ends early is one in another layout.
+                {.call = "pread", .errors = {kShort}, .outcome = {.result = 1}},
+                {.call = "pread",
+                 .outcome = {.result = -1,
+                             .records = {{0xA00, kUnit}},
+                             .log = {"ea_eadirfs_adouble_read:LINE Error: read path [{dir}/a] "
+                                     "{error}"},
+                             .error = kInjectedErrno}},
+            },
     });
 }
 
@@ -301,8 +302,8 @@ TEST(FaultRecordsTest, FlushingARecordOverTheHeadOfAResourceFile) {
                 EXPECT_EQ(Pattern(4259), Bytes(file.begin() + 741, file.end())) << run.call;
             },
         .rules =
-            Rules{TakenUpAgain("pwrite")} +
             Rules{
+                TakenUpAgain("pwrite"),
                 // It is opened once more, to be created.
                 {.call = "open", .errors = {ENOENT}, .outcome = {.files = Files::kDone}},
                 {.call = "open",
@@ -349,8 +350,8 @@ TEST(FaultRecordsTest, FlushingARecordIntoANewResourceFileLeavesNoneWhenItFails)
                 EXPECT_EQ(run.result == 0, Exists(w / kResource)) << run.call;
             },
         .rules =
-            Rules{TakenUpAgain("pwrite")} +
             Rules{
+                TakenUpAgain("pwrite"),
                 // There is none: as it is.
                 {.call = "open",
                  .ordinal = 1,
@@ -462,8 +463,9 @@ TEST(FaultRecordsTest, BringingFinderInfoFromTheResourceFileIntoTheAttribute) {
                 }
             },
         .rules =
-            SettingBothAttributes() + Rules{TakenUpAgain("pread")} +
+            SettingBothAttributes() +
             Rules{
+                TakenUpAgain("pread"),
                 // A type that is not told is none on which there is anything to do.
                 {.call = "MAVOGetFSType"},
                 // What is missing is looked for where earlier versions kept it, and opened again.
@@ -564,8 +566,8 @@ TEST(FaultRecordsTest, WritingFinderInfoIntoANewResourceFileLeavesNoEmptyOneWhen
             },
         .state = UserOf,
         .rules =
-            Rules{TakenUpAgain("pwrite")} +
             Rules{
+                TakenUpAgain("pwrite"),
                 {.call = "seteuid",
                  .ordinal = 1,
                  .outcome = {.result = -1, .records = {{0x3C00, "ea_mkdir.c"}}}},
@@ -644,8 +646,8 @@ TEST(FaultRecordsTest, WritingFinderInfoOnAnAttributeVolumeHidesTheNewDirectory)
                 }
             },
         .rules =
-            Rules{TakenUpAgain("pwrite")} +
             Rules{
+                TakenUpAgain("pwrite"),
                 {.call = "malloc",
                  .ordinal = 1,
                  .outcome = {.result = -1, .records = {{0x100, "ea_mkdir.c"}}}},
@@ -702,8 +704,9 @@ TEST(FaultRecordsTest, WritingFinderInfoOverThatOfAResourceFile) {
                 EXPECT_EQ(former, file) << run.call;
             },
         .rules =
-            Rules{TakenUpAgain("pread")} + Rules{TakenUpAgain("pwrite")} +
             Rules{
+                TakenUpAgain("pread"),
+                TakenUpAgain("pwrite"),
                 {.call = "malloc",
                  .ordinal = 1,
                  .outcome = {.result = -1, .records = {{0x100, "ea_mkdir.c"}}}},
@@ -771,8 +774,8 @@ TEST(FaultRecordsTest, WritingTheFinderInfoOfAHandle) {
                 ::close(w.fd);
             },
         .rules =
-            Rules{TakenUpAgain("pwrite")} +
             Rules{
+                TakenUpAgain("pwrite"),
                 {.call = "lseek",
                  .outcome = {.result = -1,
                              .records = {{0xD00, kWriteUnit}},
