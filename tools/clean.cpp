@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <filesystem>
 #include <iostream>
-#include <nlohmann/json.hpp>
 
 #include "include/mavoea.h"
 #include "tools/dangling.h"
@@ -120,12 +119,12 @@ class Cleaning {
             return;
         }
         Json entry;
-        SetText(entry, "path", path);
-        entry["kind"] = IdOf(dangling.kind);
-        entry["reason"] = dangling.because;
-        entry["kept"] = kept;
-        entry["removed"] = removed;
-        list_.push_back(std::move(entry));
+        entry.SetText("path", path);
+        entry.Set("kind", IdOf(dangling.kind));
+        entry.Set("reason", dangling.because);
+        entry.Set("kept", kept);
+        entry.Set("removed", removed);
+        list_.Add(std::move(entry));
     }
 
     void Add(const std::string& path, const Failure& failure) {
@@ -135,18 +134,18 @@ class Cleaning {
 
     void PrintJson() const {
         Json json;
-        json["found"] = list_;
-        json["dangling"] = dangling_;
-        json["removed"] = removed_;
-        json["kept"] = kept_;
-        json["failed"] = failures_.size();
+        json.Set("found", list_);
+        json.Set("dangling", dangling_);
+        json.Set("removed", removed_);
+        json.Set("kept", kept_);
+        json.Set("failed", failures_.size());
         SetFailures(json, failures_);
         Print(json);
     }
 
     const CleanOptions& options_;
     std::vector<std::string> pending_;  // directories
-    Json list_ = Json::array();
+    Json list_ = Json::Array();
     std::size_t dangling_ = 0;  // neither removed nor kept
     std::size_t removed_ = 0;
     std::size_t kept_ = 0;

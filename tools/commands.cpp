@@ -6,7 +6,6 @@
 #include <algorithm>
 #include <iomanip>
 #include <iostream>
-#include <nlohmann/json.hpp>
 
 #include "format/ea_stream.h"
 #include "tools/clean.h"
@@ -68,35 +67,36 @@ ExitStatus Where(const Options& options, const Declarations& declarations) {
     const Object object = FindObject(options.paths.front());
     const std::string source = TypeSource(object, declarations);
     Json json;
-    SetText(json, "path", object.path);
-    json["type"] = object.type;
-    json["typeName"] = TypeName(object.type);
-    json["typeSource"] = source;
-    json["files"] = Json::array();
+    json.SetText("path", object.path);
+    json.Set("type", object.type);
+    json.Set("typeName", TypeName(object.type));
+    json.Set("typeSource", source);
+    Json files = Json::Array();
     std::string text = Printable(object.path) + "\n  volume type: " + std::to_string(object.type) +
                        ", " + std::string(TypeName(object.type)) + " (" + source + ")\n";
     for (const MetadataPath& place : MetadataPaths(object)) {
         struct stat info;
         const bool exists = !place.path.empty() && ::lstat(place.path.c_str(), &info) == 0;
         Json entry;
-        entry["kind"] = place.id;
+        entry.Set("kind", place.id);
         text += std::string("  ") + place.label + ": ";
         if (place.path.empty()) {
-            entry["path"] = nullptr;
-            entry["problem"] = place.problem;
+            entry.Set("path", Json());
+            entry.Set("problem", place.problem);
             text += "none, " + place.problem + '\n';
         } else {
-            SetText(entry, "path", place.path);
+            entry.SetText("path", place.path);
             text += Printable(place.path) + (exists ? " (exists" : " (missing");
             if (exists && S_ISREG(info.st_mode)) {
                 text += ", " + std::to_string(info.st_size) + " bytes";
-                entry["size"] = info.st_size;
+                entry.Set("size", info.st_size);
             }
             text += ")\n";
         }
-        entry["exists"] = exists;
-        json["files"].push_back(std::move(entry));
+        entry.Set("exists", exists);
+        files.Add(std::move(entry));
     }
+    json.Set("files", std::move(files));
     if (options.json) {
         Print(json);
     } else {
@@ -126,21 +126,21 @@ void ListText(const std::vector<Attribute>& list, bool details) {
 }
 
 Json ListJson(const std::vector<Attribute>& list) {
-    Json json = Json::array();
+    Json json = Json::Array();
     for (const Attribute& attribute : list) {
         Json entry;
-        SetText(entry, "name", attribute.name);
-        entry["size"] = attribute.size;
-        entry["kind"] = KindName(attribute.kind);
-        SetText(entry, "file", attribute.file);
-        json.push_back(std::move(entry));
+        entry.SetText("name", attribute.name);
+        entry.Set("size", attribute.size);
+        entry.Set("kind", KindName(attribute.kind));
+        entry.SetText("file", attribute.file);
+        json.Add(std::move(entry));
     }
     return json;
 }
 
 ExitStatus List(const Options& options) {
     ExitStatus status = kSuccess;
-    Json json = Json::array();
+    Json json = Json::Array();
     bool first = true;
     for (const std::string& path : options.paths) {
         try {
@@ -148,10 +148,10 @@ ExitStatus List(const Options& options) {
             const std::vector<Attribute> list = OpenStore(object)->List();
             if (options.json) {
                 Json entry;
-                SetText(entry, "path", object.path);
-                entry["type"] = object.type;
-                entry["attributes"] = ListJson(list);
-                json.push_back(std::move(entry));
+                entry.SetText("path", object.path);
+                entry.Set("type", object.type);
+                entry.Set("attributes", ListJson(list));
+                json.Add(std::move(entry));
                 continue;
             }
             if (options.paths.size() > 1) {
@@ -177,10 +177,10 @@ ExitStatus Get(const Options& options) {
     if (!value) throw NoAttribute(options);
     if (options.json) {
         Json json;
-        SetText(json, "path", object.path);
-        SetText(json, "name", options.name);
-        json["size"] = value->size();
-        json["hex"] = HexDigits(*value);
+        json.SetText("path", object.path);
+        json.SetText("name", options.name);
+        json.Set("size", value->size());
+        json.Set("hex", HexDigits(*value));
         Print(json);
     } else if (options.hex) {
         std::cout << HexDump(*value);
@@ -213,9 +213,9 @@ ExitStatus Set(const Options& options) {
     store->Set(options.name, value);
     if (options.json) {
         Json json;
-        SetText(json, "path", object.path);
-        SetText(json, "name", options.name);
-        json["size"] = value.size();
+        json.SetText("path", object.path);
+        json.SetText("name", options.name);
+        json.Set("size", value.size());
         Print(json);
     }
     return kSuccess;
@@ -227,9 +227,9 @@ ExitStatus Remove(const Options& options) {
     if (!OpenStore(object)->Remove(options.name)) throw NoAttribute(options);
     if (options.json) {
         Json json;
-        SetText(json, "path", object.path);
-        SetText(json, "name", options.name);
-        json["removed"] = true;
+        json.SetText("path", object.path);
+        json.SetText("name", options.name);
+        json.Set("removed", true);
         Print(json);
     }
     return kSuccess;
@@ -239,15 +239,15 @@ ExitStatus Remove(const Options& options) {
 
 ExitStatus Lock(const Options& options, bool locked) {
     ExitStatus status = kSuccess;
-    Json json = Json::array();
+    Json json = Json::Array();
     for (const std::string& path : options.paths) {
         try {
             const Object object = FindObject(path);
             SetLocked(object, locked);
             Json entry;
-            SetText(entry, "path", object.path);
-            entry["locked"] = locked;
-            json.push_back(std::move(entry));
+            entry.SetText("path", object.path);
+            entry.Set("locked", locked);
+            json.Add(std::move(entry));
         } catch (const Failure& failure) {
             Report(failure.what());
             status = std::max(status, failure.status());
@@ -263,7 +263,7 @@ ExitStatus Lock(const Options& options, bool locked) {
 // none.
 ExitStatus DumpRecord(const Options& options) {
     const Object object = FindObject(options.paths.front());
-    Json json = Json::array();
+    Json json = Json::Array();
     std::size_t violations = 0;
     bool found = false;
     for (const RecordPlace place : {RecordPlace::kAttribute, RecordPlace::kResourceFile}) {
@@ -276,7 +276,7 @@ ExitStatus DumpRecord(const Options& options) {
                                      : "netatalk record, head of a resource file";
         violations += findings.violations.size();
         if (options.json) {
-            json.push_back(DumpJson(stored->file, layout, findings, kind));
+            json.Add(DumpJson(stored->file, layout, findings, kind));
         } else {
             std::cout << (found ? "\n" : "") << DumpText(stored->file, layout, findings, kind);
         }

@@ -8,7 +8,6 @@
 #include <cerrno>
 #include <climits>
 #include <map>
-#include <nlohmann/json.hpp>
 #include <set>
 #include <string_view>
 
@@ -229,12 +228,12 @@ std::string DifferenceText(const Difference& difference) {
 
 Json DifferenceJson(const Difference& difference) {
     Json json;
-    SetText(json, "path", difference.path);
-    json["aspect"] = WordOf(difference.aspect);
-    if (!difference.name.empty()) SetText(json, "name", difference.name);
-    json["what"] = WordOf(difference.what);
-    if (difference.offset) json["offset"] = *difference.offset;
-    if (difference.because != nullptr) json["because"] = difference.because;
+    json.SetText("path", difference.path);
+    json.Set("aspect", WordOf(difference.aspect));
+    if (!difference.name.empty()) json.SetText("name", difference.name);
+    json.Set("what", WordOf(difference.what));
+    if (difference.offset) json.Set("offset", *difference.offset);
+    if (difference.because != nullptr) json.Set("because", difference.because);
     return json;
 }
 

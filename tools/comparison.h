@@ -7,6 +7,7 @@
 #include <optional>
 #include <string>
 
+#include "tools/json.h"
 #include "tools/messages.h"
 #include "tools/text.h"
 #include "tools/volume.h"

@@ -7,7 +7,6 @@
 #include <cstdint>
 #include <filesystem>
 #include <iostream>
-#include <nlohmann/json.hpp>
 #include <set>
 #include <vector>
 
@@ -195,7 +194,7 @@ class Conversion {
     void Add(const Difference& difference) {
         ++differences_;
         if (options_.json) {
-            list_.push_back(DifferenceJson(difference));
+            list_.Add(DifferenceJson(difference));
         } else {
             progress_.Clear();
             std::cout << DifferenceText(difference) << '\n';
@@ -216,11 +215,11 @@ class Conversion {
 
     void PrintJson() const {
         Json json;
-        json["converted"] = converted_;
-        json["compared"] = compared_;
-        json["differences"] = list_;
-        json["failed"] = failures_.size();
-        json["interrupted"] = Interrupted() != 0;
+        json.Set("converted", converted_);
+        json.Set("compared", compared_);
+        json.Set("differences", list_);
+        json.Set("failed", failures_.size());
+        json.Set("interrupted", Interrupted() != 0);
         SetMessages(json, "notes", notes_);
         SetFailures(json, failures_);
         Print(json);
@@ -233,7 +232,7 @@ class Conversion {
     std::uint64_t converted_ = 0;
     std::uint64_t compared_ = 0;
     std::uint64_t differences_ = 0;
-    Json list_ = Json::array();
+    Json list_ = Json::Array();
     std::vector<std::string> notes_;
     std::vector<FailedObject> failures_;
     ExitStatus status_ = kSuccess;

@@ -1,7 +1,5 @@
 #include "tools/dump.h"
 
-#include <nlohmann/json.hpp>
-
 #include "tools/entry_text.h"
 #include "tools/text.h"
 
@@ -82,7 +80,9 @@ void AddAttributes(const Layout& layout, Fields* out) {
     }
 }
 
-Json RangeJson(Range range) { return {{"offset", range.offset}, {"length", range.length}}; }
+Json RangeJson(Range range) {
+    return Json::Object({{"offset", range.offset}, {"length", range.length}});
+}
 
 }  // namespace
 
@@ -105,56 +105,58 @@ std::string DumpText(const std::string& path, const Layout& layout, const Findin
 Json DumpJson(const std::string& path, const Layout& layout, const Findings& findings,
               const char* kind) {
     Json json;
-    SetText(json, "file", path);
-    json["kind"] = kind == nullptr ? FileKind(layout) : kind;
-    json["size"] = layout.file_size;
+    json.SetText("file", path);
+    json.Set("kind", kind == nullptr ? FileKind(layout) : kind);
+    json.Set("size", layout.file_size);
     if (layout.header) {
         const AppleDoubleHeader& header = *layout.header;
-        json["header"] = {{"magic", header.magic},
-                          {"version", header.version},
-                          {"filler", HexDigits(header.filler)},
-                          {"entryCount", header.entry_count}};
-        json["entries"] = Json::array();
+        json.Set("header", Json::Object({{"magic", header.magic},
+                                         {"version", header.version},
+                                         {"filler", HexDigits(header.filler)},
+                                         {"entryCount", header.entry_count}}));
+        Json entries = Json::Array();
         for (std::size_t i = 0; i < layout.entries.size(); ++i) {
             const EntryDescriptor& entry = layout.entries[i];
-            Json item = {{"id", static_cast<std::uint32_t>(entry.id)},
-                         {"name", EntryName(entry.id)},
-                         {"offset", entry.data.offset},
-                         {"length", entry.data.length}};
+            Json item = Json::Object({{"id", static_cast<std::uint32_t>(entry.id)},
+                                      {"name", EntryName(entry.id)},
+                                      {"offset", entry.data.offset},
+                                      {"length", entry.data.length}});
             if (const auto contents = layout.contents.find(i); contents != layout.contents.end()) {
                 AddEntryJson(entry.id, contents->second, &item);
             }
-            json["entries"].push_back(std::move(item));
+            entries.Add(std::move(item));
         }
+        json.Set("entries", std::move(entries));
     }
-    if (!layout.finder_info.empty()) json["finderInfo"] = HexDigits(layout.finder_info);
+    if (!layout.finder_info.empty()) json.Set("finderInfo", HexDigits(layout.finder_info));
     if (layout.attributes) {
         const AttributeHeader& attributes = *layout.attributes;
-        json["attributeHeader"] = {{"pad", attributes.pad},
-                                   {"magic", attributes.magic},
-                                   {"debugTag", attributes.debug_tag},
-                                   {"totalSize", attributes.total_size},
-                                   {"dataStart", attributes.data.offset},
-                                   {"dataLength", attributes.data.length},
-                                   {"reserved", HexDigits(attributes.reserved)},
-                                   {"flags", attributes.flags},
-                                   {"count", attributes.count}};
-        json["attributes"] = Json::array();
+        json.Set("attributeHeader", Json::Object({{"pad", attributes.pad},
+                                                  {"magic", attributes.magic},
+                                                  {"debugTag", attributes.debug_tag},
+                                                  {"totalSize", attributes.total_size},
+                                                  {"dataStart", attributes.data.offset},
+                                                  {"dataLength", attributes.data.length},
+                                                  {"reserved", HexDigits(attributes.reserved)},
+                                                  {"flags", attributes.flags},
+                                                  {"count", attributes.count}}));
+        Json list = Json::Array();
         for (const Layout::Record& record : layout.records) {
             Json entry;
-            SetText(entry, "name", record.name());
-            entry["offset"] = record.fixed.value.offset;
-            entry["length"] = record.fixed.value.length;
-            entry["flags"] = record.fixed.flags;
-            entry["nameSize"] = record.fixed.name_size;
-            json["attributes"].push_back(std::move(entry));
+            entry.SetText("name", record.name());
+            entry.Set("offset", record.fixed.value.offset);
+            entry.Set("length", record.fixed.value.length);
+            entry.Set("flags", record.fixed.flags);
+            entry.Set("nameSize", record.fixed.name_size);
+            list.Add(std::move(entry));
         }
+        json.Set("attributes", std::move(list));
     }
     if (const auto fork = layout.FindEntry(EntryId::kResourceFork)) {
-        json["resourceFork"] = RangeJson(layout.entries[*fork].data);
+        json.Set("resourceFork", RangeJson(layout.entries[*fork].data));
     }
-    json["notes"] = findings.notes;
-    json["violations"] = findings.violations;
+    json.Set("notes", findings.notes);
+    json.Set("violations", findings.violations);
     return json;
 }
 

@@ -4,6 +4,7 @@
 
 #include <string>
 
+#include "tools/json.h"
 #include "tools/layout.h"
 
 namespace mavoea::tool {

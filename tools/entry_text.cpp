@@ -3,7 +3,6 @@
 #include <array>
 #include <cstdint>
 #include <ctime>
-#include <nlohmann/json.hpp>
 #include <vector>
 
 #include "util/bytes.h"
@@ -126,24 +125,26 @@ std::string EntryText(EntryId id, const Bytes& bytes) {
 void AddEntryJson(EntryId id, const Bytes& bytes, Json* entry) {
     switch (ContentsOf(id, bytes)) {
         case Contents::kText:
-            SetText(*entry, "text", TextOf(bytes));
+            entry->SetText("text", TextOf(bytes));
             return;
         case Contents::kDates: {
             const std::vector<Date> dates = DecodeDates(bytes);
+            Json json;
             for (std::size_t i = 0; i < dates.size(); ++i) {
-                (*entry)["dates"][kDateNames[i]] = {{"seconds", dates[i].seconds},
-                                                    {"time", dates[i].time}};
+                json.Set(kDateNames[i],
+                         Json::Object({{"seconds", dates[i].seconds}, {"time", dates[i].time}}));
             }
+            entry->Set("dates", std::move(json));
             return;
         }
         case Contents::kAfpFileInfo: {
             const std::uint16_t word = LoadBe16(&bytes[kAfpAttributesOffset]);
-            (*entry)["attributes"] = word;
-            (*entry)["attributeNames"] = AfpAttributeNames(word);
+            entry->Set("attributes", word);
+            entry->Set("attributeNames", AfpAttributeNames(word));
             return;
         }
         case Contents::kBytes:
-            (*entry)["hex"] = HexDigits(bytes);
+            entry->Set("hex", HexDigits(bytes));
             return;
     }
 }

@@ -5,6 +5,7 @@
 #include <string>
 
 #include "format/apple_double.h"
+#include "tools/json.h"
 #include "tools/text.h"
 
 namespace mavoea::tool {

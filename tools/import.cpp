@@ -2,7 +2,6 @@
 
 #include <iostream>
 #include <memory>
-#include <nlohmann/json.hpp>
 
 #include "format/ea_stream.h"
 #include "tools/contents.h"
@@ -100,29 +99,26 @@ void PrintText(const std::string& path, const Contents& contents) {
 Json ImportJson(const std::string& source, const std::string& path, const Contents& contents,
                 const std::vector<std::string>& failures) {
     Json json;
-    SetText(json, "path", path);
-    SetText(json, "appleDouble", source);
-    json["attributes"] = Json::array();
+    json.SetText("path", path);
+    json.SetText("appleDouble", source);
+    Json attributes = Json::Array();
     for (const Contents::Attribute& attribute : contents.attributes) {
         Json entry;
-        SetText(entry, "name", attribute.name);
-        entry["size"] = attribute.value.size();
-        json["attributes"].push_back(std::move(entry));
+        entry.SetText("name", attribute.name);
+        entry.Set("size", attribute.value.size());
+        attributes.Add(std::move(entry));
     }
-    json["finderInfo"] = contents.finder_info.has_value();
-    json["resourceFork"] = contents.fork ? contents.fork->size() : 0;
-    json["notTakenOver"] = Json::array();
+    json.Set("attributes", std::move(attributes));
+    json.Set("finderInfo", contents.finder_info.has_value());
+    json.Set("resourceFork", contents.fork ? contents.fork->size() : 0);
+    Json others = Json::Array();
     for (const std::string& other : contents.others) {
         Json entry;
-        SetText(entry, "name", other);
-        json["notTakenOver"].push_back(std::move(entry));
+        entry.SetText("name", other);
+        others.Add(std::move(entry));
     }
-    json["failures"] = Json::array();
-    for (const std::string& failure : failures) {
-        Json entry;
-        SetText(entry, "message", failure);
-        json["failures"].push_back(std::move(entry));
-    }
+    json.Set("notTakenOver", std::move(others));
+    SetMessages(json, "failures", failures);
     return json;
 }
 

@@ -8,7 +8,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <iostream>
-#include <nlohmann/json.hpp>
 
 #include "tools/interrupt.h"
 #include "tools/output.h"
@@ -106,12 +105,12 @@ void Job::PrintText() const {
 
 void Job::PrintJson() const {
     Json json;
-    json["task"] = doing_;
-    json["done"] = done_;
-    json["skipped"] = skipped_;
-    if (has_bytes_) json["bytes"] = bytes_;
-    json["failed"] = failures_.size();
-    json["interrupted"] = stopped();
+    json.Set("task", doing_);
+    json.Set("done", done_);
+    json.Set("skipped", skipped_);
+    if (has_bytes_) json.Set("bytes", bytes_);
+    json.Set("failed", failures_.size());
+    json.Set("interrupted", stopped());
     if (options_.verbose) SetMessages(json, "lines", lines_);
     SetMessages(json, "notes", notes_);
     SetFailures(json, failures_);

@@ -6,7 +6,7 @@
 #include <string_view>
 #include <vector>
 
-#include "tools/text.h"
+#include "tools/json.h"
 
 namespace mavoea::tool {
 

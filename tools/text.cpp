@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <array>
-#include <nlohmann/json.hpp>
 
 namespace mavoea::tool {
 namespace {
@@ -20,12 +19,6 @@ constexpr int DigitValue(char c) {
 }
 
 constexpr bool IsBlank(char c) { return c == ' ' || (c >= '\t' && c <= '\r'); }
-
-// The text with U+FFFD for what is no UTF-8.
-std::string MadeUtf8(std::string_view text) {
-    constexpr auto kReplace = Json::error_handler_t::replace;
-    return Json::parse(Json(text).dump(-1, ' ', false, kReplace)).get<std::string>();
-}
 
 }  // namespace
 
@@ -94,15 +87,6 @@ std::string Printable(std::string_view text) {
         }
     }
     return safe;
-}
-
-void SetText(Json& object, const std::string& key, std::string_view text) {
-    const std::string made = MadeUtf8(text);
-    object[key] = made;
-    if (made != text) {
-        object[key + "Hex"] =
-            HexDigits({reinterpret_cast<const std::uint8_t*>(text.data()), text.size()});
-    }
 }
 
 }  // namespace mavoea::tool

@@ -1,9 +1,8 @@
-// Bytes and names as text: for people, and for JSON.
+// Bytes and names as text.
 #ifndef MAVOEA_TOOLS_TEXT_H_
 #define MAVOEA_TOOLS_TEXT_H_
 
 #include <cstdint>
-#include <nlohmann/json_fwd.hpp>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -14,7 +13,6 @@
 namespace mavoea::tool {
 
 using Bytes = std::vector<std::uint8_t>;
-using Json = nlohmann::ordered_json;
 
 // `digits` hexadecimal digits behind "0x".
 std::string HexNumber(std::uint64_t value, int digits = 8);
@@ -32,10 +30,6 @@ std::string HexDump(ByteView bytes);
 // A name or path on one line of a terminal: control characters as "\x0A", a backslash doubled, all
 // other bytes as they are.
 std::string Printable(std::string_view text);
-
-// Sets object[key] to the text. What is no UTF-8 gets U+FFFD in its place, and all bytes are in
-// object[key + "Hex"] besides.
-void SetText(Json& object, const std::string& key, std::string_view text);
 
 }  // namespace mavoea::tool
 

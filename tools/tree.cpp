@@ -9,7 +9,6 @@
 #include <cstdint>
 #include <iostream>
 #include <memory>
-#include <nlohmann/json.hpp>
 
 #include "include/mavoea.h"
 #include "tools/file.h"
@@ -165,11 +164,11 @@ class Walk {
     void PrintJson() const {
         constexpr std::array<const char*, 3> kKeys = {"done", "current", "nothing"};
         Json json;
-        json["task"] = task_.doing;
+        json.Set("task", task_.doing);
         for (std::size_t i = 0; i < counts_.size(); ++i) {
-            if (Words()[i] != nullptr) json[kKeys[i]] = counts_[i];
+            if (Words()[i] != nullptr) json.Set(kKeys[i], counts_[i]);
         }
-        json["failed"] = failures_.size();
+        json.Set("failed", failures_.size());
         SetMessages(json, "notes", notes_);
         SetFailures(json, failures_);
         Print(json);
