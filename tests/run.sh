@@ -18,7 +18,7 @@ build_and_test() {
     cmake --preset "$1"
     cmake --build --preset "$1"
     step "test: $1"
-    ctest --preset "$1" -j 2
+    ctest --preset "$1" -j 3 # some wait for a disk
 }
 
 step packages

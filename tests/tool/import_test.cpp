@@ -229,7 +229,8 @@ TEST_P(RefusedTest, WhatIsNoAppleDoubleFileChangesNothing) {
 TEST_P(RefusedTest, EveryTruncationChangesNothing) {
     const Bytes whole =
         MacSidecar({{{"a", Ascii("one")}, {"b", Pattern(300)}}, Pattern(32, 1), Pattern(50)}).bytes;
-    for (std::size_t size = 0; size < whole.size(); size += size < 600 ? 37 : 501) {
+    for (std::size_t size = 0; size < whole.size();
+         size += (size < 600 ? 37U : 501U) * kSeriesStep) {
         SCOPED_TRACE(size);
         const ToolResult result =
             Import(Bytes(whole.begin(), whole.begin() + static_cast<std::ptrdiff_t>(size)));

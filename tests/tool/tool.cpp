@@ -11,6 +11,10 @@
 #include <iterator>
 #include <sstream>
 
+template class nlohmann::basic_json<>;
+
+void nlohmann::PrintTo(const json& value, std::ostream* out) { *out << value.dump(2); }
+
 namespace mavoea::test {
 namespace {
 
@@ -25,6 +29,8 @@ void Limit(decltype(RLIMIT_AS) what, std::size_t bytes) {
 }
 
 }  // namespace
+
+nlohmann::json ToolResult::json() const { return nlohmann::json::parse(out); }
 
 void PrintTo(const ToolResult& result, std::ostream* out) {
     *out << "exit status " << result.status << "\nout: " << result.out << "\nerr: " << result.err;

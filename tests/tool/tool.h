@@ -12,6 +12,12 @@
 #include "tests/support/emulator.h"
 #include "tests/support/temp_dir.h"
 
+// Compiled once, in tool.cpp.
+extern template class nlohmann::basic_json<>;
+namespace nlohmann {
+void PrintTo(const json& value, std::ostream* out);
+}
+
 namespace mavoea::test {
 
 struct ToolResult {
@@ -20,7 +26,7 @@ struct ToolResult {
     std::string err;
 
     Bytes bytes() const { return Ascii(out); }
-    nlohmann::json json() const { return nlohmann::json::parse(out); }
+    nlohmann::json json() const;
 };
 void PrintTo(const ToolResult& result, std::ostream* out);
 

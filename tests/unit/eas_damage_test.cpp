@@ -244,7 +244,7 @@ class EasDamageTest : public StreamTest {
 TEST_F(EasDamageTest, EveryTruncationIsHarmless) {
     for (const auto& [kind, bytes] : Kinds()) {
         SCOPED_TRACE(kind);
-        for (std::size_t length = 0; length <= bytes.size(); ++length) {
+        for (std::size_t length = 0; length <= bytes.size(); length += kSeriesStep) {
             SCOPED_TRACE(length);
             TryAll(Slice(bytes, 0, length));
             if (HasFailure()) return;
