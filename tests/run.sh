@@ -12,10 +12,10 @@ step() {
     echo "==== $* ($(($(date +%s) - begun)) s)"
 }
 
-# build_and_test PRESET
+# build_and_test PRESET [OPTION]
 build_and_test() {
     step "build: $1"
-    cmake --preset "$1"
+    cmake --preset "$@"
     cmake --build --preset "$1"
     step "test: $1"
     ctest --preset "$1" -j 3 # some wait for a disk
@@ -29,11 +29,13 @@ sh tests/packages.sh g++ cmake ninja-build pkg-config libacl1-dev libattr1-dev l
     googletest dpkg-dev make
 
 build_and_test release
-build_and_test sanitize
+# What tests the tool runs it as a process: the programs of one build can test the tool of each.
+tool_tests=-DMAVOEA_TOOL_TESTS="$root/build/release/bin"
+build_and_test sanitize "$tool_tests"
 
 step "libraries: powerpc"
 sh tests/powerpc/libraries.sh
-build_and_test powerpc
+build_and_test powerpc "$tool_tests"
 
 step "build: fuzz"
 cmake --preset fuzz

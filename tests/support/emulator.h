@@ -4,9 +4,6 @@
 
 #include <gtest/gtest.h>
 
-#include <cstddef>
-#include <vector>
-
 namespace mavoea::test {
 
 // Whether the programs of this build are started with another one: MAVOEA_EMULATOR is its name and
@@ -15,14 +12,8 @@ inline constexpr bool kEmulated = sizeof MAVOEA_EMULATOR > 1;
 
 // Of the longest series only each seventh step is taken in an emulator, which takes some thirty
 // times as long; 7 has no factor in common with the sizes of fields.
-inline constexpr int kSeriesStep = kEmulated ? 7 : 1;
-
-template <class T>
-std::vector<T> Thinned(const std::vector<T>& all) {
-    std::vector<T> some;
-    for (std::size_t i = 0; i < all.size(); i += kSeriesStep) some.push_back(all[i]);
-    return some;
-}
+inline constexpr int kEmulatedSeriesStep = 7;
+inline constexpr int kSeriesStep = kEmulated ? kEmulatedSeriesStep : 1;
 
 // qemu makes a fork of what is to share its parent's memory.
 inline constexpr char kNoSpawnErrors[] =

@@ -464,14 +464,14 @@ TEST_F(CleanTest, WhatCannotBeRemovedIsToldAndTheRestGoes) {
     // The superuser may remove everything.
     constexpr uid_t kNobody = 65534;
     const bool is_root = ::geteuid() == 0;
-    if (is_root && !std::string(MAVOEA_TOOL_SANITIZED).empty()) {
+    if (is_root && Tested().sanitized()) {
         GTEST_SKIP() << "a sanitizer cannot look into a process that has changed its user";
     }
     if (is_root) {
         ASSERT_EQ(0, ::chown(dir_.path().c_str(), kNobody, kNobody));
         ASSERT_EQ(0, ::seteuid(kNobody));
     }
-    if (::eaccess(MAVOEA_TOOL_PATH, X_OK) != 0) {
+    if (::eaccess(Tested().path.c_str(), X_OK) != 0) {
         ASSERT_TRUE(!is_root || ::seteuid(0) == 0);
         GTEST_SKIP() << "other users may not run the tool where it is";
     }

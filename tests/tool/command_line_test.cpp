@@ -118,7 +118,7 @@ TEST(CommandLineTest, StandardOutputThatCannotBeWrittenIsAFailure) {
     if (::access("/dev/full", W_OK) != 0) GTEST_SKIP() << "there is no /dev/full";
     const Volume volume(0);
     ASSERT_THAT(volume.Set("a", Ascii("value")), Succeeded());
-    const std::string command = ToolCommand() + " --volume " + volume.path() + "=0 get " +
+    const std::string command = Tested().Command() + " --volume " + volume.path() + "=0 get " +
                                 volume.object() + " a >/dev/full 2>/dev/null";
     const int status = std::system(command.c_str());
     ASSERT_TRUE(WIFEXITED(status));

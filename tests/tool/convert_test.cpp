@@ -10,7 +10,6 @@
 #include <tuple>
 #include <vector>
 
-#include "tests/support/emulator.h"
 #include "tests/support/object_files.h"
 #include "tests/support/record_builder.h"
 #include "tests/support/stream_builder.h"

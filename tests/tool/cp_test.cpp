@@ -2,7 +2,6 @@
 
 #include <sys/acl.h>
 
-#include "tests/support/emulator.h"
 #include "tests/tool/travel.h"
 
 namespace mavoea::test {

@@ -7,7 +7,6 @@
 #include <functional>
 #include <random>
 
-#include "tests/support/emulator.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/tool.h"
 
@@ -288,7 +287,7 @@ TEST_F(DumpTest, NamesMustEndAndDiffer) {
 
 TEST_F(DumpTest, EveryTruncationIsSeenAndSurvived) {
     const Bytes whole = Sample().Build();
-    for (std::size_t size = 1; size < whole.size(); size += kSeriesStep) {
+    for (std::size_t size = 1; size < whole.size(); size += SeriesStep()) {
         SCOPED_TRACE(size);
         const Bytes part(whole.begin(), whole.begin() + static_cast<std::ptrdiff_t>(size));
         const ToolResult result = Dump(part);
@@ -301,7 +300,7 @@ TEST_F(DumpTest, EveryTruncationIsSeenAndSurvived) {
 
 TEST_F(DumpTest, RandomBytesBehindAGoodHeaderAreSurvived) {
     std::mt19937 random(20240611);
-    for (int round = 0; round < 150; round += kSeriesStep) {
+    for (std::size_t round = 0; round < 150; round += SeriesStep()) {
         SCOPED_TRACE(round);
         Bytes bytes(random() % 400);
         for (std::uint8_t& byte : bytes) byte = static_cast<std::uint8_t>(random());
@@ -317,7 +316,7 @@ TEST_F(DumpTest, RandomBytesBehindAGoodHeaderAreSurvived) {
 
 TEST_F(DumpTest, ASampleWithOneByteChangedIsSurvived) {
     const Bytes whole = Sample().Build();
-    for (std::size_t at = 0; at < 160; at += kSeriesStep) {
+    for (std::size_t at = 0; at < 160; at += SeriesStep()) {
         SCOPED_TRACE(at);
         Bytes bytes = whole;
         bytes[at] ^= 0xFF;

@@ -38,7 +38,7 @@ class FinderAndForkTest : public ::testing::TestWithParam<int> {
     std::unique_ptr<Volume> volume_;
 };
 
-INSTANTIATE_TEST_SUITE_P(VolumeTypes, FinderAndForkTest, ::testing::Values(0, 1, 2),
+INSTANTIATE_TEST_SUITE_P(VolumeTypes, FinderAndForkTest, ::testing::ValuesIn(Types({0, 1, 2})),
                          [](const auto& tested) { return "Type" + std::to_string(tested.param); });
 
 TEST_P(FinderAndForkTest, AForkComesBackAsItWas) {

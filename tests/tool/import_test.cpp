@@ -210,7 +210,7 @@ class RefusedTest : public ImportTest {
         EXPECT_EQ("kept\n", volume_.List().out);
     }
 };
-INSTANTIATE_TEST_SUITE_P(VolumeTypes, RefusedTest, ::testing::Values(0, 1, 2),
+INSTANTIATE_TEST_SUITE_P(VolumeTypes, RefusedTest, ::testing::ValuesIn(Types({0, 1, 2})),
                          [](const auto& tested) { return "Type" + std::to_string(tested.param); });
 
 TEST_P(RefusedTest, WhatIsNoAppleDoubleFileChangesNothing) {
@@ -230,7 +230,7 @@ TEST_P(RefusedTest, EveryTruncationChangesNothing) {
     const Bytes whole =
         MacSidecar({{{"a", Ascii("one")}, {"b", Pattern(300)}}, Pattern(32, 1), Pattern(50)}).bytes;
     for (std::size_t size = 0; size < whole.size();
-         size += (size < 600 ? 37U : 501U) * kSeriesStep) {
+         size += (size < 600 ? 37 : 501) * SeriesStep()) {
         SCOPED_TRACE(size);
         const ToolResult result =
             Import(Bytes(whole.begin(), whole.begin() + static_cast<std::ptrdiff_t>(size)));

@@ -174,7 +174,7 @@ TEST(LockRecordTest, ManyFilesTakeNoMoreDescriptorsThanOne) {
     MAVOEA_SKIP_WITHOUT_ATTRIBUTES(volume.path());
     ASSERT_THAT(volume.Set("com.apple.ResourceFork", Ascii("make the directory")), Succeeded());
     std::string command =
-        "ulimit -n 16; " + ToolCommand() + " --volume " + volume.path() + "=1 unlock";
+        "ulimit -n 16; " + Tested().Command() + " --volume " + volume.path() + "=1 unlock";
     for (int i = 0; i < 40; ++i) {
         const std::string name = "f" + std::to_string(i);
         WriteFile(volume.path() + "/" + name, {});

@@ -1,6 +1,5 @@
 // mavoea mv, on real files.
 
-#include "tests/support/emulator.h"
 #include "tests/tool/travel.h"
 
 namespace mavoea::test {

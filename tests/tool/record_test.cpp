@@ -261,7 +261,7 @@ TEST_F(RecordTest, NoRecordIsNotFound) {
 
 TEST_F(RecordTest, NoBytesInARecordsPlaceMakeTheToolFail) {
     const Bytes record = AttributeRecord();
-    for (std::size_t at = 0; at < 122; at += kSeriesStep) {
+    for (std::size_t at = 0; at < 122; at += SeriesStep()) {
         Bytes damaged = record;
         damaged[at] = 0xFF;
         SetAttribute(volume_.object(), kRecordAttribute, damaged);

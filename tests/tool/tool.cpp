@@ -23,6 +23,11 @@ std::string Contents(const std::string& path) {
     return {bytes.begin(), bytes.end()};
 }
 
+std::string FromEnvironment(const char* variable, const char* otherwise) {
+    const char* const value = std::getenv(variable);
+    return value != nullptr ? value : otherwise;
+}
+
 void Limit(decltype(RLIMIT_AS) what, std::size_t bytes) {
     const rlimit limit = {bytes, bytes};
     if (setrlimit(what, &limit) != 0) _exit(125);
@@ -36,10 +41,29 @@ void PrintTo(const ToolResult& result, std::ostream* out) {
     *out << "exit status " << result.status << "\nout: " << result.out << "\nerr: " << result.err;
 }
 
+const TestedTool& Tested() {
+    static const TestedTool tool = {
+        FromEnvironment("MAVOEA_TOOL", MAVOEA_TOOL_PATH),
+        FromEnvironment("MAVOEA_TOOL_EMULATOR", MAVOEA_EMULATOR),
+        FromEnvironment("MAVOEA_TOOL_SANITIZERS", MAVOEA_TOOL_SANITIZERS),
+    };
+    return tool;
+}
+
+std::string TestedTool::Command() const { return emulator + (emulated() ? " " : "") + path; }
+
+std::vector<int> Types(std::vector<int> all) {
+    std::erase_if(all, [](int type) {
+        if (Tested().emulated()) return type != 0 && type != 2;
+        return Tested().sanitized() && type > 2 && type != 7;
+    });
+    return all;
+}
+
 ToolStart::ToolStart(const Arguments& arguments) {
-    std::istringstream emulator(MAVOEA_EMULATOR);
+    std::istringstream emulator(Tested().emulator);
     words_.assign(std::istream_iterator<std::string>(emulator), {});
-    words_.push_back(MAVOEA_TOOL_PATH);
+    words_.push_back(Tested().path);
     words_.insert(words_.end(), arguments.begin(), arguments.end());
     for (std::string& word : words_) argv_.push_back(word.data());
     argv_.push_back(nullptr);
@@ -61,7 +85,7 @@ ToolResult RunTool(const Arguments& arguments, const std::string& input, Limits 
         for (int i = 0; i < 3; ++i) {
             if (dup2(fds[i], i) != i) _exit(126);
         }
-        if (limits.memory != 0 && std::string(MAVOEA_TOOL_SANITIZED).empty()) {
+        if (limits.memory != 0 && !Tested().emulated() && !Tested().sanitized()) {
             Limit(RLIMIT_AS, limits.memory);
         }
         if (limits.file_size != 0) {

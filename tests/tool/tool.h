@@ -32,26 +32,43 @@ void PrintTo(const ToolResult& result, std::ostream* out);
 
 using Arguments = std::vector<std::string>;
 
-// Volume types; of those that keep metadata in the same way only the first where programs take long
-// to start, in an emulator and under a sanitizer.
-inline std::vector<int> Types(std::vector<int> all) {
-    const bool slow = kEmulated || *MAVOEA_TOOL_SANITIZED != '\0';
-    if (slow) std::erase_if(all, [](int type) { return type > 2 && type != 7; });
-    return all;
+// The tool that is tested. It is that of the tests' own build; the environment may name one of
+// another build, which need not be for this kind of processor: MAVOEA_TOOL, MAVOEA_TOOL_EMULATOR
+// and MAVOEA_TOOL_SANITIZERS.
+struct TestedTool {
+    std::string path;
+    std::string emulator;    // with its arguments; empty: none
+    std::string sanitizers;  // those that it is built with; empty: none
+
+    bool emulated() const { return !emulator.empty(); }
+    bool sanitized() const { return !sanitizers.empty(); }
+    std::string Command() const;  // the words of a shell's command line that start it
+};
+const TestedTool& Tested();
+
+// Volume types; where programs take long to start some of them. Under a sanitizer, of those that
+// keep metadata in the same way the first; in an emulator two, which make files of every layout.
+std::vector<int> Types(std::vector<int> all);
+
+// Each step of a long series, or each seventh where the tool runs in an emulator.
+inline std::size_t SeriesStep() { return Tested().emulated() ? kEmulatedSeriesStep : 1; }
+
+// Pairs of volume types, on each of which many tests run: each third under a sanitizer, where a run
+// of the tool takes five times as long, so that each of the four kinds is at both ends.
+template <class T>
+std::vector<T> Thinned(const std::vector<T>& all) {
+    const std::size_t step = Tested().sanitized() ? 3 : SeriesStep();
+    std::vector<T> some;
+    for (std::size_t i = 0; i < all.size(); i += step) some.push_back(all[i]);
+    return some;
 }
 
 // What the tool may use, in bytes, 0 for as much as it likes. A limit on memory has no effect under
-// a sanitizer, which needs much of its own, nor in an emulator, which does not pass it on.
+// a sanitizer and in an emulator, which need much of their own.
 struct Limits {
     std::size_t memory = 0;
     std::size_t file_size = 0;  // of every file that it writes, its output too
 };
-
-// The words of a shell's command line that start the tool.
-inline std::string ToolCommand() {
-    const std::string emulator = MAVOEA_EMULATOR;
-    return emulator + (emulator.empty() ? "" : " ") + MAVOEA_TOOL_PATH;
-}
 
 // What starts the tool in place of a process; made before a fork, so that the child need not
 // allocate.

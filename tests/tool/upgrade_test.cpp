@@ -283,7 +283,7 @@ std::string OnTerminal(const std::string& arguments, int* status) {
     const std::string name = ptsname(terminal);
     // Held open, so that what was written can be read after the program's end.
     const int other_side = open(name.c_str(), O_RDWR | O_NOCTTY | O_CLOEXEC);
-    const std::string command = ToolCommand() + " " + arguments + " >/dev/null 2>" + name;
+    const std::string command = Tested().Command() + " " + arguments + " >/dev/null 2>" + name;
     *status = system(command.c_str());
     std::string text(4096, '\0');
     const ssize_t size =
