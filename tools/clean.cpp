@@ -8,6 +8,7 @@
 #include "tools/dangling.h"
 #include "tools/file.h"
 #include "tools/output.h"
+#include "tools/text.h"
 #include "tools/volume.h"
 
 namespace mavoea::tool {

@@ -8,6 +8,7 @@
 #include "tools/file.h"
 #include "tools/output.h"
 #include "tools/store.h"
+#include "tools/text.h"
 
 namespace mavoea::tool {
 namespace {

@@ -27,11 +27,6 @@ Json::Json(const Json& other) : value_(std::make_unique<Value>(*other.value_)) {
 Json::Json(Json&& other) noexcept = default;
 Json::~Json() = default;
 
-Json& Json::operator=(Json other) noexcept {
-    value_ = std::move(other.value_);
-    return *this;
-}
-
 Json Json::Array() {
     Json array;
     *array.value_ = Value::array();
@@ -49,10 +44,9 @@ void Json::Set(std::string_view key, Json value) {
 }
 
 void Json::SetText(const std::string& key, std::string_view text) {
-    auto made = Value::parse(Dump(text, -1)).get<std::string>();
-    const bool is_utf8 = made == text;
-    (*value_)[key] = std::move(made);
-    if (!is_utf8) {
+    const auto made = Value::parse(Dump(text, -1)).get<std::string>();
+    Set(key, made);
+    if (made != text) {
         Set(key + "Hex",
             HexDigits({reinterpret_cast<const std::uint8_t*>(text.data()), text.size()}));
     }

@@ -37,7 +37,6 @@ class Json {
     // NOLINTEND(google-explicit-constructor)
     Json(const Json& other);
     Json(Json&& other) noexcept;
-    Json& operator=(Json other) noexcept;
     ~Json();
 
     static Json Array();
