@@ -53,10 +53,7 @@ const TestedTool& Tested() {
 std::string TestedTool::Command() const { return emulator + (emulated() ? " " : "") + path; }
 
 std::vector<int> Types(std::vector<int> all) {
-    std::erase_if(all, [](int type) {
-        if (Tested().emulated()) return type != 0 && type != 2;
-        return Tested().sanitized() && type > 2 && type != 7;
-    });
+    if (Tested().emulated()) std::erase_if(all, [](int type) { return type != 0 && type != 2; });
     return all;
 }
 

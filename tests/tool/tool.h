@@ -46,20 +46,16 @@ struct TestedTool {
 };
 const TestedTool& Tested();
 
-// Volume types; where programs take long to start some of them. Under a sanitizer, of those that
-// keep metadata in the same way the first; in an emulator two, which make files of every layout.
+// Volume types; in an emulator two of them, which make files of every layout.
 std::vector<int> Types(std::vector<int> all);
 
 // Each step of a long series, or each seventh where the tool runs in an emulator.
 inline std::size_t SeriesStep() { return Tested().emulated() ? kEmulatedSeriesStep : 1; }
 
-// Pairs of volume types, on each of which many tests run: each third under a sanitizer, where a run
-// of the tool takes five times as long, so that each of the four kinds is at both ends.
 template <class T>
 std::vector<T> Thinned(const std::vector<T>& all) {
-    const std::size_t step = Tested().sanitized() ? 3 : SeriesStep();
     std::vector<T> some;
-    for (std::size_t i = 0; i < all.size(); i += step) some.push_back(all[i]);
+    for (std::size_t i = 0; i < all.size(); i += SeriesStep()) some.push_back(all[i]);
     return some;
 }
 
