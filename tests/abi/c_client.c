@@ -131,7 +131,7 @@ int main(void) {
 
     snprintf(command, sizeof command, "%s/%s/@eaDir", start, dir);
     CHECK(MAVOEAMKDir(0, command) == 0); /* exists already */
-    snprintf(command, sizeof command, "rm -rf '%s/%s'", start, dir);
+    snprintf(command, sizeof command, "rm -rf %s", dir);
     CHECK(system(command) == 0);
     return failures == 0 ? 0 : 1;
 }

@@ -1388,9 +1388,7 @@ class OtherOwnerTest : public HostileNeighboursTest {
  protected:
     static constexpr uid_t kUser = 54321;
 
-    void SetUp() override {
-        if (!RunsAsRoot()) GTEST_SKIP() << "needs root, to become another user";
-    }
+    void SetUp() override { MAVOEA_SKIP_WITHOUT_OTHER_USERS(); }
 };
 
 TEST_F(OtherOwnerTest, AFileOfAnotherUserIsNotOpenedAndKeepsItsMode) {

@@ -14,6 +14,9 @@
 namespace mavoea::test {
 namespace {
 
+// Tests expect the modes that the usual umask gives, and let other users into their directories.
+[[maybe_unused]] const mode_t kFormerUmask = umask(022);
+
 [[noreturn]] void Die(const std::string& why) {
     fprintf(stderr, "test support: %s\n", why.c_str());
     abort();

@@ -481,7 +481,7 @@ TEST_F(EaMkdirTest, AFailedSwitchBackIsNotLookedAt) {
 }
 
 TEST_F(EaMkdirTest, AProcessWithASavedUidOf0MakesThemAsTheSuperuserAndComesBack) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     ASSERT_EQ(0, ::chmod(dir_.path().c_str(), 0755));  // the user may not write here
     AsUser(kUser, Root::kSaved, [this] {
@@ -504,7 +504,7 @@ TEST_F(EaMkdirTest, AProcessWithASavedUidOf0MakesThemAsTheSuperuserAndComesBack)
 }
 
 TEST_F(EaMkdirTest, AProcessThatCannotBecomeTheSuperuserMakesNothing) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     AsUser(65534, Root::kGivenUp, [this] {
         EXPECT_EQ(-1, MAVOEAMKDir(1, folder_.c_str()));

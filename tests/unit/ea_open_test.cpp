@@ -638,7 +638,7 @@ TEST_P(EaOpenUpgradeTest, AFailureOfTheUpgradeIsIgnored) {
 // ---- As another user ------------------------------------------------------------------------
 
 TEST_P(EaOpenInEaDirTest, TheDirectoryIsMadeByTheSuperuserAndTheFileByTheUser) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     ASSERT_EQ(0, chmod(dir_.path().c_str(), 0755));  // the user may not write here
     AsUser(kUser, Root::kSaved, [this] {
@@ -654,7 +654,7 @@ TEST_P(EaOpenInEaDirTest, TheDirectoryIsMadeByTheSuperuserAndTheFileByTheUser) {
 }
 
 TEST_P(EaOpenInEaDirTest, AFileThatTheUserMayNotOpenFailsWithEaccesOnce) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     MakeEaDir();
     WriteFile(stream_, Ascii("stream"));
@@ -672,7 +672,7 @@ TEST_P(EaOpenInEaDirTest, AFileThatTheUserMayNotOpenFailsWithEaccesOnce) {
 }
 
 TEST_P(EaOpenInEaDirTest, WhoCannotBecomeTheSuperuserCannotCreateEvenWhereTheDirectoryExists) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     MakeEaDir();
     ASSERT_EQ(0, chmod(ea_dir_.c_str(), 0777));
@@ -802,7 +802,7 @@ TEST_F(EaOpenAppleDoubleTest, ADirectoryInPlaceOfTheFileFailsWithEisdir) {
 }
 
 TEST_F(EaOpenAppleDoubleTest, AFileThatTheUserMayNotOpenFailsWithEacces) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     WriteFile(sidecar_, Ascii("double"));
     ASSERT_EQ(0, chmod(sidecar_.c_str(), 0600));
@@ -810,7 +810,7 @@ TEST_F(EaOpenAppleDoubleTest, AFileThatTheUserMayNotOpenFailsWithEacces) {
 }
 
 TEST_F(EaOpenAppleDoubleTest, WhoCannotBecomeTheSuperuserCreatesIt) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     AsUser(65534, Root::kGivenUp, [this] {
         const Fd fd(Open(O_RDWR | O_CREAT));

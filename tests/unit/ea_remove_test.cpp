@@ -1246,7 +1246,7 @@ TEST_F(EaRemoveTest, ALargeEaDirectoryIsNotRead) {
 // ---- As another user ----------------------------------------------------------------------------
 
 TEST_F(EaRemoveTest, WhoMayNotWriteTheEaDirectoryFailsWith0x3900AndLosesNothing) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     file_.MakeStream();
     file_.MakeResource();
     ASSERT_EQ(0, ::chmod(file_.ea_dir().c_str(), 0755));
@@ -1260,7 +1260,7 @@ TEST_F(EaRemoveTest, WhoMayNotWriteTheEaDirectoryFailsWith0x3900AndLosesNothing)
 }
 
 TEST_F(EaRemoveTest, WhoMayNotReadTheEaDirectoryLogsThatAndLeavesIt) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     other_.MakeStream();
     ASSERT_EQ(0, ::chmod(file_.ea_dir().c_str(), 0));
     AsUser(kNobody, Root::kGivenUp, [this] {
@@ -1272,7 +1272,7 @@ TEST_F(EaRemoveTest, WhoMayNotReadTheEaDirectoryLogsThatAndLeavesIt) {
 }
 
 TEST_F(EaRemoveTest, WhoMayNotReadALegacyFolderLeavesIt) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     file_.MakeLegacy("color");
     ASSERT_EQ(0, ::chmod(file_.folder().c_str(), 0));
     AsUser(kNobody, Root::kGivenUp, [this] {

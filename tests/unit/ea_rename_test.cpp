@@ -1279,7 +1279,7 @@ TEST_F(EaRenameTest, ANewSidecarThatCannotBeLookedAtCountsAsMissing) {
 // ---- As another user ----------------------------------------------------------------------------
 
 TEST_F(EaRenameTest, WhoMayNotWriteTheOldEaDirectoryFailsAndLosesNothing) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     old_.MakeStream();
     MakeDir(new_.ea_dir());
@@ -1294,7 +1294,7 @@ TEST_F(EaRenameTest, WhoMayNotWriteTheOldEaDirectoryFailsAndLosesNothing) {
 }
 
 TEST_F(EaRenameTest, AUserMovesFilesIntoAnEaDirectoryThatTheSuperuserMakes) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     old_.MakeStream();
     for (const std::string& dir : {old_.parent, old_.ea_dir()}) {

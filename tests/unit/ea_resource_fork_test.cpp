@@ -500,7 +500,7 @@ TEST_P(ResourceForkOperationTest, AForkWhosePathDoesNotFitFailsAsAFailedStat) {
 
 // With the real identity: a process that can become the superuser does, and comes back.
 TEST_P(ResourceForkOperationTest, AProcessWithASavedUidOf0BecomesTheSuperuserAndComesBack) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     SetMode(0640);
     ASSERT_EQ(0, chmod(fork_.c_str(), 0600));  // only root may use the fork
@@ -523,7 +523,7 @@ TEST_P(ResourceForkOperationTest, AProcessWithASavedUidOf0BecomesTheSuperuserAnd
 }
 
 TEST_P(ResourceForkOperationTest, WithTheBitInPlaceTheForkIsUsedAsTheUserWhoCalls) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     ASSERT_EQ(0, chmod(fork_.c_str(), 0600));
     AsUser(kUser, Root::kSaved, [this] {
@@ -536,7 +536,7 @@ TEST_P(ResourceForkOperationTest, WithTheBitInPlaceTheForkIsUsedAsTheUserWhoCall
 }
 
 TEST_P(ResourceForkOperationTest, AProcessThatCannotBecomeTheSuperuserLogsItAndGoesOn) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     SetMode(0644);
     ASSERT_EQ(0, chown(object_.c_str(), 65534, 65534));
@@ -552,7 +552,7 @@ TEST_P(ResourceForkOperationTest, AProcessThatCannotBecomeTheSuperuserLogsItAndG
 }
 
 TEST_P(ResourceForkOperationTest, AFileOfSomebodyElseKeepsItsModeAndItsForkIsTriedAllTheSame) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
     SetMode(0644);
     ASSERT_EQ(0, chmod(fork_.c_str(), 0666));

@@ -860,7 +860,7 @@ TEST_F(EaUpgradeBadFileTest, ASocket) {
 }
 
 TEST_F(EaUpgradeBadFileTest, OneThatTheUserMayNotRead) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     MakeFolder(two_);
     WriteFile(bad_, Ascii("secret"));
     ASSERT_EQ(0, chmod(bad_.c_str(), 0600));
@@ -1234,7 +1234,7 @@ TEST_F(EaUpgradeTest, AProcessInTheLegacyFolderItselfStaysInIt) {
 }
 
 TEST_F(EaUpgradeTest, AProcessThatCouldNotComeBackStaysWhereItIsAndTheUpgradeFails) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     MakeFolder(two_);
     MakeSidecar(SmallSidecar(), 200);
     const TempDir closed;
@@ -1253,7 +1253,7 @@ TEST_F(EaUpgradeTest, AProcessThatCouldNotComeBackStaysWhereItIsAndTheUpgradeFai
 }
 
 TEST_F(EaUpgradeTest, AProcessWhoseWayBackClosesMeanwhileIsLeftInTheRootDirectory) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs to be started as the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     MakeFolder(two_);
     AsUser(kUser, Root::kGivenUp, [this] {
         const std::string own = dir_ / "own";

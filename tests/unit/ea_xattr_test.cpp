@@ -159,7 +159,7 @@ TEST_F(RealXattrEnumTest, NamesAreAppendedToWhatTheListHolds) {
 
 TEST_F(RealXattrEnumTest, NamesThatSetfattrWroteAreFound) {
     if (!HasProgram("setfattr")) GTEST_SKIP() << "setfattr is not installed (package attr)";
-    ASSERT_EQ(0, RunProgram("setfattr -n user.by.setfattr -v text '" + object_ + "'").status);
+    ASSERT_EQ(0, RunProgram("setfattr -n user.by.setfattr -v text " + Quoted(object_)).status);
     List list;
     EXPECT_EQ(0, MAVOEAXattrEnum(object_.c_str(), list.out()));
     EXPECT_THAT(list.strings(), Contains("user.by.setfattr"));
@@ -458,7 +458,7 @@ TEST_F(XattrGetTest, AnyNegativeResultBecomesMinusOne) {
 
 TEST_F(RealXattrGetTest, AValueThatSetfattrWroteIsRead) {
     if (!HasProgram("setfattr")) GTEST_SKIP() << "setfattr is not installed (package attr)";
-    ASSERT_EQ(0, RunProgram("setfattr -n user.hex -v 0x00FF4D '" + object_ + "'").status);
+    ASSERT_EQ(0, RunProgram("setfattr -n user.hex -v 0x00FF4D " + Quoted(object_)).status);
     char value[8];
     ASSERT_EQ(3, MAVOEAXattrGet(object_.c_str(), "user.hex", value, 8));
     EXPECT_EQ(Hex("00 FF 4D"), Bytes(value, value + 3));
@@ -524,7 +524,7 @@ TEST_F(RealXattrSetTest, GetfattrSeesTheValue) {
     if (!HasProgram("getfattr")) GTEST_SKIP() << "getfattr is not installed (package attr)";
     ASSERT_EQ(0, MAVOEAXattrSet(object_.c_str(), "user.seen", "by others", 9, 0));
     const auto seen =
-        RunProgram("getfattr --absolute-names --only-values -n user.seen '" + object_ + "'");
+        RunProgram("getfattr --absolute-names --only-values -n user.seen " + Quoted(object_));
     EXPECT_EQ(0, seen.status);
     EXPECT_EQ("by others", seen.output);
 }
@@ -630,7 +630,7 @@ TEST_F(RealXattrRemoveTest, GetfattrNoLongerSeesIt) {
     Put("user.gone", "1");
     Put("user.stays", "2");
     ASSERT_EQ(0, MAVOEAXattrRemove(object_.c_str(), "user.gone"));
-    const auto seen = RunProgram("getfattr --absolute-names -m user. '" + object_ + "'");
+    const auto seen = RunProgram("getfattr --absolute-names -m user. " + Quoted(object_));
     EXPECT_EQ("# file: " + object_ + "\nuser.stays\n\n", seen.output);
 }
 

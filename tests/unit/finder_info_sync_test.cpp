@@ -360,7 +360,7 @@ TEST_F(FinderInfoTest, AResourceFileThatCannotBeOpenedStopsTheSync) {
 }
 
 TEST_F(FinderInfoTest, AResourceFileThatAnotherUserMayNotReadStopsTheSync) {
-    if (!RunsAsRoot()) GTEST_SKIP() << "needs the superuser";
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     FillResourceFile(FreshResourceFile(Pattern(32)));
     ASSERT_EQ(0, chmod(dir_.path().c_str(), 0777));
     ASSERT_EQ(0, chmod(object_.c_str(), 0666));

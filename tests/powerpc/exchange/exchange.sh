@@ -12,7 +12,7 @@ trap 'rm -rf "$work"' EXIT
 {
     echo '#!/bin/sh'
     printf 'exec'
-    for word in "$@"; do printf " '%s'" "$word"; done
+    for word in "$@"; do printf " '%s'" "$(printf %s "$word" | sed "s/'/'\\\\''/g")"; done
     echo ' "$@"'
 } > "$work/cross"
 chmod +x "$work/cross"
