@@ -95,6 +95,10 @@ apt update
 
 # ---- Building -------------------------------------------------------------------------------------
 
+# They are put in place by a copy, as configure takes no path with a blank. Each looks for the other
+# where it lies itself, wherever that is.
+stage=$work/stage
+export LD_RUN_PATH='$ORIGIN'
 build() {
     cd "$work"/source/"$1"-*/
     # Debian's patches are younger than the files generated from what they change; those need not be
@@ -102,13 +106,18 @@ build() {
     touch aclocal.m4
     find . -name Makefile.in -exec touch {} +
     touch configure include/config.h.in
-    ./configure --quiet --host=$host --prefix="$prefix" --disable-static --disable-nls \
-        CPPFLAGS="-I$prefix/include" LDFLAGS="-L$prefix/lib"
-    make -s -j 2 > make.log 2>&1 && make -s install >> make.log 2>&1 || { cat make.log; exit 1; }
-    rm -f "$prefix"/lib/lib"$1".la
+    ./configure --quiet --host=$host --prefix=/usr --libdir=/usr/lib --sysconfdir=/etc \
+        --disable-static --disable-nls CPPFLAGS="-I$stage/usr/include" LDFLAGS="-L$stage/usr/lib"
+    make -s -j 2 > make.log 2>&1 && make -s install DESTDIR="$stage" >> make.log 2>&1 ||
+        { cat make.log; exit 1; }
+    rm -f "$stage"/usr/lib/lib"$1".la
 }
 (build attr)
 (build acl)
+rm -rf "$prefix/lib"
+mkdir "$prefix/lib"
+cp -P "$stage"/usr/lib/lib*.so* "$prefix/lib"
+cp -R "$stage"/usr/include/* "$prefix/include"
 
 # ---- Headers --------------------------------------------------------------------------------------
 
