@@ -5,8 +5,6 @@
 #include <errno.h>
 #include <limits.h>
 #include <linux/magic.h>
-#include <stdlib.h>
-#include <string.h>
 #include <sys/stat.h>
 #include <sys/sysmacros.h>
 #include <sys/vfs.h>
@@ -37,48 +35,6 @@ constexpr std::uint32_t kZfs = 0x2FC12FC1;
 constexpr std::uint32_t kBcachefs = 0xCA451A4E;
 constexpr std::uint32_t kUbifs = 0x24051905;
 constexpr std::uint32_t kGfs2 = 0x01161970;
-
-// The normalized text of an absolute path. Paths that the kernel takes stay on the stack.
-class LexicalPath {
- public:
-    explicit LexicalPath(std::string_view path) {
-        if (path.size() >= sizeof stack_) {
-            heap_ = static_cast<char*>(malloc(path.size() + 1));
-            if (heap_ == nullptr) return;
-        }
-        data_ = heap_ != nullptr ? heap_ : stack_;
-        size_ = NormalizePath(path, data_);
-    }
-    ~LexicalPath() {
-        const int saved = errno;
-        free(heap_);
-        errno = saved;
-    }
-    LexicalPath(const LexicalPath&) = delete;
-    LexicalPath& operator=(const LexicalPath&) = delete;
-
-    bool ok() const { return data_ != nullptr; }  // false: out of memory
-    std::string_view text() const { return {data_, size_}; }
-
-    // Turns the path into its parent's; the root has none.
-    void CutLast() {
-        while (size_ > 0 && data_[--size_] != '/') {
-        }
-    }
-
-    // Ended by a NUL, and "/" for the root. Only for paths below PATH_MAX.
-    const char* c_str() {
-        if (size_ == 0) return "/";
-        data_[size_] = '\0';
-        return data_;
-    }
-
- private:
-    char* heap_ = nullptr;
-    char* data_ = nullptr;
-    std::size_t size_ = 0;
-    char stack_[PATH_MAX];
-};
 
 bool MeansNothingThere(int error) {
     return error == ENOENT || error == ENOTDIR || error == ENAMETOOLONG;

@@ -2,6 +2,10 @@
 #ifndef MAVOEA_PLATFORM_CORE_LEXICAL_PATH_H_
 #define MAVOEA_PLATFORM_CORE_LEXICAL_PATH_H_
 
+#include <errno.h>
+#include <limits.h>
+#include <stdlib.h>
+
 #include <cstddef>
 #include <string_view>
 
@@ -44,6 +48,48 @@ constexpr bool IsInside(std::string_view path, std::string_view directory) {
 
 static_assert(IsInside("/v/a", "/v") && IsInside("/v", "/v") && IsInside("/v", ""));
 static_assert(!IsInside("/volume", "/v") && !IsInside("/", "/v") && IsInside("", ""));
+
+// The normalized text of an absolute path. Paths that the kernel takes stay on the stack.
+class LexicalPath {
+ public:
+    explicit LexicalPath(std::string_view path) {
+        if (path.size() >= sizeof stack_) {
+            heap_ = static_cast<char*>(malloc(path.size() + 1));
+            if (heap_ == nullptr) return;
+        }
+        data_ = heap_ != nullptr ? heap_ : stack_;
+        size_ = NormalizePath(path, data_);
+    }
+    ~LexicalPath() {
+        const int saved = errno;
+        free(heap_);
+        errno = saved;
+    }
+    LexicalPath(const LexicalPath&) = delete;
+    LexicalPath& operator=(const LexicalPath&) = delete;
+
+    bool ok() const { return data_ != nullptr; }  // false: out of memory
+    std::string_view text() const { return {data_, size_}; }
+
+    // Turns the path into its parent's; the root has none.
+    void CutLast() {
+        while (size_ > 0 && data_[--size_] != '/') {
+        }
+    }
+
+    // Ended by a NUL, and "/" for the root. Only for paths below PATH_MAX.
+    const char* c_str() {
+        if (size_ == 0) return "/";
+        data_[size_] = '\0';
+        return data_;
+    }
+
+ private:
+    char* heap_ = nullptr;
+    char* data_ = nullptr;
+    std::size_t size_ = 0;
+    char stack_[PATH_MAX];
+};
 
 }  // namespace mavoea::core
 

@@ -105,7 +105,7 @@ FILE* OpenRegular(const char* path, struct stat* status) {
     if (fd < 0) return nullptr;
     FILE* file = nullptr;
     if (fstat(fd, status) == 0) {
-        errno = EINVAL;
+        errno = S_ISDIR(status->st_mode) ? EISDIR : ENXIO;
         if (S_ISREG(status->st_mode)) file = fdopen(fd, "r");
     }
     if (file != nullptr) return file;
@@ -115,27 +115,31 @@ FILE* OpenRegular(const char* path, struct stat* status) {
     return nullptr;
 }
 
-// Reads every line into `volumes` and reports the malformed ones. 0, or the error that ended it.
-int ReadLines(FILE* file, const char* name, VolumeList* volumes) {
+// Reads every line into `volumes` and reports the malformed ones. What went wrong is the result.
+VolumeTable::Fault ReadLines(FILE* file, const char* name, VolumeList* volumes) {
+    VolumeTable::Fault fault;
     char* text = nullptr;
     std::size_t capacity = 0;
-    int error = 0;
-    for (int number = 1; error == 0; ++number) {
+    for (int number = 1; fault.error == 0; ++number) {
         errno = 0;
         const ssize_t size = getline(&text, &capacity, file);
         if (size < 0) {
-            error = feof(file) != 0 ? 0 : errno;
+            fault.error = feof(file) != 0 ? 0 : errno;
             break;
         }
         const Line line = ParseLine({text, static_cast<std::size_t>(size)});
         if (line.complaint != nullptr) {
             syslog(LOG_WARNING, "%s:%d %s, line skipped", name, number, line.complaint);
-        } else if (!line.path.empty() && !volumes->Set(line.path, line.type)) {
-            error = ENOMEM;
+            if (fault.line == 0) {
+                fault.line = number;
+                fault.problem = line.complaint;
+            }
+        } else if (!line.path.empty() && !volumes->Set(line.path, line.type, number)) {
+            fault.error = ENOMEM;
         }
     }
     free(text);
-    return error;
+    return fault;
 }
 
 constinit VolumeTable process_table(MAVO_VOLUME_TABLE);
@@ -144,7 +148,7 @@ constinit VolumeTable process_table(MAVO_VOLUME_TABLE);
 
 // ---- VolumeList ---------------------------------------------------------------------------------
 
-bool VolumeList::Set(std::string_view path, int type) {
+bool VolumeList::Set(std::string_view path, int type, int line) {
     auto* const copy = static_cast<char*>(malloc(path.size()));
     if (copy == nullptr) return false;
     const std::size_t size = NormalizePath(path, copy);
@@ -154,6 +158,7 @@ bool VolumeList::Set(std::string_view path, int type) {
         if (std::string_view(volume.path, volume.size) != std::string_view(copy, size)) continue;
         free(copy);
         volume.type = type;
+        volume.line = line;
         return true;
     }
 
@@ -167,7 +172,7 @@ bool VolumeList::Set(std::string_view path, int type) {
         volumes_ = static_cast<Volume*>(grown);
         capacity_ = capacity;
     }
-    volumes_[count_++] = {copy, size, type};
+    volumes_[count_++] = {copy, size, type, line};
     return true;
 }
 
@@ -176,7 +181,8 @@ VolumeList::Match VolumeList::Find(std::string_view path) const {
     for (std::size_t i = 0; i < count_; ++i) {
         const Volume& volume = volumes_[i];
         if (best.type >= 0 && volume.size < best.size) continue;
-        if (IsInside(path, {volume.path, volume.size})) best = {volume.size, volume.type};
+        if (!IsInside(path, {volume.path, volume.size})) continue;
+        best = {volume.size, volume.type, volume.line};
     }
     return best;
 }
@@ -191,10 +197,10 @@ void VolumeList::Clear() {
 
 bool VolumeTable::Declare(std::string_view path, int type) {
     const MutexLock lock(&mutex_);
-    return declared_.Set(path, type);
+    return declared_.Set(path, type, 0);
 }
 
-int VolumeTable::Find(std::string_view path) {
+bool VolumeTable::Find(std::string_view path, MAVOVolumeEntry* entry) {
     const int saved = errno;
     VolumeList::Match declared;
     VolumeList::Match listed;
@@ -207,13 +213,36 @@ int VolumeTable::Find(std::string_view path) {
     errno = saved;
     const bool file_knows_better =
         declared.type < 0 || (listed.type >= 0 && listed.size > declared.size);
-    return file_knows_better ? listed.type : declared.type;
+    const VolumeList::Match& best = file_knows_better ? listed : declared;
+    if (best.type < 0) return false;
+    *entry = {.type = best.type,
+              .source = file_knows_better ? MAVO_VOLUME_LISTED : MAVO_VOLUME_DECLARED,
+              .line = best.line};
+    return true;
+}
+
+int VolumeTable::Find(std::string_view path) {
+    MAVOVolumeEntry entry;
+    return Find(path, &entry) ? entry.type : -1;
+}
+
+VolumeTable::Fault VolumeTable::Check() {
+    const int saved = errno;
+    Fault fault;
+    {
+        const MutexLock lock(&mutex_);
+        const int error = Refresh();
+        fault = error == 0 ? fault_ : Fault{.error = error};
+    }
+    errno = saved;
+    return fault;
 }
 
 void VolumeTable::Clear() {
     declared_.Clear();
     listed_.Clear();
     loaded_ = {};
+    fault_ = {};
 }
 
 VolumeTable::Signature VolumeTable::SignatureOf(int result, const struct stat& status) {
@@ -230,37 +259,40 @@ bool VolumeTable::Same(const Signature& a, const Signature& b) {
            core::Same(a.modified, b.modified) && core::Same(a.changed, b.changed);
 }
 
-void VolumeTable::Refresh() {
+int VolumeTable::Refresh() {
     struct stat status;
     const Signature now = SignatureOf(stat(file_, &status), status);
-    if (!Same(now, loaded_)) Load(now);
+    return Same(now, loaded_) ? 0 : Load(now);
 }
 
 // Whatever goes wrong is reported once per state of the file; only for memory is it tried again.
-void VolumeTable::Load(const Signature& seen) {
+int VolumeTable::Load(const Signature& seen) {
     struct stat status;
     VolumeList volumes;
     Signature loaded = seen;
-    int error = 0;
+    Fault fault;
     if (FILE* const file = OpenRegular(file_, &status)) {
         // Taken before the first byte is read: a change meanwhile makes it differ the next time.
         loaded = SignatureOf(0, status);
-        error = ReadLines(file, file_, &volumes);
+        fault = ReadLines(file, file_, &volumes);
         fclose(file);
     } else {
-        error = errno;
+        fault.error = errno;
+        if (fault.error == ENOENT || fault.error == ENOTDIR) fault.error = 0;  // it need not exist
     }
 
-    if (error == ENOMEM) {
+    if (fault.error == ENOMEM) {
         volumes.Clear();
-        return;
+        return ENOMEM;
     }
-    if (error != 0 && error != ENOENT && error != ENOTDIR) {
-        syslog(LOG_WARNING, "%s cannot be read: %s", file_, strerror(error));
+    if (fault.error != 0) {
+        syslog(LOG_WARNING, "%s cannot be read: %s", file_, strerror(fault.error));
     }
     listed_.Clear();
     listed_ = volumes;
     loaded_ = loaded;
+    fault_ = fault;
+    return 0;
 }
 
 VolumeTable& ProcessVolumeTable() { return process_table; }
@@ -283,4 +315,30 @@ int MAVOVolumeDeclare(const char* szPath, int type) {
 
 int MAVOVolumeTypeFromName(const char* szName) {
     return szName == nullptr ? -1 : ParseType(szName);
+}
+
+int MAVOVolumeFind(const char* szPath, MAVOVolumeEntry* pEntry) {
+    if (szPath == nullptr || !IsAbsolute(szPath) || pEntry == nullptr) {
+        errno = EINVAL;
+        return -1;
+    }
+    const LexicalPath lexical(szPath);
+    if (!lexical.ok()) return -1;
+    return process_table.Find(lexical.text(), pEntry) ? 1 : 0;
+}
+
+int MAVOVolumeTableCheck(int* pLine, const char** pszProblem) {
+    if (pLine == nullptr || pszProblem == nullptr) {
+        errno = EINVAL;
+        return -1;
+    }
+    const VolumeTable::Fault fault = process_table.Check();
+    if (fault.error != 0) {
+        errno = fault.error;
+        return -1;
+    }
+    if (fault.line == 0) return 0;
+    *pLine = fault.line;
+    *pszProblem = fault.problem;
+    return 1;
 }

@@ -9,20 +9,23 @@
 #include <cstddef>
 #include <string_view>
 
+#include "platform/include/mavocore.h"
+
 namespace mavoea::core {
 
 // Volumes and their types. What it holds is freed with Clear() and not by a destructor, so that the
 // process's table stays usable for threads that still run while the process exits.
 class VolumeList {
  public:
-    // Adds a volume, or changes its type. `path` is absolute. False when out of memory; the list is
-    // unchanged then.
-    bool Set(std::string_view path, int type);
+    // Adds a volume, or changes its type and line. `path` is absolute. False when out of memory;
+    // the list is unchanged then.
+    bool Set(std::string_view path, int type, int line);
 
     // A volume that was found; `size` tells how long its path is. Without one, `type` is -1.
     struct Match {
         std::size_t size = 0;
         int type = -1;
+        int line = 0;
     };
 
     // The volume with the longest path that `path`, normalized, is inside.
@@ -35,6 +38,7 @@ class VolumeList {
         char* path;  // normalized, without a NUL
         std::size_t size;
         int type;
+        int line;  // 0: of no file
     };
 
     Volume* volumes_ = nullptr;
@@ -53,9 +57,20 @@ class VolumeTable {
     // Declares a volume for this process. False when out of memory.
     bool Declare(std::string_view path, int type);
 
-    // The type of the volume that `path`, normalized, is inside; -1 when the table knows of none.
-    // Loads the file when it has changed. errno stays as it is.
+    // Whether `path`, normalized, is inside a volume; *entry becomes that volume's, or stays as it
+    // is. Loads the file when it has changed. errno stays as it is.
+    bool Find(std::string_view path, MAVOVolumeEntry* entry);
+
+    // Its type only; -1 for none.
     int Find(std::string_view path);
+
+    // What is wrong with the file as it is now. Loads it when it has changed. errno stays as it is.
+    struct Fault {
+        int error = 0;                  // why it cannot be read; all else says nothing then
+        int line = 0;                   // the first malformed one, from 1; 0: none is
+        const char* problem = nullptr;  // static text
+    };
+    Fault Check();
 
     void Clear();
 
@@ -72,14 +87,16 @@ class VolumeTable {
 
     static Signature SignatureOf(int result, const struct stat& status);
     static bool Same(const Signature& a, const Signature& b);
-    void Refresh();
-    void Load(const Signature& seen);
+    // 0, or ENOMEM: the table then holds what an earlier state of the file said.
+    int Refresh();
+    int Load(const Signature& seen);
 
     const char* const file_;
     pthread_mutex_t mutex_ = PTHREAD_MUTEX_INITIALIZER;
     VolumeList declared_ = {};
     VolumeList listed_ = {};
     Signature loaded_ = {};  // at first that of no file at all: an inode is never 0
+    Fault fault_ = {};       // of the state that has been loaded
 };
 
 // The table that MAVOGetFSType() asks.

@@ -117,6 +117,27 @@ MAVOCORE_API int MAVOVolumeDeclare(const char* szPath, int type);
  * (1), "fileea" (2), "xattr" (7). -1 when it means none. */
 MAVOCORE_API int MAVOVolumeTypeFromName(const char* szName);
 
+/* Where an entry of the volume table comes from. */
+enum { MAVO_VOLUME_DECLARED = 1, MAVO_VOLUME_LISTED = 2 };
+
+typedef struct MAVOVolumeEntry {
+    int type;   /* 0 to 12 */
+    int source; /* MAVO_VOLUME_... */
+    int line;   /* of MAVO_VOLUME_TABLE, from 1, when listed; else 0 */
+} MAVOVolumeEntry;
+
+/* The entry that decides for the absolute path szPath, as MAVOGetFSType() takes it; the filesystem
+ * is not asked. 1 and *pEntry; 0 when the table knows of none; -1 with errno EINVAL when an
+ * argument is NULL or the path is not absolute, or ENOMEM. *pEntry changes only with 1. */
+MAVOCORE_API int MAVOVolumeFind(const char* szPath, MAVOVolumeEntry* pEntry);
+
+/* Looks for what is wrong with MAVO_VOLUME_TABLE. 0: nothing, or the file is not there. 1: line
+ * *pLine, from 1, is the first malformed one, and *pszProblem says how, as "does not end in a
+ * volume type" does (static text). -1 with errno: the file cannot be read, EISDIR and ENXIO when it
+ * is no regular file; EINVAL when an argument is NULL. *pLine and *pszProblem change only with 1.
+ */
+MAVOCORE_API int MAVOVolumeTableCheck(int* pLine, const char** pszProblem);
+
 /* Which of the two indexes an event is for. */
 enum { MAVO_INDEX_FILE = 0, MAVO_INDEX_SEARCH = 1 };
 

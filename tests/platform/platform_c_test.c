@@ -44,6 +44,13 @@ int main(void) {
 
     CHECK(MAVOVolumeDeclare("/volume", MAVOVolumeTypeFromName("xattr")) == 0);
     CHECK(MAVOGetFSType("/volume/a", 1) == 7);
+    MAVOVolumeEntry entry;
+    CHECK(MAVOVolumeFind("/volume/a", &entry) == 1 && entry.type == 7);
+    CHECK(entry.source == MAVO_VOLUME_DECLARED && entry.line == 0);
+    int line = 0;
+    const char* problem = NULL;
+    CHECK(MAVOVolumeTableCheck(&line, NULL) == -1);
+    CHECK(MAVOVolumeTableCheck(&line, &problem) != 1 || (line > 0 && problem != NULL));
 
     char name[16];
     CHECK(MAVOStrReplaceFATReservedChar("a?", name, (int)sizeof name) == 0);

@@ -4,7 +4,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <cstdio>
 #include <fstream>
 #include <iterator>
 #include <regex>
@@ -13,8 +12,11 @@
 #include <string>
 #include <vector>
 
+#include "tests/support/process.h"
+
 namespace {
 
+using ::mavoea::test::Quoted;
 using ::testing::Contains;
 using ::testing::Each;
 using ::testing::IsEmpty;
@@ -23,19 +25,16 @@ using ::testing::Not;
 
 std::vector<std::string> LinesOf(const std::string& command) {
     std::vector<std::string> lines;
-    std::FILE* const pipe = popen(command.c_str(), "r");
-    if (pipe == nullptr) return lines;
-    std::string text;
-    for (int c; (c = std::fgetc(pipe)) != EOF;) text += static_cast<char>(c);
-    EXPECT_EQ(0, pclose(pipe)) << command;
-    std::istringstream in(text);
+    const mavoea::test::ProgramResult result = mavoea::test::RunProgram(command);
+    EXPECT_EQ(0, result.status) << command;
+    std::istringstream in(result.output);
     for (std::string line; std::getline(in, line);) lines.push_back(line);
     return lines;
 }
 
 std::set<std::string> ExportedBy(const std::string& library) {
     std::set<std::string> names;
-    for (const std::string& line : LinesOf("nm -D --defined-only '" + library + "'")) {
+    for (const std::string& line : LinesOf("nm -D --defined-only " + Quoted(library))) {
         std::smatch match;
         if (std::regex_match(line, std::regex("[0-9a-f]+ A LIB\\w+"))) continue;  // the version
         EXPECT_TRUE(std::regex_match(line, match, std::regex("[0-9a-f]+ T (\\w+)(@@\\w+)?")))
@@ -58,7 +57,7 @@ std::set<std::string> DeclaredIn(const std::string& header, const std::string& m
 
 std::vector<std::string> Tagged(const std::string& library, const std::string& tag) {
     std::vector<std::string> values;
-    for (const std::string& line : LinesOf("LC_ALL=C readelf -dW '" + library + "'")) {
+    for (const std::string& line : LinesOf("LC_ALL=C readelf -dW " + Quoted(library))) {
         std::smatch match;
         if (std::regex_search(line, match, std::regex("\\(" + tag + "\\).*\\[(.*)\\]"))) {
             values.push_back(match[1]);
@@ -70,7 +69,7 @@ std::vector<std::string> Tagged(const std::string& library, const std::string& t
 // Symbols that would come from the C++ run-time library.
 [[maybe_unused]] std::vector<std::string> CxxSymbolsNeededBy(const std::string& library) {
     std::vector<std::string> names;
-    for (const std::string& line : LinesOf("nm -D --undefined-only '" + library + "'")) {
+    for (const std::string& line : LinesOf("nm -D --undefined-only " + Quoted(library))) {
         if (std::regex_search(line, std::regex("GLIBCXX|CXXABI| _Z"))) names.push_back(line);
     }
     return names;
@@ -85,7 +84,8 @@ TEST(PlatformLibrariesTest, MavocoreExportsWhatItsHeaderDeclares) {
                                           "MLIBCFileStat",        "MAVOGetFSType",
                                           "MLIBMavoFileIndexAdd", "MLIBMavoIndexAddEx",
                                           "MAVOVolumeDeclare",    "MAVOStrReplaceFATReservedChar",
-                                          "MAVOIndexObserverSet", "MAVOVolumeTypeFromName"};
+                                          "MAVOIndexObserverSet", "MAVOVolumeTypeFromName",
+                                          "MAVOVolumeFind",       "MAVOVolumeTableCheck"};
     EXPECT_EQ(kNames, DeclaredIn(MAVOCORE_HEADER, "MAVOCORE_API"));
     EXPECT_EQ(kNames, ExportedBy(MAVOCORE_FILE));
 }
