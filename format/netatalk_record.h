@@ -53,6 +53,69 @@ inline constexpr std::array<RecordEntry, 8> kFreshRecord = {{
 }};
 static_assert(DescriptorsEnd(kFreshRecord.size()) == 122);
 
+// The head of a resource file that holds more than Finder info and a resource fork: netatalk's
+// classic layout, with the fork behind it.
+inline constexpr std::array<RecordEntry, 13> kResourceHead = {{
+    {Slot{3}, 3, {182, 0}},  // real name
+    {Slot::kComment, 4, {437, 0}},
+    {Slot::kFileDates, 8, {637, 16}},
+    {Slot::kFinderInfo, 9, {653, 32}},
+    {Slot{15}, 15, {685, 4}},  // AFP directory id
+    {Slot::kAfpFileInfo, 14, {689, 4}},
+    {Slot{13}, 13, {693, 0}},  // AFP short name
+    {Slot{11}, 11, {705, 8}},  // ProDOS file info
+    {Slot::kPrivateDevice, 0x80444556, {713, 0}},
+    {Slot::kPrivateInode, 0x80494E4F, {721, 0}},
+    {Slot::kPrivateSync, 0x8053594E, {729, 0}},
+    {Slot::kPrivateId, 0x8053567E, {737, 0}},
+    {Slot::kResourceFork, 2, {kResourceHeadSize, 0}},
+}};
+static_assert(DescriptorsEnd(kResourceHead.size()) == 182);
+
+// How many bytes an entry can have in a block of that layout; 0 where it has no place.
+template <std::size_t kCount>
+constexpr std::uint32_t RoomFor(const std::array<RecordEntry, kCount>& layout, std::uint32_t id,
+                                std::size_t block_size) {
+    for (std::size_t i = 0; i < kCount; ++i) {
+        if (layout[i].id != id) continue;
+        const std::size_t end = i + 1 < kCount ? layout[i + 1].data.offset : block_size;
+        // The Finder info of a fresh record stands before the comment, which comes first.
+        if (end > layout[i].data.offset) {
+            return static_cast<std::uint32_t>(end) - layout[i].data.offset;
+        }
+        return layout[i].data.length;
+    }
+    return 0;
+}
+static_assert(RoomFor(kResourceHead, 4, kResourceHeadSize) == 200);
+static_assert(RoomFor(kResourceHead, 13, kResourceHeadSize) == 12);
+static_assert(RoomFor(kFreshRecord, 4, kAttributeBlockSize) == 200);
+static_assert(RoomFor(kFreshRecord, 8, kAttributeBlockSize) == 16);
+
+// Fills a block of that layout, which is all zeros. `bytes_of` gives an entry's bytes by its id,
+// none for what a fresh record has; they fit. The fork itself lies behind the block.
+template <std::size_t kCount, class BytesOf>
+constexpr void EncodeRecord(const std::array<RecordEntry, kCount>& layout, BytesOf bytes_of,
+                            std::uint32_t fork_length, ByteSpan block) {
+    BeWriter out(block);
+    EncodeAppleDoubleHeader({.magic = kAppleDoubleMagic,
+                             .version = kAppleDoubleVersion2,
+                             .filler = {},
+                             .entry_count = static_cast<std::uint16_t>(kCount)},
+                            out);
+    for (const RecordEntry& entry : layout) {
+        const ByteView bytes = bytes_of(entry.id);
+        Range data = entry.data;
+        if (entry.slot == Slot::kResourceFork) {
+            data.length = fork_length;
+        } else if (!bytes.empty()) {
+            data.length = static_cast<std::uint32_t>(bytes.size());
+        }
+        EncodeEntryDescriptor({static_cast<EntryId>(entry.id), data}, out);
+        BeWriter(block.subspan(entry.data.offset)).Copy(bytes);
+    }
+}
+
 // The slot of an on-disk id; kNone for an id that has none.
 constexpr Slot SlotOf(std::uint32_t id) {
     if (id <= 15) return static_cast<Slot>(id);

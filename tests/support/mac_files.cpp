@@ -178,6 +178,19 @@ std::vector<MacFile> AllMacFiles() {
     return files;
 }
 
+std::map<std::uint32_t, Bytes> EntriesOf(const Bytes& bytes) {
+    std::map<std::uint32_t, Bytes> entries;
+    const std::size_t end = 26 + std::size_t{12} * U16At(bytes, 24);
+    for (std::size_t at = 26; at < end; at += 12) {
+        const std::uint32_t id = U32At(bytes, at);
+        const std::uint32_t length = U32At(bytes, at + 8);
+        constexpr std::uint32_t kPrivate = 0x80000000;
+        if (id == 2 || id == 9 || id >= kPrivate || length == 0) continue;
+        entries[id] = Part(bytes, U32At(bytes, at + 4), length);
+    }
+    return entries;
+}
+
 std::optional<MacContents> ReadMacFile(const Bytes& bytes) {
     const auto holds = [&bytes](std::uint64_t at, std::uint64_t length) {
         return at <= bytes.size() && length <= bytes.size() - at;

@@ -3,6 +3,7 @@
 #ifndef MAVOEA_TESTS_SUPPORT_MAC_FILES_H_
 #define MAVOEA_TESTS_SUPPORT_MAC_FILES_H_
 
+#include <cstdint>
 #include <map>
 #include <optional>
 #include <ostream>
@@ -67,6 +68,10 @@ std::vector<MacFile> AllMacFiles();
 // says so. Nothing when it is none, or anything in it lies outside the file; without a Finder info
 // or fork entry those are zeros and empty.
 std::optional<MacContents> ReadMacFile(const Bytes& bytes);
+
+// The entries of an AppleDouble file by their ids, without Finder info and fork, without empty ones
+// and without netatalk's private ones. None lies outside the file.
+std::map<std::uint32_t, Bytes> EntriesOf(const Bytes& bytes);
 
 // A file that another program wrote, and what ReadMacFile() finds in it.
 struct SampleFile {

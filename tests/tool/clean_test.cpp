@@ -8,6 +8,7 @@
 #include <filesystem>
 
 #include "tests/support/object_files.h"
+#include "tests/support/process.h"
 #include "tests/tool/tool.h"
 
 namespace mavoea::test {
@@ -461,32 +462,26 @@ TEST_F(CleanTest, OnlyDirectoriesOfObjectsAreCleaned) {
 }
 
 TEST_F(CleanTest, WhatCannotBeRemovedIsToldAndTheRestGoes) {
-    // The superuser may remove everything.
-    constexpr uid_t kNobody = 65534;
-    const bool is_root = ::geteuid() == 0;
-    if (is_root && Tested().sanitized()) {
-        GTEST_SKIP() << "a sanitizer cannot look into a process that has changed its user";
+    const auto clean = [this] {
+        MakeObject("here");
+        MakeEaFile("gone@MavoEAStream");
+        WriteFile(dir_ / "._gone", kAppleDouble);
+        ASSERT_EQ(0, chmod((dir_ / "@eaDir").c_str(), 0555));
+        const ToolResult result = Clean({"--yes"});
+        EXPECT_EQ(2, result.status);
+        EXPECT_THAT(
+            result.err,
+            HasSubstr("gone@MavoEAStream: Permission denied; run mavoea as a user who may"));
+        EXPECT_THAT(result.out, HasSubstr("1 removed, 0 kept, 1 failed\n"));
+        EXPECT_FALSE(Exists(dir_ / "._gone"));
+        EXPECT_EQ(0, chmod((dir_ / "@eaDir").c_str(), 0755));
+    };
+    if (RunsAsRoot()) {  // The superuser may remove everything.
+        MAVOEA_SKIP_WITHOUT_OTHER_USERS();
+        AsUser(65534, Root::kGivenUp, clean);
+    } else {
+        clean();
     }
-    if (is_root) {
-        ASSERT_EQ(0, ::chown(dir_.path().c_str(), kNobody, kNobody));
-        ASSERT_EQ(0, ::seteuid(kNobody));
-    }
-    if (::eaccess(Tested().path.c_str(), X_OK) != 0) {
-        ASSERT_TRUE(!is_root || ::seteuid(0) == 0);
-        GTEST_SKIP() << "other users may not run the tool where it is";
-    }
-    MakeObject("here");
-    MakeEaFile("gone@MavoEAStream");
-    WriteFile(dir_ / "._gone", kAppleDouble);
-    ASSERT_EQ(0, chmod((dir_ / "@eaDir").c_str(), 0555));
-    const ToolResult result = Clean({"--yes"});
-    EXPECT_EQ(2, result.status);
-    EXPECT_THAT(result.err,
-                HasSubstr("gone@MavoEAStream: Permission denied; run mavoea as a user who may"));
-    EXPECT_THAT(result.out, HasSubstr("1 removed, 0 kept, 1 failed\n"));
-    EXPECT_FALSE(Exists(dir_ / "._gone"));
-    EXPECT_EQ(0, chmod((dir_ / "@eaDir").c_str(), 0755));
-    ASSERT_TRUE(!is_root || ::seteuid(0) == 0);
 }
 
 }  // namespace

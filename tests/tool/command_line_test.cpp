@@ -6,6 +6,7 @@
 
 #include <filesystem>
 
+#include "tests/support/process.h"
 #include "tests/tool/tool.h"
 
 namespace mavoea::test {
@@ -23,7 +24,6 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
         std::string message;
     } cases[] = {
         {{}, "A subcommand is required"},
-        {{"bogus"}, "A subcommand is required"},
         {{"list"}, "PATH is required"},
         {{"where"}, "PATH is required"},
         {{"get", object}, "NAME is required"},
@@ -42,7 +42,7 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
         {{"convert", "--to", "0", object}, "DST is required"},
         {{"convert", "--to", "0", object, object, object},
          "The following argument was not expected: " + object},
-        {{"lock", "-r", object}, "The following argument was not expected: -r"},
+        {{"get", "-r", object, "a"}, "The following argument was not expected: -r"},
         {{"dump"}, "FILE is required"},
         {{"dump", "--record"}, "FILE is required"},
         {{"get", object, "a", "b"}, "The following argument was not expected: b"},
@@ -56,6 +56,8 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
         EXPECT_THAT(result, Failed(2, message + "; mavoea --help has the usage"));
         EXPECT_EQ("", result.out);
     }
+    EXPECT_THAT(RunTool({"bogus"}),
+                Failed(2, "bogus: unknown command; mavoea --help has all of them"));
     EXPECT_EQ(std::vector<std::string>{"file.txt"}, NamesIn(volume.path()));
 }
 
@@ -118,8 +120,8 @@ TEST(CommandLineTest, StandardOutputThatCannotBeWrittenIsAFailure) {
     if (::access("/dev/full", W_OK) != 0) GTEST_SKIP() << "there is no /dev/full";
     const Volume volume(0);
     ASSERT_THAT(volume.Set("a", Ascii("value")), Succeeded());
-    const std::string command = Tested().Command() + " --volume " + volume.path() + "=0 get " +
-                                volume.object() + " a >/dev/full 2>/dev/null";
+    const std::string command = Tested().Command() + " --volume " + Quoted(volume.path()) +
+                                "=0 get " + Quoted(volume.object()) + " a >/dev/full 2>/dev/null";
     const int status = std::system(command.c_str());
     ASSERT_TRUE(WIFEXITED(status));
     EXPECT_EQ(2, WEXITSTATUS(status));
@@ -167,17 +169,27 @@ TEST(VolumeOptionTest, MayStandBeforeOrBehindTheCommandAndTheLongestPrefixCounts
     const Volume volume(0);
     const std::string& object = volume.object();
     const std::string dir = volume.path();
-    const auto type_of = [&](const Arguments& arguments) {
-        const auto json = RunTool(arguments).json();
-        EXPECT_EQ("--volume", json["typeSource"]);
-        return json["type"].get<int>();
+    const struct {
+        Arguments arguments;
+        int type;
+        std::string given;
+    } cases[] = {
+        {{"--json", "--volume", dir + "=7", "where", object}, 7, "7"},
+        {{"where", object, "--volume", dir + "=xattr", "--json"}, 7, "xattr"},
+        {{"where", "--json", "--volume", dir + "=fileea", object}, 2, "fileea"},
+        {{"--volume", "/=0", "where", object, "--volume", dir + "=eadir", "--json"}, 1, "eadir"},
+        {{"--volume", dir + "=5", "--volume", "/=0", "where", object, "--json"}, 5, "5"},
     };
-    EXPECT_EQ(7, type_of({"--json", "--volume", dir + "=7", "where", object}));
-    EXPECT_EQ(7, type_of({"where", object, "--volume", dir + "=xattr", "--json"}));
-    EXPECT_EQ(2, type_of({"where", "--json", "--volume", dir + "=fileea", object}));
-    EXPECT_EQ(1,
-              type_of({"--volume", "/=0", "where", object, "--volume", dir + "=eadir", "--json"}));
-    EXPECT_EQ(5, type_of({"--volume", dir + "=5", "--volume", "/=0", "where", object, "--json"}));
+    for (const auto& [arguments, type, given] : cases) {
+        const auto json = RunTool(arguments).json();
+        EXPECT_EQ(type, json["type"]);
+        EXPECT_EQ("--volume " + dir + "=" + given, json["typeSource"]);
+    }
+    // The directory is told as it is, from wherever it was named.
+    std::filesystem::current_path(dir);
+    EXPECT_EQ("--volume " + dir + "=xattr",
+              RunTool({"--json", "--volume", ".=xattr", "where", "file.txt"}).json()["typeSource"]);
+    std::filesystem::current_path("/");
 }
 
 TEST(VolumeOptionTest, ADeclarationThatMeansNothingIsRefused) {
@@ -238,8 +250,8 @@ TEST(WhereTest, ShowsTypeAndPlacesAndWhatIsThere) {
     std::filesystem::create_directories(dir + "/@eaDir/file.txt");
     const ToolResult where = volume.Run({"where", volume.object()});
     EXPECT_THAT(where, Succeeded());
-    EXPECT_EQ(dir + "/file.txt\n" +
-                  "  volume type: 0, AppleDouble (--volume)\n"
+    EXPECT_EQ(dir + "/file.txt\n" + "  volume type: 0, AppleDouble (--volume " + dir +
+                  "=0)\n"
                   "  EA stream: " +
                   dir + "/@eaDir/file.txt@MavoEAStream (missing)\n" + "  resource file: " + dir +
                   "/@eaDir/file.txt@MavoResource (missing)\n" + "  legacy folder: " + dir +
@@ -256,7 +268,7 @@ TEST(WhereTest, JsonHasTheSame) {
     EXPECT_EQ(volume.object(), json["path"]);
     EXPECT_EQ(1, json["type"]);
     EXPECT_EQ("EA directory", json["typeName"]);
-    EXPECT_EQ("--volume", json["typeSource"]);
+    EXPECT_EQ("--volume " + volume.path() + "=1", json["typeSource"]);
     ASSERT_EQ(5U, json["files"].size());
     EXPECT_EQ("stream", json["files"][0]["kind"]);
     EXPECT_EQ(volume.stream(), json["files"][0]["path"]);

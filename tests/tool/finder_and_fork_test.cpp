@@ -247,8 +247,9 @@ TEST_P(FinderAndForkTest, AForkThatPassesTheEndOfTheFileIsToldSo) {
     PutU32(file, kForkLengthAt, 0xFFFFFFFF);
     WriteFile(volume_->finder_file(), file);
     EXPECT_THAT(volume_->Get(kFork),
-                Failed(2, volume_->finder_file() + ": its resource fork passes the end of the "
-                                                   "file; look at it with: mavoea dump FILE"));
+                Failed(2, volume_->finder_file() +
+                              ": damaged: its resource fork passes the end of the file; look at "
+                              "it with: mavoea dump FILE"));
     ASSERT_THAT(volume_->Set(kFork, Ascii("mended")), Succeeded());
     EXPECT_EQ("mended", volume_->Get(kFork).out);
 }

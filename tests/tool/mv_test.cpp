@@ -1,5 +1,7 @@
 // mavoea mv, on real files.
 
+#include "tests/support/object_files.h"
+#include "tests/support/stream_builder.h"
 #include "tests/tool/travel.h"
 
 namespace mavoea::test {
@@ -247,8 +249,11 @@ TEST_F(MvTest, MetadataThatDoesNotArriveKeepsTheSourceWhole) {
     mkdir(travel.From("@eaDir/a").c_str(), 0777);
     travel.MakeFile(travel.From("@eaDir/a/MAVOPHOTO:BIG"), std::string(100000, 'x'));
     const ToolResult result = travel.Run({"mv", travel.From("a"), travel.To("a")});
-    EXPECT_EQ(2, result.status);
-    EXPECT_THAT(result.err, HasSubstr("its metadata could not be copied"));
+    EXPECT_THAT(result, Failed(2, travel.From("a") + ": not all of its metadata arrived at " +
+                                      travel.To("a") +
+                                      ": \"/MAVOPHOTO:BIG\" of another service (No space left on "
+                                      "device); keep the original, or take the rest along by "
+                                      "hand"));
     EXPECT_EQ("data", TextOf(travel.From("a")));
     travel.ExpectMetadata(travel.From("a"));
     EXPECT_EQ(100000U, ReadFile(travel.From("@eaDir/a/MAVOPHOTO:BIG")).size());
@@ -260,12 +265,13 @@ TEST_F(MvTest, ARenameWhoseMetadataCannotFollowIsTakenBack) {
     travel.GiveMetadata(travel.From("a"));
     mkdir(travel.To("._a").c_str(), 0755);
     travel.MakeFile(travel.To("._a/in the way"));
-    const ToolResult result = travel.Run({"mv", travel.From("a"), travel.To("a")});
-    EXPECT_EQ(2, result.status);
-    EXPECT_THAT(result.err, HasSubstr("it could not be removed: Is a directory"));
+    EXPECT_THAT(travel.Run({"mv", travel.From("a"), travel.To("a")}),
+                Failed(2, travel.From("a") + ": something is in the way of its metadata at " +
+                              travel.To("._a") + "; see what it is, and move it away"));
     EXPECT_EQ("data", TextOf(travel.From("a")));
     travel.ExpectMetadata(travel.From("a"));
-    EXPECT_FALSE(Exists(travel.To("a")));
+    EXPECT_THAT(NamesIn(travel.source()), ElementsAre("._a", "a"));
+    EXPECT_THAT(Tree(travel.target()), ElementsAre("._a/", "._a/in the way"));
 }
 
 TEST_F(MvTest, WhatIsInTheWayOfMetadataKeepsAllWhereItWas) {
@@ -283,18 +289,52 @@ TEST_F(MvTest, WhatIsInTheWayOfMetadataKeepsAllWhereItWas) {
     EXPECT_THAT(NamesIn(travel_.To("@eaDir")), ElementsAre("a"));
 }
 
-TEST_F(MvTest, MetadataOfNoObjectIsNotLostWithItsDirectory) {
+TEST_F(MvTest, MetadataOfNoObjectGoesWithItsDirectory) {
     const SecondVolume second;
     MAVOEA_SKIP_WITHOUT_SECOND(second);
     const Travel travel(kEaDirectory, kEaDirectory, second.path());
     mkdir(travel.From("tree").c_str(), 0755);
     travel.MakeFile(travel.From("tree/a"));
+    travel.GiveMetadata(travel.From("tree/a"));
     travel.MakeFile(travel.From("tree/._gone"), "whose?");
-    const ToolResult result = travel.Run({"mv", travel.From("tree"), travel.target()});
-    EXPECT_EQ(2, result.status);
-    EXPECT_THAT(result.err, HasSubstr("it is metadata of no object, and has not been moved"));
-    EXPECT_EQ("whose?", TextOf(travel.From("tree/._gone")));
+    travel.MakeFile(travel.From("tree/@eaDir/gone@MavoEAStream"), "of none");
+    EXPECT_THAT(travel.Run({"mv", travel.From("tree"), travel.target()}), Succeeded());
+    EXPECT_THAT(NamesIn(travel.source()), ElementsAre());
+    EXPECT_EQ("whose?", TextOf(travel.To("tree/._gone")));
+    EXPECT_EQ("of none", TextOf(travel.To("tree/@eaDir/gone@MavoEAStream")));
     EXPECT_EQ("data", TextOf(travel.To("tree/a")));
+    travel.ExpectMetadata(travel.To("tree/a"));
+}
+
+// On a volume of attributes a "._" file is a file like any other; elsewhere it would replace the
+// metadata of another, or be replaced by it.
+TEST_F(MvTest, AFileThatWouldBecomeMetadataOfAnotherIsToldOfAndKept) {
+    const Bytes apple_double = StreamImage{.attributes = {{"a", Ascii("1")}}}.Build();
+    for (const int type : {kAppleDouble, kEaDirectory, kFileEa}) {
+        SCOPED_TRACE(type);
+        const Travel travel(kXattr, type);
+        mkdir(travel.From("tree").c_str(), 0755);
+        travel.MakeFile(travel.From("tree/x"));
+        WriteFile(travel.From("tree/._x"), apple_double);
+        EXPECT_THAT(
+            travel.Run({"mv", travel.From("tree"), travel.target()}),
+            Failed(2, travel.From("tree/._x") + ": it would be metadata of '" +
+                          travel.To("tree/x") + "', just made, there; give it another name"));
+        EXPECT_THAT(NamesIn(travel.From("tree")), ElementsAre("._x", "x"));
+        EXPECT_EQ(apple_double, ReadFile(travel.From("tree/._x")));
+        EXPECT_EQ("data", TextOf(travel.From("tree/x")));
+        EXPECT_THAT(NamesIn(travel.To("tree")), ElementsAre("x"));
+        EXPECT_EQ("data", TextOf(travel.To("tree/x")));
+
+        EXPECT_THAT(
+            travel.Run({"mv", travel.From("tree/._x"), travel.From("tree/x"), travel.target()}),
+            Failed(2, travel.From("tree/x") + ": '" + travel.To("._x") +
+                          "', just made, would be its metadata there; give that another "
+                          "name"));
+        EXPECT_THAT(NamesIn(travel.From("tree")), ElementsAre("x"));
+        EXPECT_EQ(apple_double, ReadFile(travel.To("._x")));
+        EXPECT_FALSE(Exists(travel.To("x")));
+    }
 }
 
 TEST_F(MvTest, AnInterruptLeavesEveryObjectWholeInOnePlace) {

@@ -11,6 +11,7 @@
 #include <string>
 #include <vector>
 
+#include "tests/support/process.h"
 #include "tests/support/temp_dir.h"
 #include "tests/tool/tool.h"
 
@@ -46,12 +47,12 @@ class RealVolumes {
         const std::string path = room_ / name;
         const std::string disk = room_ / (name + ".disk");
         if (mkdir(path.c_str(), 0755) != 0) return;
-        std::string command = "mount -t tmpfs none '" + path + "'";
+        std::string command = "mount -t tmpfs none " + Quoted(path);
         if (name != "tmpfs") {
             WriteFile(disk, {});
             if (truncate(disk.c_str(), 512 << 20) != 0) return;  // holes, but for what mkfs writes
-            command = "mkfs." + name + " '" + disk + "' && mount -t " + name + " -o loop '" + disk +
-                      "' '" + path + "'";
+            command = "mkfs." + name + " " + Quoted(disk) + " && mount -t " + name + " -o loop " +
+                      Quoted(disk) + " " + Quoted(path);
         }
         command = "PATH=/usr/sbin:/sbin:$PATH; exec >/dev/null 2>&1; " + command;
         if (std::system(command.c_str()) == 0) paths_[name] = path;

@@ -78,34 +78,62 @@ TEST_P(RepairTest, ObjectsWithoutAResourceFileHaveNothingToRepair) {
     EXPECT_FALSE(Exists(volume_.stream()));
 }
 
-TEST_P(RepairTest, AFileThatWouldLoseAnEntryIsNotChanged) {
-    // The attribute header is where it always is; Finder info at 240, a comment at 280.
+// Three entries: Finder info of 40 bytes at 240 over an attribute area with the attribute "a", one
+// of that id and 7 bytes at 280, a fork of 4 bytes. The attribute header is where it always is.
+Bytes WithThirdEntry(std::uint32_t id) {
     Bytes file =
         Hex("00 05 16 07  00 02 00 00  00*16  00 03 "
             "00 00 00 09  00 00 00 F0  00 00 00 28 "
             "00 00 00 02  00 00 01 1F  00 00 00 04 "
-            "00 00 00 04  00 00 01 18  00 00 00 07 "
+            "00 00 00 00  00 00 01 18  00 00 00 07 "
             "00*20 00 00 'ATTR' 00 00 00 00 "
             "00 00 00 8B  00 00 00 88  00 00 00 03  00*12  00 00 00 01 "
             "00 00 00 88  00 00 00 03  00 00  02  'a' 00  00 00 00 'xyz'");
+    PutU32(file, 50, id);
     file.resize(240);
-    file = file + Pattern(40) + Ascii("commentfork");
+    return file + Pattern(40) + Ascii("commentfork");
+}
+
+TEST_P(RepairTest, AFileThatWouldLoseAnEntryIsNotChanged) {
+    Bytes file = WithThirdEntry(0x63);
     WriteFile(volume_.resource(), file);
     const ToolResult result = Repair();
     EXPECT_EQ(2, result.status);
     EXPECT_EQ(Counts(0, 0, 1), result.out);
     EXPECT_EQ("mavoea: " + volume_.resource() +
-                  ": a repair would lose its comment; move the file away if that is no loss\n",
+                  ": a repair would lose its entry of id 0x00000063: a resource file has no place "
+                  "for it; move the file away if that is no loss\n",
               result.err);
     EXPECT_EQ(file, ReadFile(volume_.resource()));
     EXPECT_FALSE(Exists(volume_.stream()));
 
-    // Without any bytes the comment is no loss, but then there are still three entries.
+    // Without any bytes it is no loss.
     PutU32(file, 58, 0);
     WriteFile(volume_.resource(), file);
-    EXPECT_THAT(Repair().err,
-                HasSubstr(": it has 3 entries; only files of 2 or 13 can be repaired; "));
-    EXPECT_EQ(file, ReadFile(volume_.resource()));
+    EXPECT_THAT(Repair(), Succeeded());
+    EXPECT_EQ(Hex("00051607 00020000 'Mac OS X        ' 0002"
+                  "00000009 00000032 00000020"
+                  "00000002 00000052 00000004") +
+                  Pattern(32) + Ascii("fork"),
+              ReadFile(volume_.resource()));
+    EXPECT_EQ("xyz", volume_.Get("a").out);
+}
+
+TEST_P(RepairTest, ACommentIsKeptInAHeadOfThirteenEntries) {
+    WriteFile(volume_.resource(), WithThirdEntry(4));
+    const ToolResult result = Repair();
+    EXPECT_THAT(result, Succeeded());
+    EXPECT_EQ(Counts(1, 0, 0), result.out);
+    EXPECT_EQ("xyz", volume_.Get("a").out);
+    const Bytes file = ReadFile(volume_.resource());
+    EXPECT_EQ(kNetatalkHead + 4, file.size());
+    EXPECT_EQ(13, U16At(file, 24));
+    EXPECT_EQ((MacContents{{}, Pattern(32), Ascii("fork")}), ReadMacFile(file));
+    auto entries = EntriesOf(file);
+    EXPECT_EQ(Ascii("comment"), entries[4]);
+    entries.erase(4);
+    for (const auto& [id, bytes] : entries) EXPECT_EQ(Bytes(bytes.size()), bytes) << id;
+    EXPECT_EQ(Counts(0, 1, 0), Repair().out);
 }
 
 TEST_P(RepairTest, DamageChangesNothing) {
@@ -133,10 +161,18 @@ TEST_P(RepairTest, ALinkInTheResourceFilesPlaceIsNotFollowed) {
     const Bytes file = StreamImage{.attributes = {{"a", Ascii("secret")}}}.Build();
     WriteFile(target, file);
     std::filesystem::create_symlink(target, volume_.resource());
-    EXPECT_EQ("mavoea: " + volume_.resource() + ": not a regular file; move it away\n",
-              Repair().err);
+    const std::string message =
+        volume_.resource() +
+        ": a symbolic link in the place of a file; see who put it there, and move it away";
+    const ToolResult result = Repair();
+    EXPECT_THAT(result, Failed(2, message));
+    EXPECT_EQ(Counts(0, 0, 1), result.out);
     EXPECT_EQ(file, ReadFile(target));
-    EXPECT_EQ("", volume_.List().out);
+    EXPECT_TRUE(std::filesystem::is_symlink(volume_.resource()));
+    EXPECT_FALSE(Exists(volume_.stream()));
+    const ToolResult list = volume_.List();
+    EXPECT_THAT(list, Failed(2, message));
+    EXPECT_EQ("", list.out);
 }
 
 TEST_P(RepairTest, ATreeIsRepairedThoughSomeOfItFails) {

@@ -34,7 +34,8 @@ using Arguments = std::vector<std::string>;
 
 // The tool that is tested. It is that of the tests' own build; the environment may name one of
 // another build, which need not be for this kind of processor: MAVOEA_TOOL, MAVOEA_TOOL_EMULATOR
-// and MAVOEA_TOOL_SANITIZERS.
+// and MAVOEA_TOOL_SANITIZERS. Once a test is to be another user, it is a copy that every user can
+// run.
 struct TestedTool {
     std::string path;
     std::string emulator;    // with its arguments; empty: none
@@ -59,11 +60,13 @@ std::vector<T> Thinned(const std::vector<T>& all) {
     return some;
 }
 
-// What the tool may use, in bytes, 0 for as much as it likes. A limit on memory has no effect under
-// a sanitizer and in an emulator, which need much of their own.
+// What the tool may use, 0 for as much as it likes. A limit on memory has no effect under a
+// sanitizer and in an emulator, which need much of their own.
 struct Limits {
-    std::size_t memory = 0;
-    std::size_t file_size = 0;  // of every file that it writes, its output too
+    std::size_t memory = 0;      // in bytes
+    std::size_t file_size = 0;   // in bytes, of every file that it writes, its output too
+    std::size_t open_files = 0;  // at any time
+    uid_t user = 0;              // the superuser runs it as that user for good, and as that group
 };
 
 // What starts the tool in place of a process; made before a fork, so that the child need not
@@ -143,6 +146,14 @@ bool KeepsUserAttributes(const std::string& directory);
 #define MAVOEA_SKIP_WITHOUT_ATTRIBUTES(directory)                                            \
     if (!KeepsUserAttributes(directory)) {                                                   \
         GTEST_SKIP() << "files in " << directory << " keep no extended attributes of users"; \
+    }
+
+// Whether files in that directory can be given to any user: a user namespace has some only.
+bool AnyoneOwns(const std::string& directory);
+
+#define MAVOEA_SKIP_UNLESS_ANYONE_OWNS(directory)                            \
+    if (!AnyoneOwns(directory)) {                                            \
+        GTEST_SKIP() << "files in " << directory << " cannot be given away"; \
     }
 
 // Making EA directories takes the superuser.

@@ -187,9 +187,9 @@ class RunningTool {
     std::string said_;
 };
 
-#define MAVOEA_SKIP_WITHOUT_SECOND(volume)                                       \
-    if (!(volume).ok()) {                                                        \
-        GTEST_SKIP() << "no second file system here; run this test as the root"; \
+#define MAVOEA_SKIP_WITHOUT_SECOND(volume)                                              \
+    if (!(volume).ok()) {                                                               \
+        GTEST_SKIP() << "no second file system: needs the right to mount, or /dev/shm"; \
     }
 
 }  // namespace mavoea::test

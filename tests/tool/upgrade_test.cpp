@@ -8,8 +8,10 @@
 #include <unistd.h>
 
 #include <filesystem>
+#include <optional>
 
 #include "tests/support/mac_files.h"
+#include "tests/support/process.h"
 #include "tests/support/record_builder.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/tool.h"
@@ -68,16 +70,74 @@ TEST_P(UpgradeTest, AttributeFilesBecomeAStream) {
     EXPECT_EQ(Counts(0, 1, 0, 0), Upgrade().out);
 }
 
-TEST_P(UpgradeTest, AnAppleDoubleFileBecomesTheStreamAsItIs) {
+// What a metadata file holds, if there is one.
+MacContents ContentsOf(const std::string& path) {
+    if (!Exists(path)) return {};
+    return ReadMacFile(ReadFile(path)).value_or(MacContents{{{"no", Ascii("AppleDouble file")}}});
+}
+
+using Entries = std::map<std::uint32_t, Bytes>;
+
+// Those that say something.
+Entries MeaningOf(Entries entries) {
+    std::erase_if(entries,
+                  [](const auto& entry) { return entry.second == Bytes(entry.second.size()); });
+    return entries;
+}
+
+TEST_P(UpgradeTest, AnAppleDoubleFileIsSplitIntoStreamAndResourceFile) {
     for (const MacFile& file : AllMacFiles()) {
         SCOPED_TRACE(file.layout);
         const Volume volume(GetParam());
         WriteFile(volume.apple_double(), file.bytes);
+        // Macintosh and MS-DOS file info, which have no place.
+        const Entries entries = EntriesOf(file.bytes);
+        const bool whole = !entries.contains(10) && !entries.contains(12);
         const ToolResult result = volume.Run({"upgrade", volume.object()});
-        EXPECT_THAT(result, Succeeded());
-        EXPECT_EQ(Counts(1, 0, 0, 0), result.out);
-        EXPECT_FALSE(Exists(volume.apple_double()));
-        EXPECT_EQ(file.bytes, ReadFile(volume.stream()));
+        if (whole) {
+            EXPECT_THAT(result, Succeeded());
+            EXPECT_EQ(Counts(1, 0, 0, 0), result.out);
+            EXPECT_FALSE(Exists(volume.apple_double()));
+        }
+        EXPECT_EQ((MacContents{file.contents.attributes, Bytes(32), {}}),
+                  ContentsOf(volume.stream()));
+        EXPECT_EQ((MacContents{{}, file.contents.finder_info, file.ForkInUse()}),
+                  ContentsOf(volume.resource()));
+        for (const auto& [name, value] : file.contents.attributes) {
+            EXPECT_EQ(value, volume.Get(name).bytes()) << name;
+        }
+        if (file.contents.finder_info != Bytes(32)) {
+            EXPECT_EQ(file.contents.finder_info, volume.Get("com.apple.FinderInfo").bytes());
+        }
+        EXPECT_EQ(file.ForkInUse(), volume.Get("com.apple.ResourceFork").bytes());
+    }
+}
+
+TEST_P(UpgradeTest, OtherEntriesOfAnAppleDoubleFileGoAlong) {
+    const MacFile file = NetatalkFile(Pattern(32, 1), Ascii("fork"));
+    WriteFile(volume_.apple_double(), file.bytes);
+    EXPECT_THAT(Upgrade(), Succeeded());
+    EXPECT_FALSE(Exists(volume_.apple_double()));
+    EXPECT_EQ(MeaningOf(EntriesOf(file.bytes)), MeaningOf(EntriesOf(ReadFile(volume_.resource()))));
+    EXPECT_EQ("1", volume_.Get("mavoea.locked").out);
+}
+
+TEST_P(UpgradeTest, AnAppleDoubleFileWithEntriesThatHaveNoPlaceStays) {
+    const MacFile file = ThirteenEntryFile(Pattern(32, 1), Ascii("fork"));
+    WriteFile(volume_.apple_double(), file.bytes);
+    const std::string why =
+        std::string(GetParam() == 2 ? "neither a record nor a resource file" : "a resource file") +
+        " has no place for it)";
+    for (int i = 0; i < 2; ++i) {
+        const ToolResult result = Upgrade();
+        EXPECT_THAT(result,
+                    Failed(2, volume_.object() +
+                                  ": not all that an earlier version kept could be converted: "
+                                  "Macintosh file info (" +
+                                  why + ", MS-DOS file info (" + why +
+                                  "; see where it lies with: mavoea list -l PATH"));
+        EXPECT_EQ(Counts(0, 0, 0, 1), result.out);
+        EXPECT_EQ(file.bytes, ReadFile(volume_.apple_double()));
     }
 }
 
@@ -89,7 +149,7 @@ TEST_P(UpgradeTest, AnAppleDoubleFileThatWasReadLaterLeavesTheAttributeFiles) {
     EXPECT_EQ(0, result.status);
     EXPECT_EQ(Counts(1, 0, 0, 0), result.out);
     EXPECT_EQ("mavoea: note: " + volume_.object() + ": 1 file stays in " + Folder() +
-                  ": its AppleDouble file was read later and has become the EA stream\n",
+                  ": its AppleDouble file was read later and has been taken\n",
               result.err);
     EXPECT_EQ("a\n", volume_.List().out);
     const ToolResult again = Upgrade();
@@ -169,16 +229,20 @@ TEST_P(UpgradeTest, WhatCannotBeReadStaysAndIsNamedWhileTheRestIsConverted) {
     EXPECT_TRUE(Exists(Folder() + "/directory"));
 }
 
-TEST_P(UpgradeTest, ANameThatIsTooLongForAnAppleDoubleFileIsToldSo) {
+TEST_P(UpgradeTest, ANameThatIsTooLongForAnAppleDoubleFileIsNotTooLong) {
     const std::string name(254, 'n');
-    WriteFile(volume_.path() + "/" + name, {});
-    EXPECT_EQ(Counts(0, 0, 1, 0), volume_.Run({"upgrade", volume_.path() + "/" + name}).out);
+    const std::string object = volume_.path() + "/" + name;
+    WriteFile(object, {});
+    EXPECT_EQ(Counts(0, 0, 1, 0), volume_.Run({"upgrade", object}).out);
     AddLegacy(volume_.path() + "/@eaDir/" + name, "color", Ascii("blue"));
-    const ToolResult result = volume_.Run({"upgrade", volume_.path() + "/" + name});
-    EXPECT_EQ(2, result.status);
-    EXPECT_THAT(result.err, HasSubstr(": its name is too long for the 1 file of its legacy folder "
-                                      "to be converted, \"color\"; "));
-    EXPECT_EQ(Ascii("blue"), ReadFile(volume_.path() + "/@eaDir/" + name + "/color"));
+    const ToolResult result = volume_.Run({"upgrade", object});
+    EXPECT_THAT(result, Succeeded());
+    EXPECT_EQ(Counts(1, 0, 0, 0), result.out);
+    EXPECT_EQ("blue", volume_.Run({"get", object, "color"}).out);
+    const std::vector<std::string> names = NamesIn(volume_.path() + "/@eaDir");
+    ASSERT_EQ(1U, names.size());
+    EXPECT_THAT(names[0], ::testing::EndsWith("@MavoEAStream"));
+    EXPECT_EQ(Counts(0, 1, 0, 0), volume_.Run({"upgrade", object}).out);
 }
 
 // ---- Trees --------------------------------------------------------------------------------------
@@ -189,9 +253,11 @@ TEST_P(UpgradeTest, ATreeIsConvertedWithItsDirectoriesAndWithoutWhatIsNoObject) 
     WriteFile(elsewhere / "file", {});
     AddLegacy(elsewhere / "@eaDir/file", "color", Ascii("outside"));
     fs::create_directories(top + "/sub/deep");
-    for (const char* name : {"/a", "/sub/b", "/sub/deep/c", "/sub/c:olon", "/sub/._b"}) {
+    // "._b" is a file like any other, for what is in it; "._d" is metadata.
+    for (const char* name : {"/a", "/sub/b", "/sub/deep/c", "/sub/c:olon", "/sub/d", "/sub/._b"}) {
         WriteFile(top + name, {});
     }
+    WriteFile(top + "/sub/._d", StreamImage{.attributes = {{"color", Ascii("of d")}}}.Build());
     fs::create_directory_symlink(elsewhere.path(), top + "/link");
     fs::create_symlink(elsewhere / "file", top + "/linked-file");
     for (const char* hidden : {"/@tmp", "/@sharebin", "/sub/@EADIR"}) {
@@ -204,12 +270,12 @@ TEST_P(UpgradeTest, ATreeIsConvertedWithItsDirectoriesAndWithoutWhatIsNoObject) 
     AddLegacy(top + "/sub/@eaDir/b", "color", Ascii("of b"));
     AddLegacy(top + "/sub/deep/@eaDir/c", "color", Ascii("of c"));
     AddLegacy(top + "/@eaDir/linked-file", "color", Ascii("of a link"));
-    AddLegacy(top + "/sub/@eaDir/c:olon", "color", Ascii("of metadata"));
+    AddLegacy(top + "/sub/@eaDir/c:olon", "color", Ascii("of c:olon"));
 
     const ToolResult result = volume_.Run({"upgrade", "-r", top});
     EXPECT_THAT(result, Succeeded());
-    // Converted: top, sub, b, c. With nothing: a, deep.
-    EXPECT_EQ(Counts(4, 0, 2, 0), result.out);
+    // Converted: top, sub, b, c, c:olon, d. With nothing: a, deep, ._b.
+    EXPECT_EQ(Counts(6, 0, 3, 0), result.out);
     EXPECT_EQ("of the top", volume_.Run({"get", top, "color"}).out);
     EXPECT_EQ("of sub", volume_.Run({"get", top + "/sub", "color"}).out);
     EXPECT_EQ("of b", volume_.Run({"get", top + "/sub/b", "color"}).out);
@@ -218,8 +284,11 @@ TEST_P(UpgradeTest, ATreeIsConvertedWithItsDirectoriesAndWithoutWhatIsNoObject) 
     EXPECT_TRUE(Exists(top + "/@tmp/@eaDir/object/color"));
     EXPECT_TRUE(Exists(top + "/sub/@EADIR/@eaDir/object/color"));
     EXPECT_TRUE(Exists(top + "/@eaDir/linked-file/color"));
-    EXPECT_TRUE(Exists(top + "/sub/@eaDir/c:olon/color"));
-    EXPECT_EQ(Counts(0, 4, 2, 0), volume_.Run({"upgrade", "-r", top}).out);
+    EXPECT_EQ("of c:olon", volume_.Run({"get", top + "/sub/c:olon", "color"}).out);
+    EXPECT_EQ("of d", volume_.Run({"get", top + "/sub/d", "color"}).out);
+    EXPECT_FALSE(Exists(top + "/sub/@eaDir/c:olon"));
+    EXPECT_FALSE(Exists(top + "/sub/._d"));
+    EXPECT_EQ(Counts(0, 6, 3, 0), volume_.Run({"upgrade", "-r", top}).out);
 }
 
 TEST_P(UpgradeTest, WithoutTheOptionADirectoryIsOneObject) {
@@ -276,30 +345,35 @@ TEST_P(UpgradeTest, AVolumeBelowThatDoesNotSuitIsOneFailure) {
 
 // ---- The progress line --------------------------------------------------------------------------
 
-// Standard error of a run whose standard error is a terminal.
-std::string OnTerminal(const std::string& arguments, int* status) {
+// Standard error of a run whose standard error is a terminal; nothing where there are no terminals.
+std::optional<std::string> OnTerminal(const std::string& arguments, int* status) {
     const int terminal = posix_openpt(O_RDWR | O_NOCTTY | O_CLOEXEC);
-    if (terminal < 0 || grantpt(terminal) != 0 || unlockpt(terminal) != 0) return {};
+    if (terminal < 0 || grantpt(terminal) != 0 || unlockpt(terminal) != 0) {
+        return std::nullopt;
+    }
     const std::string name = ptsname(terminal);
-    // Held open, so that what was written can be read after the program's end.
     const int other_side = open(name.c_str(), O_RDWR | O_NOCTTY | O_CLOEXEC);
+    if (other_side < 0) return std::nullopt;
     const std::string command = Tested().Command() + " " + arguments + " >/dev/null 2>" + name;
     *status = system(command.c_str());
-    std::string text(4096, '\0');
-    const ssize_t size =
-        fcntl(terminal, F_SETFL, O_NONBLOCK) == 0 ? read(terminal, text.data(), text.size()) : -1;
-    text.resize(static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
+    // What was written is on its way yet; when the last who could write is gone, it ends with EIO.
     close(other_side);
+    std::string text;
+    char part[4096];
+    for (ssize_t size = 0; (size = read(terminal, part, sizeof part)) > 0;) {
+        text.append(part, static_cast<std::size_t>(size));
+    }
     close(terminal);
     return text;
 }
 
 TEST(ProgressTest, ItIsOneLineOnATerminalAndIsGoneAtTheEnd) {
-    if (::access("/dev/ptmx", R_OK | W_OK) != 0) GTEST_SKIP() << "there are no terminals";
     const Volume volume(1);
     int status = -1;
-    const std::string text =
-        OnTerminal("--volume " + volume.path() + "=1 upgrade -r " + volume.path(), &status);
+    const std::optional<std::string> shown = OnTerminal(
+        "--volume " + Quoted(volume.path()) + "=1 upgrade -r " + Quoted(volume.path()), &status);
+    if (!shown) GTEST_SKIP() << "there are no terminals";
+    const std::string& text = *shown;
     EXPECT_EQ(0, status);
     EXPECT_THAT(text, HasSubstr("\rupgrading: 0 done, " + volume.path().substr(0, 20)));
     EXPECT_TRUE(text.ends_with("\r\x1b[K")) << text;

@@ -1,0 +1,25 @@
+// mavoea clean: metadata whose object is gone.
+#ifndef MAVOEA_TOOLS_CARE_CLEAN_H_
+#define MAVOEA_TOOLS_CARE_CLEAN_H_
+
+#include <string>
+#include <vector>
+
+#include "tools/say/messages.h"
+
+namespace mavoea::tool {
+
+struct CleanOptions {
+    std::vector<std::string> directories;
+    bool recursive = false;
+    bool remove = false;  // only listed otherwise
+    bool others = false;  // what other services left as well
+    bool json = false;
+};
+
+// Goes on after a failure: kSuccess when nothing failed, otherwise the gravest status.
+ExitStatus Clean(const CleanOptions& options);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_CARE_CLEAN_H_

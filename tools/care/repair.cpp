@@ -1,0 +1,94 @@
+#include "tools/care/repair.h"
+
+#include <fcntl.h>
+
+#include <algorithm>
+
+#include "include/mavoea.h"
+#include "tools/care/upgrade.h"
+#include "tools/say/messages.h"
+#include "tools/store/reader.h"
+#include "tools/store/sidecars.h"
+#include "tools/store/writer.h"
+
+namespace mavoea::tool {
+namespace {
+
+// Whether the resource file wrongly holds attributes.
+bool HoldsAttributes(const Metadata& metadata) {
+    if (!metadata.whole_resource) return false;
+    const std::string& path = metadata.whole_resource->path();
+    const auto in_it = [&](const Metadata::Attribute& attribute) {
+        return attribute.holder == path;
+    };
+    return std::any_of(metadata.attributes.begin(), metadata.attributes.end(), in_it);
+}
+
+// Both files are written anew, with what is known of them and nothing else.
+void RefuseToLose(const Metadata& metadata) {
+    for (const WholeFile& whole : {metadata.whole_resource, metadata.whole_stream}) {
+        if (!whole) continue;
+        for (const Metadata::Stray& stray : metadata.strays) {
+            if (stray.holder != whole->path()) continue;
+            throw Failure(kFailed, whole->path(), "a repair would lose " + stray.item,
+                          "move the file away if that is no loss");
+        }
+    }
+    if (!metadata.problems.empty()) throw Failure(metadata.problems.front());
+}
+
+Outcome RepairObject(const Object& volume_object) {
+    // The record of a file-EA volume has no part in it.
+    constexpr int kEaDirectoryType = 1;
+    const Object object = {volume_object.place, kEaDirectoryType};
+    const Sidecars sidecars = Sidecars::Find(object, Sidecars::Services::kFind);
+    if (!sidecars.resource) return Outcome::kNothing;
+    // The resource file has the last word on an attribute that the stream has as well.
+    Metadata metadata = ReadMetadata(object, sidecars);
+    if (!HoldsAttributes(metadata)) {
+        for (const Failure& problem : metadata.problems) {
+            if (problem.subject() == sidecars.resource->path()) throw Failure(problem);
+        }
+        return Outcome::kNothing;
+    }
+    const std::string resource = metadata.whole_resource->path();
+    std::erase_if(metadata.strays, [&](const Metadata::Stray& stray) {
+        return metadata.whole_stream && stray.holder == metadata.whole_stream->path() &&
+               stray.attribute;
+    });
+    RefuseToLose(metadata);
+    RequireOwnNames(object);
+    metadata.whole_resource.reset();
+    metadata.whole_stream.reset();
+    metadata.strays.clear();
+    std::vector<Missing> missing;
+    const Writer& writer = WriterFor(object);
+    const Metadata fitting = writer.Fit(metadata, object, &missing);
+    if (!missing.empty()) {
+        throw Failure(
+            kFailed, resource,
+            "a repair would lose its " + missing.front().item + ": " + missing.front().reason,
+            "move the file away if that is no loss");
+    }
+    const Written written = writer.Write(object, fitting, {.old = Old::kKept});
+    auto lost = WhatIsMissing(fitting, ReadMetadata(object, Sidecars::Services::kFind));
+    lost.insert(lost.end(), written.missing.begin(), written.missing.end());
+    if (lost.empty()) return Outcome::kDone;
+    throw Failure(kFailed, resource,
+                  "not all of it arrived: " + lost.front().item + " (" + lost.front().reason + ')',
+                  "look at it with: mavoea dump FILE");
+}
+
+}  // namespace
+
+ExitStatus Repair(const TreeOptions& options) {
+    return RunOnTree(options,
+                     {.doing = "repairing",
+                      .done = "repaired",
+                      .current = nullptr,
+                      .nothing = "with nothing to repair",
+                      .check = RequireEaDirectory,
+                      .work = [](const Object& object, Notes*) { return RepairObject(object); }});
+}
+
+}  // namespace mavoea::tool

@@ -1,0 +1,65 @@
+// The command line, parsed.
+#ifndef MAVOEA_TOOLS_CLI_COMMAND_LINE_H_
+#define MAVOEA_TOOLS_CLI_COMMAND_LINE_H_
+
+#include <optional>
+#include <string>
+#include <variant>
+#include <vector>
+
+#include "tools/say/job.h"
+
+namespace mavoea::tool {
+
+enum class Command {
+    kWhere,
+    kList,
+    kGet,
+    kSet,
+    kRemove,
+    kLock,
+    kUnlock,
+    kImport,
+    kCopy,
+    kMove,
+    kDelete,
+    kUpgrade,
+    kRepair,
+    kClean,
+    kConvert,
+    kDump
+};
+
+struct Options {
+    Command command = Command::kWhere;
+    std::vector<std::string> volumes;  // PATH=TYPE
+    bool json = false;
+
+    std::vector<std::string> paths;  // one, but for list, lock, unlock, upgrade and repair
+    std::string name;
+    std::string apple_double;  // import
+    bool details = false;      // list -l
+    bool recursive = false;
+    bool yes = false;                             // clean: what is listed is removed
+    bool all = false;                             // clean: things of other services, too
+    std::string to;                               // convert: the destination's volume type
+    std::string destination;                      // convert
+    bool compare_only = false;                    // convert
+    Consent consent = Consent::kUsual;            // cp, mv, rm: the last of -i, -f and -n
+    bool verbose = false;                         // cp, mv, rm
+    std::optional<std::string> target_directory;  // cp, mv
+    bool no_target_directory = false;             // cp, mv
+    bool allow_loss = false;                      // cp, mv, convert
+    bool record = false;                          // dump: the record of an object
+    bool hex = false;                             // get, set
+    std::optional<std::string> value;             // set: none of the two means standard input
+    std::optional<std::string> file;
+};
+
+// What to do, or the exit status when everything has been said: help, version, or what is wrong
+// with the command line. Throws Failure for a command that is none.
+std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_CLI_COMMAND_LINE_H_

@@ -1,0 +1,250 @@
+#include "tools/cli/commands.h"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <iostream>
+
+#include "format/ea_stream.h"
+#include "tools/care/clean.h"
+#include "tools/care/repair.h"
+#include "tools/care/upgrade.h"
+#include "tools/move/convert.h"
+#include "tools/move/copy.h"
+#include "tools/move/delete.h"
+#include "tools/move/import.h"
+#include "tools/place/file.h"
+#include "tools/place/volume.h"
+#include "tools/say/output.h"
+#include "tools/say/text.h"
+#include "tools/show/attributes.h"
+#include "tools/show/dump.h"
+#include "tools/show/where.h"
+#include "tools/store/adoption.h"
+#include "tools/store/change.h"
+#include "tools/store/layout.h"
+#include "tools/store/record.h"
+#include "tools/walk/tree.h"
+
+namespace mavoea::tool {
+namespace {
+
+void CheckName(const Options& options) {
+    if (options.name.empty()) {
+        throw Failure(kFailed, options.paths.front(), "the attribute's name is empty",
+                      "give it a name");
+    }
+    if (options.name.size() >= kNameSizeMax) {
+        throw Failure(kFailed, options.paths.front(),
+                      "the attribute's name has " + std::to_string(options.name.size()) +
+                          " bytes, at most " + std::to_string(kNameSizeMax - 1) + " are possible",
+                      "use a shorter name");
+    }
+}
+
+// ---- get, set, remove ---------------------------------------------------------------------------
+
+ExitStatus GetValue(const Options& options) {
+    CheckName(options);
+    const Format format = options.json  ? Format::kJson
+                          : options.hex ? Format::kHexDump
+                                        : Format::kRaw;
+    return Get(options.paths.front(), options.name, format);
+}
+
+Bytes ValueToSet(const Options& options) {
+    if (options.value && options.hex) {
+        if (auto bytes = ParseHex(*options.value)) return *std::move(bytes);
+        throw Failure(kFailed, options.paths.front(), "VALUE is not hexadecimal digits",
+                      "give two digits for each byte, or leave --hex out");
+    }
+    if (options.value) return {options.value->begin(), options.value->end()};
+    if (options.file) {
+        const File file = File::OpenAny(*options.file);
+        return ReadToEnd(file.fd(), file.path(), kStreamSizeMax);
+    }
+    return ReadToEnd(STDIN_FILENO, "standard input", kStreamSizeMax);
+}
+
+// Opens what is to be changed; what an earlier version kept comes along.
+std::unique_ptr<Changer> OpenToChange(const Object& object) {
+    auto changer = OpenChanger(object);
+    Notes notes;
+    AdoptForChange(object, &notes);
+    for (const std::string& note : notes) Note(note);
+    return changer;
+}
+
+ExitStatus Set(const Options& options) {
+    CheckName(options);
+    const Object object = FindObject(options.paths.front());
+    const Bytes value = ValueToSet(options);
+    OpenToChange(object)->Set(options.name, value);
+    if (options.json) {
+        Json json;
+        json.SetText("path", object.path());
+        json.SetText("name", options.name);
+        json.Set("size", value.size());
+        Print(json);
+    }
+    return kSuccess;
+}
+
+ExitStatus Remove(const Options& options) {
+    CheckName(options);
+    const Object object = FindObject(options.paths.front());
+    if (!OpenToChange(object)->Remove(options.name)) {
+        throw NoAttribute(options.paths.front(), options.name);
+    }
+    if (options.json) {
+        Json json;
+        json.SetText("path", object.path());
+        json.SetText("name", options.name);
+        json.Set("removed", true);
+        Print(json);
+    }
+    return kSuccess;
+}
+
+// ---- lock, unlock -------------------------------------------------------------------------------
+
+ExitStatus Lock(const Options& options, bool locked) {
+    ExitStatus status = kSuccess;
+    Json json = Json::Array();
+    const auto fail = [&](const Failure& failure) {
+        Report(failure.what());
+        status = std::max(status, failure.status());
+    };
+    const auto work = [&](const Object& object, const std::string&) {
+        try {
+            SetLocked(object, locked);
+            Json entry;
+            entry.SetText("path", object.path());
+            entry.Set("locked", locked);
+            json.Add(std::move(entry));
+        } catch (const Failure& failure) {
+            fail(failure);
+        }
+        return true;
+    };
+    VisitObjects(options.paths, options.recursive,
+                 {.work = work, .on_failure = [&](const std::string&, const Failure& failure) {
+                      fail(failure);
+                  }});
+    if (options.json) Print(json);
+    return status;
+}
+
+// ---- dump ---------------------------------------------------------------------------------------
+
+// The two places of an object's record; the head of a resource file that is too short for one is
+// none.
+ExitStatus DumpRecord(const Options& options) {
+    const Object object = FindObject(options.paths.front());
+    Json json = Json::Array();
+    std::size_t violations = 0;
+    bool found = false;
+    for (const RecordPlace place : {RecordPlace::kAttribute, RecordPlace::kResourceFile}) {
+        const auto stored = ReadStoredRecord(object, place);
+        if (!stored) continue;
+        const Layout layout = ReadLayout(stored->block);
+        const Findings findings = CheckRecord(layout, place);
+        const char* const kind = place == RecordPlace::kAttribute
+                                     ? "netatalk record, attribute user.netatalk.Metadata"
+                                     : "netatalk record, head of a resource file";
+        violations += findings.violations.size();
+        if (options.json) {
+            json.Add(DumpJson(stored->file, layout, findings, kind));
+        } else {
+            std::cout << (found ? "\n" : "") << DumpText(stored->file, layout, findings, kind);
+        }
+        found = true;
+    }
+    if (options.json) Print(json);
+    if (!found) {
+        throw Failure(kNotFound, options.paths.front(), "no netatalk record",
+                      "mavoea where PATH has the files in which metadata may be");
+    }
+    if (violations == 0) return kSuccess;
+    throw Failure(kFailed, options.paths.front(), "its netatalk record is damaged",
+                  "let the AFP service write it anew, or remove it");
+}
+
+ExitStatus Dump(const Options& options) {
+    if (options.record) return DumpRecord(options);
+    const std::string& path = options.paths.front();
+    const Layout layout = ReadLayout(File::OpenToRead(path));
+    const Findings findings = CheckLayout(layout);
+    if (options.json) {
+        Print(DumpJson(path, layout, findings));
+    } else {
+        std::cout << DumpText(path, layout, findings);
+    }
+    if (findings.violations.empty()) return kSuccess;
+    const std::size_t count = findings.violations.size();
+    throw Failure(
+        kFailed, path,
+        "the layout is violated in " + std::to_string(count) + (count == 1 ? " place" : " places"),
+        "restore the file from a copy, or leave it alone");
+}
+
+}  // namespace
+
+ExitStatus Run(const Options& options) {
+    RequireVolumeTable();
+    for (const std::string& volume : options.volumes) DeclareVolume(volume);
+    const TreeOptions tree = {options.paths, options.recursive, options.json};
+    const JobOptions job = {options.paths, options.recursive, options.consent, options.verbose,
+                            options.json};
+    const CopyOptions copy = {job, options.target_directory, options.no_target_directory,
+                              options.allow_loss};
+    switch (options.command) {
+        case Command::kWhere:
+            return Where(options.paths.front(), options.json);
+        case Command::kList:
+            return List({.paths = options.paths,
+                         .details = options.details,
+                         .recursive = options.recursive,
+                         .json = options.json});
+        case Command::kGet:
+            return GetValue(options);
+        case Command::kSet:
+            return Set(options);
+        case Command::kRemove:
+            return Remove(options);
+        case Command::kLock:
+            return Lock(options, true);
+        case Command::kUnlock:
+            return Lock(options, false);
+        case Command::kImport:
+            return Import(options.apple_double, options.paths.front(), options.json);
+        case Command::kCopy:
+            return Copy(copy);
+        case Command::kMove:
+            return Move(copy);
+        case Command::kDelete:
+            return Delete(job);
+        case Command::kUpgrade:
+            return Upgrade(tree);
+        case Command::kRepair:
+            return Repair(tree);
+        case Command::kClean:
+            return Clean({.directories = options.paths,
+                          .recursive = options.recursive,
+                          .remove = options.yes,
+                          .others = options.all,
+                          .json = options.json});
+        case Command::kConvert:
+            return Convert({.source = options.paths.front(),
+                            .destination = options.destination,
+                            .type = options.to,
+                            .recursive = options.recursive,
+                            .compare_only = options.compare_only,
+                            .json = options.json});
+        case Command::kDump:
+            break;
+    }
+    return Dump(options);
+}
+
+}  // namespace mavoea::tool

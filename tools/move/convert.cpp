@@ -1,0 +1,211 @@
+#include "tools/move/convert.h"
+
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdint>
+#include <filesystem>
+#include <iostream>
+#include <set>
+#include <vector>
+
+#include "tools/place/volume.h"
+#include "tools/say/interrupt.h"
+#include "tools/say/output.h"
+#include "tools/say/progress.h"
+#include "tools/transfer/comparison.h"
+#include "tools/transfer/transfer.h"
+#include "tools/transfer/tree_copy.h"
+
+namespace mavoea::tool {
+namespace {
+
+struct Pair {
+    Place from;
+    Place to;
+};
+
+class Conversion {
+ public:
+    Conversion(const ConvertOptions& options, Pair top)
+        : options_(options),
+          top_(std::move(top)),
+          progress_(options.compare_only ? "comparing" : "converting") {}
+
+    void Copy() {
+        Transfer transfer({.on_bytes = [this](std::uint64_t) { Show(in_hand_); },
+                           .give_up = InterruptedAgain,
+                           .on_note = [this](const std::string& note) { notes_.push_back(note); }});
+        const TreeCopyHooks hooks = {
+            .stopped = [] { return Interrupted() != 0; },
+            .on_begin = [this](const Place& from) { Show(from.path()); },
+            .on_done = [this](const Place&, const Place&) { ++converted_; },
+            .on_failure = [this](const std::string& path,
+                                 const Failure& failure) { AddFailure(path, failure); },
+            .recursive = options_.recursive};
+        CopyTree(&transfer, top_.from, top_.to, hooks);
+        Try(top_.to.path(), [&] { transfer.MakeDurable(); });
+    }
+
+    void Compare() {
+        std::vector<Pair> pairs = {top_};
+        while (!pairs.empty() && Interrupted() == 0) {
+            const Pair pair = std::move(pairs.back());
+            pairs.pop_back();
+            Show(pair.from.path());
+            Try(pair.from.path(), [&] { CompareObject(pair, &pairs); });
+        }
+    }
+
+    ExitStatus Summarize() {
+        progress_.Clear();
+        if (options_.json) {
+            PrintJson();
+        } else {
+            if (!options_.compare_only) std::cout << converted_ << " converted, ";
+            std::cout << compared_ << " compared, " << differences_
+                      << (differences_ == 1 ? " difference, " : " differences, ")
+                      << failures_.size() << " failed\n";
+        }
+        for (const std::string& note : notes_) Note(note);
+        for (const FailedObject& failed : failures_) Report(failed.message);
+        if (Interrupted() != 0) {
+            Report("interrupted; the source is as it was, give the command again");
+            constexpr int kSignalled = 128;
+            return static_cast<ExitStatus>(kSignalled + Interrupted());
+        }
+        return differences_ > 0 ? kFailed : status_;
+    }
+
+ private:
+    void CompareObject(const Pair& pair, std::vector<Pair>* pairs) {
+        const auto info = pair.from.Status();
+        if (!info) throw SystemFailure(pair.from.path(), ENOENT);
+        const auto there = pair.to.Status();
+        if (!there) {
+            return Add({.path = pair.from.path(), .what = Difference::What::kMissing});
+        }
+        const ComparisonReceiver receiver = {
+            .differs = [this](const Difference& difference) { Add(difference); },
+            .fails = [&](const Failure& failure) { AddFailure(pair.from.path(), failure); },
+            .give_up = InterruptedAgain};
+        tool::Compare(ObjectAt(pair.from, &*info), ObjectAt(pair.to, &*there), receiver);
+        ++compared_;
+        if (!options_.recursive || !S_ISDIR(info->st_mode) || !S_ISDIR(there->st_mode)) return;
+        const DirectoryRef from = pair.from.directory->OpenIn(pair.from.name);
+        const DirectoryRef to = pair.to.directory->OpenIn(pair.to.name);
+        std::vector<Directory::Entry> entries = ObjectsIn(from);
+        std::set<std::string> known;
+        for (auto entry = entries.rbegin(); entry != entries.rend(); ++entry) {
+            pairs->push_back({{from, entry->name}, {to, entry->name}});
+            known.insert(entry->name);
+        }
+        for (const Directory::Entry& entry : ObjectsIn(to)) {
+            if (known.contains(entry.name)) continue;
+            Add({.path = to->PathOf(entry.name), .what = Difference::What::kExtra});
+        }
+    }
+
+    template <class Work>
+    void Try(const std::string& path, Work work) {
+        try {
+            work();
+        } catch (const Failure& failure) {
+            AddFailure(path, failure);
+        }
+    }
+
+    void Add(const Difference& difference) {
+        ++differences_;
+        if (options_.json) {
+            list_.Add(DifferenceJson(difference));
+        } else {
+            progress_.Clear();
+            std::cout << DifferenceText(difference) << '\n';
+        }
+    }
+
+    void AddFailure(const std::string& path, const Failure& failure) {
+        failures_.push_back({path, failure.what()});
+        status_ = std::max(status_, failure.status());
+    }
+
+    void Show(const std::string& path) {
+        in_hand_ = path;
+        progress_.Show(std::to_string(converted_) + " converted, " + std::to_string(compared_) +
+                           " compared, " + std::to_string(failures_.size()) + " failed",
+                       path);
+    }
+
+    void PrintJson() const {
+        Json json;
+        json.Set("converted", converted_);
+        json.Set("compared", compared_);
+        json.Set("differences", list_);
+        json.Set("failed", failures_.size());
+        json.Set("interrupted", Interrupted() != 0);
+        SetMessages(json, "notes", notes_);
+        SetFailures(json, failures_);
+        Print(json);
+    }
+
+    const ConvertOptions& options_;
+    Pair top_;
+    Progress progress_;
+    std::string in_hand_;
+    std::uint64_t converted_ = 0;
+    std::uint64_t compared_ = 0;
+    std::uint64_t differences_ = 0;
+    Json list_ = Json::Array();
+    std::vector<std::string> notes_;
+    std::vector<FailedObject> failures_;
+    ExitStatus status_ = kSuccess;
+};
+
+// Where it is, whatever symbolic links lead there; one at its own end stays.
+std::filesystem::path RealPath(const Place& place) {
+    const std::filesystem::path given(place.path());
+    std::error_code error;
+    const auto parent = std::filesystem::canonical(place.directory->ProcPath(), error);
+    return error ? given : parent / place.name;
+}
+
+bool IsWithin(const std::filesystem::path& inner, const std::filesystem::path& outer) {
+    return std::mismatch(outer.begin(), outer.end(), inner.begin(), inner.end()).first ==
+           outer.end();
+}
+
+}  // namespace
+
+ExitStatus Convert(const ConvertOptions& options) {
+    if (options.recursive) RequireDescriptorPaths();
+    const Object source = FindObject(options.source);
+    RequireParent(source);
+    if (options.destination.empty()) {
+        throw Failure(kFailed, "DST", "it is empty", "name the copy");
+    }
+    // The destination's type must not say anything of the source.
+    (void)DeclareType(options.destination, options.type, "--to " + options.type);
+    const Place destination = PlaceOf(options.destination);
+    const auto real_source = RealPath(source.place);
+    const auto real_destination = RealPath(destination);
+    if (IsWithin(real_destination, real_source) || IsWithin(real_source, real_destination)) {
+        throw Failure(kFailed, options.destination, "it and the source are not apart",
+                      "name a place outside of the source");
+    }
+    const Object target = ObjectAt(destination, nullptr);
+    if (source.keeping() == Keeping::kNone) throw NoStore(source);
+    if (target.kind() == VolumeKind::kNone) throw NoStore(target);
+    if (options.compare_only && !destination.Status()) {
+        throw SystemFailure(destination.path(), ENOENT);
+    }
+
+    WatchForInterrupts();
+    Conversion conversion(options, {source.place, destination});
+    if (!options.compare_only) conversion.Copy();
+    conversion.Compare();
+    return conversion.Summarize();
+}
+
+}  // namespace mavoea::tool

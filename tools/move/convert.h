@@ -1,0 +1,26 @@
+// mavoea convert: a copy on a volume of another kind, compared with what was copied.
+#ifndef MAVOEA_TOOLS_MOVE_CONVERT_H_
+#define MAVOEA_TOOLS_MOVE_CONVERT_H_
+
+#include <string>
+
+#include "tools/say/messages.h"
+
+namespace mavoea::tool {
+
+struct ConvertOptions {
+    std::string source;
+    std::string destination;  // of the copy itself; its parent is there
+    std::string type;         // of the destination's volume, as --volume takes it
+    bool recursive = false;
+    bool compare_only = false;
+    bool json = false;
+};
+
+// Nothing is removed from the source. Goes on after a failure; kSuccess when nothing failed and
+// nothing differs, otherwise the gravest status; 128 and the signal's number when interrupted.
+ExitStatus Convert(const ConvertOptions& options);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_MOVE_CONVERT_H_

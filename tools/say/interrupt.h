@@ -1,0 +1,18 @@
+// Ctrl-C and its like: noticed between objects, not in the middle of one.
+#ifndef MAVOEA_TOOLS_SAY_INTERRUPT_H_
+#define MAVOEA_TOOLS_SAY_INTERRUPT_H_
+
+namespace mavoea::tool {
+
+// From here on SIGINT and SIGTERM are counted only, unless they are ignored.
+void WatchForInterrupts();
+
+// The number of the first signal that came, 0 when none did.
+int Interrupted();
+
+// Whether another one came after it: not even the object in hand is to be finished.
+bool InterruptedAgain();
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_SAY_INTERRUPT_H_

@@ -1,0 +1,37 @@
+#include "tools/say/output.h"
+
+#include <iostream>
+
+namespace mavoea::tool {
+
+void Print(const Json& json) { std::cout << json.Text() << '\n'; }
+
+void SetMessages(Json& json, const char* key, const std::vector<std::string>& messages) {
+    Json list = Json::Array();
+    for (const std::string& message : messages) {
+        Json item;
+        item.SetText("message", message);
+        list.Add(std::move(item));
+    }
+    json.Set(key, std::move(list));
+}
+
+void SetFailures(Json& json, const std::vector<FailedObject>& failures) {
+    Json list = Json::Array();
+    for (const FailedObject& failed : failures) {
+        Json item;
+        item.SetText("path", failed.path);
+        item.SetText("message", failed.message);
+        list.Add(std::move(item));
+    }
+    json.Set("failures", std::move(list));
+}
+
+void Report(std::string_view message) {
+    std::cout.flush();  // What was found before comes first.
+    std::cerr << "mavoea: " << message << '\n';
+}
+
+void Note(std::string_view message) { Report("note: " + std::string(message)); }
+
+}  // namespace mavoea::tool

@@ -1,0 +1,212 @@
+#include "tools/show/attributes.h"
+
+#include <fcntl.h>
+
+#include <algorithm>
+#include <iomanip>
+#include <iostream>
+#include <optional>
+
+#include "tools/place/volume.h"
+#include "tools/say/output.h"
+#include "tools/say/text.h"
+#include "tools/store/reader.h"
+#include "tools/store/sidecars.h"
+#include "tools/walk/tree.h"
+
+namespace mavoea::tool {
+namespace {
+
+struct Line {
+    std::string name;
+    std::uint64_t size;
+    const char* kind;
+    std::string file;  // that holds it
+};
+
+std::vector<Line> LinesOf(const Object& object, const Metadata& metadata) {
+    std::vector<Line> lines;
+    for (const Metadata::Attribute& attribute : metadata.attributes) {
+        lines.push_back({attribute.name, attribute.value.size(), "attribute", attribute.holder});
+    }
+    if (const auto& info = metadata.finder_info) {
+        lines.push_back(
+            {std::string(kFinderInfoName), info->value.size(), "Finder info", info->holder});
+    }
+    if (const auto& fork = metadata.fork) {
+        lines.push_back(
+            {std::string(kResourceForkName), fork->value.size(), "resource fork", fork->holder});
+    }
+    if (metadata.locked) {
+        lines.push_back({std::string(kLockedName), 1, "locked state", object.path()});
+    }
+    return lines;
+}
+
+// On an AppleDouble volume, a file of the metadata's name that holds none is told.
+void AddOccupied(const Object& object, Metadata* metadata) {
+    const std::string name = AppleDoubleName(object.place.name);
+    if (object.keeping() != Keeping::kAppleDouble || name.empty()) return;
+    try {
+        const auto file = object.place.directory->FindFile(name, O_RDONLY);
+        if (!file || file->Size() == 0 || IsAppleDouble(*object.place.directory, name)) return;
+        metadata->problems.emplace_back(kFailed, file->path(), "no AppleDouble file",
+                                        "move it away, or look at it with: mavoea dump FILE");
+    } catch (const Failure& failure) {
+        metadata->problems.push_back(failure);
+    }
+}
+
+Metadata ReadAll(const Object& object) {
+    RequireParent(object);
+    if (object.keeping() == Keeping::kNone) throw NoStore(object);
+    Metadata metadata = ReadMetadata(object, Sidecars::Services::kLeaveOut);
+    AddOccupied(object, &metadata);
+    return metadata;
+}
+
+class Listing {
+ public:
+    explicit Listing(const ListOptions& options) : options_(options) {}
+
+    ExitStatus Run() {
+        VisitObjects(
+            options_.paths, options_.recursive,
+            {.work = [this](const Object& object,
+                            const std::string& shown) { return Show(object, shown); },
+             .on_failure = [this](const std::string&, const Failure& failure) { Add(failure); }});
+        if (options_.json) Print(json_);
+        return status_;
+    }
+
+ private:
+    void Add(const Failure& failure) {
+        Report(failure.what());
+        status_ = std::max(status_, failure.status());
+    }
+
+    bool Show(const Object& object, const std::string& shown) {
+        try {
+            const Metadata metadata = ReadAll(object);
+            const std::vector<Line> lines = LinesOf(object, metadata);
+            if (options_.json) {
+                AddJson(object, lines);
+            } else if (!lines.empty() || !options_.recursive) {
+                AddText(shown, lines);
+            }
+            for (const Failure& problem : metadata.problems) Add(problem);
+        } catch (const Failure& failure) {
+            Add(failure);
+        }
+        return true;
+    }
+
+    void AddText(const std::string& path, const std::vector<Line>& lines) {
+        if (options_.recursive || options_.paths.size() > 1) {
+            std::cout << (first_ ? "" : "\n") << Printable(path) << ":\n";
+        }
+        first_ = false;
+        std::size_t width = 0;
+        for (const Line& line : lines) width = std::max(width, Printable(line.name).size());
+        for (const Line& line : lines) {
+            const std::string name = Printable(line.name);
+            if (!options_.details) {
+                std::cout << name << '\n';
+                continue;
+            }
+            std::cout << std::setw(10) << line.size << "  " << std::left << std::setw(13)
+                      << line.kind << "  " << std::setw(static_cast<int>(width)) << name
+                      << std::right << "  " << Printable(line.file) << '\n';
+        }
+    }
+
+    void AddJson(const Object& object, const std::vector<Line>& lines) {
+        Json attributes = Json::Array();
+        for (const Line& line : lines) {
+            Json entry;
+            entry.SetText("name", line.name);
+            entry.Set("size", line.size);
+            entry.Set("kind", line.kind);
+            entry.SetText("file", line.file);
+            attributes.Add(std::move(entry));
+        }
+        Json entry;
+        entry.SetText("path", object.path());
+        entry.Set("type", object.type);
+        entry.Set("attributes", std::move(attributes));
+        json_.Add(std::move(entry));
+    }
+
+    const ListOptions& options_;
+    Json json_ = Json::Array();
+    bool first_ = true;
+    ExitStatus status_ = kSuccess;
+};
+
+std::optional<Content> Find(const Metadata& metadata, const std::string& name) {
+    switch (KindOf(name)) {
+        case Kind::kFinderInfo:
+            return metadata.finder_info ? std::optional(metadata.finder_info->value) : std::nullopt;
+        case Kind::kResourceFork:
+            return metadata.fork ? std::optional(metadata.fork->value) : std::nullopt;
+        case Kind::kLocked:
+            return Content(Bytes{static_cast<std::uint8_t>(metadata.locked ? '1' : '0')});
+        case Kind::kAttribute:
+            break;
+    }
+    const Metadata::Attribute* const attribute = metadata.Find(name);
+    return attribute != nullptr ? std::optional(attribute->value) : std::nullopt;
+}
+
+void WriteRaw(const Content& value) {
+    constexpr std::uint64_t kPiece = std::uint64_t{1} << 20;
+    for (std::uint64_t at = 0; at < value.size(); at += kPiece) {
+        const Bytes piece = value.Read(at, kPiece);
+        std::cout.write(reinterpret_cast<const char*>(piece.data()),
+                        static_cast<std::streamsize>(piece.size()));
+    }
+}
+
+}  // namespace
+
+ExitStatus List(const ListOptions& options) { return Listing(options).Run(); }
+
+ExitStatus Get(const std::string& path, const std::string& name, Format format) {
+    const Object object = FindObject(path);
+    const Metadata metadata = ReadAll(object);
+    const std::optional<Content> value = Find(metadata, name);
+    // The lock is told by what could be read, unless nothing of it could.
+    const bool unknown = !value || KindOf(name) == Kind::kLocked;
+    if (unknown && !metadata.problems.empty()) throw Failure(metadata.problems.front());
+    if (!value) throw NoAttribute(path, name);
+    // Finder info and fork lie in several places, the first of which counts.
+    const bool several = KindOf(name) == Kind::kFinderInfo || KindOf(name) == Kind::kResourceFork;
+    if ((value->damaged() || several) && !metadata.problems.empty()) {
+        throw Failure(metadata.problems.front());
+    }
+    switch (format) {
+        case Format::kRaw:
+            WriteRaw(*value);
+            break;
+        case Format::kHexDump:
+            std::cout << HexDump(value->All());
+            break;
+        case Format::kJson: {
+            Json json;
+            json.SetText("path", object.path());
+            json.SetText("name", name);
+            json.Set("size", value->size());
+            json.Set("hex", HexDigits(value->All()));
+            Print(json);
+            break;
+        }
+    }
+    return kSuccess;
+}
+
+Failure NoAttribute(const std::string& path, const std::string& name) {
+    return {kNotFound, path, "no attribute \"" + Printable(name) + "\"",
+            "mavoea list PATH has the names"};
+}
+
+}  // namespace mavoea::tool

@@ -1,0 +1,32 @@
+// mavoea list and mavoea get: what an object has, wherever it lies. Nothing changes by it.
+#ifndef MAVOEA_TOOLS_SHOW_ATTRIBUTES_H_
+#define MAVOEA_TOOLS_SHOW_ATTRIBUTES_H_
+
+#include <string>
+#include <vector>
+
+#include "tools/say/messages.h"
+
+namespace mavoea::tool {
+
+struct ListOptions {
+    std::vector<std::string> paths;
+    bool details = false;
+    bool recursive = false;
+    bool json = false;
+};
+
+// In recursive work, objects that have nothing are left out. What cannot be looked at is told, and
+// is a failure.
+ExitStatus List(const ListOptions& options);
+
+enum class Format { kRaw, kHexDump, kJson };
+
+ExitStatus Get(const std::string& path, const std::string& name, Format format);
+
+// What there is to say of an attribute that an object does not have.
+Failure NoAttribute(const std::string& path, const std::string& name);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_SHOW_ATTRIBUTES_H_

@@ -1,0 +1,320 @@
+#include "tools/store/change.h"
+
+#include <fcntl.h>
+
+#include <cerrno>
+#include <limits>
+
+#include "format/apple_double.h"
+#include "include/mavoea.h"
+#include "tools/say/messages.h"
+#include "tools/store/apple_double_file.h"
+#include "tools/store/marks.h"
+#include "tools/store/reader.h"
+#include "tools/store/record.h"
+#include "tools/store/rights.h"
+#include "tools/store/sidecars.h"
+#include "tools/store/stream_file.h"
+
+namespace mavoea::tool {
+namespace {
+
+// Finder info of another size than its own is a Failure.
+void CheckFinderInfoSize(const std::string& path, const Bytes& value) {
+    if (value.size() == kFinderInfoSize) return;
+    throw Failure(kFailed, path,
+                  "Finder info has " + std::to_string(kFinderInfoSize) + " bytes, the value has " +
+                      std::to_string(value.size()),
+                  "give all of them, as with --hex and 64 digits");
+}
+
+// ---- Volumes that keep metadata in files beside the object --------------------------------------
+
+class FileChanger final : public Changer {
+ public:
+    explicit FileChanger(const Object& object)
+        : object_(object), has_record_(object.kind() == VolumeKind::kFileEA) {
+        const Place& place = object.place;
+        if (object.keeping() == Keeping::kAppleDouble) {
+            const std::string name = AppleDoubleName(place.name);
+            if (name.empty()) {
+                throw Failure(kFailed, object.path(), "the path of its metadata would be too long",
+                              "use a shorter name or path");
+            }
+            names_ = {name};
+        } else {
+            RequireOwnNames(object);
+            const std::string derived = NameInEaDirectory(place.name);
+            names_ = {derived + "@" MAVOEA_KIND_RESOURCE, derived + "@" MAVOEA_KIND_STREAM};
+        }
+    }
+
+    void Set(const std::string& name, const Bytes& value) override {
+        switch (KindOf(name)) {
+            case Kind::kAttribute:
+            case Kind::kLocked: {
+                const auto file = Open(names_.back(), true);
+                StreamFile(*file).Set(name, value);
+                file->Commit();
+                return;
+            }
+            case Kind::kFinderInfo:
+                CheckFinderInfoSize(object_.path(), value);
+                // Nothing at all means none, also where another file still has some.
+                if (IsAllZero(value)) {
+                    Remove(name);
+                } else {
+                    SetFinderInfo(value);
+                }
+                return;
+            case Kind::kResourceFork:
+                if (value.empty()) {
+                    Remove(name);
+                } else {
+                    const auto file = Open(names_.front(), true);
+                    AppleDoubleFile(*file).SetFork(value);
+                    file->Commit();
+                }
+                return;
+        }
+    }
+
+    bool Remove(const std::string& name) override {
+        const Kind kind = KindOf(name);
+        if (kind == Kind::kAttribute || kind == Kind::kLocked) {
+            const auto file = Open(names_.back(), false);
+            return file && StreamFile(*file).Remove(name);
+        }
+        bool removed = false;
+        std::shared_ptr<const Inode> inode;
+        std::optional<Record> record;
+        if (kind == Kind::kFinderInfo && has_record_) {
+            inode = Inode::Open(object_.place);
+            record = Record::Read(*inode);
+        }
+        for (const std::string& holder : names_) {
+            const auto opened = Open(holder, false);
+            if (!opened) continue;
+            AppleDoubleFile file(*opened);
+            if (kind == Kind::kFinderInfo && file.HasFinderInfo()) {
+                file.SetFinderInfo(Bytes(kFinderInfoSize));
+                removed = true;
+            }
+            if (kind == Kind::kResourceFork && file.ForkLength() > 0) {
+                file.SetFork({});
+                removed = true;
+            }
+        }
+        if (record && record->HasFinderInfo()) {
+            record->SetFinderInfo(Bytes(kFinderInfoSize));
+            record->Store(*inode);
+            removed = true;
+        }
+        if (removed && inode) StampFlushTime(*inode);
+        return removed;
+    }
+
+ private:
+    std::unique_ptr<ChangedFile> Open(const std::string& name, bool make) const {
+        DirectoryRef in = object_.place.directory;
+        if (object_.keeping() == Keeping::kEaDirectory) {
+            in = make ? NeedEaDirectory(*in) : in->FindAgain(kEaDirName);
+        }
+        return in ? ChangedFile::Open(object_.place, {in, name}, make) : nullptr;
+    }
+
+    // Into the first holder, then into the record: a record that is there keeps its other entries,
+    // one that is missing is made.
+    void SetFinderInfo(const Bytes& value) const {
+        std::shared_ptr<const Inode> inode;
+        std::optional<Record> record;
+        if (has_record_) {
+            inode = Inode::Open(object_.place);
+            record = Record::Read(*inode);
+        }
+        if (record) record->SetFinderInfo(value);
+        const auto file = Open(names_.front(), true);
+        AppleDoubleFile(*file).SetFinderInfo(value);
+        file->Commit();
+        if (record) record->Store(*inode);
+        if (inode && !record) StoreFreshRecord(*inode, value);
+        if (inode) StampFlushTime(*inode);
+    }
+
+    const Object object_;
+    bool has_record_;
+    // Of Finder info and resource fork: the first that has them is believed, and written; the last
+    // has the attributes.
+    std::vector<std::string> names_;
+};
+
+// ---- Volumes that keep attributes of the object itself ------------------------------------------
+
+class AttributeChanger final : public Changer {
+ public:
+    explicit AttributeChanger(const Object& object) : inode_(Inode::Open(object.place)) {
+        if (inode_->HoldsContents()) return;
+        throw Failure(kFailed, object.path(), "only files and directories have attributes",
+                      "name what it leads to, if it is a symbolic link");
+    }
+
+    void Set(const std::string& name, const Bytes& value) override {
+        if (value.size() > std::size_t{std::numeric_limits<int>::max()}) {
+            throw Failure(kFailed, inode_->path(), "the value has 2 GiB or more",
+                          "use a smaller value");
+        }
+        if (KindOf(name) == Kind::kFinderInfo) CheckFinderInfoSize(inode_->path(), value);
+        if (KindOf(name) != Kind::kResourceFork) return inode_->SetAttribute(name, value);
+        static constexpr std::uint8_t kNothing = 0;  // The library takes no NULL.
+        const ErrorMark mark;
+        if (MAVOEAXattrSet(inode_->ProcPath().c_str(), name.c_str(),
+                           value.empty() ? &kNothing : value.data(), static_cast<int>(value.size()),
+                           0) == 0) {
+            return;
+        }
+        const LibraryError error = mark.Get();
+        if (!OffersNoFork(error)) throw LibraryFailure(inode_->path(), error);
+        throw Failure(kFailed, inode_->path(), "its file system offers no resource fork for it",
+                      "only files have one, on volumes of Mac file systems");
+    }
+
+    bool Remove(const std::string& name) override {
+        if (KindOf(name) != Kind::kResourceFork) return inode_->RemoveAttribute(name);
+        const std::string path = inode_->ProcPath();
+        const ErrorMark mark;
+        // Emptying a fork that is empty succeeds.
+        if (MAVOEAXattrGet(path.c_str(), name.c_str(), nullptr, 0) > 0 &&
+            MAVOEAXattrRemove(path.c_str(), name.c_str()) == 0) {
+            return true;
+        }
+        const LibraryError error = mark.Get();
+        if (OffersNoFork(error) || error.error == ENODATA) return false;
+        throw LibraryFailure(inode_->path(), error);
+    }
+
+ private:
+    // Directories have none, and most file systems offer none.
+    static bool OffersNoFork(const LibraryError& error) {
+        return error.code == MAVOEA_ERR_NOTHING_THERE || error.error == ENOTDIR ||
+               error.error == ENOENT;
+    }
+
+    std::shared_ptr<const Inode> inode_;
+};
+
+// ---- The lock -----------------------------------------------------------------------------------
+
+constexpr std::uint16_t kLocking = kAfpNoWrite | kAfpNoRename | kAfpNoDelete;
+// What the library sets in records that say something of the lock.
+constexpr std::uint16_t kLockedByLibrary = 0xA000;
+
+std::uint16_t WithLock(std::uint16_t word, bool locked) {
+    return static_cast<std::uint16_t>(locked ? word | kLockedByLibrary
+                                             : word & ~(kLocking | kLockedByLibrary));
+}
+
+void SetRecordLock(const Object& object, const Inode& inode, bool locked) {
+    if (object.kind() == VolumeKind::kFileEA) {
+        auto record = Record::Read(inode);
+        const auto word = record ? record->AfpAttributes() : std::nullopt;
+        if (!word || WithLock(*word, locked) == *word) return;
+        record->SetAfpAttributes(WithLock(*word, locked));
+        return record->Store(inode);
+    }
+    const Sidecars sidecars = Sidecars::Find(object, Sidecars::Services::kLeaveOut);
+    if (!sidecars.resource) return;
+    const Place place = {sidecars.resource->directory, sidecars.resource->name};
+    {
+        // Nothing is opened for writing that need not be.
+        const auto file = place.directory->FindFile(place.name, O_RDONLY);
+        if (!file || !ReadLayout(*file).FindEntry(EntryId::kAfpFileInfo)) return;
+    }
+    RequireOwnNames(object);
+    const auto changed = ChangedFile::Open(object.place, place, false);
+    if (!changed) return;
+    AppleDoubleFile file(*changed);
+    const auto word = file.AfpAttributes();
+    if (word && WithLock(*word, locked) != *word) file.SetAfpAttributes(WithLock(*word, locked));
+}
+
+// A "._" file that had the rights of a locked object gets those of the unlocked one.
+void LetSidecarFollow(const Object& object, const Inode& inode, mode_t before) {
+    const Sidecars sidecars = Sidecars::Find(object, Sidecars::Services::kLeaveOut);
+    const auto& found = sidecars.apple_double;
+    if (!found || (found->info.st_mode & kPermissionBits) != (before & 0666)) return;
+    const auto file = found->directory->FindFile(found->name, O_RDONLY);
+    if (file && file->Status().st_nlink == 1) Rights::Of(inode).Give(*file);
+}
+
+class LockChanger final : public Changer {
+ public:
+    LockChanger(const Object& object, std::unique_ptr<Changer> changer)
+        : object_(object), changer_(std::move(changer)) {}
+
+    void Set(const std::string& name, const Bytes& value) override {
+        if (KindOf(name) != Kind::kLocked) return changer_->Set(name, value);
+        if (value.size() != 1 || (value[0] != '0' && value[0] != '1')) {
+            throw Failure(kFailed, object_.path(), "the locked state is 0 or 1",
+                          "give it without a line's end, or use mavoea lock and mavoea unlock");
+        }
+        SetLocked(object_, value[0] == '1');
+    }
+
+    bool Remove(const std::string& name) override {
+        if (KindOf(name) != Kind::kLocked) return changer_->Remove(name);
+        if (!ReadMetadata(object_, Sidecars::Services::kLeaveOut).locked) return false;
+        SetLocked(object_, false);
+        return true;
+    }
+
+ private:
+    const Object object_;
+    std::unique_ptr<Changer> changer_;
+};
+
+std::unique_ptr<Changer> MakeChanger(const Object& object) {
+    RequireParent(object);
+    switch (object.keeping()) {
+        case Keeping::kAppleDouble:
+        case Keeping::kEaDirectory:
+            return std::make_unique<FileChanger>(object);
+        case Keeping::kXattr:
+            return std::make_unique<AttributeChanger>(object);
+        case Keeping::kNone:
+            break;
+    }
+    throw NoStore(object);
+}
+
+}  // namespace
+
+std::unique_ptr<Changer> OpenChanger(const Object& object) {
+    return std::make_unique<LockChanger>(object, MakeChanger(object));
+}
+
+void SetLocked(const Object& object, bool locked) {
+    if (object.keeping() == Keeping::kNone) throw NoStore(object);
+    const Metadata metadata = ReadMetadata(object, Sidecars::Services::kLeaveOut);
+    if (!metadata.problems.empty()) throw Failure(metadata.problems.front());
+    const auto inode = Inode::Open(object.place);
+    if (inode->HoldsContents()) {
+        if (LocksByMode(object)) {
+            const mode_t before = inode->info().st_mode;
+            if (locked && (before & kWriteBits) != 0) LockMode(*inode, before & kPermissionBits);
+            if (!locked) UnlockMode(*inode);
+            if (!locked) LetSidecarFollow(object, *inode, before);
+        } else {
+            SetLockFlag(*inode, locked);
+            SetRecordLock(object, *inode, locked);
+            // An upgrade may have taken the write bits.
+            if (!locked && RemembersMode(*inode)) UnlockMode(*inode);
+        }
+    }
+    if (ReadMetadata(object, Sidecars::Services::kLeaveOut).locked == locked) return;
+    throw Failure(kFailed, object.path(),
+                  locked ? "its file system cannot keep the locked state" : "it stays locked",
+                  "the locked state takes a file system with attributes of users, and an object "
+                  "that may have them");
+}
+
+}  // namespace mavoea::tool

@@ -1,0 +1,34 @@
+// A metadata file that is changed in place, or made for a change.
+#ifndef MAVOEA_TOOLS_STORE_CHANGED_FILE_H_
+#define MAVOEA_TOOLS_STORE_CHANGED_FILE_H_
+
+#include <memory>
+
+#include "tools/place/directory.h"
+#include "tools/store/rights.h"
+
+namespace mavoea::tool {
+
+// Locked against other processes until the end of its scope. A file that is made gets its name, and
+// its object's rights, with Commit(); without, nothing of it stays. All members throw Failure.
+class ChangedFile {
+ public:
+    // Null when there is no such file and it is not to be made.
+    static std::unique_ptr<ChangedFile> Open(const Place& object, const Place& file, bool make);
+
+    const File& file() const { return made_ ? made_->file() : *existing_; }
+    const std::string& path() const { return file().path(); }
+
+    void Commit();
+
+ private:
+    ChangedFile() = default;
+
+    std::shared_ptr<const File> existing_;
+    std::unique_ptr<TemporaryFile> made_;
+    Rights rights_;
+};
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_STORE_CHANGED_FILE_H_

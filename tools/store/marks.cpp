@@ -1,0 +1,106 @@
+#include "tools/store/marks.h"
+
+#include <cerrno>
+
+#include "adouble/ea_copy_lock.h"
+#include "format/flush_time.h"
+#include "format/netatalk_record.h"
+#include "include/mavoea.h"
+#include "platform/attribute_word.h"
+#include "platform/file_status.h"
+#include "platform/kernel.h"
+#include "platform/marks.h"
+#include "tools/say/messages.h"
+
+namespace mavoea::tool {
+namespace {
+
+// The write bits that a locked file had, as text: "0220".
+constexpr const char* kFormerBits = "user.mavoea.writable";
+
+constexpr std::uint16_t kLocking = kAfpNoWrite | kAfpNoRename | kAfpNoDelete;
+
+bool LockedByRecord(const Metadata& metadata) {
+    const auto found = metadata.entries.find(EntryId::kAfpFileInfo);
+    if (found == metadata.entries.end() || found->second.value.damaged()) return false;
+    const Bytes bytes = found->second.value.All();
+    return bytes.size() >= kAfpFileInfoSize &&
+           (LoadBe16(&bytes[kAfpAttributesOffset]) & kLocking) != 0;
+}
+
+std::optional<mode_t> FormerBits(const Inode& inode) {
+    const auto value = inode.Attribute(kFormerBits);
+    if (!value || value->size() != 4) return std::nullopt;
+    mode_t bits = 0;
+    for (const std::uint8_t digit : *value) {
+        if (digit < '0' || digit > '7') return std::nullopt;
+        bits = bits << 3 | static_cast<mode_t>(digit - '0');
+    }
+    return bits & kWriteBits;
+}
+
+}  // namespace
+
+void ReadMarks(const Object& object, const Inode& inode, Metadata* metadata) {
+    if (!inode.HoldsContents()) return;
+    FileStatus status;
+    if (!ReadFileStatus(inode.ProcPath().c_str(), &status)) {
+        metadata->problems.push_back(SystemFailure(inode.path(), errno));
+        return;
+    }
+    metadata->hidden = metadata->hidden || (status.attributes & MLIBC_ATTRIBUTE_HIDDEN) != 0;
+    metadata->archived = (status.attributes & MLIBC_ATTRIBUTE_ARCHIVE) != 0;
+    metadata->locked = LocksByMode(object) ? (inode.info().st_mode & kWriteBits) == 0
+                                           : (status.attributes & MLIBC_ATTRIBUTE_LOCKED) != 0 ||
+                                                 LockedByRecord(*metadata);
+}
+
+void SetLockFlag(const Inode& inode, bool locked) {
+    (void)EASetLockFlag(inode.ProcPath().c_str(), locked ? 1 : 0);
+}
+
+void SetHidden(const Inode& inode, bool hidden) {
+    (void)kernel::FileCommand(inode.ProcPath().c_str(),
+                              hidden ? marks::kSetHidden : marks::kClearHidden);
+}
+
+void SetArchived(const Inode& inode) { (void)EASetSmbArchive(inode.ProcPath().c_str()); }
+
+void LockMode(const Inode& inode, mode_t mode) {
+    const mode_t bits = mode & kWriteBits;
+    if (bits != 0) {
+        const std::uint8_t text[] = {'0', static_cast<std::uint8_t>('0' + (bits >> 6 & 7)),
+                                     static_cast<std::uint8_t>('0' + (bits >> 3 & 7)),
+                                     static_cast<std::uint8_t>('0' + (bits & 7))};
+        try {
+            inode.SetAttribute(kFormerBits, text);
+        } catch (const Failure&) {
+            // Without such attributes the owner's is what comes back.
+        }
+    }
+    inode.SetMode(mode & ~kWriteBits);
+}
+
+void UnlockMode(const Inode& inode) {
+    const mode_t wanted = UnlockedMode(inode);
+    if (wanted != (inode.Status().st_mode & kPermissionBits)) inode.SetMode(wanted);
+    (void)inode.RemoveAttribute(kFormerBits);
+}
+
+bool RemembersMode(const Inode& inode) { return FormerBits(inode).has_value(); }
+
+mode_t UnlockedMode(const Inode& inode) {
+    const mode_t mode = inode.Status().st_mode & kPermissionBits;
+    if ((mode & kWriteBits) != 0) return mode;
+    return mode | FormerBits(inode).value_or(S_IWUSR);
+}
+
+bool IsOfRecord(std::string_view attribute) {
+    return attribute == kNetatalkAttribute || attribute == kFlushTimeAttribute;
+}
+
+bool IsMark(std::string_view attribute) {
+    return attribute == attribute_word::kName || attribute == kFormerBits;
+}
+
+}  // namespace mavoea::tool

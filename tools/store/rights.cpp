@@ -1,0 +1,65 @@
+#include "tools/store/rights.h"
+
+#include <acl/libacl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+#include "tools/say/messages.h"
+
+namespace mavoea::tool {
+namespace {
+
+constexpr mode_t kReadWrite = 0666;
+constexpr mode_t kGroupBits = 0070;
+
+void DropExecution(acl_t acl) {
+    acl_entry_t entry;
+    for (int more = acl_get_entry(acl, ACL_FIRST_ENTRY, &entry); more == 1;
+         more = acl_get_entry(acl, ACL_NEXT_ENTRY, &entry)) {
+        acl_permset_t permissions;
+        if (acl_get_permset(entry, &permissions) != 0) continue;
+        (void)acl_delete_perm(permissions, ACL_EXECUTE);
+        (void)acl_set_permset(entry, permissions);
+    }
+}
+
+}  // namespace
+
+Rights Rights::Of(const Inode& object) {
+    const struct stat info = object.Status();
+    Rights rights;
+    rights.owner_ = info.st_uid;
+    rights.group_ = info.st_gid;
+    rights.mode_ = info.st_mode & kReadWrite;
+    const std::string path = object.ProcPath();
+    if (object.HoldsContents() && acl_extended_file(path.c_str()) == 1) {
+        rights.acl_.reset(acl_get_file(path.c_str(), ACL_TYPE_ACCESS));
+        if (rights.acl_) DropExecution(rights.acl_.get());
+    }
+    return rights;
+}
+
+Rights Rights::Of(const Inode& object, mode_t mode) {
+    Rights rights = Of(object);
+    rights.mode_ = mode & kReadWrite;
+    // The group's bits are the most that an ACL grants to anybody but owner and others.
+    rights.cut_ = rights.acl_ != nullptr;
+    return rights;
+}
+
+void Rights::Give(const File& file) const {
+    mode_t mode = mode_;
+    bool given = ::fchown(file.fd(), owner_, group_) == 0;
+    if (!given && ::fchown(file.fd(), static_cast<uid_t>(-1), group_) != 0 &&
+        file.Status().st_gid != group_) {
+        // Its group is another one, whose members are none of the object's.
+        mode &= ~kGroupBits;
+    } else if (acl_ && acl_set_fd(file.fd(), acl_.get()) == 0 && !cut_) {
+        return;
+    }
+    if (::fchmod(file.fd(), mode) != 0) throw SystemFailure(file.path(), errno);
+}
+
+}  // namespace mavoea::tool

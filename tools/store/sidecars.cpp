@@ -1,0 +1,303 @@
+#include "tools/store/sidecars.h"
+
+#include <fcntl.h>
+
+#include <algorithm>
+#include <array>
+
+#include "include/mavoea.h"
+#include "tools/say/messages.h"
+#include "tools/store/layout.h"
+
+namespace mavoea::tool {
+namespace {
+
+constexpr std::string_view kReserved = "MAVO";
+constexpr std::string_view kStreamSuffix = "@" MAVOEA_KIND_STREAM;
+constexpr std::string_view kResourceSuffix = "@" MAVOEA_KIND_RESOURCE;
+constexpr std::string_view kResourceCopySuffix = "@" MAVOEA_KIND_RESOURCE "Tmp";
+constexpr std::string_view kAppleDoublePrefix = "._";
+constexpr std::size_t kNameMax = 255;
+
+// The longest name that is used unchanged.
+constexpr std::size_t kUnchangedMax = kNameMax - kStreamSuffix.size();
+
+bool HasColon(const std::string& name) { return name.find(':') != std::string::npos; }
+
+class Finder {
+ public:
+    explicit Finder(const Object& object)
+        : directory_(*object.place.directory),
+          name_(object.place.name),
+          derived_(NameInEaDirectory(name_)) {}
+
+    Sidecars Run(const Object& object, Sidecars::Services services) {
+        const Keeping keeping = object.keeping();
+        if (keeping == Keeping::kNone || object.is_root()) return {};
+        if (keeping != Keeping::kXattr) FindAppleDouble();
+        try {
+            sidecars_.ea_dir = directory_.FindAgain(kEaDirName);
+        } catch (const Failure& failure) {
+            sidecars_.problem = failure;
+        }
+        if (!sidecars_.ea_dir) return std::move(sidecars_);
+        if (keeping != Keeping::kAppleDouble) FindFiles(keeping);
+        FindInFolder();
+        if (services == Sidecars::Services::kFind) FindServices();
+        return std::move(sidecars_);
+    }
+
+ private:
+    using Found = Sidecars::Found;
+
+    static std::optional<Found> Look(const DirectoryRef& directory, const std::string& name) {
+        const auto info = directory->StatusOf(name);
+        return info ? std::optional(Found{directory, name, *info}) : std::nullopt;
+    }
+
+    void FindAppleDouble() {
+        const std::string name = AppleDoubleName(name_);
+        if (name.empty()) return;
+        // Its access time says something, and is taken before anybody looks into it.
+        const auto found = Look(directory_.shared_from_this(), name);
+        if (found && IsAppleDouble(directory_, name)) sidecars_.apple_double = found;
+    }
+
+    void FindFiles(Keeping keeping) {
+        const DirectoryRef& in = sidecars_.ea_dir;
+        if (keeping == Keeping::kEaDirectory) {
+            sidecars_.stream = Look(in, derived_ + std::string(kStreamSuffix));
+        }
+        sidecars_.resource = Look(in, derived_ + std::string(kResourceSuffix));
+        const std::string copy = derived_ + std::string(kResourceCopySuffix);
+        if (copy.size() <= kNameMax) sidecars_.resource_copy = Look(in, copy);
+    }
+
+    void FindInFolder() {
+        const auto info = sidecars_.ea_dir->StatusOf(name_);
+        if (!info) return;
+        if (S_ISLNK(info->st_mode)) sidecars_.others.push_back({sidecars_.ea_dir, name_, *info});
+        if (!S_ISDIR(info->st_mode)) return;  // perhaps a file of another object
+        sidecars_.folder = sidecars_.ea_dir->OpenIn(name_);
+        AddFolder(sidecars_.folder, "/");
+    }
+
+    void AddFolder(const DirectoryRef& folder, const std::string& prefix) {
+        for (const Directory::Entry& entry : folder->Entries()) {
+            const auto found = Look(folder, entry.name);
+            if (!found) continue;
+            const std::string name = prefix + entry.name;
+            if (S_ISDIR(found->info.st_mode)) {
+                AddFolder(folder->OpenIn(entry.name), name + '/');
+                sidecars_.others.push_back(*found);
+            } else if (!found->regular()) {
+                sidecars_.others.push_back(*found);
+            } else {
+                AddFile(*found, name, prefix == "/");
+            }
+        }
+    }
+
+    void AddFile(const Found& found, const std::string& name, bool at_top) {
+        const bool reserved = found.name.starts_with(kReserved);
+        if (at_top && found.name == MAVOEA_KIND_LEGACY_RESOURCE) {
+            sidecars_.legacy_resource = found;
+        } else if (at_top && !reserved && !HasColon(found.name)) {
+            sidecars_.attribute_files.push_back(found);
+        } else {
+            if (at_top && reserved && HasColon(found.name)) sidecars_.reserved.push_back(found);
+            sidecars_.services.push_back({found, name});
+        }
+    }
+
+    // "NAME@KIND". Both may have an '@': it belongs to the object with the longest name.
+    void FindServices() {
+        const auto& all = sidecars_.ea_dir->EntriesAtFirst();
+        const std::string prefix = derived_ + '@';
+        auto entry = std::lower_bound(
+            all.begin(), all.end(), prefix,
+            [](const Directory::Entry& one, const std::string& name) { return one.name < name; });
+        for (; entry != all.end() && entry->name.starts_with(prefix); ++entry) {
+            const std::string kind = entry->name.substr(derived_.size());
+            if (kind == kStreamSuffix || kind == kResourceSuffix || kind == kResourceCopySuffix) {
+                continue;
+            }
+            if (BelongsToALongerName(entry->name)) continue;
+            const auto found = Look(sidecars_.ea_dir, entry->name);
+            if (!found) continue;
+            if (found->regular()) {
+                sidecars_.services.push_back({*found, kind});
+            } else if (!S_ISDIR(found->info.st_mode)) {
+                sidecars_.others.push_back(*found);
+            }
+        }
+    }
+
+    bool BelongsToALongerName(const std::string& name) const {
+        for (std::size_t at = name.find('@', derived_.size() + 1); at != std::string::npos;
+             at = name.find('@', at + 1)) {
+            if (directory_.Has(name.substr(0, at))) return true;
+        }
+        // A folder of an object with an '@' in its name.
+        return S_ISDIR(sidecars_.ea_dir->StatusOf(name).value_or(kNoStatus).st_mode) &&
+               directory_.Has(name);
+    }
+
+    static constexpr struct stat kNoStatus {};
+
+    const Directory& directory_;
+    const std::string& name_;
+    std::string derived_;
+    Sidecars sidecars_;
+};
+
+}  // namespace
+
+Sidecars Sidecars::Find(const Object& object, Services services) {
+    return Finder(object).Run(object, services);
+}
+
+bool Sidecars::Any() const { return folder || !Files().empty(); }
+
+std::vector<Sidecars::Found> Sidecars::Files() const {
+    std::vector<Found> files;
+    for (const auto* one : {&stream, &resource, &resource_copy, &apple_double, &legacy_resource}) {
+        if (*one) files.push_back(**one);
+    }
+    files.insert(files.end(), attribute_files.begin(), attribute_files.end());
+    for (const Service& service : services) files.push_back(service.found);
+    files.insert(files.end(), others.begin(), others.end());
+    return files;
+}
+
+std::string NameInEaDirectory(const std::string& name) {
+    if (name.size() <= kUnchangedMax) return name;
+    std::string path(MAVOEA_PATH_SIZE + 1, '\0');
+    // The directory makes no difference, and a short one leaves room for every name.
+    if (MAVOEAPathNoADFS(EA_FORM_FILE, ('/' + name).c_str(), MAVOEA_KIND_STREAM, path.data(),
+                         MAVOEA_PATH_SIZE) != 0) {
+        return name;
+    }
+    path.resize(path.find('\0'));
+    path.resize(path.size() - kStreamSuffix.size());
+    return path.substr(path.rfind('/') + 1);
+}
+
+std::string AppleDoubleName(const std::string& name) {
+    if (name.size() + kAppleDoublePrefix.size() > kNameMax) return {};
+    return std::string(kAppleDoublePrefix) + name;
+}
+
+bool IsAppleDouble(const Directory& directory, const std::string& name) {
+    const auto info = directory.StatusOf(name);
+    if (!info || !S_ISREG(info->st_mode) ||
+        info->st_size < static_cast<off_t>(AppleDoubleHeader::kSize)) {
+        return false;
+    }
+    const auto file = directory.FindFile(name, O_RDONLY);
+    if (!file) return false;
+    const Bytes head = file->Read(0, AppleDoubleHeader::kSize);
+    BeReader in(head);
+    const AppleDoubleHeader header = DecodeAppleDoubleHeader(in);
+    return in.ok() && header.magic == kAppleDoubleMagic && header.version == kAppleDoubleVersion2;
+}
+
+bool IsMetadata(const Directory& directory, const Directory::Entry& entry, int type) {
+    const Keeping keeping = KeepingOf(type);
+    if (S_ISDIR(entry.type)) return entry.name == kEaDirName && keeping != Keeping::kNone;
+    if (!S_ISREG(entry.type) || !entry.name.starts_with(kAppleDoublePrefix)) return false;
+    if (keeping != Keeping::kAppleDouble && keeping != Keeping::kEaDirectory) return false;
+    const std::string object = entry.name.substr(kAppleDoublePrefix.size());
+    return !object.empty() && directory.Has(object) && IsAppleDouble(directory, entry.name);
+}
+
+std::vector<Directory::Entry> ObjectsIn(const DirectoryRef& directory) {
+    std::vector<Directory::Entry> entries = directory->Entries();
+    const int type = ReadableType(ObjectAt({directory, kEaDirName}, nullptr).type);
+    std::erase_if(entries, [&](const Directory::Entry& entry) {
+        return IsMetadata(*directory, entry, type);
+    });
+    return entries;
+}
+
+std::optional<std::string> SharesNames(const Place& place) {
+    if (place.name.size() < kUnchangedMax) return std::nullopt;
+    const std::string derived = NameInEaDirectory(place.name);
+    for (const Directory::Entry& entry : place.directory->Entries()) {
+        if (entry.name.size() < kUnchangedMax || entry.name == place.name) continue;
+        if (NameInEaDirectory(entry.name) == derived) return entry.name;
+    }
+    return std::nullopt;
+}
+
+void RequireOwnNames(const Object& object) {
+    if (object.keeping() == Keeping::kAppleDouble) return;
+    const auto other = SharesNames(object.place);
+    if (!other) return;
+    throw Failure(kFailed, object.path(),
+                  "its metadata would have the same names as that of " +
+                      Printable(object.place.directory->PathOf(*other)),
+                  "give one of the two a shorter name, by another tool if it has metadata");
+}
+
+void RequireOwnNames(const Object& object, const Sidecars& sidecars) {
+    if (sidecars.AnyByName()) RequireOwnNames(object);
+}
+
+bool BelongsToAnObject(const Directory& directory, const std::string& name) {
+    if (directory.Has(name)) return true;
+    for (std::size_t at = name.find('@'); at != std::string::npos; at = name.find('@', at + 1)) {
+        const std::string object = name.substr(0, at);
+        if (object.empty()) continue;
+        if (directory.Has(object)) return true;
+        if (object.size() != kUnchangedMax) continue;
+        for (const Directory::Entry& entry : directory.Entries()) {
+            if (entry.name.size() > kUnchangedMax && NameInEaDirectory(entry.name) == object) {
+                return true;
+            }
+        }
+    }
+    return false;
+}
+
+std::vector<LeftOver> FindLeftOver(const Directory& directory, const Directory& ea_dir) {
+    std::vector<LeftOver> all;
+    const auto add = [&](const auto& self, const Directory& in, const std::string& prefix) -> void {
+        for (const Directory::Entry& entry : in.Entries()) {
+            const bool top = prefix.empty();
+            if (top && entry.name == kCoverName && S_ISREG(entry.type)) continue;
+            if (top && BelongsToAnObject(directory, entry.name)) continue;
+            const auto info = in.StatusOf(entry.name);
+            if (!info) continue;
+            if (S_ISDIR(info->st_mode)) {
+                self(self, *in.OpenIn(entry.name), prefix + entry.name + '/');
+            } else {
+                all.push_back({{in.shared_from_this(), entry.name, *info}, prefix + entry.name});
+            }
+        }
+    };
+    add(add, ea_dir, {});
+    return all;
+}
+
+void RemoveEaDirectoryIfEmpty(const Directory& directory) {
+    if (directory.RemoveEmpty(kEaDirName)) return;
+    const DirectoryRef ea_dir = directory.FindIn(kEaDirName);
+    if (!ea_dir) return;
+    const auto cover = ea_dir->StatusOf(kCoverName);
+    if (!cover || !S_ISREG(cover->st_mode) || ea_dir->Entries().size() != 1) return;
+    (void)ea_dir->RemoveFile(kCoverName);
+    (void)directory.RemoveEmpty(kEaDirName);
+}
+
+DirectoryRef NeedEaDirectory(const Directory& directory) {
+    if (DirectoryRef found = directory.FindAgain(kEaDirName)) return found;
+    const ErrorMark mark;
+    if (MAVOEAMKDir(0, directory.ProcPath(kEaDirName).c_str()) != 0) {
+        throw LibraryFailure(directory.PathOf(kEaDirName), mark.Get());
+    }
+    if (DirectoryRef made = directory.FindAgain(kEaDirName)) return made;
+    throw SystemFailure(directory.PathOf(kEaDirName), ENOENT);
+}
+
+}  // namespace mavoea::tool

@@ -1,0 +1,104 @@
+// What lies beside an object and belongs to it: names and statuses only, nothing is read.
+#ifndef MAVOEA_TOOLS_STORE_SIDECARS_H_
+#define MAVOEA_TOOLS_STORE_SIDECARS_H_
+
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "tools/place/volume.h"
+
+namespace mavoea::tool {
+
+inline constexpr const char* kEaDirName = "@eaDir";
+inline constexpr const char* kCoverName = ".cover";
+
+struct Sidecars {
+    struct Found {
+        DirectoryRef directory;
+        std::string name;
+        struct stat info;
+
+        std::string path() const { return directory->PathOf(name); }
+        bool regular() const { return S_ISREG(info.st_mode); }
+    };
+    struct Service {
+        Found found;
+        std::string name;  // "@KIND", or "/NAME" in the folder of the object's name
+    };
+
+    // Looking for what other services keep takes a list of the whole EA directory.
+    enum class Services { kLeaveOut, kFind };
+
+    // Throws Failure. An "@eaDir" that is a symbolic link, or may not be looked into, is a
+    // `problem`.
+    static Sidecars Find(const Object& object, Services services);
+
+    DirectoryRef ea_dir;  // null: there is none, or volumes of the type have no use for one
+    std::optional<Found> stream;
+    std::optional<Found> resource;
+    std::optional<Found> resource_copy;  // of a repair that is under way, or was cut short
+    std::optional<Found> apple_double;   // a valid "._" file
+
+    DirectoryRef folder;  // of earlier versions, and of other services
+    std::vector<Found> attribute_files;
+    std::optional<Found> legacy_resource;
+    std::vector<Found> reserved;  // "MAVO:KIND" in it, which has another name in the current layout
+
+    std::vector<Service> services;  // regular files; those in the folder are always among them
+    std::vector<Found> others;      // links, pipes and the like, in the place of any of these
+    std::optional<Failure> problem;
+
+    bool Any() const;
+    // Whether anything in the EA directory would be taken for another object's of a like name.
+    bool AnyByName() const { return stream || resource || resource_copy || !services.empty(); }
+    // All files, and links and the like, the folder's last.
+    std::vector<Found> Files() const;
+};
+
+// How names of metadata files in the EA directory begin for an object of that name.
+std::string NameInEaDirectory(const std::string& name);
+
+// "._NAME"; empty where that is too long for a name.
+std::string AppleDoubleName(const std::string& name);
+
+// Whether `name` is a valid "._" file of version 2. Throws Failure.
+bool IsAppleDouble(const Directory& directory, const std::string& name);
+
+// Whether an entry of a directory is metadata of an object in it, on volumes of that type: "@eaDir"
+// and "._" files whose object is there. Throws Failure.
+bool IsMetadata(const Directory& directory, const Directory::Entry& entry, int type);
+
+// What in a directory is an object, sorted by name. Throws Failure.
+std::vector<Directory::Entry> ObjectsIn(const DirectoryRef& directory);
+
+// Another object of the directory whose metadata would have the same names in the EA directory.
+std::optional<std::string> SharesNames(const Place& place);
+
+// Failure when there is one, and `sidecars` says that something has such a name.
+void RequireOwnNames(const Object& object, const Sidecars& sidecars);
+// The same before anything is written.
+void RequireOwnNames(const Object& object);
+
+// Whether the name of an entry of an EA directory is that of metadata of any object in `directory`.
+bool BelongsToAnObject(const Directory& directory, const std::string& name);
+
+// Something in an EA directory that belongs to no object.
+struct LeftOver {
+    Sidecars::Found found;
+    std::string path;  // below the EA directory
+};
+// All such files, and links and the like; a ".cover" is none. Throws Failure.
+std::vector<LeftOver> FindLeftOver(const Directory& directory, const Directory& ea_dir);
+
+// Removes an "@eaDir" in which nothing is left but a ".cover".
+void RemoveEaDirectoryIfEmpty(const Directory& directory);
+
+// The EA directory, made where it is missing; for that the process becomes the superuser for a
+// moment, if it may. Throws Failure.
+DirectoryRef NeedEaDirectory(const Directory& directory);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_STORE_SIDECARS_H_

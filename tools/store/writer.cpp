@@ -1,0 +1,614 @@
+#include "tools/store/writer.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <ctime>
+#include <memory>
+
+#include "format/flush_time.h"
+#include "format/netatalk_record.h"
+#include "include/mavoea.h"
+#include "tools/store/by_kind.h"
+#include "tools/store/encoding.h"
+#include "tools/store/locking.h"
+#include "tools/store/marks.h"
+#include "tools/store/rights.h"
+
+namespace mavoea::tool {
+namespace {
+
+using Found = Sidecars::Found;
+
+constexpr const char* kMoveAway = "see what it is, and move it away";
+
+// ---- Files --------------------------------------------------------------------------------------
+
+// The files of an object, made under temporary names and given theirs when all of them are whole.
+class NewFiles {
+ public:
+    NewFiles(const Inode& object, const WriteOptions& options)
+        : rights_(options.mode ? Rights::Of(object, *options.mode) : Rights::Of(object)),
+          durability_(options.durability) {}
+
+    // `holder`: the file that all of it was read from, which is left alone if it is this one.
+    void Add(const DirectoryRef& directory, const std::string& name, const Pieces& pieces,
+             const std::string& holder = {}) {
+        const Place target = {directory, name};
+        if (target.path() == holder) {
+            files_.push_back({target, nullptr});
+            return;
+        }
+        RequireFree(target);
+        auto file = std::make_unique<TemporaryFile>(target);
+        std::uint64_t end = 0;
+        for (const Content& piece : pieces) end = WriteTo(file->file(), end, piece);
+        Compare(file->file(), pieces);
+        rights_.Give(file->file());
+        if (durability_ == Durability::kNow) file->file().Sync();
+        files_.push_back({target, std::move(file)});
+    }
+
+    void GiveNames() {
+        for (const New& file : files_) {
+            if (file.temporary) file.temporary->GiveToTarget();
+        }
+        if (durability_ == Durability::kLater) return;
+        for (const New& file : files_) file.target.directory->Sync();
+    }
+
+    bool Has(const Found& found) const {
+        return std::any_of(files_.begin(), files_.end(), [&](const New& file) {
+            return file.target.name == found.name &&
+                   SameFile(file.target.directory->Status(), found.directory->Status());
+        });
+    }
+
+ private:
+    struct New {
+        Place target;
+        std::unique_ptr<TemporaryFile> temporary;  // null: it is there already
+    };
+
+    // What another process is changing is left to it.
+    static void RequireFree(const Place& target) {
+        const auto info = target.Status();
+        if (!info) return;
+        if (S_ISLNK(info->st_mode)) return;  // goes by the new file's name
+        if (!S_ISREG(info->st_mode)) {
+            throw Failure(kFailed, target.path(), "something is in the way of metadata", kMoveAway);
+        }
+        const auto file = target.directory->FindFile(target.name, O_RDWR);
+        if (file) LockFile(*file, Access::kWrite);
+    }
+
+    static void Compare(const File& written, const Pieces& pieces) {
+        std::uint64_t at = 0;
+        const auto file = std::shared_ptr<const File>(&written, [](const File*) {});
+        for (const Content& piece : pieces) {
+            if (FirstDifference(piece, Content(file, at, piece.size()))) {
+                throw Failure(kFailed, written.path(), "what was written is not what is read back",
+                              "check the disk");
+            }
+            at += piece.size();
+        }
+    }
+
+    Rights rights_;
+    Durability durability_;
+    std::vector<New> files_;
+};
+
+bool Contains(const std::vector<std::string>& paths, const std::string& path) {
+    return std::find(paths.begin(), paths.end(), path) != paths.end();
+}
+
+std::string HolderOf(const WholeFile& whole) { return whole ? whole->path() : std::string(); }
+
+void WriteMarks(const Object& to, const Inode& inode, const Metadata& metadata) {
+    if (!inode.HoldsContents()) return;
+    if (!LocksByMode(to)) SetLockFlag(inode, metadata.locked);
+    if (metadata.hidden) SetHidden(inode, true);
+    SetArchived(inode);
+}
+
+// What is damaged has no bytes to write, unless the whole file goes as it is. The reader has said
+// so among the problems. Nor has a fork that stands for none.
+void DropDamaged(Metadata* metadata) {
+    if (metadata->fork && IsBlankFork(metadata->fork->value)) metadata->fork.reset();
+    const auto drop = [&](const auto& item) {
+        return item.value.damaged() && item.holder != HolderOf(metadata->whole_stream) &&
+               item.holder != HolderOf(metadata->whole_resource);
+    };
+    std::erase_if(metadata->attributes, drop);
+    if (metadata->finder_info && drop(*metadata->finder_info)) metadata->finder_info.reset();
+    if (metadata->fork && drop(*metadata->fork)) metadata->fork.reset();
+    std::erase_if(metadata->entries, [&](const auto& entry) { return drop(entry.second); });
+}
+
+// Entries that have no room go; `room` says how much there is.
+void FitEntries(Metadata* metadata, std::uint32_t (*room)(EntryId), const char* where,
+                std::vector<Missing>* missing) {
+    std::erase_if(metadata->entries, [&](const auto& entry) {
+        const auto& [id, item] = entry;
+        if (item.value.size() <= room(id)) return false;
+        if (!SaysSomething(id, item.value.All())) return true;
+        missing->push_back(
+            {NameOfEntry(id), room(id) == 0 ? std::string(where) + " has no place for it"
+                                            : "it has more than the " + std::to_string(room(id)) +
+                                                  " bytes that " + where + " has room for"});
+        return true;
+    });
+}
+
+// ---- What other services keep -------------------------------------------------------------------
+
+DirectoryRef NeedFolder(const Directory& in, const std::string& name) {
+    if (DirectoryRef found = in.FindIn(name)) return found;
+    const ErrorMark mark;
+    if (MAVOEAMKDir(0, in.ProcPath(name).c_str()) != 0) {
+        throw LibraryFailure(in.PathOf(name), mark.Get());
+    }
+    return in.OpenIn(name);
+}
+
+// Into the EA directory of `to`; volumes of every kind can have one.
+void AddServices(const Object& to, const Metadata& metadata, NewFiles* files, Written* written) {
+    for (const Metadata::ServiceFile& service : metadata.services) {
+        try {
+            const Directory& beside = *to.place.directory;
+            if (service.name == "._") {
+                files->Add(to.place.directory, AppleDoubleName(to.place.name), {service.value},
+                           service.holder);
+            } else if (service.name.front() == '@') {
+                const std::string name = NameInEaDirectory(to.place.name) + service.name;
+                files->Add(NeedEaDirectory(beside), name, {service.value}, service.holder);
+            } else {
+                DirectoryRef folder = NeedFolder(*NeedEaDirectory(beside), to.place.name);
+                std::string name = service.name.substr(1);
+                for (std::size_t slash = name.find('/'); slash != std::string::npos;
+                     slash = name.find('/')) {
+                    folder = NeedFolder(*folder, name.substr(0, slash));
+                    name.erase(0, slash + 1);
+                }
+                files->Add(folder, name, {service.value}, service.holder);
+            }
+            written->whole.insert(service.holder);
+        } catch (const Failure& failure) {
+            written->missing.push_back(
+                {NameOfAttribute(service.name) + " of another service", failure.cause()});
+        }
+    }
+}
+
+// Everything but what services keep.
+void MissAll(Metadata* metadata, const std::string& reason, std::vector<Missing>* missing) {
+    for (const Missing& one : ItemsOf(*metadata, reason)) missing->push_back(one);
+    Metadata left;
+    left.services = std::move(metadata->services);
+    left.locked = metadata->locked;
+    left.hidden = metadata->hidden;
+    *metadata = std::move(left);
+}
+
+void FitServices(Metadata* metadata, const Object& to, std::vector<Missing>* missing) {
+    std::erase_if(metadata->services, [&](const Metadata::ServiceFile& service) {
+        const bool apple_double = service.name == "._";
+        const char* why = nullptr;
+        if (apple_double && to.keeping() == Keeping::kAppleDouble) {
+            why = "its place is that of what the object has besides";
+        } else if (apple_double && to.keeping() == Keeping::kXattr) {
+            why = "volumes of the destination's type keep no such file";
+        } else if (NameInEaDirectory(to.place.name).size() + service.name.size() > 255 ||
+                   (apple_double && AppleDoubleName(to.place.name).empty())) {
+            why = "its name would be too long";
+        }
+        if (why == nullptr) return false;
+        missing->push_back({apple_double ? "AppleDouble file " + Printable(service.holder)
+                                         : NameOfAttribute(service.name) + " of another service",
+                            why});
+        return true;
+    });
+}
+
+// ---- Volumes that keep one "._" file ------------------------------------------------------------
+
+class AppleDoubleWriter final : public Writer {
+ public:
+    Metadata Fit(Metadata metadata, const Object& to,
+                 std::vector<Missing>* missing) const override {
+        FitServices(&metadata, to, missing);
+        if (AppleDoubleName(to.place.name).empty()) {
+            MissAll(&metadata, "its name is too long for a \"._\" file", missing);
+            return metadata;
+        }
+        if (IsWhole(metadata)) return metadata;
+        metadata.whole_apple_double.reset();
+        DropDamaged(&metadata);
+        FitStream(&metadata, missing);
+        if (!metadata.attributes.empty()) {
+            FitEntries(
+                &metadata, [](EntryId) { return std::uint32_t{0}; },
+                "a \"._\" file with attributes", missing);
+        }
+        FitEntries(&metadata, RoomInHead, "a \"._\" file", missing);
+        return metadata;
+    }
+
+    Written Write(const Object& to, const Metadata& fitting,
+                  const WriteOptions& options) const override {
+        Written written;
+        const auto inode = Inode::Open(to.place);
+        const Sidecars old = Sidecars::Find(to, Sidecars::Services::kFind);
+        NewFiles files(*inode, options);
+        AddServices(to, fitting, &files, &written);
+        if (const auto pieces = PiecesOf(fitting); !pieces.empty()) {
+            const std::string name = AppleDoubleName(to.place.name);
+            RequireMetadata(to, name);
+            files.Add(to.place.directory, name, pieces, HolderOf(fitting.whole_apple_double));
+        }
+        if (fitting.whole_apple_double) written.whole.insert(fitting.whole_apple_double->path());
+        files.GiveNames();
+        if (options.old == Old::kRemoved) RemoveOld(to, old, files);
+        WriteMarks(to, *inode, fitting);
+        return written;
+    }
+
+    static void RemoveOld(const Object& to, const Sidecars& old, const NewFiles& files) {
+        std::vector<Found> left;
+        for (const Found& found : old.Files()) {
+            if (!files.Has(found)) left.push_back(found);
+        }
+        if (!old.Any()) return;
+        RemoveFiles(left);
+        RemoveEmptyDirectories(to, old);
+    }
+
+ private:
+    // Whether the file of the source says all that there is to say.
+    static bool IsWhole(const Metadata& metadata) {
+        if (!metadata.whole_apple_double) return false;
+        const std::string& path = metadata.whole_apple_double->path();
+        const auto held = [&](const Metadata::Item& item) { return item.holder == path; };
+        return std::all_of(metadata.attributes.begin(), metadata.attributes.end(),
+                           [&](const auto& attribute) { return attribute.holder == path; }) &&
+               (!metadata.finder_info || held(*metadata.finder_info)) &&
+               (!metadata.fork || held(*metadata.fork)) &&
+               std::all_of(metadata.entries.begin(), metadata.entries.end(),
+                           [&](const auto& entry) { return held(entry.second); });
+    }
+
+    static Pieces PiecesOf(const Metadata& metadata) {
+        if (const WholeFile& whole = metadata.whole_apple_double) {
+            return {Content(whole, 0, whole->Size())};
+        }
+        if (!metadata.attributes.empty()) return EncodeStream(metadata);
+        if (!metadata.entries.empty()) return EncodeWithHead(metadata);
+        if (metadata.finder_info || metadata.fork) return EncodePlain(metadata);
+        return {};
+    }
+
+    // A file of that name that is no AppleDouble file is somebody's own.
+    static void RequireMetadata(const Object& to, const std::string& name) {
+        const auto info = to.place.directory->StatusOf(name);
+        if (!info || (S_ISREG(info->st_mode) && info->st_size == 0)) return;
+        if (IsAppleDouble(*to.place.directory, name)) return;
+        throw Failure(kFailed, to.place.directory->PathOf(name),
+                      "it is in the way of metadata, and is none", kMoveAway);
+    }
+};
+
+// ---- Volumes that keep an EA directory ----------------------------------------------------------
+
+class EaDirectoryWriter : public Writer {
+ public:
+    Metadata Fit(Metadata metadata, const Object& to,
+                 std::vector<Missing>* missing) const override {
+        FitServices(&metadata, to, missing);
+        FitRecord(&metadata);
+        FitResource(&metadata);
+        DropDamaged(&metadata);
+        if (!metadata.whole_stream) FitStream(&metadata, missing);
+        if (!metadata.whole_resource) FitHead(&metadata, missing);
+        return metadata;
+    }
+
+    Written Write(const Object& to, const Metadata& fitting,
+                  const WriteOptions& options) const override {
+        Written written;
+        const auto inode = Inode::Open(to.place);
+        const Sidecars old = Sidecars::Find(to, Sidecars::Services::kFind);
+        const Pieces stream = StreamOf(fitting);
+        const Pieces resource = ResourceOf(fitting);
+        if (!stream.empty() || !resource.empty() || !fitting.services.empty()) {
+            RequireOwnNames(to);
+        } else {
+            RequireOwnNames(to, old);
+        }
+        NewFiles files(*inode, options);
+        AddServices(to, fitting, &files, &written);
+        const std::string name = NameInEaDirectory(to.place.name);
+        const auto add = [&](const char* kind, const Pieces& pieces, const WholeFile& whole) {
+            if (pieces.empty()) return;
+            files.Add(NeedEaDirectory(*to.place.directory), name + kind, pieces, HolderOf(whole));
+        };
+        add("@" MAVOEA_KIND_STREAM, stream, fitting.whole_stream);
+        add("@" MAVOEA_KIND_RESOURCE, resource, fitting.whole_resource);
+        for (const WholeFile& whole : {fitting.whole_stream, fitting.whole_resource}) {
+            if (whole) written.whole.insert(whole->path());
+        }
+        files.GiveNames();
+        if (options.old == Old::kRemoved) AppleDoubleWriter::RemoveOld(to, old, files);
+        WriteRecord(*inode, fitting, &written);
+        WriteMarks(to, *inode, fitting);
+        return written;
+    }
+
+ protected:
+    virtual void FitRecord(Metadata* metadata) const { metadata->whole_record.reset(); }
+    virtual void FitHead(Metadata* metadata, std::vector<Missing>* missing) const {
+        FitEntries(metadata, RoomInHead, "a resource file", missing);
+    }
+    virtual void WriteRecord(const Inode&, const Metadata&, Written*) const {}
+    // Whether an entry goes into the resource file.
+    virtual bool GoesIntoHead(const Metadata&) const { return true; }
+
+    static bool IsHeldBy(const WholeFile& whole, const std::string& holder) {
+        return whole && whole->path() == holder;
+    }
+
+ private:
+    // The resource file of the source goes as it is when nothing that it should hold is elsewhere;
+    // a record goes as it is itself.
+    static void FitResource(Metadata* metadata) {
+        const auto fits = [&](const Metadata::Item& item) {
+            return IsHeldBy(metadata->whole_resource, item.holder) ||
+                   IsHeldBy(metadata->whole_stream, item.holder) ||
+                   (metadata->whole_record && !Contains(metadata->earlier, item.holder));
+        };
+        const bool all = (!metadata->finder_info || fits(*metadata->finder_info)) &&
+                         (!metadata->fork || fits(*metadata->fork)) &&
+                         std::all_of(metadata->entries.begin(), metadata->entries.end(),
+                                     [&](const auto& entry) { return fits(entry.second); });
+        if (!all) metadata->whole_resource.reset();
+    }
+
+    static Pieces StreamOf(const Metadata& metadata) {
+        if (const WholeFile& whole = metadata.whole_stream) {
+            return {Content(whole, 0, whole->Size())};
+        }
+        Metadata attributes;
+        for (const Metadata::Attribute& attribute : metadata.attributes) {
+            if (IsHeldBy(metadata.whole_resource, attribute.holder)) continue;
+            attributes.attributes.push_back(attribute);
+        }
+        return attributes.attributes.empty() ? Pieces() : EncodeStream(attributes);
+    }
+
+    Pieces ResourceOf(const Metadata& metadata) const {
+        if (const WholeFile& whole = metadata.whole_resource) {
+            return {Content(whole, 0, whole->Size())};
+        }
+        Metadata head = metadata;
+        const auto in_stream = [&](const std::optional<Metadata::Item>& item) {
+            return item && IsHeldBy(metadata.whole_stream, item->holder);
+        };
+        if (in_stream(head.finder_info)) head.finder_info.reset();
+        if (in_stream(head.fork)) head.fork.reset();
+        std::erase_if(head.entries, [&](const auto& entry) { return in_stream(entry.second); });
+        if (!head.entries.empty() && GoesIntoHead(head)) return EncodeWithHead(head);
+        if (head.finder_info || head.fork) return EncodePlain(head);
+        return {};
+    }
+};
+
+// ---- Volumes that keep a record with the object as well -----------------------------------------
+
+class FileEaWriter final : public EaDirectoryWriter {
+ protected:
+    // The record goes as it is, unless an earlier layout has something for it.
+    void FitRecord(Metadata* metadata) const override {
+        const auto is_earlier = [&](const Metadata::Item& item) {
+            return Contains(metadata->earlier, item.holder);
+        };
+        const bool any =
+            std::any_of(metadata->entries.begin(), metadata->entries.end(), [&](const auto& entry) {
+                return RoomInRecord(entry.first) > 0 && is_earlier(entry.second);
+            });
+        const bool finder_info = metadata->finder_info && is_earlier(*metadata->finder_info);
+        if (any || finder_info) metadata->whole_record.reset();
+    }
+
+    void FitHead(Metadata* metadata, std::vector<Missing>* missing) const override {
+        FitEntries(
+            metadata, [](EntryId id) { return std::max(RoomInHead(id), RoomInRecord(id)); },
+            "neither a record nor a resource file", missing);
+    }
+
+    // The record has the usual ones.
+    bool GoesIntoHead(const Metadata& metadata) const override {
+        return std::any_of(metadata.entries.begin(), metadata.entries.end(), [](const auto& entry) {
+            return RoomInRecord(entry.first) < entry.second.value.size();
+        });
+    }
+
+    void WriteRecord(const Inode& inode, const Metadata& metadata,
+                     Written* written) const override {
+        if (!inode.HoldsContents()) return;
+        Metadata record;
+        record.finder_info = metadata.finder_info;
+        for (const auto& [id, item] : metadata.entries) {
+            if (item.value.size() <= RoomInRecord(id)) record.entries[id] = item;
+        }
+        try {
+            if (metadata.whole_record) {
+                inode.SetAttribute(kNetatalkAttribute, *metadata.whole_record);
+            } else if (record.finder_info || !record.entries.empty()) {
+                inode.SetAttribute(kNetatalkAttribute, EncodeRecordBlock(record));
+            } else {
+                (void)inode.RemoveAttribute(kNetatalkAttribute);
+            }
+            inode.SetAttribute(kFlushTimeAttribute, EncodeFlushTime(std::time(nullptr)));
+        } catch (const Failure& failure) {
+            // The resource file has the Finder info, but clients look here.
+            if (metadata.HasAny()) written->missing.push_back({"netatalk record", failure.cause()});
+        }
+    }
+};
+
+// ---- Volumes that keep extended attributes ------------------------------------------------------
+
+class AttributeWriter final : public Writer {
+ public:
+    Metadata Fit(Metadata metadata, const Object& to,
+                 std::vector<Missing>* missing) const override {
+        FitServices(&metadata, to, missing);
+        DropDamaged(&metadata);
+        for (Metadata::Attribute& attribute : metadata.attributes) {
+            if (attribute.flags == 0) continue;
+            missing->push_back({"flags of " + NameOfAttribute(attribute.name),
+                                "a volume of extended attributes has no place for them"});
+            attribute.flags = 0;
+        }
+        FitEntries(
+            &metadata, [](EntryId) { return std::uint32_t{0}; }, "a volume of extended attributes",
+            missing);
+        return metadata;
+    }
+
+    Written Write(const Object& to, const Metadata& fitting,
+                  const WriteOptions& options) const override {
+        Written written;
+        const auto inode = Inode::Open(to.place);
+        const Sidecars old = Sidecars::Find(to, Sidecars::Services::kFind);
+        if (!fitting.services.empty()) RequireOwnNames(to);
+        NewFiles files(*inode, options);
+        AddServices(to, fitting, &files, &written);
+        files.GiveNames();
+        if (options.old == Old::kRemoved) AppleDoubleWriter::RemoveOld(to, old, files);
+        for (const Metadata::Attribute& attribute : fitting.attributes) {
+            Set(*inode, NameOfAttribute(attribute.name), attribute.name, attribute.value, &written);
+        }
+        if (fitting.finder_info) {
+            Set(*inode, "Finder info", std::string(kFinderInfoName), fitting.finder_info->value,
+                &written);
+        }
+        if (fitting.fork) WriteFork(*inode, fitting.fork->value, &written);
+        WriteMarks(to, *inode, fitting);
+        return written;
+    }
+
+ private:
+    static void Set(const Inode& inode, const std::string& item, const std::string& name,
+                    const Content& value, Written* written) {
+        constexpr std::uint64_t kMost = 65536;  // what the kernel takes
+        if (value.size() > kMost) {
+            written->missing.push_back({item, "it has more than the 65,536 bytes of an attribute"});
+            return;
+        }
+        try {
+            inode.SetAttribute(name, value.All());
+        } catch (const SystemFailure& failure) {
+            written->missing.push_back(
+                {item, failure.error() == ENOTSUP
+                           ? std::string("its file system takes no attribute of that name")
+                           : failure.cause()});
+        }
+    }
+
+    static void WriteFork(const Inode& inode, const Content& fork, Written* written) {
+        const std::string path = inode.ProcPath() + "/rsrc";
+        const mode_t mode = inode.Status().st_mode & kPermissionBits;
+        // The execute bit is what makes it reachable.
+        const bool widen = (mode & S_IXUSR) == 0;
+        constexpr int kFlags = O_RDWR | O_TRUNC | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
+        int fd = ::open(path.c_str(), kFlags);
+        if (fd < 0 && errno == EACCES && widen) {
+            inode.SetMode(mode | S_IXUSR);
+            fd = ::open(path.c_str(), kFlags);
+            const int error = errno;
+            inode.SetMode(mode);
+            errno = error;
+        }
+        if (fd < 0) {
+            const bool none = errno == ENOTDIR || errno == ENOENT;
+            written->missing.push_back({"resource fork", none ? "its file system offers none for it"
+                                                              : SystemFailure::Words(errno)});
+            return;
+        }
+        const File file(fd, inode.path());
+        (void)WriteTo(file, 0, fork);
+        file.Sync();
+    }
+};
+
+const Writer* FindWriter(const Object& object) {
+    return OneFor<Writer, AppleDoubleWriter, EaDirectoryWriter, FileEaWriter, AttributeWriter>(
+        object.kind());
+}
+
+}  // namespace
+
+const Writer& WriterFor(const Object& object) {
+    RequireParent(object);
+    if (const Writer* const writer = FindWriter(object)) return *writer;
+    throw NoStore(object);
+}
+
+void RequirePlace(const Object& to) {
+    if (to.keeping() != Keeping::kAppleDouble || !AppleDoubleName(to.place.name).empty()) return;
+    throw Failure(kFailed, to.path(), "its name or path is too long to have metadata there",
+                  "use a shorter name");
+}
+
+bool CopyLeftOver(const LeftOver& file, const DirectoryRef& directory) {
+    const std::size_t first = file.path.find('/');
+    if (BelongsToAnObject(*directory, file.path.substr(0, first))) return false;
+    DirectoryRef in = NeedEaDirectory(*directory);
+    std::string name = file.path;
+    for (std::size_t slash = first; slash != std::string::npos; slash = name.find('/')) {
+        in = NeedFolder(*in, name.substr(0, slash));
+        name.erase(0, slash + 1);
+    }
+    const auto source = file.found.directory->FindFile(file.found.name, O_RDONLY);
+    if (!source || in->Has(name)) return false;
+    NewFiles files(*Inode::Of(*source), {.durability = Durability::kLater});
+    files.Add(in, name, {Content(source, 0, source->Size())});
+    files.GiveNames();
+    return true;
+}
+
+void RemoveFiles(const std::vector<Sidecars::Found>& files) {
+    std::optional<Failure> failure;
+    for (const Sidecars::Found& file : files) {
+        try {
+            const auto now = file.directory->StatusOf(file.name);
+            // Something else has come there since.
+            if (!now || !SameFile(*now, file.info)) continue;
+            if (S_ISDIR(now->st_mode)) {
+                (void)file.directory->RemoveEmpty(file.name);
+            } else {
+                (void)file.directory->RemoveFile(file.name);
+            }
+        } catch (const Failure& problem) {
+            if (!failure) failure = problem;
+        }
+    }
+    if (failure) throw Failure(*failure);
+}
+
+void RemoveEmptyDirectories(const Object& object, const Sidecars& sidecars) {
+    if (sidecars.folder) (void)sidecars.ea_dir->RemoveEmpty(object.place.name);
+    if (sidecars.ea_dir) RemoveEaDirectoryIfEmpty(*object.place.directory);
+}
+
+void RemoveSidecars(const Object& object, const Sidecars& sidecars) {
+    if (!sidecars.Any()) return;
+    RemoveFiles(sidecars.Files());
+    RemoveEmptyDirectories(object, sidecars);
+}
+
+}  // namespace mavoea::tool

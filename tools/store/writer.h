@@ -1,0 +1,73 @@
+// Putting what is known of an object into each kind of place. A writer can say beforehand what its
+// place cannot hold; what it wrote it has read back, byte for byte, before it has a name.
+#ifndef MAVOEA_TOOLS_STORE_WRITER_H_
+#define MAVOEA_TOOLS_STORE_WRITER_H_
+
+#include <set>
+#include <string>
+#include <vector>
+
+#include "tools/store/metadata.h"
+#include "tools/store/sidecars.h"
+
+namespace mavoea::tool {
+
+struct Written {
+    // What could not be written, though the place could have held it.
+    std::vector<Missing> missing;
+    // Files of the source of which every byte is there.
+    std::set<std::string> whole;
+};
+
+// Whether what has been written is on disk when a writer returns, or is left to who syncs the
+// volume once for many objects.
+enum class Durability { kNow, kLater };
+
+// What becomes of files beside the object that are not written anew.
+enum class Old { kRemoved, kKept };
+
+struct WriteOptions {
+    Durability durability = Durability::kNow;
+    Old old = Old::kRemoved;
+    std::optional<mode_t> mode = {};  // that the object will have, if it is not yet the one it has
+};
+
+class Writer {
+ public:
+    virtual ~Writer() = default;
+
+    // What the place of `to` can hold of it; all else is added to *missing. Changes nothing.
+    virtual Metadata Fit(Metadata metadata, const Object& to,
+                         std::vector<Missing>* missing) const = 0;
+
+    // Puts what fits beside `to`, an object that is there, and in its record, over what is there.
+    // Its marks are set. Throws Failure; what was there is then there still, or gone, but never
+    // half of anything.
+    virtual Written Write(const Object& to, const Metadata& fitting,
+                          const WriteOptions& options) const = 0;
+};
+
+// For volumes of a type; Failure for those that keep nothing.
+const Writer& WriterFor(const Object& object);
+
+// Failure when an object of such a name can have no metadata.
+void RequirePlace(const Object& to);
+
+// Removes those of `files` that are still what was found; files first, then directories that are
+// empty. Throws Failure when some of it is left.
+void RemoveFiles(const std::vector<Sidecars::Found>& files);
+
+// Removes the object's folder and the EA directory where nothing is left in them.
+void RemoveEmptyDirectories(const Object& object, const Sidecars& sidecars);
+
+// Removes everything that lies beside an object, and nothing of another one's. Throws Failure when
+// some of it is left.
+void RemoveSidecars(const Object& object, const Sidecars& sidecars);
+
+// Copies what belongs to no object into the EA directory of `directory`, to the same place there.
+// False when something of its name, or an object that it would belong to, is there.
+bool CopyLeftOver(const LeftOver& file, const DirectoryRef& directory);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_STORE_WRITER_H_

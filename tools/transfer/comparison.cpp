@@ -1,0 +1,270 @@
+#include "tools/transfer/comparison.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <climits>
+#include <map>
+#include <set>
+
+#include "tools/store/metadata.h"
+#include "tools/store/reader.h"
+#include "tools/store/sidecars.h"
+
+namespace mavoea::tool {
+namespace {
+
+using Aspect = Difference::Aspect;
+using What = Difference::What;
+
+const char* WordOf(Aspect aspect) {
+    switch (aspect) {
+        case Aspect::kType:
+            return "type";
+        case Aspect::kData:
+            return "data";
+        case Aspect::kTarget:
+            return "target";
+        case Aspect::kAttribute:
+            return "attribute";
+        case Aspect::kEntry:
+            return "entry";
+        case Aspect::kService:
+            return "service";
+        case Aspect::kObject:
+            break;
+    }
+    return "object";
+}
+
+const char* WordOf(What what) {
+    switch (what) {
+        case What::kMissing:
+            return "missing";
+        case What::kExtra:
+            return "extra";
+        case What::kDifferent:
+            break;
+    }
+    return "different";
+}
+
+// What an object has, by what people call it.
+struct Key {
+    Aspect aspect;
+    std::string name;
+    friend auto operator<=>(const Key&, const Key&) = default;
+};
+using Values = std::map<Key, Content>;
+
+Content One() { return Content(Bytes{'1'}); }
+
+Values ValuesOf(const Metadata& metadata) {
+    Values values;
+    for (const Metadata::Attribute& attribute : metadata.attributes) {
+        values[{Aspect::kAttribute, attribute.name}] = attribute.value;
+    }
+    if (metadata.finder_info) {
+        values[{Aspect::kAttribute, std::string(kFinderInfoName)}] = metadata.finder_info->value;
+    }
+    if (metadata.fork && !IsBlankFork(metadata.fork->value)) {
+        values[{Aspect::kAttribute, std::string(kResourceForkName)}] = metadata.fork->value;
+    }
+    if (metadata.locked) values[{Aspect::kAttribute, std::string(kLockedName)}] = One();
+    if (metadata.hidden) values[{Aspect::kAttribute, "mavoea.hidden"}] = One();
+    for (const auto& [id, item] : metadata.entries) {
+        Content value = item.value;
+        if (!value.damaged()) {
+            const Bytes bytes = WithoutLock(id, value.All());
+            if (!SaysSomething(id, bytes)) continue;
+            value = Content(bytes);
+        }
+        values[{Aspect::kEntry, NameOfEntry(id)}] = std::move(value);
+    }
+    for (const Metadata::ServiceFile& file : metadata.services) {
+        values[{Aspect::kService, file.name}] = file.value;
+    }
+    return values;
+}
+
+class Comparison {
+ public:
+    Comparison(const Object& original, const Object& copy, const ComparisonReceiver& receiver)
+        : original_(AsReadable(original)), copy_(AsReadable(copy)), receiver_(receiver) {}
+
+    void Run() {
+        const struct stat info = StatusOf(original_);
+        const struct stat there = StatusOf(copy_);
+        if ((info.st_mode & S_IFMT) != (there.st_mode & S_IFMT)) {
+            return receiver_.differs({.path = original_.path(), .aspect = Aspect::kType});
+        }
+        if (S_ISREG(info.st_mode)) Try([&] { CompareData(); });
+        if (S_ISLNK(info.st_mode)) Try([&] { CompareTargets(); });
+        if ((S_ISBLK(info.st_mode) || S_ISCHR(info.st_mode)) && info.st_rdev != there.st_rdev) {
+            receiver_.differs({.path = original_.path(), .aspect = Aspect::kTarget});
+        }
+        Try([&] { CompareMetadata(); });
+    }
+
+ private:
+    template <class Work>
+    void Try(Work work) {
+        try {
+            work();
+        } catch (const Failure& failure) {
+            receiver_.fails(failure);
+        }
+    }
+
+    static struct stat StatusOf(const Object& object) {
+        if (const auto info = object.place.Status()) return *info;
+        throw SystemFailure(object.path(), ENOENT);
+    }
+
+    static std::shared_ptr<const File> OpenData(const Object& object) {
+        if (auto file = object.place.directory->FindFile(object.place.name, O_RDONLY)) return file;
+        throw SystemFailure(object.path(), ENOENT);
+    }
+
+    void CompareData() {
+        constexpr std::uint64_t kPiece = std::uint64_t{1} << 20;
+        const auto original = OpenData(original_);
+        const auto copy = OpenData(copy_);
+        for (std::uint64_t at = 0;; at += kPiece) {
+            if (receiver_.give_up()) {
+                throw Failure(kFailed, original_.path(), "it was not compared to its end",
+                              "compare again with --compare-only");
+            }
+            const Content piece(original->Read(at, kPiece));
+            if (const auto offset = FirstDifference(piece, Content(copy->Read(at, kPiece)))) {
+                return receiver_.differs(
+                    {.path = original_.path(), .aspect = Aspect::kData, .offset = at + *offset});
+            }
+            if (piece.size() < kPiece) return;
+        }
+    }
+
+    void CompareTargets() {
+        const auto target_of = [](const Object& object) {
+            Bytes target(PATH_MAX);
+            const ssize_t size =
+                ::readlinkat(object.place.directory->fd(), object.place.name.c_str(),
+                             reinterpret_cast<char*>(target.data()), target.size());
+            if (size < 0) throw SystemFailure(object.path(), errno);
+            target.resize(static_cast<std::size_t>(size));
+            return Content(std::move(target));
+        };
+        if (const auto offset = FirstDifference(target_of(original_), target_of(copy_))) {
+            receiver_.differs(
+                {.path = original_.path(), .aspect = Aspect::kTarget, .offset = offset});
+        }
+    }
+
+    void CompareMetadata() {
+        const Metadata wanted = ReadMetadata(original_, Sidecars::Services::kFind);
+        const Metadata found = ReadMetadata(copy_, Sidecars::Services::kFind);
+        for (const Metadata* one : {&wanted, &found}) {
+            for (const Failure& problem : one->problems) receiver_.fails(problem);
+        }
+        const Values original = ValuesOf(wanted);
+        const Values copy = ValuesOf(found);
+        std::set<Key> keys;
+        for (const Values* values : {&original, &copy}) {
+            for (const auto& [key, value] : *values) keys.insert(key);
+        }
+        const bool in_inode =
+            original_.keeping() == Keeping::kXattr || copy_.keeping() == Keeping::kXattr;
+        // What cannot be read has been told, and may hold what seems not to be there.
+        const bool original_is_known = wanted.problems.empty();
+        const bool copy_is_known = found.problems.empty();
+        for (const Key& key : keys) {
+            const auto value = original.find(key);
+            const auto there = copy.find(key);
+            Difference difference = {
+                .path = original_.path(), .aspect = key.aspect, .name = key.name};
+            if (there == copy.end()) {
+                if (!copy_is_known) continue;
+                difference.what = What::kMissing;
+            } else if (value == original.end()) {
+                if (!original_is_known) continue;
+                // An attribute that the original has as every file may have some.
+                if (in_inode && InodeHas(key.name, there->second)) continue;
+                difference.what = What::kExtra;
+            } else if (value->second.damaged() || there->second.damaged()) {
+                continue;  // told as what cannot be read
+            } else {
+                difference.offset = FirstDifference(value->second, there->second);
+                if (!difference.offset) continue;
+            }
+            receiver_.differs(std::move(difference));
+        }
+        CompareStrays(wanted, found);
+    }
+
+    // What lies beside the original, and has no place in what is compared.
+    void CompareStrays(const Metadata& wanted, const Metadata& found) {
+        const auto name_of = [](const Metadata::Stray& stray) {
+            return stray.holder.substr(stray.holder.rfind('/') + 1) + '\n' + stray.reason;
+        };
+        std::multiset<std::string> there;
+        for (const Metadata::Stray& stray : found.strays) there.insert(name_of(stray));
+        for (const Metadata::Stray& stray : wanted.strays) {
+            if (const auto same = there.find(name_of(stray)); same != there.end()) {
+                there.erase(same);
+                continue;
+            }
+            receiver_.differs({.path = original_.path(),
+                               .aspect = Aspect::kService,
+                               .what = What::kMissing,
+                               .name = stray.item});
+        }
+    }
+
+    bool InodeHas(const std::string& name, const Content& value) const {
+        const auto inode = Inode::Open(original_.place);
+        if (!inode->HoldsContents()) return false;
+        const auto own = inode->Attribute(name);
+        return own && *own == value.All();
+    }
+
+    const Object original_;
+    const Object copy_;
+    const ComparisonReceiver& receiver_;
+};
+
+}  // namespace
+
+std::string DifferenceText(const Difference& difference) {
+    std::string text = Printable(difference.path) + ": ";
+    if (difference.aspect == Aspect::kAttribute) {
+        text += '"' + Printable(difference.name) + "\": ";
+    } else if (difference.aspect == Aspect::kEntry) {
+        text += "AppleDouble " + difference.name + ": ";
+    } else if (difference.aspect == Aspect::kService) {
+        text += "of another service, \"" + Printable(difference.name) + "\": ";
+    } else if (difference.aspect != Aspect::kObject) {
+        text += std::string(WordOf(difference.aspect)) + ": ";
+    }
+    text += WordOf(difference.what);
+    if (difference.offset) text += " at byte " + std::to_string(*difference.offset);
+    return text;
+}
+
+Json DifferenceJson(const Difference& difference) {
+    Json json;
+    json.SetText("path", difference.path);
+    json.Set("aspect", WordOf(difference.aspect));
+    if (!difference.name.empty()) json.SetText("name", difference.name);
+    json.Set("what", WordOf(difference.what));
+    if (difference.offset) json.Set("offset", *difference.offset);
+    return json;
+}
+
+void Compare(const Object& original, const Object& copy, const ComparisonReceiver& receiver) {
+    Comparison(original, copy, receiver).Run();
+}
+
+}  // namespace mavoea::tool

@@ -1,0 +1,30 @@
+#include "tools/transfer/indexes.h"
+
+#include <sys/stat.h>
+
+#include "include/mavoea.h"
+#include "platform/include/mavocore.h"
+
+namespace mavoea::tool {
+
+void ReportNew(const std::string& path, mode_t mode) {
+    constexpr int kAdded = 1;
+    constexpr int kDirectoryAdded = 3;
+    (void)MAVOIndex(path.c_str(), nullptr, S_ISDIR(mode) ? kDirectoryAdded : kAdded);
+    (void)MLIBMavoFileIndexAdd(path.c_str(), nullptr, kAdded);
+}
+
+void ReportRenamed(const std::string& from, const std::string& to) {
+    constexpr int kRenamed = 4;
+    (void)MAVOIndex(to.c_str(), from.c_str(), kRenamed);
+    (void)MLIBMavoFileIndexAdd(to.c_str(), from.c_str(), kRenamed);
+}
+
+void ReportRemoved(const std::string& path) {
+    constexpr int kSearchRemoved = 7;
+    constexpr int kFileRemoved = 6;
+    (void)MAVOIndex(path.c_str(), nullptr, kSearchRemoved);
+    (void)MLIBMavoFileIndexAdd(path.c_str(), nullptr, kFileRemoved);
+}
+
+}  // namespace mavoea::tool

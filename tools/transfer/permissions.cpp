@@ -1,0 +1,117 @@
+#include "tools/transfer/permissions.h"
+
+#include <acl/libacl.h>
+#include <attr/error_context.h>
+#include <attr/libattr.h>
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <vector>
+
+#include "tools/say/messages.h"
+
+namespace mavoea::tool {
+namespace {
+
+constexpr mode_t kPermissions = 07777;
+
+// Whether what failed with it is about what may be kept.
+bool IsRefusal(int error) {
+    switch (error) {
+        case EPERM:
+        case EACCES:
+        case ENOTSUP:
+        case ENOSYS:
+        case EINVAL:
+        case ENODATA:
+            return true;
+        default:
+            return false;
+    }
+}
+
+// What the libraries report, in place of a line on standard error.
+struct Complaints : error_context {
+    int grave = 0;  // errno of the first failure that is no refusal
+    int refused = 0;
+
+    Complaints() : error_context{Hear, Quote, Unquote} {}
+
+    static void Hear(error_context* context, const char* /*format*/, ...) {
+        const int error = errno;
+        auto* const self = static_cast<Complaints*>(context);
+        int& first = IsRefusal(error) ? self->refused : self->grave;
+        if (first == 0) first = error;
+    }
+    static const char* Quote(error_context* /*context*/, const char* text) { return text; }
+    static void Unquote(error_context* /*context*/, const char* /*text*/) {}
+};
+
+// Whether the file belongs to whom it should afterwards. Users other than root may give a group at
+// most.
+bool CopyOwner(const struct stat& info, const Inode& to) {
+    if (to.TrySetOwner(info.st_uid, info.st_gid)) return true;
+    if (!to.TrySetOwner(static_cast<uid_t>(-1), info.st_gid)) {
+        const struct stat now = to.Status();
+        return now.st_uid == info.st_uid && now.st_gid == info.st_gid;
+    }
+    return ::geteuid() == info.st_uid;
+}
+
+void UnlessRefused(const std::function<void()>& action) {
+    try {
+        action();
+    } catch (const SystemFailure& failure) {
+        if (!IsRefusal(failure.error())) throw;
+    }
+}
+
+// Where the list of attributes changes while libattr reads it, its functions read what nobody
+// wrote.
+void CopyAttributes(const Inode& from, const Inode& to,
+                    const std::function<bool(const std::string&)>& wanted) {
+    std::vector<std::string> names;
+    UnlessRefused([&] { names = from.AttributeNames(); });
+    for (const std::string& name : names) {
+        Complaints unread;  // a broken /etc/xattr.conf
+        // Those of permissions go with the ACL.
+        if (attr_copy_action(name.c_str(), &unread) != 0 || !wanted(name)) continue;
+        UnlessRefused([&] {
+            if (const auto value = from.Attribute(name)) to.SetAttribute(name, *value);
+        });
+    }
+}
+
+int CopyMode(const Subject& from, const Subject& to, error_context* context) {
+    if (from.fd >= 0 && to.fd >= 0) {
+        return perm_copy_fd(from.inode->path().c_str(), from.fd, to.inode->path().c_str(), to.fd,
+                            context);
+    }
+    return perm_copy_file(from.inode->ProcPath().c_str(), to.inode->ProcPath().c_str(), context);
+}
+
+}  // namespace
+
+std::optional<std::string> CopyPermissions(const Subject& from, const Subject& to,
+                                           const std::function<bool(const std::string&)>& wanted) {
+    const struct stat& info = from.inode->info();
+    const bool owned = CopyOwner(info, *to.inode);
+    CopyAttributes(*from.inode, *to.inode, wanted);
+    if (S_ISLNK(info.st_mode)) return std::nullopt;
+
+    Complaints permissions;
+    if (CopyMode(from, to, &permissions) != 0) {
+        if (permissions.grave != 0) throw SystemFailure(to.inode->path(), permissions.grave);
+        to.inode->SetMode(info.st_mode & kPermissions);
+    }
+    // Nobody gets another user's rights by a copy of his program.
+    if (!owned && (info.st_mode & (S_ISUID | S_ISGID)) != 0) {
+        to.inode->SetMode(info.st_mode & 01777);
+    }
+    if (permissions.refused == 0) return std::nullopt;
+    return std::string("its permissions could not be kept: ") + std::strerror(permissions.refused);
+}
+
+}  // namespace mavoea::tool

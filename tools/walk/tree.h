@@ -1,0 +1,61 @@
+// Work on many objects: those that were named and, in recursive work, all below them.
+#ifndef MAVOEA_TOOLS_WALK_TREE_H_
+#define MAVOEA_TOOLS_WALK_TREE_H_
+
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "tools/place/volume.h"
+#include "tools/say/messages.h"
+
+namespace mavoea::tool {
+
+// Calls `work` for each object that was named and, in recursive work, for all below it, and goes on
+// after what it throws. Directories are objects as well, and come before what is in them. Below a
+// directory, symbolic links are left out, hidden directories, and metadata of objects.
+struct Visit {
+    // `shown` is the path as it was given, or the object's own. False: nothing below it is to be
+    // looked at.
+    std::function<bool(const Object&, const std::string& shown)> work;
+    std::function<void(const std::string& path, const Failure&)> on_failure;
+};
+void VisitObjects(const std::vector<std::string>& paths, bool recursive, const Visit& visit);
+
+// What became of an object.
+enum class Outcome { kDone, kCurrent, kNothing };
+
+// What people should know of an object with which nothing is wrong.
+using Notes = std::vector<std::string>;
+
+struct Task {
+    // In the progress line and the summary: "upgrading", "converted", "already current", "nothing
+    // to convert". Null where an outcome cannot be.
+    const char* doing;
+    const char* done;
+    const char* current;
+    const char* nothing;
+
+    // Throws Failure for an object on a volume that does not suit. Nothing below such a directory
+    // is looked at.
+    std::function<void(const Object&)> check;
+    // Throws Failure.
+    std::function<Outcome(const Object&, Notes*)> work;
+};
+
+struct TreeOptions {
+    std::vector<std::string> paths;
+    bool recursive = false;
+    bool json = false;
+};
+
+// Does the task to one object after the other, and goes on after a failure.
+//
+// Shows how far it is on standard error, when that is a terminal; at the end the counts are on
+// standard output, and notes and failures on standard error. kSuccess when nothing failed,
+// otherwise the gravest status.
+ExitStatus RunOnTree(const TreeOptions& options, const Task& task);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_WALK_TREE_H_
