@@ -6,16 +6,15 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <ctime>
 #include <memory>
 
-#include "format/flush_time.h"
 #include "format/netatalk_record.h"
 #include "include/mavoea.h"
 #include "tools/store/by_kind.h"
 #include "tools/store/encoding.h"
 #include "tools/store/locking.h"
 #include "tools/store/marks.h"
+#include "tools/store/record.h"
 #include "tools/store/rights.h"
 
 namespace mavoea::tool {
@@ -155,6 +154,15 @@ DirectoryRef NeedFolder(const Directory& in, const std::string& name) {
     return in.OpenIn(name);
 }
 
+// Where the file of that path below the directory is to be, in folders that are there.
+Place NeedFolders(DirectoryRef in, std::string path) {
+    for (std::size_t slash; (slash = path.find('/')) != std::string::npos;) {
+        in = NeedFolder(*in, path.substr(0, slash));
+        path.erase(0, slash + 1);
+    }
+    return {in, path};
+}
+
 // Into the EA directory of `to`; volumes of every kind can have one.
 void AddServices(const Object& to, const Metadata& metadata, NewFiles* files, Written* written) {
     for (const Metadata::ServiceFile& service : metadata.services) {
@@ -167,14 +175,9 @@ void AddServices(const Object& to, const Metadata& metadata, NewFiles* files, Wr
                 const std::string name = NameInEaDirectory(to.place.name) + service.name;
                 files->Add(NeedEaDirectory(beside), name, {service.value}, service.holder);
             } else {
-                DirectoryRef folder = NeedFolder(*NeedEaDirectory(beside), to.place.name);
-                std::string name = service.name.substr(1);
-                for (std::size_t slash = name.find('/'); slash != std::string::npos;
-                     slash = name.find('/')) {
-                    folder = NeedFolder(*folder, name.substr(0, slash));
-                    name.erase(0, slash + 1);
-                }
-                files->Add(folder, name, {service.value}, service.holder);
+                const Place place =
+                    NeedFolders(NeedEaDirectory(beside), to.place.name + service.name);
+                files->Add(place.directory, place.name, {service.value}, service.holder);
             }
             written->whole.insert(service.holder);
         } catch (const Failure& failure) {
@@ -451,7 +454,7 @@ class FileEaWriter final : public EaDirectoryWriter {
             } else {
                 (void)inode.RemoveAttribute(kNetatalkAttribute);
             }
-            inode.SetAttribute(kFlushTimeAttribute, EncodeFlushTime(std::time(nullptr)));
+            StampFlushTime(inode);
         } catch (const Failure& failure) {
             // The resource file has the Finder info, but clients look here.
             if (metadata.HasAny()) written->missing.push_back({"netatalk record", failure.cause()});
@@ -565,18 +568,13 @@ void RequirePlace(const Object& to) {
 }
 
 bool CopyLeftOver(const LeftOver& file, const DirectoryRef& directory) {
-    const std::size_t first = file.path.find('/');
-    if (BelongsToAnObject(*directory, file.path.substr(0, first))) return false;
-    DirectoryRef in = NeedEaDirectory(*directory);
-    std::string name = file.path;
-    for (std::size_t slash = first; slash != std::string::npos; slash = name.find('/')) {
-        in = NeedFolder(*in, name.substr(0, slash));
-        name.erase(0, slash + 1);
-    }
+    const std::string first = file.path.substr(0, file.path.find('/'));
+    if (BelongsToAnObject(*directory, first)) return false;
+    const Place to = NeedFolders(NeedEaDirectory(*directory), file.path);
     const auto source = file.found.directory->FindFile(file.found.name, O_RDONLY);
-    if (!source || in->Has(name)) return false;
+    if (!source || to.directory->Has(to.name)) return false;
     NewFiles files(*Inode::Of(*source), {.durability = Durability::kLater});
-    files.Add(in, name, {Content(source, 0, source->Size())});
+    files.Add(to.directory, to.name, {Content(source, 0, source->Size())});
     files.GiveNames();
     return true;
 }
