@@ -31,11 +31,6 @@ std::optional<struct stat> StatusBehind(const std::string& path) {
     throw SystemFailure(path, errno);
 }
 
-struct stat StatusOf(const Place& place) {
-    if (const auto info = place.Status()) return *info;
-    throw SystemFailure(place.path(), ENOENT);
-}
-
 std::string LastName(std::string path) {
     while (path.size() > 1 && path.back() == '/') path.pop_back();
     return path.substr(path.rfind('/') + 1);

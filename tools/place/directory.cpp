@@ -182,6 +182,11 @@ bool Place::Writable() const {
            ::faccessat(directory->fd(), name.c_str(), W_OK, AT_EACCESS) == 0 || errno != EACCES;
 }
 
+struct stat StatusOf(const Place& place) {
+    if (const auto info = place.Status()) return *info;
+    throw SystemFailure(place.path(), ENOENT);
+}
+
 // ---- Inode --------------------------------------------------------------------------------------
 
 std::shared_ptr<const Inode> Inode::Find(const Place& place) {

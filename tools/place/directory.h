@@ -101,6 +101,9 @@ struct Place {
     bool Writable() const;
 };
 
+// Of what is there; a Failure when nothing is.
+struct stat StatusOf(const Place& place);
+
 // An object's own descriptor. It says nothing of what the name leads to later.
 class Inode {
  public:

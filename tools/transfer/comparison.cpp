@@ -96,8 +96,8 @@ class Comparison {
         : original_(AsReadable(original)), copy_(AsReadable(copy)), receiver_(receiver) {}
 
     void Run() {
-        const struct stat info = StatusOf(original_);
-        const struct stat there = StatusOf(copy_);
+        const struct stat info = StatusOf(original_.place);
+        const struct stat there = StatusOf(copy_.place);
         if ((info.st_mode & S_IFMT) != (there.st_mode & S_IFMT)) {
             return receiver_.differs({.path = original_.path(), .aspect = Aspect::kType});
         }
@@ -117,11 +117,6 @@ class Comparison {
         } catch (const Failure& failure) {
             receiver_.fails(failure);
         }
-    }
-
-    static struct stat StatusOf(const Object& object) {
-        if (const auto info = object.place.Status()) return *info;
-        throw SystemFailure(object.path(), ENOENT);
     }
 
     static std::shared_ptr<const File> OpenData(const Object& object) {

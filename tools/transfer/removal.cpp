@@ -57,11 +57,6 @@ class Beside {
     bool shared_ = false;
 };
 
-struct stat StatusOf(const Object& object) {
-    if (const auto info = object.place.Status()) return *info;
-    throw SystemFailure(object.path(), ENOENT);
-}
-
 // An EA directory in which nothing belongs to an object any more.
 void RemoveEaDirectory(const Directory& inside, const MayGo& may_go) {
     const auto info = inside.StatusOf(kEaDirName);
@@ -89,7 +84,7 @@ void RemoveEaDirectory(const Directory& inside, const MayGo& may_go) {
 
 void RemoveObject(const Object& object, bool alone, const MayGo& may_go) {
     const Beside beside(object, alone);
-    if (!may_go(StatusOf(object))) throw HasNotGone(object.path());
+    if (!may_go(StatusOf(object.place))) throw HasNotGone(object.path());
     // Data first: without it, metadata is of no use to anybody.
     if (!object.place.directory->RemoveFile(object.place.name)) {
         throw SystemFailure(object.path(), ENOENT);
@@ -126,7 +121,8 @@ void RemoveCarried(const Object& object, const MayGo& was_carried) {
     std::optional<Failure> failure;
     std::vector<Level> levels;
     const auto begin = [&](const Object& one) {
-        if (!S_ISDIR(StatusOf(one).st_mode)) return RemoveObject(one, levels.empty(), was_carried);
+        if (!S_ISDIR(StatusOf(one.place).st_mode))
+            return RemoveObject(one, levels.empty(), was_carried);
         const DirectoryRef inside = one.place.directory->OpenIn(one.place.name);
         levels.push_back({one, inside, ObjectsIn(inside)});
     };

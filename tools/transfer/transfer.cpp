@@ -40,11 +40,6 @@ bool HoldsContents(const struct stat& info) {
 
 std::pair<dev_t, ino_t> IdOf(const struct stat& info) { return {info.st_dev, info.st_ino}; }
 
-struct stat StatusOf(const Place& place) {
-    if (const auto info = place.Status()) return *info;
-    throw SystemFailure(place.path(), ENOENT);
-}
-
 Failure HasBecomeAnother(const Place& place) {
     return {kFailed, place.path(), "it has become another file", "try again"};
 }

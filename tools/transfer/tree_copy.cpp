@@ -1,7 +1,6 @@
 #include "tools/transfer/tree_copy.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <vector>
 
 #include "tools/store/sidecars.h"
@@ -55,13 +54,12 @@ class TreeCopy {
 
     void Begin(const Place& from, const Place& to) {
         Guard(from, [&] {
-            const auto info = from.Status();
-            if (!info) throw SystemFailure(from.path(), ENOENT);
-            if (!hooks_.may_take(from, *info, to)) return hooks_.on_skip();
+            const struct stat info = StatusOf(from);
+            if (!hooks_.may_take(from, info, to)) return hooks_.on_skip();
             hooks_.on_begin(from);
-            if (S_ISDIR(info->st_mode)) return Enter(from, to);
+            if (S_ISDIR(info.st_mode)) return Enter(from, to);
             const bool contents =
-                hooks_.recursive || S_ISREG(info->st_mode) || S_ISLNK(info->st_mode);
+                hooks_.recursive || S_ISREG(info.st_mode) || S_ISLNK(info.st_mode);
             if (contents) {
                 transfer_.CopyObject(from, to);
             } else {
