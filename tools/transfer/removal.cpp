@@ -121,8 +121,9 @@ void RemoveCarried(const Object& object, const MayGo& was_carried) {
     std::optional<Failure> failure;
     std::vector<Level> levels;
     const auto begin = [&](const Object& one) {
-        if (!S_ISDIR(StatusOf(one.place).st_mode))
+        if (!S_ISDIR(StatusOf(one.place).st_mode)) {
             return RemoveObject(one, levels.empty(), was_carried);
+        }
         const DirectoryRef inside = one.place.directory->OpenIn(one.place.name);
         levels.push_back({one, inside, ObjectsIn(inside)});
     };
