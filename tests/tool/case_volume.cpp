@@ -55,7 +55,9 @@ class Request {
 
 class Server {
  public:
-    Server(int device, int root) : device_(device) { nodes_[FUSE_ROOT_ID] = {root, 1}; }
+    Server(int device, int root, HardLinks hard_links) : device_(device), hard_links_(hard_links) {
+        nodes_[FUSE_ROOT_ID] = {root, 1};
+    }
 
     void Run() {
         std::vector<char> buffer(kMaxWrite + 8192);
@@ -325,6 +327,7 @@ class Server {
             case FUSE_LINK: {
                 const auto in = request.Take<fuse_link_in>();
                 const std::string name = request.Text();
+                if (hard_links_ == HardLinks::kNone) return EPERM;
                 if (linkat(AT_FDCWD, PathOf(in.oldnodeid).c_str(), Fd(node), name.c_str(),
                            AT_SYMLINK_FOLLOW) != 0) {
                     return errno;
@@ -433,6 +436,7 @@ class Server {
     }
 
     const int device_;
+    const HardLinks hard_links_;
     std::string answer_;
     std::map<std::uint64_t, Node> nodes_;  // by inode number, but for the root
     std::map<std::uint64_t, std::vector<Listed>> listings_;
@@ -441,7 +445,7 @@ class Server {
 
 }  // namespace
 
-CaseVolume::CaseVolume() {
+CaseVolume::CaseVolume(HardLinks hard_links) {
     const std::string kept = point_ / "kept";
     if (!room_.ok() || mkdir(kept.c_str(), 0755) != 0 || mkdir(path_.c_str(), 0755) != 0) return;
     const int device = open("/dev/fuse", O_RDWR | O_CLOEXEC);
@@ -455,7 +459,7 @@ CaseVolume::CaseVolume() {
         if (server_ == 0) {
             prctl(PR_SET_PDEATHSIG, SIGKILL);
             umask(0);
-            Server(device, open(kept.c_str(), O_PATH | O_CLOEXEC)).Run();
+            Server(device, open(kept.c_str(), O_PATH | O_CLOEXEC), hard_links).Run();
             _exit(0);
         }
         if (server_ < 0) umount2(path_.c_str(), MNT_DETACH);

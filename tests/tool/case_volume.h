@@ -11,13 +11,16 @@
 
 namespace mavoea::test {
 
+// Whether files can have several names, as nearly everywhere.
+enum class HardLinks { kAny, kNone };
+
 // One, empty, mounted where no other process sees it. Names are kept and listed as they were given
 // first, and looked up whatever the case of their letters. As on the kernel's own file systems of
 // that kind, every spelling of a name leads to the same inode, and a rename from one to another
 // succeeds and does nothing. ok() is false when this process may not mount, or FUSE is missing.
 class CaseVolume {
  public:
-    CaseVolume();
+    explicit CaseVolume(HardLinks hard_links = HardLinks::kAny);
     ~CaseVolume();
     CaseVolume(const CaseVolume&) = delete;
     CaseVolume& operator=(const CaseVolume&) = delete;

@@ -33,7 +33,7 @@ class CleanTest : public ::testing::Test {
     void MakeObject(const std::string& name) const { Files(name).MakeObject(); }
 
     ToolResult Clean(Arguments arguments = {}) const {
-        arguments.insert(arguments.begin(), "clean");
+        arguments.insert(arguments.begin(), {"clean", "--wait", "0"});
         arguments.push_back(dir_.path());
         return RunTool(arguments);
     }
@@ -396,7 +396,7 @@ TEST_F(CleanTest, APathThatHoldsItsNameEarlierIsNotTakenForIt) {
     MakeDir(odd);
     const ObjectFiles gone = {odd, "gone"};
     gone.MakeStream();
-    const ToolResult result = RunTool({"clean", "--yes", odd});
+    const ToolResult result = RunTool({"clean", "--yes", "--wait", "0", odd});
     EXPECT_THAT(result, Succeeded());
     EXPECT_THAT(Tree(dir_.path()), ElementsAre("my@eaDirectory/"));
 }
@@ -434,7 +434,8 @@ TEST_F(CleanTest, SeveralDirectoriesAreCleanedThoughOneIsMissing) {
     ObjectFiles{other.path(), "gone"}.MakeStream();
     Files("gone").MakeStream();
     const std::string missing = dir_ / "missing";
-    const ToolResult result = RunTool({"clean", "--yes", dir_.path(), missing, other.path()});
+    const ToolResult result =
+        RunTool({"clean", "--yes", "--wait", "0", dir_.path(), missing, other.path()});
     EXPECT_EQ(1, result.status);
     EXPECT_EQ("mavoea: " + missing + ": No such file or directory; check the path\n", result.err);
     EXPECT_THAT(result.out, HasSubstr("4 removed, 0 kept, 1 failed\n"));
@@ -454,7 +455,7 @@ TEST_F(CleanTest, OnlyDirectoriesOfObjectsAreCleaned) {
         {dir_ / "@eaDir", "in an EA directory; name a directory that holds objects"},
     };
     for (const auto& [path, cause] : cases) {
-        const ToolResult result = RunTool({"clean", "--yes", path});
+        const ToolResult result = RunTool({"clean", "--yes", "--wait", "0", path});
         EXPECT_THAT(result, Failed(2, path + ": " + cause));
         EXPECT_EQ("0 removed, 0 kept, 1 failed\n", result.out);
     }

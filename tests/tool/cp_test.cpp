@@ -8,6 +8,7 @@
 namespace mavoea::test {
 namespace {
 
+using ::testing::AnyOf;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using ::testing::Not;
@@ -66,9 +67,10 @@ TEST_P(CpPairTest, DirectoriesGoWithAllThatIsInThem) {
     travel.GiveMetadata(travel.From("tree"), "white");
     travel.GiveMetadata(travel.From("tree/sub"), "black");
     travel.GiveMetadata(travel.From("tree/sub/file"), "green");
-    const ToolResult result = travel.Run({"cp", "-r", travel.From("tree"), travel.target()});
+    const ToolResult result =
+        travel.Run({"--json", "cp", "-r", travel.From("tree"), travel.target()});
     EXPECT_THAT(result, Succeeded());
-    EXPECT_THAT(result.out, HasSubstr("3 copied"));
+    EXPECT_EQ(3, result.json()["done"]);
     EXPECT_EQ("data", TextOf(travel.To("tree/sub/file")));
     travel.ExpectMetadata(travel.To("tree"), "white");
     travel.ExpectMetadata(travel.To("tree/sub"), "black");
@@ -106,7 +108,7 @@ TEST_P(CpPairTest, ModeAndTimesAreKept) {
         ASSERT_EQ(0, chmod(travel.From(name).c_str(), mode));
         const timespec times[] = {{1000000000, 123456789}, {1100000000, 987654321}};
         ASSERT_EQ(0, utimensat(AT_FDCWD, travel.From(name).c_str(), times, 0));
-        EXPECT_THAT(travel.Run({"cp", travel.From(name), travel.To(name)}), Succeeded());
+        EXPECT_THAT(travel.Run({"cp", "-p", travel.From(name), travel.To(name)}), Succeeded());
         const struct stat there = StatusOf(travel.To(name));
         EXPECT_EQ(1000000000, there.st_atim.tv_sec);
         EXPECT_EQ(123456789, there.st_atim.tv_nsec);
@@ -126,6 +128,11 @@ TEST_P(CpPairTest, TheLockedStateGoesAlong) {
     ASSERT_EQ(0, travel.Run({"lock", travel.From("a")}).status);
     EXPECT_THAT(travel.Run({"cp", travel.From("a"), travel.To("a")}), Succeeded());
     EXPECT_EQ("1", travel.Run({"get", travel.To("a"), "mavoea.locked"}).out);
+}
+
+std::string CannotCreate(const std::string& path) {
+    return "cannot create regular file '" + path +
+           "': Permission denied; run mavoea as a user who may, or as root";
 }
 
 class CpTest : public ::testing::Test {
@@ -173,7 +180,7 @@ TEST_F(CpTest, OwnerAttributesAndAclAreKept) {
     ASSERT_NE(nullptr, acl);
     ASSERT_EQ(0, acl_set_file(from.c_str(), ACL_TYPE_ACCESS, acl));
     acl_free(acl);
-    EXPECT_THAT(travel_.Run({"cp", from, travel_.To("a")}), Succeeded());
+    EXPECT_THAT(travel_.Run({"cp", "-a", from, travel_.To("a")}), Succeeded());
     const struct stat there = StatusOf(travel_.To("a"));
     EXPECT_EQ(1234U, there.st_uid);
     EXPECT_EQ(4321U, there.st_gid);
@@ -187,6 +194,26 @@ TEST_F(CpTest, OwnerAttributesAndAclAreKept) {
     EXPECT_THAT(text, HasSubstr("user:77:r--"));
     acl_free(text);
     acl_free(copied);
+}
+
+TEST_F(CpTest, ANewFileIsTheCopiersOwn) {
+    const std::string from = travel_.From("a");
+    travel_.MakeFile(from);
+    MAVOEA_SKIP_UNLESS_ANYONE_OWNS(travel_.source());
+    ASSERT_EQ(0, chown(from.c_str(), 1234, 4321));
+    ASSERT_EQ(0, chmod(from.c_str(), 06757));
+    const timespec old[] = {{1000000000, 0}, {1000000000, 0}};
+    ASSERT_EQ(0, utimensat(AT_FDCWD, from.c_str(), old, 0));
+    ASSERT_EQ(0, setxattr(from.c_str(), "user.other", "value", 5, 0));
+    const Umask umask(027);
+    EXPECT_THAT(travel_.Run({"cp", from, travel_.To("a")}), Succeeded());
+    const struct stat there = StatusOf(travel_.To("a"));
+    EXPECT_EQ(geteuid(), there.st_uid);
+    EXPECT_EQ(getegid(), there.st_gid);
+    EXPECT_EQ(mode_t{0750}, there.st_mode & 07777);
+    EXPECT_LT(1000000000, there.st_mtim.tv_sec);
+    char value[16];
+    EXPECT_EQ(5, getxattr(travel_.To("a").c_str(), "user.other", value, sizeof value));
 }
 
 TEST_F(CpTest, HolesStayHoles) {
@@ -204,12 +231,26 @@ TEST_F(CpTest, HardLinksStayLinksOfOneFile) {
     travel_.MakeFile(travel_.From("tree/a"));
     ASSERT_EQ(0, link(travel_.From("tree/a").c_str(), travel_.From("tree/b").c_str()));
     travel_.GiveMetadata(travel_.From("tree/b"), "own");
-    EXPECT_THAT(travel_.Run({"cp", "-r", travel_.From("tree"), travel_.To("tree")}), Succeeded());
+    EXPECT_THAT(travel_.Run({"cp", "-a", travel_.From("tree"), travel_.To("tree")}), Succeeded());
     EXPECT_EQ(StatusOf(travel_.To("tree/a")).st_ino, StatusOf(travel_.To("tree/b")).st_ino);
     EXPECT_EQ(2U, StatusOf(travel_.To("tree/a")).st_nlink);
     travel_.ExpectMetadata(travel_.To("tree/b"), "own");
     travel_.ExpectNoMetadata(travel_.To("tree/a"));
     EXPECT_THAT(Travel::ObjectsIn(travel_.To("tree")), ElementsAre("a", "b"));
+}
+
+TEST_F(CpTest, NamesOfOneFileAreFilesOfTheirOwnWhereLinksAreNotKept) {
+    mkdir(travel_.From("tree").c_str(), 0755);
+    travel_.MakeFile(travel_.From("tree/a"));
+    ASSERT_EQ(0, link(travel_.From("tree/a").c_str(), travel_.From("tree/b").c_str()));
+    travel_.GiveMetadata(travel_.From("tree/b"), "own");
+    EXPECT_THAT(travel_.Run({"cp", "-r", travel_.From("tree"), travel_.To("tree")}), Succeeded());
+    for (const char* name : {"tree/a", "tree/b"}) {
+        EXPECT_EQ(1U, StatusOf(travel_.To(name)).st_nlink);
+        EXPECT_EQ("data", TextOf(travel_.To(name)));
+    }
+    travel_.ExpectMetadata(travel_.To("tree/b"), "own");
+    travel_.ExpectNoMetadata(travel_.To("tree/a"));
 }
 
 TEST_F(CpTest, InATreeSymbolicLinksAndSpecialFilesAreMadeAnew) {
@@ -222,7 +263,7 @@ TEST_F(CpTest, InATreeSymbolicLinksAndSpecialFilesAreMadeAnew) {
     ASSERT_EQ(0, chmod(travel_.From("tree/fifo").c_str(), 0620));
     travel_.MakeFile(travel_.To("outside"), "untouched");
     ASSERT_EQ(0, chmod(travel_.To("outside").c_str(), 0640));
-    EXPECT_THAT(travel_.Run({"cp", "-r", travel_.From("tree"), travel_.target()}), Succeeded());
+    EXPECT_THAT(travel_.Run({"cp", "-rp", travel_.From("tree"), travel_.target()}), Succeeded());
     EXPECT_EQ("../outside", std::filesystem::read_symlink(travel_.To("tree/link")));
     EXPECT_EQ("nowhere", std::filesystem::read_symlink(travel_.To("tree/dangling")));
     EXPECT_EQ(mode_t{S_IFIFO | 0620}, StatusOf(travel_.To("tree/fifo")).st_mode);
@@ -271,7 +312,7 @@ TEST_F(CpTest, FilesOfOtherServicesInTheLegacyFolderGoAlong) {
     EXPECT_EQ("thumbnail", TextOf(travel_.To("@eaDir/b/MAVOPHOTO:THUMB_S.jpg")));
 }
 
-TEST_F(CpTest, AskingAndForcingAndNeverTheLastCounts) {
+TEST_F(CpTest, OfAskingAndNeverTheLastCountsAndForcingUndoesNeither) {
     travel_.MakeFile(travel_.From("a"), "new");
     const auto text_after = [&](Arguments flags, const std::string& answer) {
         travel_.MakeFile(travel_.To("a"), "old");
@@ -285,12 +326,15 @@ TEST_F(CpTest, AskingAndForcingAndNeverTheLastCounts) {
     EXPECT_EQ("old", text_after({"-i"}, ""));
     EXPECT_EQ("new", text_after({"-i"}, "yes\n"));
     EXPECT_EQ("old", text_after({"-n"}, "y\n"));
-    EXPECT_EQ("new", text_after({"-n", "-f"}, "n\n"));
-    EXPECT_EQ("new", text_after({"-i", "-f"}, "n\n"));
+    EXPECT_EQ("old", text_after({"-i", "-n"}, "y\n"));
+    EXPECT_EQ("new", text_after({"-n", "-i"}, "y\n"));
+    EXPECT_EQ("old", text_after({"-n", "-i"}, "n\n"));
+    EXPECT_EQ("old", text_after({"-n", "-f"}, "y\n"));
+    EXPECT_EQ("old", text_after({"-i", "-f"}, "n\n"));
     EXPECT_EQ("old", text_after({"-f", "-i"}, "n\n"));
     EXPECT_EQ("old", text_after({"-f", "-n"}, "y\n"));
     EXPECT_EQ("old", text_after({"-fn"}, "y\n"));
-    EXPECT_EQ("new", text_after({"-nf", "-p"}, "n\n"));
+    EXPECT_EQ("old", text_after({"-nf", "-p"}, "y\n"));
 }
 
 TEST_F(CpTest, TheQuestionNamesWhatWouldBeLost) {
@@ -300,14 +344,15 @@ TEST_F(CpTest, TheQuestionNamesWhatWouldBeLost) {
               travel_.Run({"cp", "-i", travel_.From("a"), travel_.To("a")}, "y\n").err);
 }
 
-TEST_F(CpTest, SeveralSourcesGoIntoADirectoryAndFailuresAreToldAtTheEnd) {
+TEST_F(CpTest, SeveralSourcesGoIntoADirectoryAndFailuresAreTold) {
     travel_.MakeFile(travel_.From("a"));
     travel_.MakeFile(travel_.From("c"));
     const ToolResult result = travel_.Run(
         {"cp", travel_.From("a"), travel_.From("b"), travel_.From("c"), travel_.target()});
     EXPECT_EQ(1, result.status);
-    EXPECT_EQ("2 copied (8 bytes), 1 failed\n", result.out);
-    EXPECT_EQ("mavoea: " + travel_.From("b") + ": No such file or directory; check the path\n",
+    EXPECT_EQ("", result.out);
+    EXPECT_EQ("mavoea: cannot stat '" + travel_.From("b") +
+                  "': No such file or directory; check the path\n",
               result.err);
     EXPECT_THAT(Travel::ObjectsIn(travel_.target()), ElementsAre("a", "c"));
 }
@@ -318,7 +363,7 @@ TEST_F(CpTest, TheDestinationMayStandInFront) {
     EXPECT_TRUE(Exists(travel_.To("a")));
     EXPECT_THAT(
         travel_.Run({"cp", "-t", travel_.To("a"), travel_.From("a")}),
-        Failed(2, travel_.To("a") + ": it is not a directory; name a directory that is there"));
+        Failed(1, "target directory '" + travel_.To("a") + "': Not a directory; check the path"));
 }
 
 TEST_F(CpTest, WithTTheDestinationIsTheObject) {
@@ -327,10 +372,9 @@ TEST_F(CpTest, WithTTheDestinationIsTheObject) {
     mkdir(travel_.To("there").c_str(), 0755);
     EXPECT_THAT(travel_.Run({"cp", "-rT", travel_.From("tree"), travel_.To("there")}), Succeeded());
     EXPECT_THAT(NamesIn(travel_.To("there")), ElementsAre("a"));
-    EXPECT_THAT(
-        travel_.Run({"cp", "-T", travel_.From("tree/a"), travel_.To("there")}),
-        Failed(2, travel_.From("tree/a") + ": a non-directory cannot overwrite the directory '" +
-                      travel_.To("there") + "'; move that away"));
+    EXPECT_THAT(travel_.Run({"cp", "-T", travel_.From("tree/a"), travel_.To("there")}),
+                Failed(1, "cannot overwrite directory '" + travel_.To("there") +
+                              "' with non-directory; move it away"));
 }
 
 TEST_F(CpTest, WhatMakesNoSenseIsRefused) {
@@ -340,38 +384,35 @@ TEST_F(CpTest, WhatMakesNoSenseIsRefused) {
     mkdir(tree.c_str(), 0755);
     ASSERT_EQ(0, link(file.c_str(), travel_.From("name").c_str()));
     ASSERT_EQ(0, symlink("file", travel_.From("link").c_str()));
+    const std::string same = "' are the same file; name another destination";
     const struct {
         Arguments arguments;
         std::string message;
     } cases[] = {
-        {{file}, file + ": nothing says where it is to go; name the destination behind it"},
-        {{tree, travel_.To("x")}, tree + ": it is a directory; use -r"},
-        {{file, file},
-         file + ": it and '" + file + "' are the same file; name another destination"},
-        {{file, travel_.From("name")},
-         file + ": it and '" + travel_.From("name") +
-             "' are the same file; name another destination"},
-        {{"-r", travel_.From("link"), file},
-         travel_.From("link") + ": it and '" + file +
-             "' are the same file; name another destination"},
+        {{file},
+         "missing destination file operand after '" + file +
+             "'\nTry 'mavoea cp --help' for more information."},
+        {{tree, travel_.To("x")}, "-r not specified; omitting directory '" + tree + "'; use -r"},
+        {{file, file}, "'" + file + "' and '" + file + same},
+        {{file, travel_.From("name")}, "'" + file + "' and '" + travel_.From("name") + same},
+        {{"-r", travel_.From("link"), file}, "'" + travel_.From("link") + "' and '" + file + same},
         {{"-r", tree, tree},
-         tree + ": a directory cannot be copied into itself, '" + tree +
+         "cannot copy a directory, '" + tree + "', into itself, '" + tree +
              "/tree'; name another destination"},
         {{"-r", tree, tree + "/deep"},
-         tree + ": a directory cannot be copied into itself, '" + tree +
+         "cannot copy a directory, '" + tree + "', into itself, '" + tree +
              "/deep'; name another destination"},
         {{"-rT", tree, file},
-         tree + ": a directory cannot overwrite the non-directory '" + file + "'; move that away"},
+         "cannot overwrite non-directory '" + file + "' with directory '" + tree +
+             "'; move it away"},
         {{file, tree, travel_.To("x")},
-         travel_.To("x") +
-             ": several objects cannot go there, it is not a directory; name a directory that is "
-             "there"},
+         "target '" + travel_.To("x") + "': No such file or directory; check the path"},
         {{file, travel_.To("x/")},
-         travel_.To("x/") + ": it is not a directory; name a directory that is there"},
+         "cannot create regular file '" + travel_.To("x/") + "': Not a directory; check the path"},
     };
     for (auto [arguments, message] : cases) {
         arguments.insert(arguments.begin(), "cp");
-        EXPECT_THAT(travel_.Run(arguments), Failed(2, message)) << message;
+        EXPECT_THAT(travel_.Run(arguments), Failed(1, message)) << message;
     }
     EXPECT_THAT(NamesIn(travel_.target()), ElementsAre());
     EXPECT_THAT(NamesIn(tree), ElementsAre());
@@ -384,8 +425,9 @@ TEST_F(CpTest, NothingJustMadeIsOverwritten) {
     travel_.MakeFile(travel_.From("a"), "first");
     const ToolResult result =
         travel_.Run({"cp", travel_.From("a"), travel_.From("x/a"), travel_.target()});
-    EXPECT_EQ(2, result.status);
-    EXPECT_THAT(result.err, HasSubstr("it would overwrite '" + travel_.To("a") + "', just made"));
+    EXPECT_THAT(result,
+                Failed(1, "will not overwrite just-created '" + travel_.To("a") + "' with '" +
+                              travel_.From("x/a") + "'; give it another name"));
     EXPECT_EQ("first", TextOf(travel_.To("a")));
 }
 
@@ -417,10 +459,13 @@ TEST_F(CpTest, AFailureInATreeDoesNotStopTheRest) {
     for (const char* name : {"tree/a", "tree/b", "tree/c"}) travel_.MakeFile(travel_.From(name));
     mkdir(travel_.To("tree").c_str(), 0755);
     mkdir(travel_.To("tree/b").c_str(), 0755);
-    const ToolResult result = travel_.Run({"cp", "-r", travel_.From("tree"), travel_.target()});
-    EXPECT_EQ(2, result.status);
-    EXPECT_EQ("3 copied (8 bytes), 1 failed\n", result.out);
-    EXPECT_THAT(result.err, HasSubstr(travel_.From("tree/b")));
+    const ToolResult result = travel_.Run({"cp", "-rv", travel_.From("tree"), travel_.target()});
+    EXPECT_EQ(1, result.status);
+    EXPECT_THAT(result.out, HasSubstr("\n3 copied (8 bytes), 1 failed\n"));
+    EXPECT_EQ("mavoea: cannot overwrite directory '" + travel_.To("tree/b") +
+                  "' with non-directory; move it away\n",
+              result.err);
+    EXPECT_EQ("data", TextOf(travel_.To("tree/a")));
     EXPECT_EQ("data", TextOf(travel_.To("tree/c")));
 }
 
@@ -445,8 +490,7 @@ TEST_F(CpTest, WhatMayNotBeWrittenIsToldAndLeft) {
     }
     AsUser(1234, Root::kGivenUp, [&] {
         EXPECT_THAT(travel_.Run({"cp", travel_.From("a"), travel_.To("a")}),
-                    Failed(2, travel_.To("a") +
-                                  ": Permission denied; run mavoea as a user who may, or as root"));
+                    Failed(1, CannotCreate(travel_.To("a"))));
         EXPECT_EQ("old", TextOf(travel_.To("a")));
         EXPECT_THAT(travel_.Run({"cp", "-f", travel_.From("a"), travel_.To("a")}), Succeeded());
         EXPECT_EQ("new", TextOf(travel_.To("a")));
@@ -454,8 +498,7 @@ TEST_F(CpTest, WhatMayNotBeWrittenIsToldAndLeft) {
     ASSERT_EQ(0, chmod(travel_.target().c_str(), 0555));
     AsUser(1234, Root::kGivenUp, [&] {
         EXPECT_THAT(travel_.Run({"cp", travel_.From("a"), travel_.To("b")}),
-                    Failed(2, travel_.To("b") +
-                                  ": Permission denied; run mavoea as a user who may, or as root"));
+                    Failed(1, CannotCreate(travel_.To("b"))));
     });
     EXPECT_THAT(NamesIn(travel_.target()), ElementsAre("a"));
 }
@@ -469,23 +512,48 @@ TEST_F(CpTest, AnotherUsersProgramLosesItsRights) {
     }
     AsUser(1234, Root::kGivenUp, [&] {
         EXPECT_THAT(travel_.Run({"cp", travel_.From("a"), travel_.To("a")}), Succeeded());
+        EXPECT_THAT(travel_.Run({"cp", "-p", travel_.From("a"), travel_.To("b")}), Succeeded());
     });
     EXPECT_EQ(0755, ModeOf(travel_.To("a")));
+    EXPECT_EQ(0755, ModeOf(travel_.To("b")));
 }
 
-TEST_F(CpTest, OnAFullDiskTheTargetIsAsItWas) {
+TEST_F(CpTest, OnAFullDiskTheTargetOfAnAtomicCopyIsAsItWas) {
+    const SecondVolume small("size=64k", true);
+    MAVOEA_SKIP_WITHOUT_SECOND(small);
+    for (const char* option : {"--atomic", "--remove-destination"}) {
+        SCOPED_TRACE(option);
+        const Travel travel(kEaDirectory, kEaDirectory, small.path());
+        travel.MakeFile(travel.From("a"), std::string(100000, 'x'));
+        travel.MakeFile(travel.To("a"), "old");
+        travel.GiveMetadata(travel.To("a"));
+        const ToolResult result = travel.Run({"cp", option, travel.From("a"), travel.To("a")});
+        EXPECT_EQ(1, result.status);
+        EXPECT_THAT(result.err, HasSubstr("'" + travel.To("a") + "': No space left on device"));
+        EXPECT_EQ("old", TextOf(travel.To("a")));
+        travel.ExpectMetadata(travel.To("a"));
+        EXPECT_THAT(NamesIn(travel.target()), ElementsAre("@eaDir", "a"));
+        std::filesystem::remove_all(travel.target());
+    }
+}
+
+TEST_F(CpTest, OnAFullDiskWhatIsWrittenOverHasTheBeginning) {
     const SecondVolume small("size=64k", true);
     MAVOEA_SKIP_WITHOUT_SECOND(small);
     const Travel travel(kEaDirectory, kEaDirectory, small.path());
-    travel.MakeFile(travel.From("a"), std::string(100000, 'x'));
+    const std::string data(100000, 'x');
+    travel.MakeFile(travel.From("a"), data);
     travel.MakeFile(travel.To("a"), "old");
     travel.GiveMetadata(travel.To("a"));
-    EXPECT_THAT(
-        travel.Run({"cp", travel.From("a"), travel.To("a")}),
-        Failed(2, travel.To("a") + ": No space left on device; free some space on the volume"));
-    EXPECT_EQ("old", TextOf(travel.To("a")));
-    travel.ExpectMetadata(travel.To("a"));
+    const ToolResult result = travel.Run({"cp", travel.From("a"), travel.To("a")});
+    EXPECT_EQ(1, result.status);
+    EXPECT_THAT(result.err, HasSubstr(travel.To("a")));
+    EXPECT_THAT(result.err, HasSubstr(": No space left on device"));
+    const std::string written = TextOf(travel.To("a"));
+    EXPECT_GT(data.size(), written.size());
+    EXPECT_TRUE(data.starts_with(written));
     EXPECT_THAT(NamesIn(travel.target()), ElementsAre("@eaDir", "a"));
+    EXPECT_EQ(data, TextOf(travel.From("a")));
 }
 
 TEST_F(CpTest, MetadataForWhichThereIsNoRoomIsAFailure) {
@@ -578,17 +646,24 @@ TEST_F(CpTest, TheObjectInHandIsFinished) {
 
 TEST_F(CpTest, ASecondInterruptGivesTheObjectInHandUp) {
     ASSERT_EQ(0, mkfifo(travel_.From("fifo").c_str(), 0600));
-    travel_.MakeFile(travel_.To("fifo"), "old");
-    RunningTool tool(travel_.WithVolumes({"cp", travel_.From("fifo"), travel_.target()}));
-    const int fd = open(travel_.From("fifo").c_str(), O_WRONLY);
-    ASSERT_EQ(5, write(fd, "begin", 5));
-    tool.Signal(SIGINT);
-    tool.Signal(SIGTERM);
-    EXPECT_EQ(130, tool.Wait());
-    close(fd);
-    EXPECT_THAT(tool.said(), HasSubstr("interrupted"));
-    EXPECT_EQ("old", TextOf(travel_.To("fifo")));
-    EXPECT_THAT(NamesIn(travel_.target()), ElementsAre("fifo"));
+    const auto text_after = [&](const Arguments& options) {
+        travel_.MakeFile(travel_.To("fifo"), "old");
+        Arguments arguments = {"cp", travel_.From("fifo"), travel_.target()};
+        arguments.insert(arguments.end(), options.begin(), options.end());
+        RunningTool tool(travel_.WithVolumes(arguments));
+        const int fd = open(travel_.From("fifo").c_str(), O_WRONLY);
+        EXPECT_EQ(5, write(fd, "begin", 5));
+        tool.Signal(SIGINT);
+        tool.Signal(SIGTERM);
+        EXPECT_EQ(130, tool.Wait());
+        close(fd);
+        EXPECT_THAT(tool.said(), HasSubstr("interrupted"));
+        EXPECT_THAT(NamesIn(travel_.target()), ElementsAre("fifo"));
+        return TextOf(travel_.To("fifo"));
+    };
+    EXPECT_EQ("old", text_after({"--atomic"}));
+    // What was written over has what had come.
+    EXPECT_THAT(text_after({}), AnyOf("begin", ""));
 }
 
 }  // namespace

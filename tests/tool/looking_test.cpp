@@ -712,14 +712,24 @@ class UnreadableTest : public EarlierTest {
             EXPECT_THAT(result.err, HasSubstr(path));
         }
         for (const Arguments& run : Runs{
-                 {"--volume", there.path() + "=0", "cp", object(), there.path()},
-                 {"--volume", there.path() + "=0", "cp", "-r", volume_.path(), there.path()},
                  {"convert", "--to", "0", object(), there / "converted"},
                  {"convert", "--compare-only", "--to", "1", object(), there / "same"},
              }) {
             SCOPED_TRACE(::testing::PrintToString(run));
             const ToolResult result = volume_.Run(run, {}, {.user = user});
             EXPECT_EQ(2, result.status);
+            EXPECT_THAT(result.err, AnyOf(HasSubstr(path), HasSubstr(object())));
+        }
+        for (const Arguments& source : Runs{{object()}, {"-rT", volume_.path()}}) {
+            const TempDir copies(FastDirectory());
+            ASSERT_EQ(0, chmod(copies.path().c_str(), 0777));
+            Arguments run = {"--volume", copies.path() + "=0", "cp"};
+            run.insert(run.end(), source.begin(), source.end());
+            run.push_back(copies.path());
+            SCOPED_TRACE(::testing::PrintToString(run));
+            const ToolResult result = volume_.Run(run, {}, {.user = user});
+            // The data may come without its metadata, where that is no secret.
+            EXPECT_EQ(Exists(copies / "file.txt") ? 2 : 1, result.status);
             EXPECT_THAT(result.err, AnyOf(HasSubstr(path), HasSubstr(object())));
         }
     }

@@ -11,6 +11,8 @@
 #include <filesystem>
 #include <functional>
 #include <optional>
+#include <string>
+#include <vector>
 
 #include "tests/tool/stopped_tool.h"
 #include "tests/tool/travel.h"
@@ -30,20 +32,33 @@ std::optional<std::size_t> Find(const Bytes& bytes, const Bytes& wanted) {
     return static_cast<std::size_t>(at - bytes.begin());
 }
 
-// Nothing where it has gone meanwhile: files under way have names for a moment only.
+// Nothing where it has gone meanwhile: files under way may have names for a moment only.
 Bytes AttributeOf(const std::string& path, const std::string& name) {
     Bytes value(4096);
-    const ssize_t size = lgetxattr(path.c_str(), name.c_str(), value.data(), value.size());
+    const ssize_t size = getxattr(path.c_str(), name.c_str(), value.data(), value.size());
     value.resize(static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
     return value;
 }
 
-// Changes the last byte of `wanted` where a file in `tree`, or an attribute of one, holds all of
-// it. False when none does.
-bool Spoil(const std::string& tree, const Bytes& wanted) {
+std::vector<std::string> FilesIn(const std::string& tree) {
+    std::vector<std::string> files;
     for (const fs::directory_entry& entry : fs::recursive_directory_iterator(tree)) {
-        const std::string path = entry.path().string();
-        if (!entry.is_regular_file()) continue;
+        if (!entry.is_symlink() && entry.is_regular_file()) files.push_back(entry.path().string());
+    }
+    return files;
+}
+
+// With those that the tool has made there, and that have no name yet.
+std::vector<std::string> FilesIn(const std::string& tree, const FileCall& call) {
+    std::vector<std::string> files = FilesIn(tree);
+    for (const std::string& file : call.FilesWithoutNames(tree)) files.push_back(file);
+    return files;
+}
+
+// Changes the last byte of `wanted` where one of the files, or an attribute of one, holds all of
+// it. False when none does.
+bool Spoil(const std::vector<std::string>& files, const Bytes& wanted) {
+    for (const std::string& path : files) {
         if (const auto at = Find(ReadFile(path), wanted)) {
             const std::size_t last = *at + wanted.size() - 1;
             const auto other = static_cast<std::uint8_t>(wanted.back() ^ 1);
@@ -55,7 +70,7 @@ bool Spoil(const std::string& tree, const Bytes& wanted) {
         Bytes value = AttributeOf(path, Colour());
         if (value == wanted) {
             value.back() ^= 1;
-            EXPECT_EQ(0, lsetxattr(path.c_str(), Colour().c_str(), value.data(), value.size(), 0));
+            EXPECT_EQ(0, setxattr(path.c_str(), Colour().c_str(), value.data(), value.size(), 0));
             return true;
         }
     }
@@ -127,8 +142,8 @@ TEST_P(WrittenTest, IsReadBackBeforeTheSourceGoes) {
     bool spoiled = false;
     const StoppedRun run = RunStopped(
         travel_->WithVolumes({"mv", travel_->From("a"), travel_->To("a")}), travel_->dir().path(),
-        [&](const FileCall&) {
-            spoiled = spoiled || Spoil(travel_->target(), value);
+        [&](const FileCall& call) {
+            spoiled = spoiled || Spoil(FilesIn(travel_->target(), call), value);
             return !spoiled;
         },
         Stops::kAtDataToo);
@@ -138,8 +153,10 @@ TEST_P(WrittenTest, IsReadBackBeforeTheSourceGoes) {
         EXPECT_EQ(0, run.status) << run.err;
         return travel_->ExpectMetadata(travel_->To("a"), kBlue);
     }
-    ASSERT_EQ(2, run.status) << run.err;
-    EXPECT_NE(std::string::npos, run.err.find(travel_->From("a"))) << run.err;
+    // What is wrong with metadata does not keep the object from arriving.
+    ASSERT_EQ(item.empty() ? 1 : 2, run.status) << run.err;
+    const std::string named = item.empty() ? travel_->To("a") : travel_->From("a");
+    EXPECT_NE(std::string::npos, run.err.find(named)) << run.err;
     EXPECT_EQ("data of the file, as it was", TextOf(travel_->From("a")));
     travel_->ExpectMetadata(travel_->From("a"), kBlue);
 }
@@ -159,15 +176,14 @@ class ReadTest : public ::testing::Test {
     StoppedRun RunAndChange(const char* command, const Bytes& wanted,
                             const std::function<void()>& change) {
         bool changed = false;
-        const auto has_it = [&](const fs::directory_entry& entry) {
-            return entry.is_regular_file() && Find(ReadFile(entry.path().string()), wanted);
+        const auto has_it = [&](const std::string& path) {
+            return Find(ReadFile(path), wanted).has_value();
         };
         StoppedRun run =
             RunStopped(travel_->WithVolumes({command, travel_->From("a"), travel_->To("a")}),
-                       travel_->dir().path(), [&](const FileCall&) {
-                           const fs::recursive_directory_iterator files(travel_->target());
-                           if (changed || !std::any_of(begin(files), end(files), has_it))
-                               return true;
+                       travel_->dir().path(), [&](const FileCall& call) {
+                           const auto files = FilesIn(travel_->target(), call);
+                           if (std::none_of(files.begin(), files.end(), has_it)) return true;
                            change();
                            changed = true;
                            return false;
@@ -185,7 +201,7 @@ TEST_F(ReadTest, DataThatGrowsWhileItIsMovedStays) {
     const StoppedRun run = RunAndChange("mv", Ascii("first line\n"), [&] {
         WriteFile(travel_->From("a"), Ascii("first line\nsecond line\n"));
     });
-    ASSERT_EQ(2, run.status) << run.err;
+    ASSERT_EQ(1, run.status) << run.err;
     EXPECT_EQ("first line\nsecond line\n", TextOf(travel_->From("a")));
 }
 
@@ -193,9 +209,9 @@ TEST_F(ReadTest, MetadataThatChangesWhileItIsMovedStays) {
     travel_->MakeFile(travel_->From("a"));
     travel_->GiveMetadata(travel_->From("a"), kBlue);
     const StoppedRun run = RunAndChange("mv", Ascii("fork of " + kBlue), [&] {
-        EXPECT_TRUE(Spoil(travel_->source(), Ascii("fork of " + kBlue)));
+        EXPECT_TRUE(Spoil(FilesIn(travel_->source()), Ascii("fork of " + kBlue)));
     });
-    ASSERT_EQ(2, run.status) << run.err;
+    ASSERT_EQ(1, run.status) << run.err;
     EXPECT_EQ("data", TextOf(travel_->From("a")));
     EXPECT_EQ("fork of blue as it wa" + std::string(1, 's' ^ 1),
               travel_->Run({"get", travel_->From("a"), kFork}).out);
@@ -207,7 +223,7 @@ TEST_F(ReadTest, DataThatShrinksWhileItIsCopiedDoesNotArriveAsZeros) {
     travel_->MakeFile(travel_->From("a"), data);
     const StoppedRun run = RunAndChange(
         "cp", Ascii("begin"), [&] { EXPECT_EQ(0, truncate(travel_->From("a").c_str(), 0)); });
-    ASSERT_EQ(2, run.status) << run.err;
+    ASSERT_EQ(1, run.status) << run.err;
     EXPECT_FALSE(Exists(travel_->To("a")));
 }
 

@@ -324,6 +324,7 @@ class Tracer {
         const auto found = Calls().find(info.seccomp.nr);
         if (found == Calls().end()) return;
         call_.name = found->second.name;
+        call_.process = process;
         call_.look_ups.clear();
         call_.open_file.clear();
         const auto& arguments = info.seccomp.args;
@@ -448,6 +449,27 @@ bool FileCall::OnlyLooks() const {
            name.starts_with("readlink") || name.starts_with("getdents");
 }
 
+std::vector<std::string> FileCall::FilesWithoutNames(const std::string& tree) const {
+    std::vector<std::string> files;
+    const std::string descriptors = "/proc/" + std::to_string(process) + "/fd";
+    for (const auto& entry : std::filesystem::directory_iterator(descriptors)) {
+        const std::string leads_to = LinkTarget(entry.path().string());
+        if (IsIn(leads_to, tree) && leads_to.ends_with(" (deleted)")) {
+            files.push_back(entry.path().string());
+        }
+    }
+    return files;
+}
+
+bool FileCall::Changes() const {
+    constexpr const char* kReading[] = {"getxattr", "listxattr", "statfs",         "chdir",
+                                        "exec",     "open",      "name_to_handle", "pread"};
+    return !OnlyLooks() &&
+           std::none_of(std::begin(kReading), std::end(kReading), [this](const char* reading) {
+               return name.find(reading) != std::string::npos;
+           });
+}
+
 void PrintTo(const FileCall& call, std::ostream* out) {
     *out << "call " << call.nth << ", " << call.name;
     for (const FileCall::LookUp& look_up : call.look_ups) {
@@ -499,6 +521,17 @@ StoppedRun RunStoppedAt(const Arguments& arguments, const std::string& tree, int
         if (call.nth == nth) attack();
         return call.nth < nth;
     });
+}
+
+StoppedRun RunKilledAt(const Arguments& arguments, const std::string& tree, int nth) {
+    return RunStopped(
+        arguments, tree,
+        [&](const FileCall& call) {
+            if (!call.Changes() || --nth != 0) return true;
+            kill(call.process, SIGKILL);
+            return false;
+        },
+        Stops::kAtDataToo);
 }
 
 std::string WhyNotStopped() {

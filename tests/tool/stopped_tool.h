@@ -4,6 +4,7 @@
 #define MAVOEA_TESTS_TOOL_STOPPED_TOOL_H_
 
 #include <gtest/gtest.h>
+#include <sys/types.h>
 
 #include <functional>
 #include <ostream>
@@ -28,12 +29,18 @@ struct FileCall {
     std::string name;  // "openat"
     std::vector<LookUp> look_ups;
     std::string open_file;  // what its descriptor leads to, where it looks up no name
+    pid_t process = 0;      // that makes it
 
     // Whether what the name `path` stands for matters to it: it looks that up, or passes through
     // it, or lists the directory that has it.
     bool Sees(const std::string& path) const;
     // Whether it tells what is there, and nothing is done with that.
     bool OnlyLooks() const;
+    // The files in the directory `tree` that the process has open and that have no name, or none
+    // any more: paths that lead to them.
+    std::vector<std::string> FilesWithoutNames(const std::string& tree) const;
+    // Whether it may change what is there. Those that open files, and may make them, do not count.
+    bool Changes() const;
 };
 void PrintTo(const FileCall& call, std::ostream* out);
 
@@ -58,6 +65,10 @@ StoppedRun RunStopped(const Arguments& arguments, const std::string& tree, const
 // fewer.
 StoppedRun RunStoppedAt(const Arguments& arguments, const std::string& tree, int nth,
                         const std::function<void()>& attack);
+
+// The same, but the tool is killed before its nth call that Changes() something. There was no such
+// call when the run ended by itself.
+StoppedRun RunKilledAt(const Arguments& arguments, const std::string& tree, int nth);
 
 // Why processes cannot be stopped at their calls here; empty where they can.
 std::string WhyNotStopped();

@@ -8,6 +8,7 @@
 #include "include/mavoea.h"
 #include "platform/include/mavocore.h"
 #include "tools/store/sidecars.h"
+#include "tools/transfer/pending.h"
 
 namespace mavoea::tool {
 namespace {
@@ -17,6 +18,7 @@ constexpr std::string_view kCover = kCoverName;
 constexpr std::string_view kAppleDoublePrefix = "._";
 constexpr const char* kObjectGone = "its object is gone";
 constexpr const char* kNoObjects = "its directory holds no objects";
+constexpr const char* kCutShort = "a run of mavoea was cut short";
 
 using Entry = Directory::Entry;
 using Names = std::unordered_set<std::string>;
@@ -30,6 +32,14 @@ constexpr FileKind kFileKinds[] = {
     {"@" MAVOEA_KIND_RESOURCE, DanglingKind::kResource},
     {"@" MAVOEA_KIND_RESOURCE "Tmp", DanglingKind::kResourceCopy},
 };
+
+// The kind of a metadata file in an EA directory; null where the name is that of none.
+const FileKind* KindOf(const std::string& name) {
+    const auto* const kind =
+        std::find_if(std::begin(kFileKinds), std::end(kFileKinds),
+                     [&](const FileKind& one) { return name.ends_with(one.suffix); });
+    return kind == std::end(kFileKinds) ? nullptr : kind;
+}
 
 std::string LastComponent(const std::string& path) {
     const std::string text = path.c_str();
@@ -57,10 +67,11 @@ class Search {
           entries_(directory->Entries()) {}
 
     std::vector<Dangling> Run() {
+        for (const Entry& entry : entries_) LookAtOwn(directory_.shared_from_this(), entry);
         FindOrphans();
         if (!ea_dir_) return std::move(found_);
         for (const Entry& entry : entries_) {
-            if (Goes(entry.name)) continue;
+            if (Goes(entry.name) || IsOwn(entry)) continue;
             owners_.insert(NameInEaDirectory(entry.name));
             if (entry.name != kEaDir) alone_ = false;
         }
@@ -73,6 +84,22 @@ class Search {
     }
 
  private:
+    static bool IsOwn(const Entry& entry) {
+        if (S_ISDIR(entry.type)) return PendingOwner::Parse(entry.name).has_value();
+        return IsTemporaryName(entry.name);
+    }
+
+    // What this tool has given a name of its own; what it works with just now stays.
+    void LookAtOwn(const DirectoryRef& holder, const Entry& entry) {
+        if (!IsOwn(entry)) return;
+        if (S_ISDIR(entry.type)) {
+            if (!IsLeftPending(holder, entry)) return;
+            Add(DanglingKind::kPending, holder, entry.name, kCutShort);
+        } else if (IsAbandoned(*holder, entry.name)) {
+            Add(DanglingKind::kTemporary, holder, entry.name, kCutShort);
+        }
+    }
+
     // "._" files.
     void FindOrphans() {
         for (const Entry& entry : entries_) {
@@ -113,14 +140,20 @@ class Search {
     }
 
     void Look(const Entry& entry) {
+        if (IsOwn(entry)) {
+            const std::size_t before = found_.size();
+            LookAtOwn(ea_dir_, entry);
+            // What comes of a rename is there afterwards.
+            if (found_.size() == before || S_ISDIR(entry.type)) stays_ = true;
+            return;
+        }
         if (S_ISREG(entry.type)) {
             if (entry.name == kCover) return;
-            for (const auto& [suffix, kind] : kFileKinds) {
-                if (!entry.name.ends_with(suffix)) continue;
-                if (HasObject(entry.name.substr(0, entry.name.size() - suffix.size()))) {
+            if (const FileKind* const kind = KindOf(entry.name)) {
+                if (HasObject(entry.name.substr(0, entry.name.size() - kind->suffix.size()))) {
                     stays_ = true;
                 } else {
-                    Add(kind, entry.name);
+                    Add(kind->kind, entry.name);
                 }
                 return;
             }
@@ -145,7 +178,15 @@ class Search {
     }
 
     void Add(DanglingKind kind, const std::string& name, const char* because = kObjectGone) {
-        found_.push_back({kind, name, because});
+        const bool beside =
+            kind == DanglingKind::kAppleDouble || kind == DanglingKind::kEaDirectory;
+        Add(kind, beside ? directory_.shared_from_this() : ea_dir_, name, because);
+    }
+    void Add(DanglingKind kind, const DirectoryRef& holder, const std::string& name,
+             const char* because) {
+        if (const auto info = holder->StatusOf(name)) {
+            found_.push_back({kind, holder, name, because, *info});
+        }
     }
 
     void AddOther(const std::string& name, const char* because) {
@@ -169,6 +210,10 @@ class Search {
 
 const char* IdOf(DanglingKind kind) {
     switch (kind) {
+        case DanglingKind::kTemporary:
+            return "temporary";
+        case DanglingKind::kPending:
+            return "pending";
         case DanglingKind::kAppleDouble:
             return "appleDouble";
         case DanglingKind::kStream:
@@ -189,6 +234,10 @@ const char* IdOf(DanglingKind kind) {
 
 const char* LabelOf(DanglingKind kind) {
     switch (kind) {
+        case DanglingKind::kTemporary:
+            return "temporary file";
+        case DanglingKind::kPending:
+            return "unfinished rename";
         case DanglingKind::kAppleDouble:
             return "AppleDouble file";
         case DanglingKind::kStream:
@@ -205,6 +254,27 @@ const char* LabelOf(DanglingKind kind) {
             break;
     }
     return "of another service";
+}
+
+bool HasObject(const Directory& directory, const Dangling& dangling) {
+    switch (dangling.kind) {
+        case DanglingKind::kAppleDouble: {
+            const std::string object = dangling.name.substr(kAppleDoublePrefix.size());
+            return !object.empty() && directory.Has(object);
+        }
+        case DanglingKind::kStream:
+        case DanglingKind::kResource:
+        case DanglingKind::kResourceCopy: {
+            const std::string start = dangling.name.substr(
+                0, dangling.name.size() - KindOf(dangling.name)->suffix.size());
+            const auto objects = MayBelongTo(directory, dangling.name);
+            return std::any_of(objects.begin(), objects.end(), [&](const std::string& object) {
+                return NameInEaDirectory(object) == start;
+            });
+        }
+        default:
+            return BelongsToAnObject(directory, dangling.name);
+    }
 }
 
 std::vector<Dangling> FindDangling(const DirectoryRef& directory, const DirectoryRef& ea_dir,

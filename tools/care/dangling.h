@@ -10,6 +10,8 @@
 namespace mavoea::tool {
 
 enum class DanglingKind {
+    kTemporary,  // a file that a run was making when it was killed
+    kPending,    // a rename that was cut short, see tools/transfer/pending.h
     kAppleDouble,
     kStream,
     kResource,
@@ -21,12 +23,10 @@ enum class DanglingKind {
 
 struct Dangling {
     DanglingKind kind;
-    std::string name;     // in the EA directory, but for AppleDouble files and the EA directory
+    DirectoryRef holder;  // the directory or its EA directory
+    std::string name;     // in it
     const char* because;  // for people
-
-    bool InEaDirectory() const {
-        return kind != DanglingKind::kAppleDouble && kind != DanglingKind::kEaDirectory;
-    }
+    struct stat info;     // when it was found
 };
 
 // "stream", for programs, and "EA stream", for people.
@@ -36,10 +36,13 @@ const char* LabelOf(DanglingKind kind);
 // What dangles in a directory and its EA directory, in the order in which it can be removed. The EA
 // directory itself is listed where nothing stays in it: with `others`, which says that things of
 // kind kOther go as well, that may be more often. Everything that any object in the directory may
-// own is left out; what was made meanwhile as well. `ea_dir` is null where there is none. Throws
-// Failure.
+// own is left out; what was made meanwhile as well, and what processes work with that are alive.
+// `ea_dir` is null where there is none. Throws Failure.
 std::vector<Dangling> FindDangling(const DirectoryRef& directory, const DirectoryRef& ea_dir,
                                    bool others);
+
+// Whether an object has come for a thing that dangled, wherever that is now.
+bool HasObject(const Directory& directory, const Dangling& dangling);
 
 }  // namespace mavoea::tool
 

@@ -10,6 +10,7 @@
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
+#include "tools/transfer/pending.h"
 
 namespace mavoea::tool {
 namespace {
@@ -70,7 +71,8 @@ Outcome RepairObject(const Object& volume_object) {
             "a repair would lose its " + missing.front().item + ": " + missing.front().reason,
             "move the file away if that is no loss");
     }
-    const Written written = writer.Write(object, fitting, {.old = Old::kKept});
+    const Written written =
+        writer.Write(object, *Inode::Open(object.place), fitting, {.old = Old::kKept});
     auto lost = WhatIsMissing(fitting, ReadMetadata(object, Sidecars::Services::kFind));
     lost.insert(lost.end(), written.missing.begin(), written.missing.end());
     if (lost.empty()) return Outcome::kDone;
@@ -82,13 +84,15 @@ Outcome RepairObject(const Object& volume_object) {
 }  // namespace
 
 ExitStatus Repair(const TreeOptions& options) {
-    return RunOnTree(options,
-                     {.doing = "repairing",
-                      .done = "repaired",
-                      .current = nullptr,
-                      .nothing = "with nothing to repair",
-                      .check = RequireEaDirectory,
-                      .work = [](const Object& object, Notes*) { return RepairObject(object); }});
+    return RunOnTree(
+        options, {.doing = "repairing",
+                  .done = "repaired",
+                  .current = nullptr,
+                  .nothing = "with nothing to repair",
+                  .check = RequireEaDirectory,
+                  .work = [](const Object& object, Notes*) { return RepairObject(object); },
+                  .on_named = SettleNamed,
+                  .on_directory = [](const DirectoryRef& inside) { (void)SettlePending(inside); }});
 }
 
 }  // namespace mavoea::tool

@@ -2,6 +2,7 @@
 
 #include "tools/say/text.h"
 #include "tools/store/adoption.h"
+#include "tools/transfer/pending.h"
 
 namespace mavoea::tool {
 
@@ -25,12 +26,15 @@ ExitStatus Upgrade(const TreeOptions& options) {
         if (!adoption.adopted.empty()) return Outcome::kDone;
         return adoption.current ? Outcome::kCurrent : Outcome::kNothing;
     };
-    return RunOnTree(options, {.doing = "upgrading",
-                               .done = "converted",
-                               .current = "already current",
-                               .nothing = "with nothing to convert",
-                               .check = RequireEaDirectory,
-                               .work = work});
+    return RunOnTree(
+        options, {.doing = "upgrading",
+                  .done = "converted",
+                  .current = "already current",
+                  .nothing = "with nothing to convert",
+                  .check = RequireEaDirectory,
+                  .work = work,
+                  .on_named = SettleNamed,
+                  .on_directory = [](const DirectoryRef& inside) { (void)SettlePending(inside); }});
 }
 
 }  // namespace mavoea::tool

@@ -6,7 +6,9 @@
 #include <span>
 #include <string_view>
 
+#include "tools/cli/habits.h"
 #include "tools/say/messages.h"
+#include "tools/say/output.h"
 
 namespace mavoea::tool {
 namespace {
@@ -23,6 +25,7 @@ constexpr const char* kExamples = R"(Examples:
   mavoea cp -r /srv/share/letters /mnt/share
   mavoea mv letter.txt /mnt/share
   mavoea rm -r /srv/share/letters
+  mavoea carry -r /srv/share/letters /mnt/restored/letters
   mavoea upgrade -r /srv/share
   mavoea repair -r /srv/share
   mavoea clean -r /srv/share
@@ -34,8 +37,9 @@ Volume types: a number from 0 to 12, or appledouble (0), eadir (1), fileea (2), 
 Names like any other: com.apple.FinderInfo, com.apple.ResourceFork, and mavoea.locked, which is 1
 for a file that Macs may not write, rename or delete.
 Recursive work goes on after a failure, and tells at its end what failed.
-Exit status: 0 done; 1 not found, the object or the attribute; 2 anything else that went wrong;
-130 and 143: cp, mv or rm was interrupted, after the object in hand.
+Exit status: 0 done; 1 not found, the object or the attribute; 2 anything else that went wrong.
+Of cp, mv and rm: 1 something could not be done; 2 all objects arrived, and not all metadata; 130 and
+143 interrupted, after the object in hand. Under the names cp, mv and rm the tool is that command.
 A NAME or VALUE that begins with '-' stands behind "--". Control characters in names are shown as
 "\x0A", backslashes doubled; --json has names as they are.)";
 
@@ -72,42 +76,19 @@ void AddTree(CLI::App* sub, Options* options) {
     AddPaths(sub, options);
 }
 
+void AddSource(CLI::App* sub, Options* options) {
+    sub->add_option_function<std::string>(
+           "SRC", [=](const std::string& path) { options->paths = {path}; }, "The original")
+        ->required();
+}
+
 void AddAllowLoss(CLI::App* sub, Options* options) {
     sub->add_flag("--allow-loss", options->allow_loss,
                   "What cannot be kept at the destination is named, and may be lost");
 }
 
-// Of two that contradict each other the last counts.
-void AddConsent(CLI::App* sub, const char* flag, Consent consent, Options* options,
-                const char* what) {
-    sub->add_flag_callback(
-           flag, [=] { options->consent = consent; }, what)
-        ->trigger_on_parse();
-}
-
-// What cp, mv and rm share.
-void AddHabits(CLI::App* sub, Options* options) {
-    AddConsent(sub, "-i,--interactive", Consent::kAsk, options, "Ask before anything is lost");
-    AddConsent(sub, "-f,--force", Consent::kForce, options, "Never ask");
-    sub->add_flag("-v,--verbose", options->verbose, "Say what is done");
-}
-
-// What cp and mv share.
-void AddDestination(CLI::App* sub, Options* options) {
-    AddHabits(sub, options);
-    AddAllowLoss(sub, options);
-    AddConsent(sub, "-n,--no-clobber", Consent::kNever, options, "Leave alone what is there");
-    CLI::Option* const directory =
-        sub->add_option_function<std::string>(
-               "-t,--target-directory",
-               [=](const std::string& path) { options->target_directory = path; },
-               "The directory to put all of them into")
-            ->type_name("DIR");
-    sub->add_flag("-T,--no-target-directory", options->no_target_directory,
-                  "DST is the new object itself, never the directory to put it into")
-        ->excludes(directory);
-    sub->add_option("PATH", options->paths, "SRC... DST, or SRC... with -t")->required();
-}
+// Their arguments are read elsewhere.
+void AddNothing(CLI::App* /*sub*/, Options* /*options*/) {}
 
 void AddName(CLI::App* sub, Options* options) {
     sub->add_option("NAME", options->name, "The attribute's name")->required();
@@ -161,21 +142,17 @@ constexpr Syntax kCommands[] = {
          sub->add_option("APPLEDOUBLE", options->apple_double, "An AppleDouble file")->required();
          AddPath(sub, options, "A file or directory");
      }},
-    {Command::kCopy, "cp", "Copy objects with data, permissions, times and metadata",
+    {Command::kCopy, "cp", "Copy objects with their metadata, with the options of cp", AddNothing},
+    {Command::kMove, "mv", "Move or rename objects with their metadata, with the options of mv",
+     AddNothing},
+    {Command::kDelete, "rm", "Remove objects with their metadata, with the options of rm",
+     AddNothing},
+    {Command::kCarry, "carry", "Give a copy that another program has made the original's metadata",
      [](CLI::App* sub, Options* options) {
-         sub->add_flag("-r,-R,-a,--recursive", options->recursive,
-                       "With all that is below directories; symbolic links are copied as such");
-         sub->add_flag_callback(
-             "-p,--preserve", [] {}, "Keep mode, owner and times, as is always done");
-         AddDestination(sub, options);
-     }},
-    {Command::kMove, "mv", "Move or rename objects with their metadata", AddDestination},
-    {Command::kDelete, "rm", "Remove objects with their metadata",
-     [](CLI::App* sub, Options* options) {
-         sub->add_flag("-r,-R,--recursive", options->recursive,
-                       "With all that is in directories; symbolic links are not followed");
-         AddHabits(sub, options);
-         AddPaths(sub, options);
+         AddRecursive(sub, options);
+         sub->add_flag("-v,--verbose", options->verbose, "Say what is done");
+         AddSource(sub, options);
+         sub->add_option("DST", options->destination, "The copy's own path")->required();
      }},
     {Command::kUpgrade, "upgrade", "Convert what earlier versions kept into the current layout",
      AddTree},
@@ -183,7 +160,12 @@ constexpr Syntax kCommands[] = {
     {Command::kClean, "clean", "List metadata whose object is gone, and remove it with --yes",
      [](CLI::App* sub, Options* options) {
          AddRecursive(sub, options);
-         sub->add_flag("--yes", options->yes, "Remove what is listed");
+         sub->add_flag("--yes", options->yes, "Remove what is listed, when a second look finds it");
+         sub->add_option("--wait", options->wait,
+                         "How long after the first look the second one comes; 0: at once")
+             ->type_name("SECONDS")
+             ->check(CLI::Range(0, 3600))
+             ->capture_default_str();
          sub->add_flag("--all", options->all,
                        "With what other services keep in EA directories for objects that are gone");
          sub->add_option("DIR", options->paths, "Directories")->required();
@@ -197,9 +179,7 @@ constexpr Syntax kCommands[] = {
              ->required();
          AddAllowLoss(sub, options);
          sub->add_flag("--compare-only", options->compare_only, "Copy nothing, only compare");
-         sub->add_option_function<std::string>(
-                "SRC", [=](const std::string& path) { options->paths = {path}; }, "What to copy")
-             ->required();
+         AddSource(sub, options);
          sub->add_option("DST", options->destination,
                          "The copy's own path, not that of the directory around it")
              ->required();
@@ -237,22 +217,67 @@ std::size_t Distance(std::string_view one, std::string_view other) {
     return table[one.size()][other.size()];
 }
 
-// The first word that is no option and no value of one; none when it is a command, or missing.
-std::optional<std::string> UnknownCommand(std::span<const char* const> arguments) {
+// The first word that is no option and no value of one.
+struct Word {
+    std::size_t index;
+    const Syntax* syntax;              // null: it is no command
+    std::vector<std::string> volumes;  // options before it
+    bool json = false;
+};
+
+// None when there is no such word, or another option before it.
+std::optional<Word> FindCommand(std::span<const char* const> arguments) {
+    constexpr std::string_view kVolume = "--volume";
+    Word found = {0, nullptr, {}};
     for (std::size_t i = 0; i < arguments.size(); ++i) {
         const std::string_view word = arguments[i];
-        if (word == "--volume") {
-            ++i;
+        if (word == kVolume) {
+            if (++i < arguments.size()) found.volumes.emplace_back(arguments[i]);
         } else if (!word.starts_with('-')) {
-            const bool known = std::any_of(std::begin(kCommands), std::end(kCommands),
-                                           [&](const Syntax& one) { return one.name == word; });
-            if (known) return std::nullopt;
-            return std::string(word);
-        } else if (word != "--json" && !word.starts_with("--volume=")) {
+            found.index = i;
+            const auto* const known =
+                std::find_if(std::begin(kCommands), std::end(kCommands),
+                             [&](const Syntax& one) { return one.name == word; });
+            if (known != std::end(kCommands)) found.syntax = known;
+            return found;
+        } else if (word == "--json") {
+            found.json = true;
+        } else if (word.starts_with("--volume=")) {
+            found.volumes.emplace_back(word.substr(kVolume.size() + 1));
+        } else {
             return std::nullopt;
         }
     }
     return std::nullopt;
+}
+
+std::optional<Habit> HabitOf(Command command) {
+    switch (command) {
+        case Command::kCopy:
+            return Habit::kCopy;
+        case Command::kMove:
+            return Habit::kMove;
+        case Command::kDelete:
+            return Habit::kDelete;
+        default:
+            return std::nullopt;
+    }
+}
+
+std::variant<Options, int> ParseAs(Command command, Habit habit, std::span<const char* const> words,
+                                   Word before = {}) {
+    auto parsed = ParseHabit(habit, words);
+    if (const int* const status = std::get_if<int>(&parsed)) return *status;
+    auto& read = std::get<HabitOptions>(parsed);
+    Options options;
+    options.command = command;
+    options.volumes = std::move(before.volumes);
+    options.volumes.insert(options.volumes.end(), read.volumes.begin(), read.volumes.end());
+    options.copy = std::move(read.copy);
+    options.remove = std::move(read.remove);
+    options.json = before.json || read.json;
+    options.copy.job.json = options.remove.job.json = options.json;
+    return options;
 }
 
 Failure NoCommand(const std::string& word) {
@@ -278,6 +303,24 @@ Failure NoCommand(const std::string& word) {
 }  // namespace
 
 std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
+    const std::span<const char* const> arguments(argv + 1, argv + std::max(argc, 1));
+    const std::string program = argc > 0 ? argv[0] : "";
+    const std::string own_name = program.substr(program.rfind('/') + 1);
+    for (const Syntax& one : kCommands) {
+        const auto habit = HabitOf(one.command);
+        if (!habit || own_name != one.name) continue;
+        SpeakAs(own_name);
+        return ParseAs(one.command, *habit, arguments);
+    }
+    if (auto word = FindCommand(arguments)) {
+        if (word->syntax == nullptr) throw NoCommand(arguments[word->index]);
+        const Command command = word->syntax->command;
+        const auto behind = arguments.subspan(word->index + 1);
+        if (const auto habit = HabitOf(command)) {
+            return ParseAs(command, *habit, behind, *std::move(word));
+        }
+    }
+
     Options options;
     CLI::App app(
         "Shows and changes the Mac and SMB metadata of files: named attributes, resource "
@@ -294,8 +337,6 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
         ->allow_extra_args(false)
         ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
 
-    const std::span<const char* const> arguments(argv + 1, argv + std::max(argc, 1));
-    if (const auto word = UnknownCommand(arguments)) throw NoCommand(*word);
     for (const Syntax& syntax : kCommands) {
         CLI::App* const sub = app.add_subcommand(syntax.name, syntax.what);
         sub->callback([&options, &syntax] { options.command = syntax.command; });
@@ -324,9 +365,6 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
     options.apple_double = Unguarded(std::move(options.apple_double));
     options.destination = Unguarded(std::move(options.destination));
     options.to = Unguarded(std::move(options.to));
-    if (options.target_directory) {
-        options.target_directory = Unguarded(*std::move(options.target_directory));
-    }
     if (options.value) options.value = Unguarded(*std::move(options.value));
     if (options.file) options.file = Unguarded(*std::move(options.file));
     return options;

@@ -7,7 +7,7 @@
 #include <variant>
 #include <vector>
 
-#include "tools/say/job.h"
+#include "tools/move/options.h"
 
 namespace mavoea::tool {
 
@@ -23,6 +23,7 @@ enum class Command {
     kCopy,
     kMove,
     kDelete,
+    kCarry,
     kUpgrade,
     kRepair,
     kClean,
@@ -40,24 +41,26 @@ struct Options {
     std::string apple_double;  // import
     bool details = false;      // list -l
     bool recursive = false;
-    bool yes = false;                             // clean: what is listed is removed
-    bool all = false;                             // clean: things of other services, too
-    std::string to;                               // convert: the destination's volume type
-    std::string destination;                      // convert
-    bool compare_only = false;                    // convert
-    Consent consent = Consent::kUsual;            // cp, mv, rm: the last of -i, -f and -n
-    bool verbose = false;                         // cp, mv, rm
-    std::optional<std::string> target_directory;  // cp, mv
-    bool no_target_directory = false;             // cp, mv
-    bool allow_loss = false;                      // cp, mv, convert
-    bool record = false;                          // dump: the record of an object
-    bool hex = false;                             // get, set
-    std::optional<std::string> value;             // set: none of the two means standard input
+    bool yes = false;                  // clean: what is listed is removed
+    int wait = 2;                      // clean: seconds between its two looks
+    bool all = false;                  // clean: things of other services, too
+    std::string to;                    // convert: the destination's volume type
+    std::string destination;           // convert, carry
+    bool compare_only = false;         // convert
+    bool verbose = false;              // carry
+    bool allow_loss = false;           // convert
+    bool record = false;               // dump: the record of an object
+    bool hex = false;                  // get, set
+    std::optional<std::string> value;  // set: none of the two means standard input
     std::optional<std::string> file;
+
+    CopyOptions copy;      // cp, mv
+    RemoveOptions remove;  // rm
 };
 
 // What to do, or the exit status when everything has been said: help, version, or what is wrong
-// with the command line. Throws Failure for a command that is none.
+// with the command line. A program that is called cp, mv or rm is that command. Throws Failure for
+// a command that is none.
 std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv);
 
 }  // namespace mavoea::tool

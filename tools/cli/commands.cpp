@@ -9,6 +9,7 @@
 #include "tools/care/clean.h"
 #include "tools/care/repair.h"
 #include "tools/care/upgrade.h"
+#include "tools/move/carry.h"
 #include "tools/move/convert.h"
 #include "tools/move/copy.h"
 #include "tools/move/delete.h"
@@ -24,6 +25,7 @@
 #include "tools/store/change.h"
 #include "tools/store/layout.h"
 #include "tools/store/record.h"
+#include "tools/transfer/pending.h"
 #include "tools/walk/tree.h"
 
 namespace mavoea::tool {
@@ -68,6 +70,7 @@ Bytes ValueToSet(const Options& options) {
 
 // Opens what is to be changed; what an earlier version kept comes along.
 std::unique_ptr<Changer> OpenToChange(const Object& object) {
+    SettleNamed(object);
     auto changer = OpenChanger(object);
     Notes notes;
     AdoptForChange(object, &notes);
@@ -112,7 +115,7 @@ ExitStatus Lock(const Options& options, bool locked) {
     ExitStatus status = kSuccess;
     Json json = Json::Array();
     const auto fail = [&](const Failure& failure) {
-        Report(failure.what());
+        Report(failure);
         status = std::max(status, failure.status());
     };
     const auto work = [&](const Object& object, const std::string&) {
@@ -128,9 +131,10 @@ ExitStatus Lock(const Options& options, bool locked) {
         return true;
     };
     VisitObjects(options.paths, options.recursive,
-                 {.work = work, .on_failure = [&](const std::string&, const Failure& failure) {
-                      fail(failure);
-                  }});
+                 {.work = work,
+                  .on_failure = [&](const std::string&, const Failure& failure) { fail(failure); },
+                  .on_named = SettleNamed,
+                  .on_directory = [](const DirectoryRef& inside) { (void)SettlePending(inside); }});
     if (options.json) Print(json);
     return status;
 }
@@ -194,10 +198,6 @@ ExitStatus Run(const Options& options) {
     RequireVolumeTable();
     for (const std::string& volume : options.volumes) DeclareVolume(volume);
     const TreeOptions tree = {options.paths, options.recursive, options.json};
-    const JobOptions job = {options.paths, options.recursive, options.consent, options.verbose,
-                            options.json};
-    const CopyOptions copy = {job, options.target_directory, options.no_target_directory,
-                              options.allow_loss};
     switch (options.command) {
         case Command::kWhere:
             return Where(options.paths.front(), options.json);
@@ -219,11 +219,14 @@ ExitStatus Run(const Options& options) {
         case Command::kImport:
             return Import(options.apple_double, options.paths.front(), options.json);
         case Command::kCopy:
-            return Copy(copy);
+            return Copy(options.copy);
         case Command::kMove:
-            return Move(copy);
+            return Move(options.copy);
         case Command::kDelete:
-            return Delete(job);
+            return Delete(options.remove);
+        case Command::kCarry:
+            return Carry({{options.paths, options.recursive, options.verbose, options.json},
+                          options.destination});
         case Command::kUpgrade:
             return Upgrade(tree);
         case Command::kRepair:
@@ -233,6 +236,7 @@ ExitStatus Run(const Options& options) {
                           .recursive = options.recursive,
                           .remove = options.yes,
                           .others = options.all,
+                          .wait = options.wait,
                           .json = options.json});
         case Command::kConvert:
             return Convert({.source = options.paths.front(),

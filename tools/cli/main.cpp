@@ -34,8 +34,8 @@ int RunAndReport(int argc, char** argv) {
         throw Failure(kFailed, "standard output", "it could not be written",
                       "free some space, or write it elsewhere");
     } catch (const Failure& failure) {
-        Report(failure.what());
-        return failure.status();
+        Report(failure);
+        return SpeaksAsAnother() ? kRefused : failure.status();
     } catch (const std::bad_alloc&) {
         Report("out of memory; use smaller values");
     } catch (const std::exception& failure) {

@@ -26,26 +26,30 @@ struct Pair {
     Place to;
 };
 
-class Conversion {
+class Conversion final : private TreeCopy {
  public:
     Conversion(const ConvertOptions& options, Pair top)
         : options_(options),
           top_(std::move(top)),
-          progress_(options.compare_only ? "comparing" : "converting") {}
+          progress_(options.compare_only ? "comparing" : "converting"),
+          transfer_({.watch = {.on_bytes = [this](std::uint64_t) { Show(in_hand_); },
+                               .give_up = InterruptedAgain},
+                     .on_note = [this](const std::string& note) { notes_.push_back(note); }}) {}
+
+    // What was not there before has been read back as it was written: it needs no second look.
+    void CopyAndCompare() {
+        const bool is_new = !top_.to.Status();
+        Copy();
+        if (is_new && failures_.empty()) {
+            compared_ = converted_;
+        } else {
+            Compare();
+        }
+    }
 
     void Copy() {
-        Transfer transfer({.on_bytes = [this](std::uint64_t) { Show(in_hand_); },
-                           .give_up = InterruptedAgain,
-                           .on_note = [this](const std::string& note) { notes_.push_back(note); }});
-        const TreeCopyHooks hooks = {
-            .stopped = [] { return Interrupted() != 0; },
-            .on_begin = [this](const Place& from) { Show(from.path()); },
-            .on_done = [this](const Place&, const Place&) { ++converted_; },
-            .on_failure = [this](const std::string& path,
-                                 const Failure& failure) { AddFailure(path, failure); },
-            .recursive = options_.recursive};
-        CopyTree(&transfer, top_.from, top_.to, hooks);
-        Try(top_.to.path(), [&] { transfer.MakeDurable(); });
+        CopyTree(top_.from, top_.to);
+        Try(top_.to.path(), [&] { transfer_.MakeDurable(); });
     }
 
     void Compare() {
@@ -79,6 +83,32 @@ class Conversion {
     }
 
  private:
+    bool Stopped() const override { return Interrupted() != 0; }
+
+    void Begin(const Place& from, const Place& to, Level* level) override {
+        Show(from.path());
+        const struct stat info = StatusOf(from);
+        if (!S_ISDIR(info.st_mode)) {
+            transfer_.CopyObject(from, to, Links::kSeveral);
+            ++converted_;
+            return;
+        }
+        level->inside = from.Open();
+        level->info = info;
+        level->is_new = !to.Status();
+        level->made = transfer_.MakeDirectory(from, to);
+        if (options_.recursive) level->entries = ObjectsIn(level->inside);
+    }
+
+    void Finish(const Level& level) override {
+        transfer_.FinishDirectory(level.from, *level.inside, level.to, level.made, level.is_new);
+        ++converted_;
+    }
+
+    void Fail(const Place& from, const Failure& failure) override {
+        AddFailure(from.path(), failure);
+    }
+
     void CompareObject(const Pair& pair, std::vector<Pair>* pairs) {
         const auto info = pair.from.Status();
         if (!info) throw SystemFailure(pair.from.path(), ENOENT);
@@ -153,6 +183,7 @@ class Conversion {
     const ConvertOptions& options_;
     Pair top_;
     Progress progress_;
+    Transfer transfer_;
     std::string in_hand_;
     std::uint64_t converted_ = 0;
     std::uint64_t compared_ = 0;
@@ -187,7 +218,7 @@ ExitStatus Convert(const ConvertOptions& options) {
     }
     // The destination's type must not say anything of the source.
     (void)DeclareType(options.destination, options.type, "--to " + options.type);
-    const Place destination = PlaceOf(options.destination);
+    const Place destination = PlaceOf(options.destination, Shown::kWhole);
     const auto real_source = RealPath(source.place);
     const auto real_destination = RealPath(destination);
     if (IsWithin(real_destination, real_source) || IsWithin(real_source, real_destination)) {
@@ -203,8 +234,11 @@ ExitStatus Convert(const ConvertOptions& options) {
 
     WatchForInterrupts();
     Conversion conversion(options, {source.place, destination});
-    if (!options.compare_only) conversion.Copy();
-    conversion.Compare();
+    if (options.compare_only) {
+        conversion.Compare();
+    } else {
+        conversion.CopyAndCompare();
+    }
     return conversion.Summarize();
 }
 

@@ -1,136 +1,212 @@
 #include "tools/move/delete.h"
 
+#include <fcntl.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
-#include <vector>
+#include <cerrno>
+#include <string>
 
+#include "tools/move/ends.h"
 #include "tools/place/volume.h"
-#include "tools/say/text.h"
+#include "tools/say/job.h"
+#include "tools/say/output.h"
 #include "tools/transfer/removal.h"
-#include "tools/transfer/tree_copy.h"
 
 namespace mavoea::tool {
 namespace {
 
-bool Always(const struct stat&) { return true; }
-
-std::string LastName(std::string path) {
-    while (path.size() > 1 && path.back() == '/') path.pop_back();
-    return path.substr(path.rfind('/') + 1);
+// With one slash at its end where there were more.
+std::string WithOneSlash(std::string path) {
+    while (path.size() > 2 && path.ends_with("//")) path.pop_back();
+    return path;
 }
 
-class Deletion {
+// What a path leads to that somebody named.
+struct Named {
+    Place place;
+    struct stat info;
+    bool behind_link = false;  // it has a slash at its end, and would be a link without
+};
+
+// Throws SystemFailure.
+Named FindNamed(const std::string& path) {
+    if (path.empty()) throw SystemFailure(path, ENOENT);
+    struct stat own;
+    std::string bare = path;
+    while (bare.size() > 1 && bare.back() == '/') bare.pop_back();
+    const bool directory_only = bare.size() < path.size();
+    const bool link = directory_only && ::lstat(bare.c_str(), &own) == 0 && S_ISLNK(own.st_mode);
+    Named named;
+    try {
+        named.place = PlaceOf(path, Shown::kAsGiven);
+    } catch (const SystemFailure& failure) {
+        throw SystemFailure(path, link ? ENOTDIR : failure.error());
+    }
+    const Directory& directory = *named.place.directory;
+    if (::fstatat(directory.fd(), named.place.name.c_str(), &named.info, AT_SYMLINK_NOFOLLOW) !=
+        0) {
+        throw SystemFailure(path, errno);
+    }
+    if (directory_only && !S_ISDIR(named.info.st_mode)) throw SystemFailure(path, ENOTDIR);
+    named.place.shown = WithOneSlash(path);
+    named.behind_link = link;
+    return named;
+}
+
+class Deletion final : private TreeRemoval {
  public:
-    explicit Deletion(const JobOptions& options)
-        : options_(options), job_("removing", "removed", options) {}
+    explicit Deletion(const RemoveOptions& options)
+        : options_(options), job_("removing", "removed", options.job) {
+        const bool terminal = options.presumes_terminal || ::isatty(STDIN_FILENO) == 1;
+        asks_always_ = options.ask == AskToRemove::kAlways;
+        asks_if_protected_ = asks_always_ || (options.ask != AskToRemove::kNever && terminal);
+    }
 
     ExitStatus Run() {
-        if (options_.recursive) RequireDescriptorPaths();
-        for (const std::string& path : options_.paths) {
+        if (options_.job.recursive) RequireDescriptorPaths();
+        if (options_.ask == AskToRemove::kOnce && !AgreesToAll()) return job_.Finish();
+        for (const std::string& path : options_.job.paths) {
             if (job_.stopped()) break;
-            Guard(path, [&] { DeleteNamed(path); });
-            while (!levels_.empty()) GoOn();
+            RemoveNamed(path);
         }
+        Tidy();
         return job_.Finish();
     }
 
  private:
-    // A directory that is being emptied.
-    struct Level {
-        Object object;
-        DirectoryRef inside;
-        std::vector<Directory::Entry> entries;
-        std::uint64_t left;  // failed or skipped before
-        std::size_t next = 0;
-    };
+    // ---- What was named -------------------------------------------------------------------------
 
-    template <class Work>
-    void Guard(const std::string& path, Work work) {
+    bool AgreesToAll() {
+        constexpr std::size_t kMany = 3;
+        const std::size_t count = options_.job.paths.size();
+        const bool recursive = options_.job.recursive;
+        if (count == 0 || (!recursive && count <= kMany)) return true;
+        return job_.Ask("remove " + std::to_string(count) +
+                        (count == 1 ? " argument" : " arguments") +
+                        (recursive ? " recursively?" : "?"));
+    }
+
+    void RemoveNamed(const std::string& path) {
         try {
-            work();
+            Named named = FindNamed(path);
+            behind_link_ = named.behind_link;
+            if (S_ISDIR(named.info.st_mode)) RequireRemovable(path, named);
+            // What has been listed there stays known.
+            DirectoryRef& directory = named.place.directory;
+            if (IsLikeLast(*directory)) directory = last_;
+            last_ = directory;
+            RemoveTree(named.place, named.info);
+        } catch (const SystemFailure& failure) {
+            const int error = failure.error();
+            if (options_.force && (error == ENOENT || error == ENOTDIR)) return;
+            Fail(path, Refusal("cannot remove " + Quoted(path), error));
         } catch (const Failure& failure) {
-            // Nothing is wrong with what has gone meanwhile, or with -f was never there.
-            const bool gone = failure.status() == kNotFound && failure.subject() == path;
-            if (gone && (options_.consent == Consent::kForce || !levels_.empty())) return;
-            job_.AddFailure(path, failure);
+            Fail(path, failure);
         }
     }
 
-    void DeleteNamed(const std::string& path) {
+    void RequireRemovable(const std::string& path, const Named& named) {
+        const bool recursive = options_.job.recursive;
+        if (!recursive && !options_.directories) throw SystemFailure(path, EISDIR);
         const std::string last = LastName(path);
         if (last == "." || last == "..") {
-            throw Failure(kFailed, path, "the directories \".\" and \"..\" are not removed",
-                          "name it from the directory above it");
+            throw Refusal(
+                "refusing to remove '.' or '..' directory: skipping " + Quoted(named.place.path()),
+                "name it from the directory above it");
         }
-        const Object object = FindObject(path);
-        if (object.is_root()) {
-            throw Failure(kFailed, path, "the root is not removed", "name something below it");
+        struct stat root;
+        if (recursive && options_.preserve_root && ::stat("/", &root) == 0 &&
+            SameFile(root, named.info)) {
+            const std::string name = named.place.path();
+            throw TwoLines("it is dangerous to operate recursively on " + Quoted(name) +
+                               (name == "/" ? "" : " (same as '/')"),
+                           "use --no-preserve-root to override this failsafe");
         }
-        const auto info = object.place.Status();
-        if (info && S_ISDIR(info->st_mode) && !options_.recursive) {
-            throw Failure(kFailed, path, "it is a directory", "use -r");
+        if (recursive && options_.preserve_mounts &&
+            named.place.directory->Status().st_dev != named.info.st_dev) {
+            throw TwoLines(OnAnotherDevice(named.place), "and --preserve-root=all is in effect");
         }
-        Begin(object);
     }
 
-    void Begin(const Object& object) {
-        const std::string path = object.path();
-        const auto info = object.place.Status();
-        if (!info) throw SystemFailure(path, ENOENT);
-        if (!S_ISDIR(info->st_mode)) {
-            const std::string what = std::string("remove ") + NameOfType(info->st_mode) + ' ';
-            if (!job_.MayBeLost(object.place.Writable(), what + Quoted(path) + '?')) return Skip();
-            if (job_.stopped()) return;
-            RemoveObject(object, levels_.empty(), Always);
-            job_.AddDone(path, "removed " + Quoted(path));
-            return;
-        }
-        const DirectoryRef inside = object.place.directory->OpenIn(object.place.name);
-        if (options_.consent == Consent::kAsk && !inside->Entries().empty() &&
-            !job_.Ask("descend into directory " + Quoted(path) + '?')) {
-            return Skip();
-        }
-        levels_.push_back({object, inside, ObjectsIn(inside), job_.failures() + job_.skipped()});
+    static std::string OnAnotherDevice(const Place& place) {
+        return "skipping " + Quoted(place.path()) + ", since it's on a different device";
     }
 
-    // The next of what is in the innermost directory, or that directory itself.
-    void GoOn() {
-        Level& level = levels_.back();
-        if (job_.stopped()) return levels_.clear();
-        if (level.next < level.entries.size()) {
-            const Place place = {level.inside, level.entries[level.next++].name};
-            const std::string path = place.path();
-            return Guard(path, [&] {
-                const auto info = place.Status();
-                if (info) Begin(ObjectAt(place, &*info));
-            });
-        }
-        const Level done = std::move(level);
-        levels_.pop_back();
-        if (job_.failures() + job_.skipped() > done.left) return;
-        const std::string path = done.object.path();
-        if (options_.consent == Consent::kAsk &&
-            !job_.Ask("remove directory " + Quoted(path) + '?')) {
-            return Skip();
-        }
-        if (job_.stopped()) return levels_.clear();
-        Guard(path, [&] {
-            RemoveEmptyDirectory(done.object, levels_.empty(), Always);
-            job_.AddDone(path, "removed directory " + Quoted(path));
-        });
+    bool IsLikeLast(const Directory& directory) const {
+        return last_ && last_->path() == directory.path() &&
+               last_->location() == directory.location() &&
+               SameFile(last_->Status(), directory.Status());
     }
 
-    void Skip() {
+    // ---- Each object ----------------------------------------------------------------------------
+
+    bool Stopped() const override { return job_.stopped(); }
+    bool MayBeGone() const override { return options_.force || !at_top(); }
+
+    void Fail(const std::string& path, const Failure& failure) override {
+        job_.AddFailure(path, failure);
+        if (dynamic_cast<const TwoLines*>(&failure) != nullptr && SpeaksAsAnother()) {
+            Report(static_cast<const TwoLines&>(failure).second());
+        }
+    }
+
+    void Removed(const Place& place, mode_t type) override {
+        job_.AddDone();
+        if (!options_.job.verbose) return;
+        job_.Say((S_ISDIR(type) ? "removed directory " : "removed ") + Quoted(place.path()));
+    }
+
+    Answer MayEnter(const Place& place, const struct stat& info, bool empty) override {
+        if (at_top()) device_ = info.st_dev;
+        if (options_.one_file_system && info.st_dev != device_) {
+            throw Refusal(OnAnotherDevice(place), "leave out --one-file-system");
+        }
+        if (empty) return MayRemove(place, S_IFDIR);
+        if (!options_.job.recursive) throw SystemFailure(place.path(), ENOTEMPTY);
+        return Ask("descend into ", place, S_IFDIR);
+    }
+
+    Answer MayRemove(const Place& place, mode_t type) override {
+        if (Ask("remove ", place, type) == Answer::kNo) return Answer::kNo;
+        if (!at_top() || !behind_link_) return Answer::kYes;
+        if (options_.force) return Answer::kNo;
+        throw SystemFailure(place.path(), ENOTDIR);
+    }
+
+    Answer Ask(const char* what, const Place& place, mode_t type) {
+        const bool is_protected = asks_if_protected_ && !place.Writable();
+        if (!asks_always_ && !is_protected) return Answer::kYes;
+        const std::string name = S_ISDIR(type) ? "directory" : NameOfType(StatusOf(place));
+        const std::string object =
+            (is_protected ? "write-protected " : "") + name + ' ' + Quoted(place.path());
+        if (job_.Ask(what + object + '?')) return Answer::kYes;
         if (!job_.stopped()) job_.AddSkipped();
+        return Answer::kNo;
     }
 
-    const JobOptions& options_;
+    // A refusal that rm says in two lines.
+    class TwoLines : public Refusal {
+     public:
+        TwoLines(const std::string& first, const std::string& second)
+            : Refusal(first, second), second_(second) {}
+        const std::string& second() const { return second_; }
+
+     private:
+        std::string second_;
+    };
+
+    const RemoveOptions& options_;
     Job job_;
-    std::vector<Level> levels_;
+    bool asks_always_;
+    bool asks_if_protected_;
+    DirectoryRef last_;         // in which something was named
+    bool behind_link_ = false;  // what is in hand
+    dev_t device_ = 0;          // of what was named
 };
 
 }  // namespace
 
-ExitStatus Delete(const JobOptions& options) { return Deletion(options).Run(); }
+ExitStatus Delete(const RemoveOptions& options) { return Deletion(options).Run(); }
 
 }  // namespace mavoea::tool

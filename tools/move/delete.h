@@ -2,11 +2,11 @@
 #ifndef MAVOEA_TOOLS_MOVE_DELETE_H_
 #define MAVOEA_TOOLS_MOVE_DELETE_H_
 
-#include "tools/say/job.h"
+#include "tools/move/options.h"
 
 namespace mavoea::tool {
 
-ExitStatus Delete(const JobOptions& options);
+ExitStatus Delete(const RemoveOptions& options);
 
 }  // namespace mavoea::tool
 

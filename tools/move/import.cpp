@@ -14,6 +14,7 @@
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
+#include "tools/transfer/pending.h"
 
 namespace mavoea::tool {
 namespace {
@@ -164,7 +165,8 @@ class ObjectImport {
             }
             for (const Missing& one : missing) Miss(one.item, one.reason);
             if (fitting.entries.empty()) return;
-            const Written written = writer.Write(object_, fitting, {.old = Old::kKept});
+            const Written written =
+                writer.Write(object_, *Inode::Open(object_.place), fitting, {.old = Old::kKept});
             for (const Missing& one : written.missing) Miss(one.item, one.reason);
             const Metadata found = ReadMetadata(object_, Sidecars::Services::kFind);
             for (const Missing& one : WhatIsMissing(fitting, found)) Miss(one.item, one.reason);
@@ -230,7 +232,7 @@ Json ImportJson(const std::string& source, const std::string& path, const Metada
 
 // A link at the end of its path is not followed: others may have put it there.
 std::shared_ptr<const File> OpenSource(const std::string& path) {
-    const Place place = PlaceOf(path);
+    const Place place = PlaceOf(path, Shown::kWhole);
     if (auto file = place.directory->FindFile(place.name, O_RDONLY)) return file;
     throw SystemFailure(path, ENOENT);
 }
@@ -239,6 +241,7 @@ std::shared_ptr<const File> OpenSource(const std::string& path) {
 
 ExitStatus Import(const std::string& apple_double, const std::string& path, bool json) {
     const Object object = FindObject(path);
+    SettleNamed(object);
     ObjectImport import(object);
     Metadata metadata = ReadAppleDoubleFile(OpenSource(apple_double));
     SortOut(&metadata);

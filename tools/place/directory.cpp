@@ -2,13 +2,17 @@
 
 #include <dirent.h>
 #include <fcntl.h>
+#include <sys/file.h>
+#include <sys/random.h>
 #include <sys/xattr.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
+#include <climits>
+#include <ctime>
 #include <memory>
-#include <random>
 #include <string_view>
 
 #include "tools/say/messages.h"
@@ -22,74 +26,185 @@ Failure NotThis(const std::string& path, const char* what) {
     return {kFailed, path, what, "see who put it there, and move it away"};
 }
 
+// The lock of a file that one process at a time works on. Nobody waits for it; where there are no
+// such locks, everybody has it.
+bool TryToLock(int fd) { return ::flock(fd, LOCK_EX | LOCK_NB) == 0 || errno != EWOULDBLOCK; }
+
+constexpr std::string_view kLetters = "abcdefghijklmnopqrstuvwxyz0123456789";
+constexpr std::size_t kLetterCount = 8;
+
+bool IsAscii(const std::string& name) {
+    return std::all_of(name.begin(), name.end(),
+                       [](char c) { return static_cast<unsigned char>(c) < 0x80; });
+}
+
+std::string OtherCase(std::string name) {
+    for (char& c : name) {
+        const bool letter = (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z');
+        if (letter) c = static_cast<char>(c ^ ('a' ^ 'A'));
+    }
+    return name;
+}
+
+// The first of the sorted entries that does not come before that name.
+auto FirstFrom(const std::vector<Directory::Entry>& entries, const std::string& name) {
+    return std::lower_bound(entries.begin(), entries.end(), name,
+                            [](const Directory::Entry& entry, const std::string& wanted) {
+                                return entry.name < wanted;
+                            });
+}
+
 std::string ProcPathOf(int fd) { return "/proc/self/fd/" + std::to_string(fd); }
+
+void AddTo(std::string* path, const std::string& name) {
+    if (name == ".") return;
+    if (!path->empty() && path->back() != '/') path->push_back('/');
+    *path += name;
+}
 
 }  // namespace
 
 // ---- Directory ----------------------------------------------------------------------------------
 
-DirectoryRef Directory::Open(const std::string& path, const std::string& shown) {
-    File file(::open(path.c_str(), kFlags), shown);
-    if (file.fd() < 0) throw SystemFailure(shown, errno);
-    return DirectoryRef(new Directory(std::move(file)));
+DirectoryRef Directory::Open(const std::string& path, const std::string& shown,
+                             const std::string& location) {
+    const int fd = ::open(path.c_str(), kFlags);
+    if (fd < 0) throw SystemFailure(path, errno);
+    const Names names = {nullptr, {}, shown, std::make_shared<const std::string>(location)};
+    return DirectoryRef(new Directory(fd, std::make_shared<Names>(names)));
 }
 
-DirectoryRef Directory::FindIn(const std::string& name) const {
-    File file(::openat(fd(), name.c_str(), kFlags | O_NOFOLLOW), PathOf(name));
-    if (file.fd() >= 0) return DirectoryRef(new Directory(std::move(file)));
+// One after the other: those of a deep tree would take the whole stack.
+Directory::Names::~Names() {
+    std::shared_ptr<Names> next = std::move(above);
+    while (next && next.use_count() == 1) next = std::shared_ptr<Names>(std::move(next->above));
+}
+
+std::shared_ptr<Directory::Names> Directory::NamesOf(const std::string& name,
+                                                     const std::string& shown) const {
+    const bool has_location = HasLocation(name);
+    const Names names = {
+        names_, name, shown,
+        has_location ? std::make_shared<const std::string>(LocationOf(name)) : names_->location,
+        has_location};
+    return std::make_shared<Names>(names);
+}
+
+DirectoryRef Directory::FindIn(const std::string& name) const { return FindIn(name, {}); }
+
+DirectoryRef Directory::FindIn(const std::string& name, const std::string& shown) const {
+    const int fd = ::openat(this->fd(), name.c_str(), kFlags | O_NOFOLLOW);
+    if (fd >= 0) return DirectoryRef(new Directory(fd, NamesOf(name, shown)));
     const int error = errno;
     if (error == ENOENT) return nullptr;
     const auto info = error == ENOTDIR || error == ELOOP ? StatusOf(name) : std::nullopt;
+    const std::string path = shown.empty() ? PathOf(name) : shown;
     if (info && S_ISLNK(info->st_mode)) {
-        throw NotThis(PathOf(name), "a symbolic link in the place of a directory");
+        throw NotThis(path, "a symbolic link in the place of a directory");
     }
-    throw SystemFailure(PathOf(name), error);
+    throw SystemFailure(path, error);
 }
 
-DirectoryRef Directory::OpenIn(const std::string& name) const {
-    if (DirectoryRef found = FindIn(name)) return found;
-    throw SystemFailure(PathOf(name), ENOENT);
+DirectoryRef Directory::OpenIn(const std::string& name) const { return OpenIn(name, {}); }
+
+DirectoryRef Directory::OpenIn(const std::string& name, const std::string& shown) const {
+    if (DirectoryRef found = FindIn(name, shown)) return found;
+    throw SystemFailure(shown.empty() ? PathOf(name) : shown, ENOENT);
+}
+
+DirectoryRef Directory::OpenAbove(const struct stat& former) const {
+    const int fd = ::openat(this->fd(), "..", kFlags);
+    if (fd < 0) throw SystemFailure(path(), errno);
+    DirectoryRef above(new Directory(fd, names_->above));
+    if (SameFile(above->Status(), former)) return above;
+    throw Failure(kFailed, path(), "it has been moved into another directory meanwhile",
+                  "give the command again");
 }
 
 DirectoryRef Directory::FindAgain(const std::string& name) const {
-    if (kept_ && kept_->path() == PathOf(name)) {
+    if (kept_ && kept_->names_->name == name) {
+        if (listed()) return kept_;
         const auto info = StatusOf(name);
         if (info && SameFile(*info, kept_->Status())) return kept_;
     }
-    return kept_ = FindIn(name);
+    return kept_ = MayHave(name) ? FindIn(name) : nullptr;
 }
 
-DirectoryRef Directory::MakeIn(const std::string& name) const {
-    if (::mkdirat(fd(), name.c_str(), S_IRWXU) != 0) throw SystemFailure(PathOf(name), errno);
+void Directory::Forget(const std::string& name) const {
+    if (kept_ && kept_->names_->name == name) kept_ = nullptr;
+}
+
+DirectoryRef Directory::LockIn(const std::string& name, bool* busy) const {
+    constexpr int kLockFlags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
+    const int fd = ::openat(this->fd(), name.c_str(), kLockFlags);
+    if (fd < 0) {
+        if (errno == ENOENT) return nullptr;
+        throw SystemFailure(PathOf(name), errno);
+    }
+    DirectoryRef directory(new Directory(fd, NamesOf(name, {})));
+    if (TryToLock(fd)) return directory;
+    *busy = true;
+    return nullptr;
+}
+
+DirectoryRef Directory::MakeIn(const std::string& name, mode_t mode) const {
+    constexpr mode_t kRights = S_IRWXU | S_IRWXG | S_IRWXO;
+    if (::mkdirat(fd(), name.c_str(), mode) != 0) throw SystemFailure(PathOf(name), errno);
     DirectoryRef made = OpenIn(name);
     // Whoever may write here may have put another one in its place, which is not to be changed.
     const struct stat info = made->Status();
-    if (info.st_uid != ::geteuid() || (info.st_mode & 0077) != 0) {
+    if (info.st_uid != ::geteuid() || (info.st_mode & kRights & ~mode) != 0) {
         throw NotThis(made->path(), "another directory has come where one was just made");
     }
+    made->first_ = std::make_unique<std::vector<Entry>>();
+    NoteCome(name);
     return made;
 }
 
 std::string Directory::PathOf(const std::string& name) const {
-    if (name == ".") return path();
-    return path() == "/" ? '/' + name : path() + '/' + name;
+    std::vector<const std::string*> below = {&name};
+    const Names* names = names_.get();
+    for (; names->above && names->shown.empty(); names = names->above.get()) {
+        below.push_back(&names->name);
+    }
+    std::string path = names->shown;
+    for (auto one = below.rbegin(); one != below.rend(); ++one) AddTo(&path, **one);
+    return path;
+}
+
+std::string Directory::LocationOf(const std::string& name) const {
+    std::string location = *names_->location;
+    if (HasLocation(name)) AddTo(&location, name);
+    return location;
+}
+
+bool Directory::HasLocation(const std::string& name) const {
+    return names_->has_location && names_->location->size() + 1 + name.size() < PATH_MAX;
+}
+
+struct stat Directory::Status() const {
+    struct stat info;
+    if (::fstat(fd(), &info) != 0) throw SystemFailure(path(), errno);
+    return info;
 }
 
 std::string Directory::ProcPath() const { return ProcPathOf(fd()); }
 std::string Directory::ProcPath(const std::string& name) const { return ProcPath() + '/' + name; }
 
-File Directory::Reopened() const {
-    File file(OpenQuietly(fd(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC), path());
-    if (file.fd() < 0) throw SystemFailure(path(), errno);
-    return file;
+int Directory::OpenToRead() const {
+    const int own = OpenQuietly(fd(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    if (own < 0) throw SystemFailure(path(), errno);
+    return own;
 }
 
+File Directory::Reopened() const { return {OpenToRead(), path()}; }
+
 std::vector<Directory::Entry> Directory::Entries() const {
-    const int own = ::fcntl(Reopened().fd(), F_DUPFD_CLOEXEC, 0);
-    const std::unique_ptr<DIR, int (*)(DIR*)> dir(own < 0 ? nullptr : ::fdopendir(own), ::closedir);
+    const int own = OpenToRead();
+    const std::unique_ptr<DIR, int (*)(DIR*)> dir(::fdopendir(own), ::closedir);
     if (!dir) {
         const int error = errno;
-        if (own >= 0) ::close(own);
+        ::close(own);
         throw SystemFailure(path(), error);
     }
     std::vector<Entry> entries;
@@ -118,11 +233,77 @@ const std::vector<Directory::Entry>& Directory::EntriesAtFirst() const {
     return *first_;
 }
 
+std::vector<std::string> Directory::NamesAtFirst(const std::string& prefix) const {
+    std::set<std::string> names;
+    const std::vector<Entry>& all = EntriesAtFirst();
+    for (auto entry = FirstFrom(all, prefix); entry != all.end() && entry->name.starts_with(prefix);
+         ++entry) {
+        names.insert(entry->name);
+    }
+    for (auto name = later_.lower_bound(prefix); name != later_.end() && name->starts_with(prefix);
+         ++name) {
+        names.insert(*name);
+    }
+    return {names.begin(), names.end()};
+}
+
+bool Directory::MayHave(const std::string& name) const { return ListTells(name).value_or(true); }
+
+bool Directory::HadAtFirst(const std::string& name) const {
+    const auto tells = ListTells(name);
+    return tells ? *tells : Has(name);
+}
+
+// None where there is no list, and for what could be there under a name that is listed otherwise:
+// in other letters, or another form of the same ones.
+std::optional<bool> Directory::ListTells(const std::string& name) const {
+    if (!listed()) return std::nullopt;
+    if (Lists(name)) return true;
+    if (first_->empty() && later_.empty()) return false;
+    if (IsAscii(name) && (OtherCase(name) == name || TellsCasesApart())) return false;
+    return std::nullopt;
+}
+
+bool Directory::Lists(const std::string& name) const {
+    const auto found = FirstFrom(*first_, name);
+    return (found != first_->end() && found->name == name) || later_.contains(name);
+}
+
+// Found out once, by a name that is there, in the other case.
+bool Directory::TellsCasesApart() const {
+    if (tells_cases_apart_) return *tells_cases_apart_;
+    const auto try_name = [this](const std::string& name) {
+        const std::string other = OtherCase(name);
+        if (!IsAscii(name) || Lists(other) || !Has(name)) return false;
+        tells_cases_apart_ = !Has(other);
+        return true;
+    };
+    const bool tried = std::any_of(first_->begin(), first_->end(),
+                                   [&](const Entry& entry) { return try_name(entry.name); }) ||
+                       std::any_of(later_.begin(), later_.end(), try_name);
+    if (!tried) tells_cases_apart_ = false;  // nobody can tell
+    return *tells_cases_apart_;
+}
+
+void Directory::NoteCome(const std::string& name) const {
+    if (listed() && !Lists(name)) later_.insert(name);
+}
+
 std::optional<struct stat> Directory::StatusOf(const std::string& name) const {
     struct stat info;
     if (::fstatat(fd(), name.c_str(), &info, AT_SYMLINK_NOFOLLOW) == 0) return info;
     if (errno == ENOENT || errno == ENAMETOOLONG) return std::nullopt;
     throw SystemFailure(PathOf(name), errno);
+}
+
+std::string Directory::NameOf(const struct stat& info, const std::string& name) const {
+    std::string found = name;
+    for (const Entry& entry : Entries()) {
+        if (entry.name == name) return name;
+        const auto other = StatusOf(entry.name);
+        if (other && SameFile(*other, info)) found = entry.name;
+    }
+    return found;
 }
 
 std::shared_ptr<const File> Directory::FindFile(const std::string& name, int flags) const {
@@ -159,15 +340,32 @@ bool Directory::Remove(const std::string& name) const {
 }
 
 bool Directory::RemoveEmpty(const std::string& name) const {
-    if (::unlinkat(fd(), name.c_str(), AT_REMOVEDIR) == 0) return true;
+    if (::unlinkat(fd(), name.c_str(), AT_REMOVEDIR) == 0) {
+        Forget(name);
+        return true;
+    }
     if (errno == ENOENT || errno == ENOTEMPTY || errno == EEXIST) return false;
     throw SystemFailure(PathOf(name), errno);
 }
 
 void Directory::Rename(const std::string& name, const Directory& to,
                        const std::string& new_name) const {
-    if (::renameat(fd(), name.c_str(), to.fd(), new_name.c_str()) == 0) return;
+    if (::renameat(fd(), name.c_str(), to.fd(), new_name.c_str()) == 0) {
+        return to.NoteCome(new_name);
+    }
     throw SystemFailure(PathOf(name), errno);
+}
+
+bool Directory::RenameToNew(const std::string& name, const Directory& to,
+                            const std::string& new_name) const {
+    if (::renameat2(fd(), name.c_str(), to.fd(), new_name.c_str(), RENAME_NOREPLACE) == 0) {
+        return true;
+    }
+    if (errno == EEXIST) return false;
+    if (errno != EINVAL && errno != ENOSYS) throw SystemFailure(PathOf(name), errno);
+    if (to.Has(new_name)) return false;  // a file system that cannot look and rename in one step
+    Rename(name, to, new_name);
+    return true;
 }
 
 void Directory::Sync() const { Reopened().Sync(); }
@@ -177,9 +375,10 @@ void Directory::SyncVolume() const {
 }
 
 bool Place::Writable() const {
+    if (::faccessat(directory->fd(), name.c_str(), W_OK, AT_EACCESS) == 0) return true;
+    if (errno != EACCES) return true;
     const auto info = Status();
-    return !info || S_ISLNK(info->st_mode) ||
-           ::faccessat(directory->fd(), name.c_str(), W_OK, AT_EACCESS) == 0 || errno != EACCES;
+    return !info || S_ISLNK(info->st_mode);
 }
 
 struct stat StatusOf(const Place& place) {
@@ -187,17 +386,29 @@ struct stat StatusOf(const Place& place) {
     throw SystemFailure(place.path(), ENOENT);
 }
 
+std::uint64_t BirthOf(const Place& place) {
+    constexpr std::uint64_t kSecond = 1'000'000'000;
+    struct statx info;
+    if (::statx(place.directory->fd(), place.name.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BTIME,
+                &info) != 0) {
+        if (errno == ENOENT) throw SystemFailure(place.path(), errno);
+        return 0;
+    }
+    if ((info.stx_mask & STATX_BTIME) == 0) return 0;
+    return static_cast<std::uint64_t>(info.stx_btime.tv_sec) * kSecond + info.stx_btime.tv_nsec;
+}
+
 // ---- Inode --------------------------------------------------------------------------------------
 
 std::shared_ptr<const Inode> Inode::Find(const Place& place) {
     constexpr int kInodeFlags = O_PATH | O_NOFOLLOW | O_CLOEXEC;
-    File file(::openat(place.directory->fd(), place.name.c_str(), kInodeFlags), place.path());
-    if (file.fd() < 0) {
+    auto file = std::make_shared<const File>(
+        ::openat(place.directory->fd(), place.name.c_str(), kInodeFlags), place.path());
+    if (file->fd() < 0) {
         if (errno == ENOENT) return nullptr;
-        throw SystemFailure(file.path(), errno);
+        throw SystemFailure(file->path(), errno);
     }
-    const struct stat info = file.Status();
-    return std::shared_ptr<const Inode>(new Inode(std::move(file), info));
+    return std::shared_ptr<const Inode>(new Inode(std::move(file), true));
 }
 
 std::shared_ptr<const Inode> Inode::Open(const Place& place) {
@@ -205,26 +416,34 @@ std::shared_ptr<const Inode> Inode::Open(const Place& place) {
     throw SystemFailure(place.path(), ENOENT);
 }
 
+std::shared_ptr<const Inode> Inode::Of(const std::shared_ptr<const File>& file) {
+    return std::shared_ptr<const Inode>(new Inode(file, false));
+}
+
 std::shared_ptr<const Inode> Inode::Of(const File& file) {
-    File own(::fcntl(file.fd(), F_DUPFD_CLOEXEC, 0), file.path());
-    if (own.fd() < 0) throw SystemFailure(file.path(), errno);
-    const struct stat info = own.Status();
-    return std::shared_ptr<const Inode>(new Inode(std::move(own), info));
+    const auto own =
+        std::make_shared<const File>(::fcntl(file.fd(), F_DUPFD_CLOEXEC, 0), file.path());
+    if (own->fd() < 0) throw SystemFailure(file.path(), errno);
+    return Of(own);
 }
 
 bool Inode::HoldsContents() const { return S_ISREG(info_.st_mode) || S_ISDIR(info_.st_mode); }
 
-std::string Inode::ProcPath() const { return ProcPathOf(file_.fd()); }
+std::string Inode::ProcPath() const { return ProcPathOf(file_->fd()); }
 
 std::vector<std::string> Inode::AttributeNames() const {
-    const std::string at = ProcPath();
-    std::vector<char> list;
-    ssize_t size = ::listxattr(at.c_str(), nullptr, 0);
-    while (size > 0) {
+    constexpr std::size_t kUsual = 1024;
+    const auto read = [this](char* list, std::size_t size) {
+        return by_path_ ? ::listxattr(ProcPath().c_str(), list, size)
+                        : ::flistxattr(file_->fd(), list, size);
+    };
+    std::vector<char> list(kUsual);
+    ssize_t size = read(list.data(), list.size());
+    while (size < 0 && errno == ERANGE) {
+        size = read(nullptr, 0);
+        if (size < 0) break;
         list.resize(static_cast<std::size_t>(size));
-        size = ::listxattr(at.c_str(), list.data(), list.size());
-        if (size >= 0 || errno != ERANGE) break;
-        size = ::listxattr(at.c_str(), nullptr, 0);
+        size = read(list.data(), list.size());
     }
     if (size < 0 && errno != ENOTSUP) throw SystemFailure(path(), errno);
     std::vector<std::string> names;
@@ -237,85 +456,143 @@ std::vector<std::string> Inode::AttributeNames() const {
 
 std::optional<Bytes> Inode::Attribute(const std::string& name) const {
     constexpr std::size_t kUsual = 512;
-    const std::string at = ProcPath();
+    const auto read = [&](void* value, std::size_t size) {
+        return by_path_ ? ::getxattr(ProcPath().c_str(), name.c_str(), value, size)
+                        : ::fgetxattr(file_->fd(), name.c_str(), value, size);
+    };
     Bytes value(kUsual);
     for (;;) {
-        ssize_t size = ::getxattr(at.c_str(), name.c_str(), value.data(), value.size());
+        ssize_t size = read(value.data(), value.size());
         if (size >= 0) {
             value.resize(static_cast<std::size_t>(size));
             return value;
         }
         if (errno == ENODATA || errno == ENOTSUP) return std::nullopt;
         if (errno != ERANGE) throw SystemFailure(path(), errno);
-        size = ::getxattr(at.c_str(), name.c_str(), nullptr, 0);
+        size = read(nullptr, 0);
         // It may have gone, or grown, in between.
         if (size > 0) value.resize(static_cast<std::size_t>(size));
     }
 }
 
 void Inode::SetAttribute(const std::string& name, ByteView value) const {
-    if (::setxattr(ProcPath().c_str(), name.c_str(), value.data(), value.size(), 0) != 0) {
-        throw SystemFailure(path(), errno);
-    }
+    const int result =
+        by_path_ ? ::setxattr(ProcPath().c_str(), name.c_str(), value.data(), value.size(), 0)
+                 : ::fsetxattr(file_->fd(), name.c_str(), value.data(), value.size(), 0);
+    if (result != 0) throw SystemFailure(path(), errno);
 }
 
 bool Inode::RemoveAttribute(const std::string& name) const {
-    if (::removexattr(ProcPath().c_str(), name.c_str()) == 0) return true;
+    const int result = by_path_ ? ::removexattr(ProcPath().c_str(), name.c_str())
+                                : ::fremovexattr(file_->fd(), name.c_str());
+    if (result == 0) return true;
     if (errno == ENODATA || errno == ENOTSUP) return false;
     throw SystemFailure(path(), errno);
 }
 
 void Inode::SetMode(mode_t mode) const {
-    if (::chmod(ProcPath().c_str(), mode) != 0) throw SystemFailure(path(), errno);
+    const int result = by_path_ ? ::chmod(ProcPath().c_str(), mode) : ::fchmod(file_->fd(), mode);
+    if (result != 0) throw SystemFailure(path(), errno);
 }
 
 bool Inode::TrySetOwner(uid_t owner, gid_t group) const {
-    return ::fchownat(file_.fd(), "", owner, group, AT_EMPTY_PATH) == 0;
+    return ::fchownat(file_->fd(), "", owner, group, AT_EMPTY_PATH) == 0;
 }
 
 void Inode::SetTimes(const timespec (&times)[2]) const {
-    if (::utimensat(AT_FDCWD, ProcPath().c_str(), times, 0) != 0 && errno != EPERM) {
-        throw SystemFailure(path(), errno);
-    }
+    const int result = by_path_ ? ::utimensat(AT_FDCWD, ProcPath().c_str(), times, 0)
+                                : ::futimens(file_->fd(), times);
+    if (result != 0 && errno != EPERM) throw SystemFailure(path(), errno);
 }
 
 // ---- Temporary files ----------------------------------------------------------------------------
 
 std::string TemporaryName() {
-    static std::random_device random;
-    constexpr std::string_view kLetters = "abcdefghijklmnopqrstuvwxyz0123456789";
-    std::uniform_int_distribution<std::size_t> letter(0, kLetters.size() - 1);
-    std::string text = ".mavoea-";
-    for (int i = 0; i < 8; ++i) text += kLetters[letter(random)];
+    std::array<std::uint8_t, kLetterCount> random{};
+    // Names that are taken are no harm: another one is tried.
+    (void)::getrandom(random.data(), random.size(), GRND_NONBLOCK);
+    std::string text(kOwnPrefix);
+    for (const std::uint8_t byte : random) text += kLetters[byte % kLetters.size()];
     return text;
 }
 
-TemporaryFile::TemporaryFile(const Place& target)
-    : target_(target), file_([&] {
-          constexpr int kAttempts = 100;
-          constexpr int kMake = O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
-          for (int attempt = 1;; ++attempt) {
-              name_ = TemporaryName();
-              const int fd =
-                  ::openat(target.directory->fd(), name_.c_str(), kMake, S_IRUSR | S_IWUSR);
-              if (fd >= 0) return File(fd, target.path());
-              if (errno != EEXIST || attempt == kAttempts) {
-                  throw SystemFailure(target.path(), errno);
-              }
-          }
-      }()) {}
+bool IsTemporaryName(std::string_view name) {
+    return name.size() == kOwnPrefix.size() + kLetterCount && name.starts_with(kOwnPrefix) &&
+           name.find_first_not_of(kLetters, kOwnPrefix.size()) == std::string_view::npos;
+}
+
+namespace {
+
+// Calls `work` while nobody else can lock what has been left, and returns what that does.
+template <class Work>
+bool WithAbandoned(const Directory& directory, const std::string& name, Work work) {
+    constexpr time_t kLong = 60;  // seconds
+    const auto info = directory.StatusOf(name);
+    if (!info || S_ISDIR(info->st_mode)) return false;
+    if (!S_ISREG(info->st_mode) || info->st_nlink > 1) {
+        return info->st_ctime + kLong < ::time(nullptr) && work();
+    }
+    const auto file = directory.FindFile(name, O_RDONLY);
+    return file && TryToLock(file->fd()) && work();
+}
+
+}  // namespace
+
+bool IsAbandoned(const Directory& directory, const std::string& name) {
+    return WithAbandoned(directory, name, [] { return true; });
+}
+
+bool RemoveAbandoned(const Directory& directory, const std::string& name) {
+    return WithAbandoned(directory, name, [&] { return directory.RemoveFile(name); });
+}
+
+// Calls `use` with one temporary name after the other, until it returns true; it returns false with
+// errno.
+template <class Use>
+void TemporaryFile::TryNames(Use use) const {
+    constexpr int kAttempts = 100;
+    for (int attempt = 1; !use(TemporaryName()); ++attempt) {
+        if (errno != EEXIST || attempt == kAttempts) throw SystemFailure(target_.path(), errno);
+    }
+}
+
+TemporaryFile::TemporaryFile(const Place& target, mode_t mode) : target_(target) {
+    if (MakeNameless(mode)) return;
+    TryNames([&](const std::string& name) {
+        constexpr int kMake = O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
+        const int fd = ::openat(target_.directory->fd(), name.c_str(), kMake, mode);
+        if (fd < 0) return false;
+        file_ = std::make_shared<const File>(fd, target_.path());
+        // Before it was locked somebody may have taken it for one that is left over.
+        if (!TryToLock(fd) || file_->Status().st_nlink == 0) {
+            errno = EEXIST;
+            return false;
+        }
+        name_ = name;
+        return true;
+    });
+}
 
 TemporaryFile::~TemporaryFile() {
-    if (made_) (void)::unlinkat(target_.directory->fd(), name_.c_str(), 0);
+    if (!name_.empty()) (void)::unlinkat(target_.directory->fd(), name_.c_str(), 0);
 }
 
 void TemporaryFile::GiveToTarget() {
+    if (name_.empty()) {
+        if (LinkTo(target_.name)) return target_.directory->NoteCome(target_.name);
+        if (errno != EEXIST) throw SystemFailure(target_.path(), errno);
+        NeedName();
+    }
     target_.directory->Rename(name_, *target_.directory, target_.name);
-    made_ = false;
+    name_.clear();
     RequireTarget();
 }
 
 void TemporaryFile::GiveToNewTarget() {
+    if (name_.empty()) {
+        if (LinkTo(target_.name)) return target_.directory->NoteCome(target_.name);
+        throw SystemFailure(target_.path(), errno);
+    }
     const int fd = target_.directory->fd();
     if (::linkat(fd, name_.c_str(), fd, target_.name.c_str(), 0) == 0) {
         (void)::unlinkat(fd, name_.c_str(), 0);
@@ -326,13 +603,46 @@ void TemporaryFile::GiveToNewTarget() {
     } else {
         target_.directory->Rename(name_, *target_.directory, target_.name);
     }
-    made_ = false;
+    name_.clear();
+    target_.directory->NoteCome(target_.name);
     RequireTarget();
+}
+
+// False where the file system, or the kernel, has no such files.
+bool TemporaryFile::MakeNameless(mode_t mode) {
+    constexpr int kMake = O_RDWR | O_TMPFILE | O_CLOEXEC;
+    const int fd = ::openat(target_.directory->fd(), ".", kMake, mode);
+    if (fd < 0) {
+        if (errno == EOPNOTSUPP || errno == EISDIR || errno == EINVAL) return false;
+        throw SystemFailure(target_.path(), errno);
+    }
+    file_ = std::make_shared<const File>(fd, target_.path());
+    return true;
+}
+
+// Gives a file without a name its first one. False with errno, EEXIST when that is taken.
+bool TemporaryFile::LinkTo(const std::string& name) const {
+    const int fd = target_.directory->fd();
+    if (::linkat(file_->fd(), "", fd, name.c_str(), AT_EMPTY_PATH) == 0) return true;
+    if (errno != ENOENT) return false;
+    // That takes a privilege; a path does not.
+    const std::string path = ProcPathOf(file_->fd());
+    return ::linkat(AT_FDCWD, path.c_str(), fd, name.c_str(), AT_SYMLINK_FOLLOW) == 0;
+}
+
+// Only what has a name can replace something.
+void TemporaryFile::NeedName() {
+    (void)TryToLock(file_->fd());
+    TryNames([this](const std::string& name) {
+        if (!LinkTo(name)) return false;
+        name_ = name;
+        return true;
+    });
 }
 
 void TemporaryFile::RequireTarget() const {
     const auto there = target_.Status();
-    if (there && SameFile(*there, file_.Status())) return;
+    if (there && SameFile(*there, file_->Status())) return;
     throw NotThis(target_.path(), "another file has come where one was just made");
 }
 

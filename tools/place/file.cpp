@@ -17,7 +17,10 @@ File::~File() {
 }
 
 File::File(File&& other) noexcept
-    : fd_(std::exchange(other.fd_, -1)), path_(std::move(other.path_)) {}
+    : fd_(std::exchange(other.fd_, -1)),
+      path_(std::move(other.path_)),
+      seen_size_(other.seen_size_),
+      contents_(std::move(other.contents_)) {}
 
 int OpenQuietly(int directory, const char* name, int flags) {
     const int fd = ::openat(directory, name, flags | O_NOATIME);
@@ -46,17 +49,51 @@ File File::OpenAny(const std::string& path) {
 struct stat File::Status() const {
     struct stat info;
     if (::fstat(fd_, &info) != 0) throw SystemFailure(path_, errno);
+    seen_size_ = static_cast<std::uint64_t>(info.st_size);
     return info;
 }
 
-std::uint64_t File::Size() const { return static_cast<std::uint64_t>(Status().st_size); }
+std::uint64_t File::Size() const {
+    return contents_ ? contents_->size() : static_cast<std::uint64_t>(Status().st_size);
+}
 
 Bytes File::Read(std::uint64_t offset, std::uint64_t size) const {
     const std::uint64_t file_size = Size();
     if (offset >= file_size) return {};
-    Bytes bytes(static_cast<std::size_t>(std::min(size, file_size - offset)));
+    size = std::min(size, file_size - offset);
+    if (contents_) {
+        const ByteView part =
+            ByteView(*contents_)
+                .subspan(static_cast<std::size_t>(offset), static_cast<std::size_t>(size));
+        return {part.begin(), part.end()};
+    }
+    Bytes bytes(static_cast<std::size_t>(size));
+    bytes.resize(ReadAt(offset, bytes, bytes.size()));
+    return bytes;
+}
+
+bool File::KeepContents(std::uint64_t most) const {
+    contents_.reset();
+    if (!seen_size_) (void)Status();
+    for (;;) {
+        const std::uint64_t size = *seen_size_;
+        if (size > most) return false;
+        // One byte more: the file may have grown since.
+        Bytes bytes(static_cast<std::size_t>(size) + 1);
+        bytes.resize(ReadAt(0, bytes, static_cast<std::size_t>(size)));
+        if (bytes.size() <= size) {
+            contents_ = std::move(bytes);
+            return true;
+        }
+        (void)Status();
+    }
+}
+
+// How much of `bytes` could be read: `enough` at least, but at the end of the file.
+std::size_t File::ReadAt(std::uint64_t offset, std::span<std::uint8_t> bytes,
+                         std::size_t enough) const {
     std::size_t done = 0;
-    while (done < bytes.size()) {
+    while (done < enough) {
         const ssize_t got = ::pread(fd_, bytes.data() + done, bytes.size() - done,
                                     static_cast<off_t>(offset + done));
         if (got < 0 && errno == EINTR) continue;
@@ -64,11 +101,12 @@ Bytes File::Read(std::uint64_t offset, std::uint64_t size) const {
         if (got == 0) break;
         done += static_cast<std::size_t>(got);
     }
-    bytes.resize(done);
-    return bytes;
+    return done;
 }
 
 void File::Write(std::uint64_t offset, ByteView bytes) const {
+    contents_.reset();
+    seen_size_ = std::max(seen_size_.value_or(0), offset + bytes.size());
     std::size_t done = 0;
     while (done < bytes.size()) {
         const ssize_t put = ::pwrite(fd_, bytes.data() + done, bytes.size() - done,
@@ -76,6 +114,15 @@ void File::Write(std::uint64_t offset, ByteView bytes) const {
         if (put < 0 && errno == EINTR) continue;
         if (put <= 0) throw SystemFailure(path_, put < 0 ? errno : ENOSPC);
         done += static_cast<std::size_t>(put);
+    }
+}
+
+void File::Append(ByteView bytes) const {
+    while (!bytes.empty()) {
+        const ssize_t put = ::write(fd_, bytes.data(), bytes.size());
+        if (put < 0 && errno == EINTR) continue;
+        if (put <= 0) throw SystemFailure(path_, put < 0 ? errno : ENOSPC);
+        bytes = bytes.subspan(static_cast<std::size_t>(put));
     }
 }
 
@@ -89,6 +136,8 @@ void File::Reserve(std::uint64_t offset, std::uint64_t size) const {
 }
 
 void File::Resize(std::uint64_t size) const {
+    contents_.reset();
+    seen_size_.reset();
     if (::ftruncate(fd_, static_cast<off_t>(size)) != 0) throw SystemFailure(path_, errno);
 }
 

@@ -5,6 +5,8 @@
 #include <sys/stat.h>
 
 #include <cstdint>
+#include <optional>
+#include <span>
 #include <string>
 
 #include "tools/say/text.h"
@@ -35,7 +37,14 @@ class File {
     // Up to `size` bytes at `offset`, fewer only where the file ends.
     Bytes Read(std::uint64_t offset, std::uint64_t size) const;
 
+    // Reads all of it at once where that is no more than `most` bytes. From then on Size() and
+    // Read() tell what it held, and ask nobody, until this writes to it. False when it has more.
+    bool KeepContents(std::uint64_t most) const;
+    bool keeps_contents() const { return contents_.has_value(); }
+
     void Write(std::uint64_t offset, ByteView bytes) const;
+    // Where the descriptor stands, for what has no offsets.
+    void Append(ByteView bytes) const;
 
     // Sees to it that the range can be written; a full disk then leaves the file as it was.
     void Reserve(std::uint64_t offset, std::uint64_t size) const;
@@ -44,8 +53,13 @@ class File {
     void Sync() const;
 
  private:
+    std::size_t ReadAt(std::uint64_t offset, std::span<std::uint8_t> bytes,
+                       std::size_t enough) const;
+
     int fd_;
     std::string path_;
+    mutable std::optional<std::uint64_t> seen_size_;  // what it had at least, when last looked at
+    mutable std::optional<Bytes> contents_;
 };
 
 // A descriptor for reading that leaves the access time alone where the process may have that:

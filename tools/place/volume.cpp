@@ -53,16 +53,16 @@ std::string RealPath(const std::string& path) {
     return {text.data(), static_cast<std::size_t>(size)};
 }
 
-Place RootPlace() { return {Directory::Open("/", "/"), "."}; }
+Place RootPlace() { return {Directory::Open("/", "/", "/"), "."}; }
 
-int TypeOfFileSystem(const Place& place, const struct stat* info) {
+int TypeOfFileSystem(const Place& place, bool is_directory) {
 #if MAVOEA_HOST_PLATFORM
     const Directory& directory = *place.directory;
-    const bool own = info != nullptr && S_ISDIR(info->st_mode);
-    return MAVOGetFSType((own ? directory.ProcPath(place.name) : directory.ProcPath()).c_str(), 1);
+    return MAVOGetFSType(
+        (is_directory ? directory.ProcPath(place.name) : directory.ProcPath()).c_str(), 1);
 #else
-    (void)info;
-    return MAVOGetFSType(place.path().c_str(), 1);
+    (void)is_directory;
+    return MAVOGetFSType(place.location().c_str(), 1);
 #endif
 }
 
@@ -98,29 +98,44 @@ Keeping KeepingOf(int type) {
     return Keeping::kNone;
 }
 
-Place PlaceOf(const std::string& path) {
+Place PlaceOf(const std::string& path, Shown shown) {
     if (path.empty()) throw Failure(kFailed, "PATH", "it is empty", "name a file or directory");
     const std::string given = WithoutSlashes(path);
     const std::size_t slash = given.rfind('/');
     const std::string name = given.substr(slash + 1);
+    const auto called = [&](Place place) {
+        if (shown == Shown::kAsGiven) place.shown = given;
+        return place;
+    };
     if (given == "/") return RootPlace();
     if (name == "." || name == "..") {
         const std::string real = RealPath(path);
-        return real == "/" ? RootPlace() : PlaceOf(real);
+        return called(real == "/" ? RootPlace() : PlaceOf(real, Shown::kWhole));
     }
     const std::string parent = slash == std::string::npos ? "."
                                : slash == 0               ? "/"
                                                           : given.substr(0, slash);
     try {
-        const std::string shown = HasDotDot(parent) ? RealPath(parent) : Normalized(parent);
-        return {Directory::Open(parent, shown), name};
+        const std::string location = HasDotDot(parent) ? RealPath(parent) : Normalized(parent);
+        const std::string prefix = given.substr(0, slash == std::string::npos ? 0 : slash + 1);
+        const Place place = {
+            Directory::Open(parent, shown == Shown::kAsGiven ? prefix : location, location), name};
+        // Behind a slash the kernel follows a link.
+        struct stat info;
+        const bool follows =
+            path != given &&
+            ::fstatat(place.directory->fd(), name.c_str(), &info, AT_SYMLINK_NOFOLLOW) == 0 &&
+            S_ISLNK(info.st_mode);
+        return follows ? called(PlaceOf(RealPath(path), Shown::kWhole)) : place;
     } catch (const SystemFailure& failure) {
         throw SystemFailure(path, failure.error());
+    } catch (const fs::filesystem_error& failure) {  // the working directory has gone
+        throw SystemFailure(path, failure.code().value());
     }
 }
 
 Object FindObject(const std::string& path) {
-    const Place place = PlaceOf(path);
+    const Place place = PlaceOf(path, Shown::kWhole);
     struct stat info;
     if (::fstatat(place.directory->fd(), place.name.c_str(), &info, AT_SYMLINK_NOFOLLOW) != 0) {
         throw SystemFailure(path, errno);
@@ -129,16 +144,25 @@ Object FindObject(const std::string& path) {
 }
 
 Object ObjectAt(const Place& place, const struct stat* info) {
-    Object object = {place, -1};
 #if MAVOEA_HOST_PLATFORM
     MAVOVolumeEntry entry;
-    if (MAVOVolumeFind(place.path().c_str(), &entry) == 1) {
-        object.type = entry.type;
-        return object;
-    }
+    if (MAVOVolumeFind(place.location().c_str(), &entry) == 1) return {place, entry.type};
 #endif
-    object.type = TypeOfFileSystem(place, info);
-    return object;
+    return {place, TypeOfFileSystem(place, info != nullptr && S_ISDIR(info->st_mode))};
+}
+
+Object ObjectAt(const Place& place, mode_t type) {
+    // The destination of a conversion may be declared, and be a file.
+    const bool is_volume =
+        S_ISDIR(type) || (!Declared().empty() && Declared().contains(place.location()));
+    if (is_volume) {
+        struct stat info = {};
+        info.st_mode = type;
+        return ObjectAt(place, &info);
+    }
+    std::optional<int>& kept = place.directory->volume_type();
+    if (!kept) kept = ObjectAt(place, nullptr).type;
+    return {place, *kept};
 }
 
 int ReadableType(int type) {
@@ -225,7 +249,7 @@ void RequireVolumeTable() {
 std::string TypeSource(const Object& object) {
 #if MAVOEA_HOST_PLATFORM
     MAVOVolumeEntry entry;
-    const std::string path = object.path();
+    const std::string path = object.place.location();
     if (MAVOVolumeFind(path.c_str(), &entry) != 1) return "the filesystem";
     if (entry.source == MAVO_VOLUME_LISTED) {
         return std::string(MAVO_VOLUME_TABLE) + ", line " + std::to_string(entry.line);

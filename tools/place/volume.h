@@ -26,9 +26,12 @@ struct Object {
     bool is_root() const { return place.name == "."; }
 };
 
-// Where somebody's path leads: what comes before its last name is the kernel's to follow. Throws
-// Failure, with the path as it was given.
-Place PlaceOf(const std::string& path);
+// How people are shown a path that somebody gave.
+enum class Shown { kWhole, kAsGiven };  // absolute
+
+// Where somebody's path leads: what comes before its last name is the kernel's to follow, and so is
+// a link with a slash behind it. Throws Failure, with the path as it was given.
+Place PlaceOf(const std::string& path, Shown shown);
 
 // The object at a path that somebody gave. Failure when nothing is there; a dangling symbolic link
 // is something.
@@ -37,6 +40,9 @@ Object FindObject(const std::string& path);
 // An object in an open directory, or one that is to come there. `info`: its status, null when there
 // is nothing yet.
 Object ObjectAt(const Place& place, const struct stat* info);
+// One that is there, and of that type, S_IFREG for instance. Volumes are directories: the type of
+// the one that all else in a directory is on is found once.
+Object ObjectAt(const Place& place, mode_t type);
 
 // What a volume that is only copied to holds is read as it will be by those who copied.
 int ReadableType(int type);

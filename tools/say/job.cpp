@@ -23,7 +23,7 @@ bool Job::Ask(const std::string& question) {
     constexpr int kWait = 100;  // milliseconds
     progress_.Clear();
     std::cout.flush();
-    std::cerr << "mavoea: " << question << ' ' << std::flush;
+    std::cerr << Speaker() << ": " << question << ' ' << std::flush;
     std::string answer;
     while (!stopped()) {
         pollfd input = {STDIN_FILENO, POLLIN, 0};
@@ -39,21 +39,11 @@ bool Job::Ask(const std::string& question) {
     return false;
 }
 
-bool Job::MayBeLost(bool writable, const std::string& question) {
-    if (options_.consent == Consent::kAsk) return Ask(question);
-    const bool asks =
-        options_.consent == Consent::kUsual && ::isatty(STDIN_FILENO) == 1 && !writable;
-    return !asks || Ask("it is write-protected: " + question);
-}
-
-void Job::AddDone(const std::string& path, const std::string& line) {
-    ++done_;
-    if (options_.verbose && options_.json) lines_.push_back(line);
-    if (options_.verbose && !options_.json) {
-        progress_.Clear();
-        std::cout << line << '\n';
-    }
-    ShowProgress(path);
+void Job::Say(const std::string& line) {
+    if (!options_.verbose) return;
+    if (options_.json) return lines_.push_back(line);
+    progress_.Clear();
+    std::cout << line << '\n';
 }
 
 void Job::AddBytes(std::uint64_t bytes) {
@@ -63,8 +53,25 @@ void Job::AddBytes(std::uint64_t bytes) {
 }
 
 void Job::AddFailure(const std::string& path, const Failure& failure) {
-    failures_.push_back({path, failure.what()});
-    status_ = std::max(status_, failure.status());
+    ++failures_;
+    const bool incomplete = dynamic_cast<const Incomplete*>(&failure) != nullptr;
+    if (!incomplete) status_ = kRefused;
+    if (incomplete && status_ == kSuccess) status_ = kFailed;
+    progress_.Clear();
+    Report(failure);
+    if (options_.json) failed_.push_back({path, failure.what()});
+}
+
+void Job::AddNote(const std::string& note) {
+    if (options_.json) return notes_.push_back(note);
+    progress_.Clear();
+    Note(note);
+}
+
+void Job::AddWarning(const std::string& warning) {
+    if (options_.json) return notes_.push_back(warning);
+    progress_.Clear();
+    Report("warning: " + warning);
 }
 
 void Job::ShowProgress(const std::string& path) {
@@ -78,26 +85,23 @@ std::string Job::Counts() const {
     std::string text = std::to_string(done_) + ' ' + done_word_;
     if (has_bytes_) text += " (" + std::to_string(bytes_) + " bytes)";
     if (skipped_ > 0) text += ", " + std::to_string(skipped_) + " skipped";
-    return text + ", " + std::to_string(failures_.size()) + " failed";
+    return text + ", " + std::to_string(failures_) + " failed";
 }
 
 ExitStatus Job::Finish() {
     progress_.Clear();
+    // Scripts that read standard output have not asked for counts.
+    const bool counts = (options_.recursive || options_.paths.size() > 1) && !SpeaksAsAnother() &&
+                        (options_.verbose || ::isatty(STDOUT_FILENO) == 1);
     if (options_.json) {
         PrintJson();
-    } else {
-        PrintText();
+    } else if (counts) {
+        std::cout << Counts() << '\n';
     }
-    for (const FailedObject& failed : failures_) Report(failed.message);
     if (!stopped()) return status_;
     Report("interrupted: " + Counts() + "; what is left is as it was, give the command again");
     constexpr int kSignalled = 128;
     return static_cast<ExitStatus>(kSignalled + Interrupted());
-}
-
-void Job::PrintText() const {
-    if (options_.recursive || options_.paths.size() > 1) std::cout << Counts() << '\n';
-    for (const std::string& note : notes_) Note(note);
 }
 
 void Job::PrintJson() const {
@@ -106,20 +110,20 @@ void Job::PrintJson() const {
     json.Set("done", done_);
     json.Set("skipped", skipped_);
     if (has_bytes_) json.Set("bytes", bytes_);
-    json.Set("failed", failures_.size());
+    json.Set("failed", failures_);
     json.Set("interrupted", stopped());
     if (options_.verbose) SetMessages(json, "lines", lines_);
     SetMessages(json, "notes", notes_);
-    SetFailures(json, failures_);
+    SetFailures(json, failed_);
     Print(json);
 }
 
 std::string Quoted(const std::string& path) { return '\'' + Printable(path) + '\''; }
 
-const char* NameOfType(unsigned mode) {
-    switch (mode & S_IFMT) {
+const char* NameOfType(const struct stat& info) {
+    switch (info.st_mode & S_IFMT) {
         case S_IFREG:
-            return "regular file";
+            return info.st_size == 0 ? "regular empty file" : "regular file";
         case S_IFDIR:
             return "directory";
         case S_IFLNK:

@@ -2,6 +2,8 @@
 #ifndef MAVOEA_TOOLS_SAY_JOB_H_
 #define MAVOEA_TOOLS_SAY_JOB_H_
 
+#include <sys/stat.h>
+
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -12,13 +14,9 @@
 
 namespace mavoea::tool {
 
-// What is done about objects that would be lost: the last of -i, -f and -n.
-enum class Consent { kUsual, kAsk, kForce, kNever };
-
 struct JobOptions {
     std::vector<std::string> paths;
     bool recursive = false;
-    Consent consent = Consent::kUsual;
     bool verbose = false;
     bool json = false;
 };
@@ -31,28 +29,31 @@ class Job {
     // Whether standard input says yes, to a question on standard error. False when it ends, or
     // when the work is interrupted.
     bool Ask(const std::string& question);
-    // The same for something that is `writable`, or that another user, or nobody, may write to.
-    bool MayBeLost(bool writable, const std::string& question);
 
-    void AddDone(const std::string& path, const std::string& line);
+    // A line for those who want to see what is done.
+    void Say(const std::string& line);
+
+    void AddDone() { ++done_; }
     void AddSkipped() { ++skipped_; }
     void AddBytes(std::uint64_t bytes);
+    // Says it at once.
     void AddFailure(const std::string& path, const Failure& failure);
-    void AddNote(const std::string& note) { notes_.push_back(note); }
+    void AddNote(const std::string& note);
+    // A note that the commands of coreutils have as well, in their words.
+    void AddWarning(const std::string& warning);
 
     void ShowProgress(const std::string& path);
 
     bool stopped() const;  // nothing more is to be begun
-    std::uint64_t failures() const { return failures_.size(); }
+    std::uint64_t failures() const { return failures_; }
     std::uint64_t skipped() const { return skipped_; }
 
-    // Says what became of it all. kSuccess, the gravest status of the failures, or 128 and the
-    // number of the signal.
+    // Says what became of it all. kSuccess; kRefused when anything failed; kFailed when only
+    // metadata did not arrive; or 128 and the number of the signal.
     ExitStatus Finish();
 
  private:
     std::string Counts() const;
-    void PrintText() const;
     void PrintJson() const;
 
     const char* doing_;
@@ -63,18 +64,19 @@ class Job {
     std::uint64_t done_ = 0;
     std::uint64_t skipped_ = 0;
     std::uint64_t bytes_ = 0;
+    std::uint64_t failures_ = 0;
     bool has_bytes_ = false;
-    std::vector<std::string> lines_;  // --verbose, for --json
+    std::vector<std::string> lines_;  // all three for --json
     std::vector<std::string> notes_;
-    std::vector<FailedObject> failures_;
+    std::vector<FailedObject> failed_;
     ExitStatus status_ = kSuccess;
 };
 
 // 'NAME', for a line of --verbose or a question.
 std::string Quoted(const std::string& path);
 
-// "directory", "regular file", "symbolic link", ...
-const char* NameOfType(unsigned mode);
+// "directory", "regular file", "regular empty file", "symbolic link", ...
+const char* NameOfType(const struct stat& info);
 
 }  // namespace mavoea::tool
 

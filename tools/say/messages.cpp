@@ -62,11 +62,16 @@ const char* WordsFor(int code) {
 
 Failure::Failure(ExitStatus status, std::string_view subject, std::string_view cause,
                  std::string_view advice)
-    : std::runtime_error(Printable(subject) + ": " + std::string(cause) + "; " +
-                         std::string(advice)),
+    : Failure(status, Printable(subject) + ": " + std::string(cause), advice) {
+    subject_ = subject;
+    cause_ = cause;
+}
+
+Failure::Failure(ExitStatus status, const std::string& sentence, std::string_view advice)
+    : std::runtime_error(sentence + "; " + std::string(advice)),
       status_(status),
-      subject_(subject),
-      cause_(cause) {}
+      cause_(sentence),
+      brief_(sentence) {}
 
 SystemFailure::SystemFailure(std::string_view path, int error)
     : Failure(error == ENOENT ? kNotFound : kFailed, path, Words(error), Advice(error)),

@@ -1,4 +1,5 @@
-// What went wrong, for people: "PATH: cause; what to do".
+// What went wrong, for people: "PATH: cause; what to do". What the tool says in the place of a
+// command that people know ends before the advice.
 #ifndef MAVOEA_TOOLS_SAY_MESSAGES_H_
 #define MAVOEA_TOOLS_SAY_MESSAGES_H_
 
@@ -8,7 +9,12 @@
 
 namespace mavoea::tool {
 
-enum ExitStatus : int { kSuccess = 0, kNotFound = 1, kFailed = 2 };
+enum ExitStatus : int {
+    kSuccess = 0,
+    kNotFound = 1,
+    kRefused = 1,  // cp, mv and rm: anything that they could not do
+    kFailed = 2
+};
 
 class Failure : public std::runtime_error {
  public:
@@ -18,11 +24,16 @@ class Failure : public std::runtime_error {
     ExitStatus status() const { return status_; }
     const std::string& subject() const { return subject_; }
     const std::string& cause() const { return cause_; }
+    const std::string& brief() const { return brief_; }  // without the advice
+
+ protected:
+    Failure(ExitStatus status, const std::string& sentence, std::string_view advice);
 
  private:
     ExitStatus status_;
     std::string subject_;
     std::string cause_;
+    std::string brief_;
 };
 
 // A system call's failure, by its errno: kNotFound for ENOENT.
@@ -40,10 +51,27 @@ class SystemFailure : public Failure {
     int error_;
 };
 
-// What did not arrive, of an object that otherwise has.
-class Loss : public Failure {
+// What commands like cp say, in their words: names in it are for people already.
+class Refusal : public Failure {
+ public:
+    Refusal(const std::string& sentence, std::string_view advice)
+        : Failure(kRefused, sentence, advice) {}
+    // "cannot stat 'x'", and the words for errno.
+    Refusal(const std::string& what, int error)
+        : Failure(kRefused, what + ": " + SystemFailure::Words(error),
+                  SystemFailure::Advice(error)) {}
+};
+
+// An object has arrived, and its metadata has not, or not all of it.
+class Incomplete : public Failure {
  public:
     using Failure::Failure;
+};
+
+// What did not arrive has no place there, or none that could be read.
+class Loss : public Incomplete {
+ public:
+    using Incomplete::Incomplete;
 };
 
 // What a failed call of the library left behind.

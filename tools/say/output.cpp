@@ -3,6 +3,22 @@
 #include <iostream>
 
 namespace mavoea::tool {
+namespace {
+
+constexpr const char* kOwnName = "mavoea";
+
+std::string& Name() {
+    static std::string name = kOwnName;
+    return name;
+}
+
+}  // namespace
+
+void SpeakAs(const std::string& program) { Name() = program; }
+
+bool SpeaksAsAnother() { return Name() != kOwnName; }
+
+const std::string& Speaker() { return Name(); }
 
 void Print(const Json& json) { std::cout << json.Text() << '\n'; }
 
@@ -29,7 +45,12 @@ void SetFailures(Json& json, const std::vector<FailedObject>& failures) {
 
 void Report(std::string_view message) {
     std::cout.flush();  // What was found before comes first.
-    std::cerr << "mavoea: " << message << '\n';
+    std::cerr << Speaker() << ": " << message << '\n';
+}
+
+void Report(const Failure& failure) {
+    Report(SpeaksAsAnother() ? std::string_view{failure.brief()}
+                             : std::string_view{failure.what()});
 }
 
 void Note(std::string_view message) { Report("note: " + std::string(message)); }

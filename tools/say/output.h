@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "tools/say/json.h"
+#include "tools/say/messages.h"
 
 namespace mavoea::tool {
 
@@ -22,8 +23,15 @@ struct FailedObject {
 void SetMessages(Json& json, const char* key, const std::vector<std::string>& messages);
 void SetFailures(Json& json, const std::vector<FailedObject>& failures);
 
+// The name under which the tool speaks from here on: that of a command in whose place it runs,
+// which gives no advice. "mavoea" until then.
+void SpeakAs(const std::string& program);
+bool SpeaksAsAnother();
+const std::string& Speaker();
+
 // "mavoea: " and the message, on standard error.
 void Report(std::string_view message);
+void Report(const Failure& failure);
 
 // Something that went well, and that people should know more of.
 void Note(std::string_view message);

@@ -47,6 +47,7 @@ std::vector<Line> LinesOf(const Object& object, const Metadata& metadata) {
 void AddOccupied(const Object& object, Metadata* metadata) {
     const std::string name = AppleDoubleName(object.place.name);
     if (object.keeping() != Keeping::kAppleDouble || name.empty()) return;
+    if (!object.place.directory->MayHave(name)) return;
     try {
         const auto file = object.place.directory->FindFile(name, O_RDONLY);
         if (!file || file->Size() == 0 || IsAppleDouble(*object.place.directory, name)) return;
@@ -60,8 +61,9 @@ void AddOccupied(const Object& object, Metadata* metadata) {
 Metadata ReadAll(const Object& object) {
     RequireParent(object);
     if (object.keeping() == Keeping::kNone) throw NoStore(object);
-    Metadata metadata = ReadMetadata(object, Sidecars::Services::kLeaveOut);
-    AddOccupied(object, &metadata);
+    const Sidecars sidecars = Sidecars::Find(object, Sidecars::Services::kLeaveOut);
+    Metadata metadata = ReadMetadata(object, sidecars);
+    if (!sidecars.apple_double) AddOccupied(object, &metadata);
     return metadata;
 }
 
@@ -96,7 +98,7 @@ class Listing {
             }
             for (const Failure& problem : metadata.problems) Add(problem);
         } catch (const Failure& failure) {
-            Add(failure);
+            if (!options_.recursive || !HasGone(object.place, failure)) Add(failure);
         }
         return true;
     }

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <set>
 
+#include "include/mavoea.h"
 #include "tools/say/text.h"
 #include "tools/store/marks.h"
 #include "tools/store/reader.h"
@@ -13,6 +14,30 @@ namespace mavoea::tool {
 namespace {
 
 using Found = Sidecars::Found;
+
+// What there is to say of an object of which the lists tell that nothing earlier is beside it; none
+// where they cannot, or something is amiss.
+std::optional<Adoption> CurrentByLists(const Object& object) {
+    const Directory& directory = *object.place.directory;
+    const std::string apple_double = AppleDoubleName(object.place.name);
+    if (!directory.listed() || (!apple_double.empty() && directory.MayHave(apple_double))) {
+        return std::nullopt;
+    }
+    Adoption adoption;
+    DirectoryRef ea_dir;
+    try {
+        ea_dir = directory.FindAgain(kEaDirName);
+    } catch (const Failure&) {
+        return std::nullopt;
+    }
+    if (!ea_dir) return adoption;
+    const bool may_be_empty = ea_dir->EntriesAtFirst().size() < 2;  // which would go
+    if (may_be_empty || ea_dir->MayHave(object.place.name)) return std::nullopt;
+    const std::string name = NameInEaDirectory(object.place.name);
+    adoption.current = ea_dir->HadAtFirst(name + "@" MAVOEA_KIND_STREAM) ||
+                       ea_dir->HadAtFirst(name + "@" MAVOEA_KIND_RESOURCE);
+    return adoption;
+}
 
 class ObjectAdoption {
  public:
@@ -45,7 +70,8 @@ class ObjectAdoption {
         std::vector<Missing> missing;
         const Writer& writer = WriterFor(object_);
         const Metadata fitting = writer.Fit(metadata, object_, &missing);
-        const Written written = writer.Write(object_, fitting, {.old = Old::kKept});
+        const Written written =
+            writer.Write(object_, *Inode::Open(object_.place), fitting, {.old = Old::kKept});
         missing.insert(missing.end(), written.missing.begin(), written.missing.end());
         const auto again = WhatIsMissing(fitting, ReadCurrent());
         missing.insert(missing.end(), again.begin(), again.end());
@@ -111,17 +137,12 @@ class ObjectAdoption {
     void GiveMarks(const Metadata& metadata) {
         const auto inode = Inode::Open(object_.place);
         if (!inode->HoldsContents()) return;
-        const auto afp = metadata.entries.find(EntryId::kAfpFileInfo);
-        if (afp == metadata.entries.end() && !metadata.finder_info) {
+        if (!metadata.entries.contains(EntryId::kAfpFileInfo) && !metadata.finder_info) {
             adoption_.notes.emplace_back(
                 "its legacy resource file says nothing of its read-only and hidden marks");
         }
-        if (afp == metadata.entries.end()) return;
-        const Bytes info = afp->second.value.All();
         const mode_t mode = inode->Status().st_mode & kPermissionBits;
-        if (info.size() >= kAfpFileInfoSize &&
-            (LoadBe16(&info[kAfpAttributesOffset]) & kAfpNoWrite) != 0 &&
-            (mode & kWriteBits) != 0) {
+        if ((metadata.AfpAttributes().value_or(0) & kAfpNoWrite) != 0 && (mode & kWriteBits) != 0) {
             LockMode(*inode, mode);
         }
     }
@@ -190,7 +211,10 @@ class ObjectAdoption {
 
 }  // namespace
 
-Adoption Adopt(const Object& object) { return ObjectAdoption(object).Run(); }
+Adoption Adopt(const Object& object) {
+    if (const auto current = CurrentByLists(object)) return *current;
+    return ObjectAdoption(object).Run();
+}
 
 void AdoptForChange(const Object& object, std::vector<std::string>* notes) {
     if (object.keeping() != Keeping::kEaDirectory) return;

@@ -12,6 +12,12 @@
 
 namespace mavoea::tool {
 
+// A whole metadata file, for a place that keeps its like: no byte of it need be understood.
+using WholeFile = std::shared_ptr<const File>;
+
+// The most that is read at once, and held in memory.
+inline constexpr std::uint64_t kSmallFile = std::uint64_t{1} << 18;
+
 class Content {
  public:
     Content() = default;

@@ -21,11 +21,7 @@ constexpr const char* kFormerBits = "user.mavoea.writable";
 constexpr std::uint16_t kLocking = kAfpNoWrite | kAfpNoRename | kAfpNoDelete;
 
 bool LockedByRecord(const Metadata& metadata) {
-    const auto found = metadata.entries.find(EntryId::kAfpFileInfo);
-    if (found == metadata.entries.end() || found->second.value.damaged()) return false;
-    const Bytes bytes = found->second.value.All();
-    return bytes.size() >= kAfpFileInfoSize &&
-           (LoadBe16(&bytes[kAfpAttributesOffset]) & kLocking) != 0;
+    return (metadata.AfpAttributes().value_or(0) & kLocking) != 0;
 }
 
 std::optional<mode_t> FormerBits(const Inode& inode) {
@@ -39,20 +35,30 @@ std::optional<mode_t> FormerBits(const Inode& inode) {
     return bits & kWriteBits;
 }
 
+std::uint32_t AttributeWordOf(const Inode& inode) {
+#if MAVOEA_HOST_PLATFORM
+    // As the host's own function finds it, which takes a path.
+    const auto word = inode.Attribute(attribute_word::kName);
+    return word ? attribute_word::Decode(word->data(), static_cast<ssize_t>(word->size())) : 0;
+#else
+    FileStatus status;
+    if (!ReadFileStatus(inode.ProcPath().c_str(), &status)) {
+        throw SystemFailure(inode.path(), errno);
+    }
+    return status.attributes;
+#endif
+}
+
 }  // namespace
 
 void ReadMarks(const Object& object, const Inode& inode, Metadata* metadata) {
     if (!inode.HoldsContents()) return;
-    FileStatus status;
-    if (!ReadFileStatus(inode.ProcPath().c_str(), &status)) {
-        metadata->problems.push_back(SystemFailure(inode.path(), errno));
-        return;
-    }
-    metadata->hidden = metadata->hidden || (status.attributes & MLIBC_ATTRIBUTE_HIDDEN) != 0;
-    metadata->archived = (status.attributes & MLIBC_ATTRIBUTE_ARCHIVE) != 0;
-    metadata->locked = LocksByMode(object) ? (inode.info().st_mode & kWriteBits) == 0
-                                           : (status.attributes & MLIBC_ATTRIBUTE_LOCKED) != 0 ||
-                                                 LockedByRecord(*metadata);
+    const std::uint32_t word = AttributeWordOf(inode);
+    metadata->hidden = metadata->hidden || (word & MLIBC_ATTRIBUTE_HIDDEN) != 0;
+    metadata->archived = (word & MLIBC_ATTRIBUTE_ARCHIVE) != 0;
+    metadata->locked = LocksByMode(object)
+                           ? (inode.Status().st_mode & kWriteBits) == 0
+                           : (word & MLIBC_ATTRIBUTE_LOCKED) != 0 || LockedByRecord(*metadata);
 }
 
 void SetLockFlag(const Inode& inode, bool locked) {
@@ -64,7 +70,13 @@ void SetHidden(const Inode& inode, bool hidden) {
                               hidden ? marks::kSetHidden : marks::kClearHidden);
 }
 
-void SetArchived(const Inode& inode) { (void)EASetSmbArchive(inode.ProcPath().c_str()); }
+void SetArchived(const Inode& inode) {
+    if (inode.fd() >= 0) {
+        (void)kernel::SetArchiveBit(inode.fd());
+    } else {
+        (void)EASetSmbArchive(inode.ProcPath().c_str());
+    }
+}
 
 void LockMode(const Inode& inode, mode_t mode) {
     const mode_t bits = mode & kWriteBits;

@@ -36,6 +36,14 @@ const Metadata::Attribute* Metadata::Find(std::string_view name) const {
     return found == attributes.end() ? nullptr : &*found;
 }
 
+std::optional<std::uint16_t> Metadata::AfpAttributes() const {
+    const auto found = entries.find(EntryId::kAfpFileInfo);
+    if (found == entries.end() || found->second.value.damaged()) return std::nullopt;
+    const Bytes info = found->second.value.All();
+    if (info.size() < kAfpFileInfoSize) return std::nullopt;
+    return LoadBe16(&info[kAfpAttributesOffset]);
+}
+
 std::string NameOfAttribute(const std::string& name) { return '"' + Printable(name) + '"'; }
 
 std::string NameOfEntry(EntryId id) {

@@ -37,9 +37,6 @@ struct Missing {
     std::string reason;
 };
 
-// A whole metadata file, for a place that keeps its like: no byte of it need be understood.
-using WholeFile = std::shared_ptr<const File>;
-
 struct Metadata {
     struct Item {
         Content value;
@@ -96,6 +93,9 @@ struct Metadata {
                whole_stream || whole_resource || whole_record;
     }
     const Attribute* Find(std::string_view name) const;
+
+    // The attributes in the AFP file info; none when there is no such entry, or a damaged one.
+    std::optional<std::uint16_t> AfpAttributes() const;
 };
 
 // How an item is called in messages: "Finder info", "\"colour\"".

@@ -194,12 +194,16 @@ void Noting(Metadata* metadata, Work work) {
 }
 
 // Reads the file that was found, if it is still there; null when not, or when it is none.
+// One that is small is read at once.
 WholeFile ReadFound(const Found& found, Metadata* metadata) {
     WholeFile file;
     Noting(metadata, [&] {
-        file = found.directory->FindFile(found.name, O_RDONLY);
+        file = found.file ? found.file : found.directory->FindFile(found.name, O_RDONLY);
         if (!file) return;
-        LockFile(*file, Access::kRead);
+        if (!file->keeps_contents()) {
+            LockFile(*file, Access::kRead);
+            (void)file->KeepContents(kSmallFile);
+        }
         FileReader(file, metadata).Read();
     });
     return file;
@@ -235,11 +239,18 @@ void AddFolder(const Sidecars& sidecars, Metadata* metadata) {
     }
 }
 
+// One for each kind of place.
+class Reader {
+ public:
+    virtual ~Reader() = default;
+    virtual Metadata Read(const Inode& inode, const Sidecars& sidecars) const = 0;
+};
+
 // ---- Volumes that keep one "._" file ------------------------------------------------------------
 
 class AppleDoubleReader final : public Reader {
  public:
-    Metadata Read(const Object&, const Sidecars& sidecars) const override {
+    Metadata Read(const Inode&, const Sidecars& sidecars) const override {
         Metadata metadata;
         if (sidecars.apple_double) {
             metadata.whole_apple_double = ReadFound(*sidecars.apple_double, &metadata);
@@ -254,9 +265,9 @@ class AppleDoubleReader final : public Reader {
 
 class EaDirectoryReader : public Reader {
  public:
-    Metadata Read(const Object& object, const Sidecars& sidecars) const override {
+    Metadata Read(const Inode& inode, const Sidecars& sidecars) const override {
         Metadata metadata;
-        ReadFirst(object, &metadata);
+        ReadFirst(inode, &metadata);
         if (sidecars.resource) {
             metadata.whole_resource = ReadFound(*sidecars.resource, &metadata);
         } else if (sidecars.legacy_resource) {
@@ -275,7 +286,7 @@ class EaDirectoryReader : public Reader {
 
  protected:
     // What counts before the files in the EA directory.
-    virtual void ReadFirst(const Object&, Metadata*) const {}
+    virtual void ReadFirst(const Inode&, Metadata*) const {}
 
  private:
     static void ReadEarlier(const Found& found, Metadata* metadata) {
@@ -323,11 +334,7 @@ class EaDirectoryReader : public Reader {
             const Bytes info = metadata.finder_info->value.All();
             if ((LoadBe16(&info[kFinderFlagsOffset]) & kFinderInvisible) != 0) return true;
         }
-        const auto afp = metadata.entries.find(EntryId::kAfpFileInfo);
-        if (afp == metadata.entries.end() || afp->second.value.damaged()) return false;
-        const Bytes info = afp->second.value.All();
-        return info.size() >= kAfpFileInfoSize &&
-               (LoadBe16(&info[kAfpAttributesOffset]) & kAfpInvisible) != 0;
+        return (metadata.AfpAttributes().value_or(0) & kAfpInvisible) != 0;
     }
 };
 
@@ -335,12 +342,11 @@ class EaDirectoryReader : public Reader {
 
 class FileEaReader final : public EaDirectoryReader {
  protected:
-    void ReadFirst(const Object& object, Metadata* metadata) const override {
+    void ReadFirst(const Inode& inode, Metadata* metadata) const override {
         Noting(metadata, [&] {
-            const auto inode = Inode::Open(object.place);
-            if (!inode->HoldsContents()) return;
-            metadata->whole_record = inode->Attribute(kNetatalkAttribute);
-            if (metadata->whole_record) ReadRecord(object.path(), metadata);
+            if (!inode.HoldsContents()) return;
+            metadata->whole_record = inode.Attribute(kNetatalkAttribute);
+            if (metadata->whole_record) ReadRecord(inode.path(), metadata);
         });
     }
 
@@ -375,7 +381,7 @@ class FileEaReader final : public EaDirectoryReader {
 
 class AttributeReader final : public Reader {
  public:
-    Metadata Read(const Object& object, const Sidecars& sidecars) const override {
+    Metadata Read(const Inode& inode, const Sidecars& sidecars) const override {
         Metadata metadata;
         AddServices(sidecars, &metadata);
         AddFolder(sidecars, &metadata);
@@ -384,14 +390,13 @@ class AttributeReader final : public Reader {
                                        "volumes of the source's type keep no such file",
                                        file->path()});
         }
-        const auto inode = Inode::Open(object.place);
-        if (!inode->HoldsContents()) return metadata;
-        for (const std::string& name : inode->AttributeNames()) {
+        if (!inode.HoldsContents()) return metadata;
+        for (const std::string& name : inode.AttributeNames()) {
             if (IsMark(name) || IsOfTheSystem(name)) continue;
-            Noting(&metadata, [&] { ReadAttribute(*inode, name, &metadata); });
+            Noting(&metadata, [&] { ReadAttribute(inode, name, &metadata); });
         }
-        if (S_ISREG(inode->info().st_mode)) {
-            Noting(&metadata, [&] { ReadFork(*inode, &metadata); });
+        if (S_ISREG(inode.info().st_mode)) {
+            Noting(&metadata, [&] { ReadFork(inode, &metadata); });
         }
         return metadata;
     }
@@ -429,26 +434,21 @@ class AttributeReader final : public Reader {
     }
 };
 
-const Reader* FindReader(const Object& object) {
-    return OneFor<Reader, AppleDoubleReader, EaDirectoryReader, FileEaReader, AttributeReader>(
-        object.kind());
-}
-
 }  // namespace
 
-const Reader& ReaderFor(const Object& object) {
-    if (const Reader* const reader = FindReader(object)) return *reader;
-    throw NoStore(object);
+Metadata ReadMetadata(const Object& object, const Inode& inode, const Sidecars& sidecars) {
+    Metadata metadata;
+    const auto* const reader =
+        OneFor<Reader, AppleDoubleReader, EaDirectoryReader, FileEaReader, AttributeReader>(
+            object.kind());
+    if (reader != nullptr && !object.is_root()) metadata = reader->Read(inode, sidecars);
+    if (sidecars.problem) metadata.problems.push_back(*sidecars.problem);
+    Noting(&metadata, [&] { ReadMarks(object, inode, &metadata); });
+    return metadata;
 }
 
 Metadata ReadMetadata(const Object& object, const Sidecars& sidecars) {
-    Metadata metadata;
-    if (const Reader* const reader = FindReader(object); reader != nullptr && !object.is_root()) {
-        metadata = reader->Read(object, sidecars);
-    }
-    if (sidecars.problem) metadata.problems.push_back(*sidecars.problem);
-    Noting(&metadata, [&] { ReadMarks(object, *Inode::Open(object.place), &metadata); });
-    return metadata;
+    return ReadMetadata(object, *Inode::Open(object.place), sidecars);
 }
 
 Metadata ReadMetadata(const Object& object, Sidecars::Services services) {

@@ -8,20 +8,12 @@
 
 namespace mavoea::tool {
 
-class Reader {
- public:
-    virtual ~Reader() = default;
-
-    // What cannot be looked at is among the problems; a Failure is thrown where nothing can.
-    virtual Metadata Read(const Object& object, const Sidecars& sidecars) const = 0;
-};
-
-// For volumes of a type; Failure for those that keep nothing.
-const Reader& ReaderFor(const Object& object);
-
-// Through the reader of the object's volume. An object on a volume that keeps nothing has nothing.
+// Through the reader of the object's volume. What cannot be looked at is among the problems; a
+// Failure is thrown where nothing can. An object on a volume that keeps nothing has nothing.
 Metadata ReadMetadata(const Object& object, Sidecars::Services services);
 Metadata ReadMetadata(const Object& object, const Sidecars& sidecars);
+// The same for who has it open.
+Metadata ReadMetadata(const Object& object, const Inode& inode, const Sidecars& sidecars);
 
 // What an AppleDouble file holds that an object can be given. Throws Failure when it is none of
 // version 2, and for what is damaged in it.

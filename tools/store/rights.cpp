@@ -1,6 +1,5 @@
 #include "tools/store/rights.h"
 
-#include <acl/libacl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -13,6 +12,7 @@ namespace {
 
 constexpr mode_t kReadWrite = 0666;
 constexpr mode_t kGroupBits = 0070;
+constexpr const char* kAcl = "system.posix_acl_access";
 
 void DropExecution(acl_t acl) {
     acl_entry_t entry;
@@ -33,9 +33,9 @@ Rights Rights::Of(const Inode& object) {
     rights.owner_ = info.st_uid;
     rights.group_ = info.st_gid;
     rights.mode_ = info.st_mode & kReadWrite;
-    const std::string path = object.ProcPath();
-    if (object.HoldsContents() && acl_extended_file(path.c_str()) == 1) {
-        rights.acl_.reset(acl_get_file(path.c_str(), ACL_TYPE_ACCESS));
+    // One that says no more than the mode is not kept.
+    if (object.HoldsContents() && object.Attribute(kAcl)) {
+        rights.acl_.reset(acl_get_file(object.ProcPath().c_str(), ACL_TYPE_ACCESS));
         if (rights.acl_) DropExecution(rights.acl_.get());
     }
     return rights;
@@ -50,10 +50,11 @@ Rights Rights::Of(const Inode& object, mode_t mode) {
 }
 
 void Rights::Give(const File& file) const {
+    const struct stat now = file.Status();
     mode_t mode = mode_;
-    bool given = ::fchown(file.fd(), owner_, group_) == 0;
-    if (!given && ::fchown(file.fd(), static_cast<uid_t>(-1), group_) != 0 &&
-        file.Status().st_gid != group_) {
+    const bool owned = now.st_uid == owner_ && now.st_gid == group_;
+    if (!owned && ::fchown(file.fd(), owner_, group_) != 0 &&
+        ::fchown(file.fd(), static_cast<uid_t>(-1), group_) != 0 && now.st_gid != group_) {
         // Its group is another one, whose members are none of the object's.
         mode &= ~kGroupBits;
     } else if (acl_ && acl_set_fd(file.fd(), acl_.get()) == 0 && !cut_) {

@@ -22,6 +22,10 @@ constexpr std::size_t kNameMax = 255;
 // The longest name that is used unchanged.
 constexpr std::size_t kUnchangedMax = kNameMax - kStreamSuffix.size();
 
+bool MayBeAppleDouble(const struct stat& info) {
+    return S_ISREG(info.st_mode) && info.st_size >= static_cast<off_t>(AppleDoubleHeader::kSize);
+}
+
 bool HasColon(const std::string& name) { return name.find(':') != std::string::npos; }
 
 class Finder {
@@ -41,6 +45,9 @@ class Finder {
             sidecars_.problem = failure;
         }
         if (!sidecars_.ea_dir) return std::move(sidecars_);
+        if (services == Sidecars::Services::kFind || directory_.listed()) {
+            (void)sidecars_.ea_dir->EntriesAtFirst();
+        }
         if (keeping != Keeping::kAppleDouble) FindFiles(keeping);
         FindInFolder();
         if (services == Sidecars::Services::kFind) FindServices();
@@ -51,6 +58,7 @@ class Finder {
     using Found = Sidecars::Found;
 
     static std::optional<Found> Look(const DirectoryRef& directory, const std::string& name) {
+        if (!directory->MayHave(name)) return std::nullopt;
         const auto info = directory->StatusOf(name);
         return info ? std::optional(Found{directory, name, *info}) : std::nullopt;
     }
@@ -59,8 +67,10 @@ class Finder {
         const std::string name = AppleDoubleName(name_);
         if (name.empty()) return;
         // Its access time says something, and is taken before anybody looks into it.
-        const auto found = Look(directory_.shared_from_this(), name);
-        if (found && IsAppleDouble(directory_, name)) sidecars_.apple_double = found;
+        auto found = Look(directory_.shared_from_this(), name);
+        if (!found || !MayBeAppleDouble(found->info)) return;
+        found->file = tool::FindAppleDouble(directory_, name);
+        if (found->file) sidecars_.apple_double = std::move(found);
     }
 
     void FindFiles(Keeping keeping) {
@@ -74,10 +84,10 @@ class Finder {
     }
 
     void FindInFolder() {
-        const auto info = sidecars_.ea_dir->StatusOf(name_);
-        if (!info) return;
-        if (S_ISLNK(info->st_mode)) sidecars_.others.push_back({sidecars_.ea_dir, name_, *info});
-        if (!S_ISDIR(info->st_mode)) return;  // perhaps a file of another object
+        const auto found = Look(sidecars_.ea_dir, name_);
+        if (!found) return;
+        if (S_ISLNK(found->info.st_mode)) sidecars_.others.push_back(*found);
+        if (!S_ISDIR(found->info.st_mode)) return;  // perhaps a file of another object
         sidecars_.folder = sidecars_.ea_dir->OpenIn(name_);
         AddFolder(sidecars_.folder, "/");
     }
@@ -112,18 +122,13 @@ class Finder {
 
     // "NAME@KIND". Both may have an '@': it belongs to the object with the longest name.
     void FindServices() {
-        const auto& all = sidecars_.ea_dir->EntriesAtFirst();
-        const std::string prefix = derived_ + '@';
-        auto entry = std::lower_bound(
-            all.begin(), all.end(), prefix,
-            [](const Directory::Entry& one, const std::string& name) { return one.name < name; });
-        for (; entry != all.end() && entry->name.starts_with(prefix); ++entry) {
-            const std::string kind = entry->name.substr(derived_.size());
+        for (const std::string& name : sidecars_.ea_dir->NamesAtFirst(derived_ + '@')) {
+            const std::string kind = name.substr(derived_.size());
             if (kind == kStreamSuffix || kind == kResourceSuffix || kind == kResourceCopySuffix) {
                 continue;
             }
-            if (BelongsToALongerName(entry->name)) continue;
-            const auto found = Look(sidecars_.ea_dir, entry->name);
+            if (BelongsToALongerName(name)) continue;
+            const auto found = Look(sidecars_.ea_dir, name);
             if (!found) continue;
             if (found->regular()) {
                 sidecars_.services.push_back({*found, kind});
@@ -136,7 +141,7 @@ class Finder {
     bool BelongsToALongerName(const std::string& name) const {
         for (std::size_t at = name.find('@', derived_.size() + 1); at != std::string::npos;
              at = name.find('@', at + 1)) {
-            if (directory_.Has(name.substr(0, at))) return true;
+            if (directory_.HadAtFirst(name.substr(0, at))) return true;
         }
         // A folder of an object with an '@' in its name.
         return S_ISDIR(sidecars_.ea_dir->StatusOf(name).value_or(kNoStatus).st_mode) &&
@@ -188,18 +193,20 @@ std::string AppleDoubleName(const std::string& name) {
     return std::string(kAppleDoublePrefix) + name;
 }
 
-bool IsAppleDouble(const Directory& directory, const std::string& name) {
-    const auto info = directory.StatusOf(name);
-    if (!info || !S_ISREG(info->st_mode) ||
-        info->st_size < static_cast<off_t>(AppleDoubleHeader::kSize)) {
-        return false;
-    }
-    const auto file = directory.FindFile(name, O_RDONLY);
-    if (!file) return false;
+WholeFile FindAppleDouble(const Directory& directory, const std::string& name) {
+    WholeFile file = directory.FindFile(name, O_RDONLY);
+    if (!file) return nullptr;
     const Bytes head = file->Read(0, AppleDoubleHeader::kSize);
     BeReader in(head);
     const AppleDoubleHeader header = DecodeAppleDoubleHeader(in);
-    return in.ok() && header.magic == kAppleDoubleMagic && header.version == kAppleDoubleVersion2;
+    const bool valid =
+        in.ok() && header.magic == kAppleDoubleMagic && header.version == kAppleDoubleVersion2;
+    return valid ? file : nullptr;
+}
+
+bool IsAppleDouble(const Directory& directory, const std::string& name) {
+    const auto info = directory.StatusOf(name);
+    return info && MayBeAppleDouble(*info) && FindAppleDouble(directory, name) != nullptr;
 }
 
 bool IsMetadata(const Directory& directory, const Directory::Entry& entry, int type) {
@@ -208,11 +215,11 @@ bool IsMetadata(const Directory& directory, const Directory::Entry& entry, int t
     if (!S_ISREG(entry.type) || !entry.name.starts_with(kAppleDoublePrefix)) return false;
     if (keeping != Keeping::kAppleDouble && keeping != Keeping::kEaDirectory) return false;
     const std::string object = entry.name.substr(kAppleDoublePrefix.size());
-    return !object.empty() && directory.Has(object) && IsAppleDouble(directory, entry.name);
+    return !object.empty() && directory.HadAtFirst(object) && IsAppleDouble(directory, entry.name);
 }
 
 std::vector<Directory::Entry> ObjectsIn(const DirectoryRef& directory) {
-    std::vector<Directory::Entry> entries = directory->Entries();
+    std::vector<Directory::Entry> entries = directory->EntriesAtFirst();
     const int type = ReadableType(ObjectAt({directory, kEaDirName}, nullptr).type);
     std::erase_if(entries, [&](const Directory::Entry& entry) {
         return IsMetadata(*directory, entry, type);
@@ -244,20 +251,25 @@ void RequireOwnNames(const Object& object, const Sidecars& sidecars) {
     if (sidecars.AnyByName()) RequireOwnNames(object);
 }
 
-bool BelongsToAnObject(const Directory& directory, const std::string& name) {
-    if (directory.Has(name)) return true;
+std::vector<std::string> MayBelongTo(const Directory& directory, const std::string& name) {
+    std::vector<std::string> objects;
+    if (directory.Has(name)) objects.push_back(name);
     for (std::size_t at = name.find('@'); at != std::string::npos; at = name.find('@', at + 1)) {
         const std::string object = name.substr(0, at);
         if (object.empty()) continue;
-        if (directory.Has(object)) return true;
+        if (directory.Has(object)) objects.push_back(object);
         if (object.size() != kUnchangedMax) continue;
         for (const Directory::Entry& entry : directory.Entries()) {
             if (entry.name.size() > kUnchangedMax && NameInEaDirectory(entry.name) == object) {
-                return true;
+                objects.push_back(entry.name);
             }
         }
     }
-    return false;
+    return objects;
+}
+
+bool BelongsToAnObject(const Directory& directory, const std::string& name) {
+    return !MayBelongTo(directory, name).empty();
 }
 
 std::vector<LeftOver> FindLeftOver(const Directory& directory, const Directory& ea_dir) {
@@ -266,6 +278,7 @@ std::vector<LeftOver> FindLeftOver(const Directory& directory, const Directory& 
         for (const Directory::Entry& entry : in.Entries()) {
             const bool top = prefix.empty();
             if (top && entry.name == kCoverName && S_ISREG(entry.type)) continue;
+            if (entry.name.starts_with(kOwnPrefix)) continue;
             if (top && BelongsToAnObject(directory, entry.name)) continue;
             const auto info = in.StatusOf(entry.name);
             if (!info) continue;
@@ -281,9 +294,9 @@ std::vector<LeftOver> FindLeftOver(const Directory& directory, const Directory& 
 }
 
 void RemoveEaDirectoryIfEmpty(const Directory& directory) {
-    if (directory.RemoveEmpty(kEaDirName)) return;
-    const DirectoryRef ea_dir = directory.FindIn(kEaDirName);
-    if (!ea_dir) return;
+    if (!directory.MayHave(kEaDirName) || directory.RemoveEmpty(kEaDirName)) return;
+    const DirectoryRef ea_dir = directory.FindAgain(kEaDirName);
+    if (!ea_dir || !ea_dir->MayHave(kCoverName)) return;
     const auto cover = ea_dir->StatusOf(kCoverName);
     if (!cover || !S_ISREG(cover->st_mode) || ea_dir->Entries().size() != 1) return;
     (void)ea_dir->RemoveFile(kCoverName);
@@ -291,11 +304,15 @@ void RemoveEaDirectoryIfEmpty(const Directory& directory) {
 }
 
 DirectoryRef NeedEaDirectory(const Directory& directory) {
-    if (DirectoryRef found = directory.FindAgain(kEaDirName)) return found;
+    DirectoryRef found = directory.FindAgain(kEaDirName);
+    // Services tidy up as well.
+    if (found && found->Status().st_nlink > 0) return found;
     const ErrorMark mark;
     if (MAVOEAMKDir(0, directory.ProcPath(kEaDirName).c_str()) != 0) {
         throw LibraryFailure(directory.PathOf(kEaDirName), mark.Get());
     }
+    directory.NoteCome(kEaDirName);
+    directory.Forget(kEaDirName);
     if (DirectoryRef made = directory.FindAgain(kEaDirName)) return made;
     throw SystemFailure(directory.PathOf(kEaDirName), ENOENT);
 }

@@ -8,17 +8,21 @@
 #include <vector>
 
 #include "tools/place/volume.h"
+#include "tools/store/content.h"
 
 namespace mavoea::tool {
 
 inline constexpr const char* kEaDirName = "@eaDir";
 inline constexpr const char* kCoverName = ".cover";
 
+// By the lists of the object's directory and its EA directory, where those have been taken: what
+// comes later may be missed, and what has gone is not there.
 struct Sidecars {
     struct Found {
         DirectoryRef directory;
         std::string name;
         struct stat info;
+        WholeFile file = {};  // for those that have been opened already
 
         std::string path() const { return directory->PathOf(name); }
         bool regular() const { return S_ISREG(info.st_mode); }
@@ -28,7 +32,8 @@ struct Sidecars {
         std::string name;  // "@KIND", or "/NAME" in the folder of the object's name
     };
 
-    // Looking for what other services keep takes a list of the whole EA directory.
+    // Looking for what other services keep takes a list of the whole EA directory, which is taken
+    // anyway where the object's directory has been listed.
     enum class Services { kLeaveOut, kFind };
 
     // Throws Failure. An "@eaDir" that is a symbolic link, or may not be looked into, is a
@@ -65,12 +70,14 @@ std::string AppleDoubleName(const std::string& name);
 
 // Whether `name` is a valid "._" file of version 2. Throws Failure.
 bool IsAppleDouble(const Directory& directory, const std::string& name);
+// The file, if it is one; null when it is not. A Failure for what is no regular file.
+WholeFile FindAppleDouble(const Directory& directory, const std::string& name);
 
 // Whether an entry of a directory is metadata of an object in it, on volumes of that type: "@eaDir"
 // and "._" files whose object is there. Throws Failure.
 bool IsMetadata(const Directory& directory, const Directory::Entry& entry, int type);
 
-// What in a directory is an object, sorted by name. Throws Failure.
+// What in a directory is an object, sorted by name, when it was listed first. Throws Failure.
 std::vector<Directory::Entry> ObjectsIn(const DirectoryRef& directory);
 
 // Another object of the directory whose metadata would have the same names in the EA directory.
@@ -81,7 +88,8 @@ void RequireOwnNames(const Object& object, const Sidecars& sidecars);
 // The same before anything is written.
 void RequireOwnNames(const Object& object);
 
-// Whether the name of an entry of an EA directory is that of metadata of any object in `directory`.
+// The objects in `directory` of whose metadata an entry of its EA directory may have the name.
+std::vector<std::string> MayBelongTo(const Directory& directory, const std::string& name);
 bool BelongsToAnObject(const Directory& directory, const std::string& name);
 
 // Something in an EA directory that belongs to no object.
@@ -89,7 +97,8 @@ struct LeftOver {
     Sidecars::Found found;
     std::string path;  // below the EA directory
 };
-// All such files, and links and the like; a ".cover" is none. Throws Failure.
+// All such files, and links and the like; a ".cover" is none, nor is what this tool has given a
+// name of its own. Throws Failure.
 std::vector<LeftOver> FindLeftOver(const Directory& directory, const Directory& ea_dir);
 
 // Removes an "@eaDir" in which nothing is left but a ".cover".

@@ -26,12 +26,12 @@ constexpr const char* kMoveAway = "see what it is, and move it away";
 
 // ---- Files --------------------------------------------------------------------------------------
 
-// The files of an object, made under temporary names and given theirs when all of them are whole.
+// The files of an object, which get their names when all of them are whole.
 class NewFiles {
  public:
+    // `object` outlives it.
     NewFiles(const Inode& object, const WriteOptions& options)
-        : rights_(options.mode ? Rights::Of(object, *options.mode) : Rights::Of(object)),
-          durability_(options.durability) {}
+        : object_(object), mode_(options.mode), durability_(options.durability) {}
 
     // `holder`: the file that all of it was read from, which is left alone if it is this one.
     void Add(const DirectoryRef& directory, const std::string& name, const Pieces& pieces,
@@ -42,13 +42,13 @@ class NewFiles {
             return;
         }
         RequireFree(target);
-        auto file = std::make_unique<TemporaryFile>(target);
-        std::uint64_t end = 0;
-        for (const Content& piece : pieces) end = WriteTo(file->file(), end, piece);
-        Compare(file->file(), pieces);
-        rights_.Give(file->file());
-        if (durability_ == Durability::kNow) file->file().Sync();
-        files_.push_back({target, std::move(file)});
+        auto temporary = std::make_unique<TemporaryFile>(target);
+        const File& file = temporary->file();
+        Fill(file, pieces);
+        if (!rights_) rights_ = mode_ ? Rights::Of(object_, *mode_) : Rights::Of(object_);
+        rights_->Give(file);
+        if (durability_ == Durability::kNow) file.Sync();
+        files_.push_back({target, std::move(temporary)});
     }
 
     void GiveNames() {
@@ -66,6 +66,16 @@ class NewFiles {
         });
     }
 
+    // The last one that was added, as it was read back.
+    Found Last() const {
+        const New& file = files_.back();
+        if (!file.temporary) {
+            return {file.target.directory, file.target.name, StatusOf(file.target)};
+        }
+        const WholeFile& whole = file.temporary->shared_file();
+        return {file.target.directory, file.target.name, whole->Status(), whole};
+    }
+
  private:
     struct New {
         Place target;
@@ -74,6 +84,7 @@ class NewFiles {
 
     // What another process is changing is left to it.
     static void RequireFree(const Place& target) {
+        if (!target.directory->MayHave(target.name)) return;
         const auto info = target.Status();
         if (!info) return;
         if (S_ISLNK(info->st_mode)) return;  // goes by the new file's name
@@ -84,19 +95,42 @@ class NewFiles {
         if (file) LockFile(*file, Access::kWrite);
     }
 
+    // What is small is put together in memory, and written and read back at once.
+    static void Fill(const File& file, const Pieces& pieces) {
+        std::uint64_t size = 0;
+        for (const Content& piece : pieces) size += piece.size();
+        if (size > kSmallFile) {
+            std::uint64_t end = 0;
+            for (const Content& piece : pieces) end = WriteTo(file, end, piece);
+            return Compare(file, pieces);
+        }
+        Bytes bytes;
+        bytes.reserve(static_cast<std::size_t>(size));
+        for (const Content& piece : pieces) {
+            const Bytes part = piece.All();
+            bytes.insert(bytes.end(), part.begin(), part.end());
+        }
+        file.Write(0, bytes);
+        if (!file.KeepContents(size) || file.Read(0, size) != bytes) throw Differs(file);
+    }
+
     static void Compare(const File& written, const Pieces& pieces) {
         std::uint64_t at = 0;
         const auto file = std::shared_ptr<const File>(&written, [](const File*) {});
         for (const Content& piece : pieces) {
-            if (FirstDifference(piece, Content(file, at, piece.size()))) {
-                throw Failure(kFailed, written.path(), "what was written is not what is read back",
-                              "check the disk");
-            }
+            if (FirstDifference(piece, Content(file, at, piece.size()))) throw Differs(written);
             at += piece.size();
         }
     }
 
-    Rights rights_;
+    static Failure Differs(const File& written) {
+        return {kFailed, written.path(), "what was written is not what is read back",
+                "check the disk"};
+    }
+
+    const Inode& object_;
+    std::optional<mode_t> mode_;
+    std::optional<Rights> rights_;
     Durability durability_;
     std::vector<New> files_;
 };
@@ -107,9 +141,9 @@ bool Contains(const std::vector<std::string>& paths, const std::string& path) {
 
 std::string HolderOf(const WholeFile& whole) { return whole ? whole->path() : std::string(); }
 
-void WriteMarks(const Object& to, const Inode& inode, const Metadata& metadata) {
+void WriteMarks(const Object& to, const Inode& inode, const Metadata& metadata, bool is_new) {
     if (!inode.HoldsContents()) return;
-    if (!LocksByMode(to)) SetLockFlag(inode, metadata.locked);
+    if (!LocksByMode(to) && (metadata.locked || !is_new)) SetLockFlag(inode, metadata.locked);
     if (metadata.hidden) SetHidden(inode, true);
     SetArchived(inode);
 }
@@ -187,6 +221,26 @@ void AddServices(const Object& to, const Metadata& metadata, NewFiles* files, Wr
     }
 }
 
+// A file of that name that is no AppleDouble file is somebody's own.
+void RequireAppleDoublePlace(const Object& to, const std::string& name) {
+    if (!to.place.directory->MayHave(name)) return;
+    const auto info = to.place.directory->StatusOf(name);
+    if (!info || (S_ISREG(info->st_mode) && info->st_size == 0)) return;
+    if (IsAppleDouble(*to.place.directory, name)) return;
+    throw Failure(kFailed, to.place.directory->PathOf(name),
+                  "it is in the way of metadata, and is none", kMoveAway);
+}
+
+void RemoveOld(const Object& to, const Sidecars& old, const NewFiles& files) {
+    if (!old.Any()) return;
+    std::vector<Found> left;
+    for (const Found& found : old.Files()) {
+        if (!files.Has(found)) left.push_back(found);
+    }
+    RemoveFiles(left);
+    RemoveEmptyDirectories(to, old);
+}
+
 // Everything but what services keep.
 void MissAll(Metadata* metadata, const std::string& reason, std::vector<Missing>* missing) {
     for (const Missing& one : ItemsOf(*metadata, reason)) missing->push_back(one);
@@ -241,33 +295,9 @@ class AppleDoubleWriter final : public Writer {
         return metadata;
     }
 
-    Written Write(const Object& to, const Metadata& fitting,
-                  const WriteOptions& options) const override {
-        Written written;
-        const auto inode = Inode::Open(to.place);
-        const Sidecars old = Sidecars::Find(to, Sidecars::Services::kFind);
-        NewFiles files(*inode, options);
-        AddServices(to, fitting, &files, &written);
-        if (const auto pieces = PiecesOf(fitting); !pieces.empty()) {
-            const std::string name = AppleDoubleName(to.place.name);
-            RequireMetadata(to, name);
-            files.Add(to.place.directory, name, pieces, HolderOf(fitting.whole_apple_double));
-        }
-        if (fitting.whole_apple_double) written.whole.insert(fitting.whole_apple_double->path());
-        files.GiveNames();
-        if (options.old == Old::kRemoved) RemoveOld(to, old, files);
-        WriteMarks(to, *inode, fitting);
-        return written;
-    }
-
-    static void RemoveOld(const Object& to, const Sidecars& old, const NewFiles& files) {
-        std::vector<Found> left;
-        for (const Found& found : old.Files()) {
-            if (!files.Has(found)) left.push_back(found);
-        }
-        if (!old.Any()) return;
-        RemoveFiles(left);
-        RemoveEmptyDirectories(to, old);
+ protected:
+    std::vector<Part> PartsOf(const Metadata& fitting) const override {
+        return {{&Sidecars::apple_double, "", PiecesOf(fitting), fitting.whole_apple_double}};
     }
 
  private:
@@ -293,15 +323,6 @@ class AppleDoubleWriter final : public Writer {
         if (metadata.finder_info || metadata.fork) return EncodePlain(metadata);
         return {};
     }
-
-    // A file of that name that is no AppleDouble file is somebody's own.
-    static void RequireMetadata(const Object& to, const std::string& name) {
-        const auto info = to.place.directory->StatusOf(name);
-        if (!info || (S_ISREG(info->st_mode) && info->st_size == 0)) return;
-        if (IsAppleDouble(*to.place.directory, name)) return;
-        throw Failure(kFailed, to.place.directory->PathOf(name),
-                      "it is in the way of metadata, and is none", kMoveAway);
-    }
 };
 
 // ---- Volumes that keep an EA directory ----------------------------------------------------------
@@ -319,43 +340,18 @@ class EaDirectoryWriter : public Writer {
         return metadata;
     }
 
-    Written Write(const Object& to, const Metadata& fitting,
-                  const WriteOptions& options) const override {
-        Written written;
-        const auto inode = Inode::Open(to.place);
-        const Sidecars old = Sidecars::Find(to, Sidecars::Services::kFind);
-        const Pieces stream = StreamOf(fitting);
-        const Pieces resource = ResourceOf(fitting);
-        if (!stream.empty() || !resource.empty() || !fitting.services.empty()) {
-            RequireOwnNames(to);
-        } else {
-            RequireOwnNames(to, old);
-        }
-        NewFiles files(*inode, options);
-        AddServices(to, fitting, &files, &written);
-        const std::string name = NameInEaDirectory(to.place.name);
-        const auto add = [&](const char* kind, const Pieces& pieces, const WholeFile& whole) {
-            if (pieces.empty()) return;
-            files.Add(NeedEaDirectory(*to.place.directory), name + kind, pieces, HolderOf(whole));
-        };
-        add("@" MAVOEA_KIND_STREAM, stream, fitting.whole_stream);
-        add("@" MAVOEA_KIND_RESOURCE, resource, fitting.whole_resource);
-        for (const WholeFile& whole : {fitting.whole_stream, fitting.whole_resource}) {
-            if (whole) written.whole.insert(whole->path());
-        }
-        files.GiveNames();
-        if (options.old == Old::kRemoved) AppleDoubleWriter::RemoveOld(to, old, files);
-        WriteRecord(*inode, fitting, &written);
-        WriteMarks(to, *inode, fitting);
-        return written;
+ protected:
+    std::vector<Part> PartsOf(const Metadata& fitting) const override {
+        return {
+            {&Sidecars::stream, "@" MAVOEA_KIND_STREAM, StreamOf(fitting), fitting.whole_stream},
+            {&Sidecars::resource, "@" MAVOEA_KIND_RESOURCE, ResourceOf(fitting),
+             fitting.whole_resource}};
     }
 
- protected:
     virtual void FitRecord(Metadata* metadata) const { metadata->whole_record.reset(); }
     virtual void FitHead(Metadata* metadata, std::vector<Missing>* missing) const {
         FitEntries(metadata, RoomInHead, "a resource file", missing);
     }
-    virtual void WriteRecord(const Inode&, const Metadata&, Written*) const {}
     // Whether an entry goes into the resource file.
     virtual bool GoesIntoHead(const Metadata&) const { return true; }
 
@@ -438,8 +434,8 @@ class FileEaWriter final : public EaDirectoryWriter {
         });
     }
 
-    void WriteRecord(const Inode& inode, const Metadata& metadata,
-                     Written* written) const override {
+    void WriteToObject(const Inode& inode, const Metadata& metadata,
+                       Written* written) const override {
         if (!inode.HoldsContents()) return;
         Metadata record;
         record.finder_info = metadata.finder_info;
@@ -482,26 +478,19 @@ class AttributeWriter final : public Writer {
         return metadata;
     }
 
-    Written Write(const Object& to, const Metadata& fitting,
-                  const WriteOptions& options) const override {
-        Written written;
-        const auto inode = Inode::Open(to.place);
-        const Sidecars old = Sidecars::Find(to, Sidecars::Services::kFind);
-        if (!fitting.services.empty()) RequireOwnNames(to);
-        NewFiles files(*inode, options);
-        AddServices(to, fitting, &files, &written);
-        files.GiveNames();
-        if (options.old == Old::kRemoved) AppleDoubleWriter::RemoveOld(to, old, files);
+ protected:
+    std::vector<Part> PartsOf(const Metadata&) const override { return {}; }
+
+    void WriteToObject(const Inode& inode, const Metadata& fitting,
+                       Written* written) const override {
         for (const Metadata::Attribute& attribute : fitting.attributes) {
-            Set(*inode, NameOfAttribute(attribute.name), attribute.name, attribute.value, &written);
+            Set(inode, NameOfAttribute(attribute.name), attribute.name, attribute.value, written);
         }
         if (fitting.finder_info) {
-            Set(*inode, "Finder info", std::string(kFinderInfoName), fitting.finder_info->value,
-                &written);
+            Set(inode, "Finder info", std::string(kFinderInfoName), fitting.finder_info->value,
+                written);
         }
-        if (fitting.fork) WriteFork(*inode, fitting.fork->value, &written);
-        WriteMarks(to, *inode, fitting);
-        return written;
+        if (fitting.fork) WriteFork(inode, fitting.fork->value, written);
     }
 
  private:
@@ -561,6 +550,51 @@ const Writer& WriterFor(const Object& object) {
     throw NoStore(object);
 }
 
+void RequireUnlocked(const Sidecars& sidecars) {
+    for (const auto* one : {&sidecars.stream, &sidecars.resource, &sidecars.apple_double}) {
+        if (!*one || !(*one)->regular()) continue;
+        const auto file = (*one)->directory->FindFile((*one)->name, O_RDWR);
+        if (file) LockFile(*file, Access::kWrite);
+    }
+}
+
+Written Writer::Write(const Object& to, const Inode& inode, const Metadata& fitting,
+                      const WriteOptions& options) const {
+    Written written;
+    const Sidecars old = Sidecars::Find(to, Sidecars::Services::kFind);
+    std::vector<Part> parts = PartsOf(fitting);
+    std::erase_if(parts, [](const Part& part) { return part.pieces.empty(); });
+    if (!parts.empty() || !fitting.services.empty()) {
+        RequireOwnNames(to);
+    } else {
+        RequireOwnNames(to, old);
+    }
+    NewFiles files(inode, options);
+    AddServices(to, fitting, &files, &written);
+    Sidecars beside;
+    for (const Part& part : parts) {
+        if (part.kind.empty()) {
+            const std::string name = AppleDoubleName(to.place.name);
+            RequireAppleDoublePlace(to, name);
+            files.Add(to.place.directory, name, part.pieces, HolderOf(part.whole));
+        } else {
+            if (!beside.ea_dir) beside.ea_dir = NeedEaDirectory(*to.place.directory);
+            files.Add(beside.ea_dir, NameInEaDirectory(to.place.name) + part.kind, part.pieces,
+                      HolderOf(part.whole));
+        }
+        beside.*part.place = files.Last();
+        if (part.whole) written.whole.insert(part.whole->path());
+    }
+    files.GiveNames();
+    if (options.old == Old::kRemoved) RemoveOld(to, old, files);
+    WriteToObject(inode, fitting, &written);
+    WriteMarks(to, inode, fitting, options.is_new);
+    // What else there is, is looked for by name.
+    const bool alone = fitting.services.empty() && !old.problem && !old.Any();
+    written.beside = alone ? std::move(beside) : Sidecars::Find(to, Sidecars::Services::kFind);
+    return written;
+}
+
 void RequirePlace(const Object& to) {
     if (to.keeping() != Keeping::kAppleDouble || !AppleDoubleName(to.place.name).empty()) return;
     throw Failure(kFailed, to.path(), "its name or path is too long to have metadata there",
@@ -573,7 +607,8 @@ bool CopyLeftOver(const LeftOver& file, const DirectoryRef& directory) {
     const Place to = NeedFolders(NeedEaDirectory(*directory), file.path);
     const auto source = file.found.directory->FindFile(file.found.name, O_RDONLY);
     if (!source || to.directory->Has(to.name)) return false;
-    NewFiles files(*Inode::Of(*source), {.durability = Durability::kLater});
+    const auto inode = Inode::Of(source);
+    NewFiles files(*inode, {.durability = Durability::kLater});
     files.Add(to.directory, to.name, {Content(source, 0, source->Size())});
     files.GiveNames();
     return true;

@@ -7,6 +7,7 @@
 #include <string>
 #include <vector>
 
+#include "tools/store/encoding.h"
 #include "tools/store/metadata.h"
 #include "tools/store/sidecars.h"
 
@@ -17,6 +18,8 @@ struct Written {
     std::vector<Missing> missing;
     // Files of the source of which every byte is there.
     std::set<std::string> whole;
+    // What lies beside the object now. Files that were written are known by what was read back.
+    Sidecars beside;
 };
 
 // Whether what has been written is on disk when a writer returns, or is left to who syncs the
@@ -30,6 +33,9 @@ struct WriteOptions {
     Durability durability = Durability::kNow;
     Old old = Old::kRemoved;
     std::optional<mode_t> mode = {};  // that the object will have, if it is not yet the one it has
+
+    // The object has just been made by this process: it has no marks yet.
+    bool is_new = false;
 };
 
 class Writer {
@@ -40,15 +46,31 @@ class Writer {
     virtual Metadata Fit(Metadata metadata, const Object& to,
                          std::vector<Missing>* missing) const = 0;
 
-    // Puts what fits beside `to`, an object that is there, and in its record, over what is there.
-    // Its marks are set. Throws Failure; what was there is then there still, or gone, but never
-    // half of anything.
-    virtual Written Write(const Object& to, const Metadata& fitting,
-                          const WriteOptions& options) const = 0;
+    // Puts what fits beside `to`, an object that is there and open as `inode`, and in its record,
+    // over what is there. Its marks are set. Throws Failure; what was there is then there still, or
+    // gone, but never half of anything.
+    Written Write(const Object& to, const Inode& inode, const Metadata& fitting,
+                  const WriteOptions& options) const;
+
+ protected:
+    // A file to be written.
+    struct Part {
+        std::optional<Sidecars::Found> Sidecars::*place;
+        std::string kind;  // "@KIND" in the EA directory; empty for the "._" file
+        Pieces pieces;
+        WholeFile whole;  // of the source: every byte of it is in the pieces
+    };
+    virtual std::vector<Part> PartsOf(const Metadata& fitting) const = 0;
+
+    // What is kept with the object itself.
+    virtual void WriteToObject(const Inode&, const Metadata&, Written*) const {}
 };
 
 // For volumes of a type; Failure for those that keep nothing.
 const Writer& WriterFor(const Object& object);
+
+// Failure when another process is changing any of the object's metadata files.
+void RequireUnlocked(const Sidecars& sidecars);
 
 // Failure when an object of such a name can have no metadata.
 void RequirePlace(const Object& to);

@@ -2,10 +2,14 @@
 #ifndef MAVOEA_TOOLS_TRANSFER_FILE_DATA_H_
 #define MAVOEA_TOOLS_TRANSFER_FILE_DATA_H_
 
+#include <sys/stat.h>
+
 #include <cstdint>
 #include <functional>
+#include <utility>
 
 #include "tools/place/file.h"
+#include "tools/transfer/manner.h"
 
 namespace mavoea::tool {
 
@@ -18,13 +22,33 @@ struct DataWatch {
     std::function<bool()> give_up = [] { return false; };
 };
 
-// Regular files; `to` is empty. Shares the blocks where both are on a file system that can, and
-// otherwise keeps holes as holes and, when all is there, reads both and compares them. Both throw
-// Failure.
-void CopyData(const File& from, const File& to, const DataWatch& watch);
+// Copies one file after the other, and remembers between which file systems blocks cannot be
+// shared. All members throw Failure.
+class FileData {
+ public:
+    FileData(DataWatch watch, Sparse sparse, Reflink reflink)
+        : watch_(std::move(watch)), sparse_(sparse), reflink_(reflink) {}
 
-// Whatever can be read, until it ends. `from` does not block.
-void CopyStream(const File& from, const File& to, const DataWatch& watch);
+    // A regular file; `to` is empty. Shares the blocks where both are on a file system that can;
+    // otherwise, when all is there, reads it back where `to` can be read, and compares.
+    void Copy(const File& from, const File& to);
+
+    // Whatever can be read, until it ends, into whatever can be written. `from` does not block.
+    void CopyStream(const File& from, const File& to);
+
+ private:
+    bool TryToShare(const File& from, const struct stat& info, const File& to);
+    bool TryToCopySmall(const File& from, const struct stat& info, const File& to);
+    void Ask(const File& from) const;
+
+    friend class LargeCopy;
+
+    DataWatch watch_;
+    Sparse sparse_;
+    Reflink reflink_;
+    std::pair<dev_t, dev_t> apart_{};  // file systems that share no blocks
+    Bytes buffer_;
+};
 
 }  // namespace mavoea::tool
 

@@ -10,6 +10,7 @@
 #include <cstring>
 #include <vector>
 
+#include "tools/say/job.h"
 #include "tools/say/messages.h"
 
 namespace mavoea::tool {
@@ -60,32 +61,37 @@ bool CopyOwner(const struct stat& info, const Inode& to) {
     return ::geteuid() == info.st_uid;
 }
 
-void UnlessRefused(const std::function<void()>& action) {
-    try {
-        action();
-    } catch (const SystemFailure& failure) {
-        if (!IsRefusal(failure.error())) throw;
-    }
-}
-
 // Where the list of attributes changes while libattr reads it, its functions read what nobody
 // wrote.
-void CopyAttributes(const Inode& from, const Inode& to,
+void CopyAttributes(const Inode& from, const Inode& to, const Manner& manner,
                     const std::function<bool(const std::string&)>& wanted) {
+    const bool insists = manner.insists && manner.keeps_attributes;
+    const auto unless_refused = [&](const auto& action) {
+        try {
+            action();
+        } catch (const SystemFailure& failure) {
+            if (insists) {
+                throw Refusal("setting attributes for " + Quoted(to.path()), failure.error());
+            }
+            if (!IsRefusal(failure.error())) throw;
+        }
+    };
     std::vector<std::string> names;
-    UnlessRefused([&] { names = from.AttributeNames(); });
+    unless_refused([&] { names = from.AttributeNames(); });
     for (const std::string& name : names) {
         Complaints unread;  // a broken /etc/xattr.conf
         // Those of permissions go with the ACL.
         if (attr_copy_action(name.c_str(), &unread) != 0 || !wanted(name)) continue;
-        UnlessRefused([&] {
+        if (!manner.keeps_attributes && !name.starts_with("user.")) continue;
+        unless_refused([&] {
             if (const auto value = from.Attribute(name)) to.SetAttribute(name, *value);
         });
     }
 }
 
 int CopyMode(const Subject& from, const Subject& to, error_context* context) {
-    if (from.fd >= 0 && to.fd >= 0) {
+    // Those of directories have default ACLs as well, which take a path.
+    if (from.fd >= 0 && to.fd >= 0 && !S_ISDIR(from.inode->info().st_mode)) {
         return perm_copy_fd(from.inode->path().c_str(), from.fd, to.inode->path().c_str(), to.fd,
                             context);
     }
@@ -95,11 +101,12 @@ int CopyMode(const Subject& from, const Subject& to, error_context* context) {
 }  // namespace
 
 std::optional<std::string> CopyPermissions(const Subject& from, const Subject& to,
+                                           const Manner& manner,
                                            const std::function<bool(const std::string&)>& wanted) {
     const struct stat& info = from.inode->info();
-    const bool owned = CopyOwner(info, *to.inode);
-    CopyAttributes(*from.inode, *to.inode, wanted);
-    if (S_ISLNK(info.st_mode)) return std::nullopt;
+    const bool owned = !manner.keeps_owner || CopyOwner(info, *to.inode);
+    CopyAttributes(*from.inode, *to.inode, manner, wanted);
+    if (S_ISLNK(info.st_mode) || !manner.keeps_mode) return std::nullopt;
 
     Complaints permissions;
     if (CopyMode(from, to, &permissions) != 0) {

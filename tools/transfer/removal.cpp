@@ -5,17 +5,18 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <optional>
-#include <vector>
+#include <utility>
 
-#include "tools/say/messages.h"
+#include "tools/say/job.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
 #include "tools/transfer/indexes.h"
-#include "tools/transfer/tree_copy.h"
 
 namespace mavoea::tool {
 namespace {
+
+// How many directories of a tree are open at a time; each may keep its EA directory open, too.
+constexpr std::size_t kMostOpen = 16;
 
 Failure HasNotGone(const std::string& path) {
     return {kFailed, path, "it has changed, or come, since its directory was carried",
@@ -35,20 +36,20 @@ class Beside {
         }
     }
 
-    void Remove(const MayGo& may_go) const {
-        if (shared_) return;
-        std::vector<Sidecars::Found> files;
-        std::optional<Failure> failure;
+    bool in_ea_directory() const { return sidecars_.ea_dir != nullptr; }
+
+    // Before anything goes.
+    void RequireMayGo(const MayGo& may_go) const {
+        if (shared_ || !may_go) return;
         for (const Sidecars::Found& file : sidecars_.Files()) {
-            if (S_ISDIR(file.info.st_mode) || may_go(file.info)) {
-                files.push_back(file);
-            } else {
-                failure = HasNotGone(file.path());
-            }
+            if (!S_ISDIR(file.info.st_mode) && !may_go(file.info)) throw HasNotGone(file.path());
         }
-        RemoveFiles(files);
-        RemoveEmptyDirectories(object_, sidecars_);
-        if (failure) throw Failure(*failure);
+    }
+
+    void Remove() const {
+        if (shared_) return;
+        RemoveFiles(sidecars_.Files());
+        if (sidecars_.folder) (void)sidecars_.ea_dir->RemoveEmpty(object_.place.name);
     }
 
  private:
@@ -59,99 +60,234 @@ class Beside {
 
 // An EA directory in which nothing belongs to an object any more.
 void RemoveEaDirectory(const Directory& inside, const MayGo& may_go) {
-    const auto info = inside.StatusOf(kEaDirName);
-    if (!info || !S_ISDIR(info->st_mode)) return;
-    const DirectoryRef ea_dir = inside.OpenIn(kEaDirName);
     const auto remove = [&](const auto& self, const Directory& in) -> void {
         for (const Directory::Entry& entry : in.Entries()) {
-            const auto now = in.StatusOf(entry.name);
-            if (!now) continue;
-            if (S_ISDIR(now->st_mode)) {
-                self(self, *in.OpenIn(entry.name));
+            if (S_ISDIR(entry.type)) {
+                if (const DirectoryRef folder = in.FindIn(entry.name)) self(self, *folder);
                 (void)in.RemoveEmpty(entry.name);
-            } else if (entry.name == kCoverName || may_go(*now)) {
-                (void)in.RemoveFile(entry.name);
-            } else {
-                throw HasNotGone(in.PathOf(entry.name));
+                continue;
             }
+            if (may_go && entry.name != kCoverName) {
+                const auto now = in.StatusOf(entry.name);
+                if (now && !may_go(*now)) throw HasNotGone(in.PathOf(entry.name));
+            }
+            (void)in.RemoveFile(entry.name);
         }
     };
-    remove(remove, *ea_dir);
+    remove(remove, *inside.OpenIn(kEaDirName));
     (void)inside.RemoveEmpty(kEaDirName);
+}
+
+// The indexes know nothing of what no path leads to.
+void ReportRemovedAt(const Place& place) {
+    if (place.directory->HasLocation(place.name)) ReportRemoved(place.location());
+}
+
+// Both return whether an EA directory is beside it, in which nothing may be left.
+bool RemoveFileAt(const Object& object, bool alone, const MayGo& may_go) {
+    const Place& place = object.place;
+    const Beside beside(object, alone);
+    if (may_go && !may_go(StatusOf(place))) throw HasNotGone(place.path());
+    beside.RequireMayGo(may_go);
+    // Data first: without it, metadata is of no use to anybody.
+    if (::unlinkat(place.directory->fd(), place.name.c_str(), 0) != 0) {
+        throw SystemFailure(place.path(), errno);
+    }
+    beside.Remove();
+    ReportRemovedAt(place);
+    return beside.in_ea_directory();
+}
+
+// `inside` is null where nobody may look into it.
+bool RemoveDirectoryAt(const Object& object, const Directory* inside, bool alone,
+                       const MayGo& may_go) {
+    const Place& place = object.place;
+    const Beside beside(object, alone);
+    beside.RequireMayGo(may_go);
+    const auto ea_dir = inside == nullptr ? std::nullopt : inside->StatusOf(kEaDirName);
+    if (ea_dir && S_ISDIR(ea_dir->st_mode) && !inside->RemoveEmpty(kEaDirName)) {
+        for (const Directory::Entry& entry : inside->Entries()) {
+            if (entry.name != kEaDirName) throw SystemFailure(place.path(), ENOTEMPTY);
+        }
+        RemoveEaDirectory(*inside, may_go);
+    }
+    if (::unlinkat(place.directory->fd(), place.name.c_str(), AT_REMOVEDIR) != 0) {
+        throw SystemFailure(place.path(), errno);
+    }
+    beside.Remove();
+    ReportRemovedAt(place);
+    return beside.in_ea_directory();
 }
 
 }  // namespace
 
 void RemoveObject(const Object& object, bool alone, const MayGo& may_go) {
-    const Beside beside(object, alone);
-    if (!may_go(StatusOf(object.place))) throw HasNotGone(object.path());
-    // Data first: without it, metadata is of no use to anybody.
-    if (!object.place.directory->RemoveFile(object.place.name)) {
-        throw SystemFailure(object.path(), ENOENT);
-    }
-    beside.Remove(may_go);
-    ReportRemoved(object.path());
+    if (RemoveFileAt(object, alone, may_go)) RemoveEaDirectoryIfEmpty(*object.place.directory);
 }
 
 void RemoveEmptyDirectory(const Object& object, bool alone, const MayGo& may_go) {
-    const Beside beside(object, alone);
-    {
-        const DirectoryRef inside = object.place.directory->OpenIn(object.place.name);
-        for (const Directory::Entry& entry : inside->Entries()) {
-            if (entry.name != kEaDirName || !S_ISDIR(entry.type)) {
-                throw SystemFailure(object.path(), ENOTEMPTY);
-            }
-        }
-        RemoveEaDirectory(*inside, may_go);
+    const DirectoryRef inside = object.place.Open();
+    if (RemoveDirectoryAt(object, inside.get(), alone, may_go)) {
+        RemoveEaDirectoryIfEmpty(*object.place.directory);
     }
-    if (::unlinkat(object.place.directory->fd(), object.place.name.c_str(), AT_REMOVEDIR) != 0) {
-        throw SystemFailure(object.path(), errno);
-    }
-    beside.Remove(may_go);
-    ReportRemoved(object.path());
 }
 
-void RemoveCarried(const Object& object, const MayGo& was_carried) {
-    struct Level {
-        Object object;
-        DirectoryRef inside;
-        std::vector<Directory::Entry> entries;
-        std::size_t next = 0;
-    };
-    std::optional<Failure> failure;
-    std::vector<Level> levels;
-    const auto begin = [&](const Object& one) {
-        if (!S_ISDIR(StatusOf(one.place).st_mode)) {
-            return RemoveObject(one, levels.empty(), was_carried);
-        }
-        const DirectoryRef inside = one.place.directory->OpenIn(one.place.name);
-        levels.push_back({one, inside, ObjectsIn(inside)});
-    };
-    const auto guard = [&](auto work) {
-        try {
-            work();
-        } catch (const Failure& problem) {
-            if (!failure) failure = problem;
-        }
-    };
-    guard([&] { begin(object); });
-    while (!levels.empty()) {
-        Level& level = levels.back();
-        if (level.next < level.entries.size()) {
-            const Place place = {level.inside, level.entries[level.next++].name};
-            guard([&] {
-                const auto info = place.Status();
-                if (info) begin(ObjectAt(place, &*info));
-            });
-        } else {
-            const Object done = level.object;
-            levels.pop_back();
-            if (!failure) {
-                guard([&] { RemoveEmptyDirectory(done, levels.empty(), was_carried); });
-            }
-        }
+// ---- Trees --------------------------------------------------------------------------------------
+
+void TreeRemoval::RemoveTree(const Place& named, const struct stat& info) {
+    if (named_.directory != named.directory) Tidy();
+    named_ = named;
+    Guard(named, [&] { S_ISDIR(info.st_mode) ? Enter(named) : RemoveFile(named); });
+    while (!levels_.empty()) {
+        if (Stopped()) return Close();
+        Go();
     }
-    if (failure) throw Failure(*failure);
+}
+
+void TreeRemoval::Tidy() {
+    if (!std::exchange(untidy_, false)) return;
+    Guard(named_, [&] { RemoveEaDirectoryIfEmpty(*named_.directory); });
+}
+
+template <class Work>
+void TreeRemoval::Guard(const Place& place, Work work) {
+    try {
+        return work();
+    } catch (const SystemFailure& failure) {
+        const std::string path = place.path();
+        if (MayBeGone() && failure.error() == ENOENT && failure.subject() == path) return;
+        StayAbove();
+        Fail(path, Refusal("cannot remove " + Quoted(failure.subject()), failure.error()));
+    } catch (const Failure& failure) {
+        StayAbove();
+        Fail(place.path(), failure);
+    }
+}
+
+// The next of what is in the innermost directory, or that directory itself.
+void TreeRemoval::Go() {
+    Level& level = levels_.back();
+    if (level.next == level.entries.size()) return Leave();
+    const Directory::Entry& entry = level.entries[level.next++];
+    const Place place = {level.inside, entry.name};
+    const bool directory = S_ISDIR(entry.type);
+    Guard(place, [&] { directory ? Enter(place) : RemoveFile(place); });
+}
+
+void TreeRemoval::Enter(const Place& place) {
+    Level level = {place.name, {}, place.Open()};
+    level.info = level.inside->Status();
+    try {
+        level.entries = ObjectsIn(level.inside);
+    } catch (const SystemFailure& failure) {
+        if (failure.subject() != level.inside->path()) throw;
+        level.error = failure.error();
+    }
+    const bool empty = level.error == 0 && level.entries.empty();
+    if (MayEnter(place, level.info, empty) == Answer::kNo) return StayAbove();
+    level.agreed = empty;
+    levels_.push_back(std::move(level));
+    if (levels_.size() > kMostOpen) levels_[levels_.size() - 1 - kMostOpen].inside = nullptr;
+}
+
+void TreeRemoval::Leave() {
+    const std::size_t above = levels_.size() - 1;
+    if (above > 0 && !levels_[above - 1].inside) {
+        const Place place = {levels_.back().inside, "."};
+        Guard(place, [&] {
+            levels_[above - 1].inside = place.directory->OpenAbove(levels_[above - 1].info);
+        });
+        if (!levels_[above - 1].inside) return Close();
+    }
+    const Place place = PlaceOfLast();
+    const Level done = std::move(levels_.back());
+    levels_.pop_back();
+    bool gone = false;
+    Guard(place, [&] {
+        if (done.left || (!done.agreed && MayRemove(place, S_IFDIR) == Answer::kNo)) return;
+        if (Stopped()) return;
+        const Object object = ObjectAt(place, &done.info);
+        try {
+            const Directory* const inside = done.error == 0 ? done.inside.get() : nullptr;
+            NoteUntidy(RemoveDirectoryAt(object, inside, at_top(), may_go_));
+        } catch (const SystemFailure& failure) {
+            // That it is not empty says nothing where nobody could see why.
+            if (done.error == 0 || failure.subject() != place.path()) throw;
+            throw SystemFailure(place.path(), done.error);
+        }
+        gone = true;
+        Removed(place, S_IFDIR);
+    });
+    if (!gone && done.untidy) Guard(place, [&] { RemoveEaDirectoryIfEmpty(*done.inside); });
+}
+
+void TreeRemoval::RemoveFile(const Place& place) {
+    if (MayRemove(place, S_IFREG) == Answer::kNo || Stopped()) return;
+    NoteUntidy(RemoveFileAt(FileAt(place), at_top(), may_go_));
+    Removed(place, S_IFREG);
+}
+
+// What is no directory is on a volume of the type that its directory is on.
+Object TreeRemoval::FileAt(const Place& place) {
+    if (at_top()) return ObjectAt(place, nullptr);
+    std::optional<int>& type = levels_.back().type;
+    if (!type) type = ObjectAt(place, nullptr).type;
+    return {place, *type};
+}
+
+Place TreeRemoval::PlaceOfLast() const {
+    if (levels_.size() == 1) return named_;
+    return {levels_[levels_.size() - 2].inside, levels_.back().name};
+}
+
+// Leaves the rest as it is.
+void TreeRemoval::Close() {
+    const std::vector<Level> levels = std::move(levels_);
+    levels_.clear();
+    for (const Level& level : levels) {
+        if (!level.inside || !level.untidy) continue;
+        Guard({level.inside, "."}, [&] { RemoveEaDirectoryIfEmpty(*level.inside); });
+    }
+}
+
+void TreeRemoval::NoteUntidy(bool untidy) {
+    if (untidy) (at_top() ? untidy_ : levels_.back().untidy) = true;
+}
+
+void TreeRemoval::StayAbove() {
+    for (auto level = levels_.rbegin(); level != levels_.rend() && !level->left; ++level) {
+        level->left = true;
+    }
+}
+
+namespace {
+
+class CarriedRemoval final : public TreeRemoval {
+ public:
+    CarriedRemoval(const MayGo& was_carried,
+                   const std::function<void(const std::string&, const Failure&)>& fail)
+        : TreeRemoval(was_carried), fail_(fail) {}
+
+    bool failed() const { return failed_; }
+
+ private:
+    void Fail(const std::string& path, const Failure& failure) override {
+        failed_ = true;
+        fail_(path, failure);
+    }
+
+    const std::function<void(const std::string&, const Failure&)>& fail_;
+    bool failed_ = false;
+};
+
+}  // namespace
+
+bool RemoveCarried(const Place& named, const struct stat& info, const MayGo& was_carried,
+                   const std::function<void(const std::string& path, const Failure&)>& fail) {
+    CarriedRemoval removal(was_carried, fail);
+    removal.RemoveTree(named, info);
+    removal.Tidy();
+    return !removal.failed();
 }
 
 }  // namespace mavoea::tool

@@ -6,8 +6,11 @@
 #include <algorithm>
 #include <cerrno>
 #include <climits>
+#include <exception>
+#include <set>
 
 #include "format/netatalk_record.h"
+#include "tools/say/job.h"
 #include "tools/say/messages.h"
 #include "tools/say/text.h"
 #include "tools/store/marks.h"
@@ -28,8 +31,10 @@ struct Leg {
     std::shared_ptr<const Inode> source;
     Sidecars sidecars;  // of the source
     Metadata wanted;
-    bool replaces;                        // something that is there
-    std::shared_ptr<const Inode> target;  // once it is there
+    bool replaces;                             // something that is there
+    std::shared_ptr<const Inode> target = {};  // once it is there
+    std::optional<mode_t> former_mode = {};    // of a target that is written over
+    bool is_link = false;                      // the target is one more name of a file
 };
 
 namespace {
@@ -139,15 +144,45 @@ struct FinalMode {
     bool locks = false;  // the write bits go, and are remembered
 };
 
+// With which mode a new file begins; it may have all of it at once when nothing is kept.
+mode_t WantedMode(const struct stat& info, const Manner& manner) {
+    constexpr mode_t kAll = S_IRWXU | S_IRWXG | S_IRWXO;
+    constexpr mode_t kExecution = S_IXUSR | S_IXGRP | S_IXOTH;
+    if (!manner.denies_mode) return info.st_mode & (S_ISDIR(info.st_mode) ? kAll | S_ISVTX : kAll);
+    return S_ISDIR(info.st_mode) ? kAll : kAll & ~kExecution;
+}
+bool BeginsClosed(const Manner& manner) { return manner.keeps_mode || manner.keeps_owner; }
+mode_t FirstMode(const struct stat& info, const Manner& manner) {
+    const mode_t least = S_ISDIR(info.st_mode) ? S_IRWXU : S_IRUSR | S_IWUSR;
+    return BeginsClosed(manner) ? least : WantedMode(info, manner);
+}
+
+// Of what was made with the mode above.
+mode_t MadeMode(const Leg& leg, const Manner& manner) {
+    if (leg.former_mode) return *leg.former_mode;
+    if (BeginsClosed(manner)) return WantedMode(leg.source->info(), manner) & ~manner.umask;
+    return leg.target->info().st_mode & kPermissionBits;
+}
+
 // Where the permissions say whether a file is locked, the metadata decides on the write bits.
-FinalMode FinalModeOf(const Leg& leg) {
+FinalMode FinalModeOf(const Leg& leg, const Manner& manner) {
     const struct stat& info = leg.source->info();
-    const struct stat now = leg.target->Status();
-    mode_t mode = info.st_mode & kPermissionBits;
-    // Nobody gets another user's rights by a copy of his program.
-    if (now.st_uid != info.st_uid || now.st_gid != info.st_gid) mode &= ~mode_t{S_ISUID | S_ISGID};
+    mode_t mode = MadeMode(leg, manner);
+    if (manner.keeps_mode) {
+        const struct stat now = leg.target->Status();
+        mode = info.st_mode & kPermissionBits;
+        // Nobody gets another user's rights by a copy of his program.
+        if (now.st_uid != info.st_uid || now.st_gid != info.st_gid) {
+            mode &= ~mode_t{S_ISUID | S_ISGID};
+        }
+    }
     if (!LocksByMode(leg.to)) return {mode};
-    if (leg.wanted.locked) return {LocksByMode(leg.from) ? UnlockedMode(*leg.source) : mode, true};
+    if (leg.wanted.locked) {
+        const bool unlocks = LocksByMode(leg.from) && manner.keeps_mode;
+        return {unlocks ? UnlockedMode(*leg.source) : mode, true};
+    }
+    // What was there and is written over stays as it was.
+    if (!manner.keeps_mode && leg.former_mode) return {mode};
     return {(mode & kWriteBits) == 0 ? mode | S_IWUSR : mode};
 }
 
@@ -155,172 +190,127 @@ void SetTimes(const Leg& leg) {
     leg.target->SetTimes({leg.source->info().st_atim, leg.source->info().st_mtim});
 }
 
-}  // namespace
-
-Transfer::Transfer(TransferOptions options)
-    : options_(std::move(options)), watch_{options_.on_bytes, options_.give_up} {}
-
-// The destination need not be there for its volume's type to be known.
-Leg Transfer::LegFor(const Place& from, const Place& to) const {
-    const auto source = Inode::Open(from);
-    const Object object = ObjectAt(from, &source->info());
-    const Object target = AsReadable(ObjectAt(to, nullptr));
-    Sidecars sidecars = Sidecars::Find(object, Sidecars::Services::kFind);
-    Metadata wanted = ReadMetadata(object, sidecars);
-    return {object, target, source, std::move(sidecars), std::move(wanted), to.Status().has_value(),
-            nullptr};
-}
-
-void Transfer::CopyObject(const Place& from, const Place& to) {
-    Leg leg = LegFor(from, to);
-    RequireNotMade(from, to);
-    RequireNoMetadata(from, to);
-    if (!CopyName(&leg)) {
-        if (S_ISREG(leg.source->info().st_mode)) {
-            CopyFile(&leg, false);
-        } else {
-            CopyNode(&leg);
-        }
-        if (leg.source->info().st_nlink > 1) {
-            first_names_.insert_or_assign(IdOf(leg.source->info()), to);
-        }
+std::string Creating(const struct stat& info, const Place& to) {
+    switch (info.st_mode & S_IFMT) {
+        case S_IFREG:
+            return "cannot create regular file " + Quoted(to.path());
+        case S_IFLNK:
+            return "cannot create symbolic link " + Quoted(to.path());
+        case S_IFIFO:
+            return "cannot create fifo " + Quoted(to.path());
+        default:
+            return "cannot create special file " + Quoted(to.path());
     }
-    Finish(&leg);
 }
 
-void Transfer::CopyContents(const Place& from, const Place& to) {
-    Leg leg = LegFor(from, to);
-    RequireNotMade(from, to);
-    CopyFile(&leg, true);
-    Finish(&leg);
+// Says what cannot be made in the words of cp.
+template <class Make>
+auto Made(const std::string& what, Make make) {
+    try {
+        return make();
+    } catch (const SystemFailure& failure) {
+        throw Refusal(what, failure.error());
+    }
 }
 
-void Transfer::CopyFile(Leg* leg, bool stream) {
+// ---- What has been copied -----------------------------------------------------------------------
+
+// Two states of files differ in their hashes, as far as 64 bits go.
+class Hash {
+ public:
+    Hash& Add(std::uint64_t value) {
+        constexpr std::uint64_t kFactor = 0x9E3779B97F4A7C15;
+        value_ = (value_ ^ value) * kFactor;
+        value_ ^= value_ >> 29;
+        return *this;
+    }
+    Hash& Add(const timespec& time) {
+        return Add(static_cast<std::uint64_t>(time.tv_sec))
+            .Add(static_cast<std::uint64_t>(time.tv_nsec));
+    }
+    std::uint64_t value() const { return value_; }
+
+ private:
+    std::uint64_t value_ = 0;
+};
+
+// Of a directory that it is there: what was in it has been removed.
+std::uint64_t HashOf(const struct stat& info, bool with_change_time) {
+    Hash hash;
+    hash.Add(info.st_dev).Add(info.st_ino).Add(info.st_mode & S_IFMT);
+    if (S_ISDIR(info.st_mode)) return hash.value();
+    hash.Add(static_cast<std::uint64_t>(info.st_size)).Add(info.st_mtim);
+    if (with_change_time) hash.Add(info.st_ctim);
+    return hash.value();
+}
+
+bool SameState(const struct stat& one, const struct stat& other) {
+    return HashOf(one, false) == HashOf(other, false);
+}
+
+// Of the object itself, which it may not be any more.
+std::shared_ptr<const File> OpenSource(Leg* leg) {
     constexpr int kFlags = O_RDONLY | O_CLOEXEC | O_NOCTTY | O_NONBLOCK | O_NOFOLLOW;
     const Place& from = leg->from.place;
-    const File source(OpenQuietly(from.directory->fd(), from.name.c_str(), kFlags), from.path());
-    if (source.fd() < 0) throw SystemFailure(from.path(), errno);
-    leg->source = Inode::Of(source);
-    if (!stream && !S_ISREG(leg->source->info().st_mode)) throw HasBecomeAnother(from);
-    TemporaryFile temporary(leg->to.place);
-    if (stream) {
-        CopyStream(source, temporary.file(), watch_);
-    } else {
-        CopyData(source, temporary.file(), watch_);
+    auto source = std::make_shared<File>(
+        OpenQuietly(from.directory->fd(), from.name.c_str(), kFlags), from.path());
+    if (source->fd() < 0) {
+        throw Refusal("cannot open " + Quoted(from.path()) + " for reading", errno);
     }
-    leg->target = Inode::Of(temporary.file());
-    NotePermissions(
-        *leg, CopyPermissions({leg->source, source.fd()}, {leg->target, temporary.file().fd()},
-                              [&](const std::string& name) {
-                                  return !TravelsAsMetadata(name, leg->from, leg->to);
-                              }));
-    temporary.GiveToTarget();
+    leg->source = Inode::Of(std::shared_ptr<const File>(source));
+    if (!S_ISREG(leg->source->info().st_mode)) throw HasBecomeAnother(from);
+    return source;
 }
 
-void Transfer::CopyNode(Leg* leg) {
-    const struct stat& info = leg->source->info();
-    const auto node = TemporaryNode::MakeBy(leg->to.place, [&](int directory, const char* name) {
-        if (S_ISLNK(info.st_mode)) {
-            return ::symlinkat(LinkTarget(leg->from.place).c_str(), directory, name);
-        }
-        return ::mknodat(directory, name, (info.st_mode & S_IFMT) | S_IRUSR | S_IWUSR,
-                         info.st_rdev);
-    });
-    leg->target = node->inode();
-    NotePermissions(*leg,
-                    CopyPermissions({leg->source}, {leg->target}, [&](const std::string& name) {
-                        return !TravelsAsMetadata(name, leg->from, leg->to);
-                    }));
-    node->GiveToTarget();
-}
-
-// One more name for what has been copied before. False when it has not, or cannot have that name,
-// or would take the metadata of the first one with it.
-bool Transfer::CopyName(Leg* leg) {
-    if (leg->source->info().st_nlink < 2) return false;
-    const auto first = first_names_.find(IdOf(leg->source->info()));
-    if (first == first_names_.end()) return false;
-    const Place& there = first->second;
+// Whether the copy at `there` may have this object's metadata, too, where that is in the file
+// itself.
+bool SharesMetadata(const Place& there, const Leg& leg) {
     const bool in_inode =
-        leg->to.keeping() == Keeping::kXattr || leg->to.kind() == VolumeKind::kFileEA;
-    if (in_inode) {
-        const auto info = StatusOf(there);
-        const Metadata other =
-            ReadMetadata(AsReadable(ObjectAt(there, &info)), Sidecars::Services::kLeaveOut);
-        Metadata own = leg->wanted;
-        own.services.clear();
-        if (leg->to.kind() == VolumeKind::kFileEA) own.attributes.clear();
-        if (!WhatIsMissing(own, other).empty() || own.entries.size() != other.entries.size() ||
-            (own.attributes.size() != other.attributes.size() &&
-             leg->to.keeping() == Keeping::kXattr) ||
-            own.finder_info.has_value() != other.finder_info.has_value()) {
-            leg->wanted.strays.push_back(
-                {"being one file with " + Printable(there.path()),
-                 "names of one file have one metadata there, and here each has its own",
-                 {}});
-            return false;
-        }
+        leg.to.keeping() == Keeping::kXattr || leg.to.kind() == VolumeKind::kFileEA;
+    if (!in_inode) return true;
+    const auto info = StatusOf(there);
+    const Metadata other =
+        ReadMetadata(AsReadable(ObjectAt(there, &info)), Sidecars::Services::kLeaveOut);
+    Metadata own = leg.wanted;
+    own.services.clear();
+    if (leg.to.kind() == VolumeKind::kFileEA) own.attributes.clear();
+    return WhatIsMissing(own, other).empty() && own.entries.size() == other.entries.size() &&
+           (own.attributes.size() == other.attributes.size() ||
+            leg.to.keeping() != Keeping::kXattr) &&
+           own.finder_info.has_value() == other.finder_info.has_value();
+}
+
+// What of the metadata of an object that is written over lies in its attributes. What is wanted of
+// it is written anew.
+void RemoveFormerAttributes(const Leg& leg) {
+    const bool in_attributes = leg.to.keeping() == Keeping::kXattr;
+    if (!in_attributes && leg.to.kind() != VolumeKind::kFileEA) return;
+    for (const std::string& name : leg.target->AttributeNames()) {
+        const bool goes = in_attributes ? TravelsAsMetadata(name, leg.to, Object()) && !IsMark(name)
+                                        : name == kNetatalkAttribute;
+        if (goes) (void)leg.target->RemoveAttribute(name);
     }
-    const auto node = TemporaryNode::TryToMake(leg->to.place, [&](int directory, const char* name) {
-        return ::linkat(there.directory->fd(), there.name.c_str(), directory, name, 0);
-    });
-    if (!node) return false;
-    leg->target = node->inode();
-    node->GiveToTarget();
-    return true;
 }
 
-void Transfer::NotePermissions(const Leg& leg, const std::optional<std::string>& problem) const {
-    if (problem) options_.on_note(Printable(leg.to.path()) + ": " + *problem);
-    if (!HoldsContents(leg.source->info())) return;
-    // The owner of a file or directory can still change it.
-    const mode_t mode = leg.source->info().st_mode;
-    const mode_t least = S_ISDIR(mode) ? S_IRWXU : S_IRUSR | S_IWUSR;
-    if ((mode & least) != least) leg.target->SetMode((mode & kPermissionBits) | least);
+// What a service is changing stays as it is, and so does the data that belongs to it.
+void RequireUnlockedTarget(const Leg& leg) {
+    if (leg.replaces) RequireUnlocked(Sidecars::Find(leg.to, Sidecars::Services::kLeaveOut));
 }
 
-// All that comes once the data is in its place. Mode and times are right also when the metadata
-// could not be copied.
-void Transfer::Finish(Leg* leg) {
-    made_.insert_or_assign(IdOf(leg->target->info()), leg->to.place.name);
-    made_apple_double_ = made_apple_double_ || leg->to.place.name.starts_with(AppleDoubleName({}));
-    volumes_.try_emplace(leg->target->info().st_dev, leg->to.place.directory);
-    std::vector<Missing> missing;
+// What was to arrive, and what a writer said of it.
+struct Arrival {
     Metadata fitting;
     Written written;
-    std::optional<Failure> failure;
-    const bool holds = HoldsContents(leg->source->info());
-    const FinalMode final_mode = FinalModeOf(*leg);
-    WriteOptions write = {.durability = Durability::kLater};
-    if (holds) write.mode = final_mode.locks ? final_mode.mode & ~kWriteBits : final_mode.mode;
-    const bool keeps = leg->to.kind() != VolumeKind::kNone;
-    NoteOrphan(*leg);
-    if (keeps && !leg->to.is_root()) {
-        try {
-            const Writer& writer = WriterFor(leg->to);
-            fitting = writer.Fit(leg->wanted, leg->to, &missing);
-            written = writer.Write(leg->to, fitting, write);
-        } catch (const Failure& problem) {
-            failure = problem;
-        }
-    }
-    if (holds && final_mode.locks) {
-        LockMode(*leg->target, final_mode.mode);
-    } else if (holds) {
-        leg->target->SetMode(final_mode.mode);
-    }
-    SetTimes(*leg);
-    ReportNew(leg->to.path(), leg->source->info().st_mode);
-    if (failure) {
-        throw Failure(kFailed, leg->from.path(),
-                      "its metadata could not be copied: " + std::string(failure->what()),
-                      "see what is in the way, and copy it again");
-    }
-    if (!keeps) AddUnkept(*leg, &missing);
-    for (const Missing& one : written.missing) missing.push_back(one);
-    const auto whole = [&](const std::string& path) { return written.whole.contains(path); };
-    if (fitting.whole_record) written.whole.insert(leg->from.path());
-    if (keeps && leg->wanted.HasAny()) {
+};
+
+// What is not at the destination, after all, and what could not be read from the source.
+void AddWhatDidNotArrive(const Leg& leg, Arrival arrival, std::vector<Missing>* missing) {
+    Metadata& fitting = arrival.fitting;
+    std::set<std::string>& wholes = arrival.written.whole;
+    for (const Missing& one : arrival.written.missing) missing->push_back(one);
+    if (fitting.whole_record) wholes.insert(leg.from.path());
+    const auto whole = [&](const std::string& path) { return wholes.contains(path); };
+    if (leg.wanted.HasAny()) {
         const auto damaged = [&](const auto& item) {
             return item.value.damaged() && whole(item.holder);
         };
@@ -329,22 +319,297 @@ void Transfer::Finish(Leg* leg) {
         if (fitting.fork && damaged(*fitting.fork)) fitting.fork.reset();
         std::erase_if(fitting.entries, [&](const auto& entry) { return damaged(entry.second); });
     }
-    if (keeps && (leg->wanted.HasAny() || leg->wanted.locked || leg->wanted.hidden)) {
-        const Metadata found = ReadMetadata(leg->to, Sidecars::Services::kFind);
+    if (leg.wanted.HasAny() || leg.wanted.locked || leg.wanted.hidden) {
+        const Metadata found = ReadMetadata(leg.to, *leg.target, arrival.written.beside);
         for (const Missing& one : WhatIsMissing(fitting, found)) {
-            if (!Names(missing, one.item)) missing.push_back(one);
+            if (!Names(*missing, one.item)) missing->push_back(one);
         }
     }
-    for (const Metadata::Stray& stray : leg->wanted.strays) {
-        if (!whole(stray.holder)) missing.push_back({stray.item, stray.reason});
+    for (const Metadata::Stray& stray : leg.wanted.strays) {
+        if (!whole(stray.holder)) missing->push_back({stray.item, stray.reason});
     }
-    for (const Failure& problem : leg->wanted.problems) {
+    for (const Failure& problem : leg.wanted.problems) {
         if (!whole(problem.subject())) {
-            missing.push_back({Printable(problem.subject()), problem.cause()});
+            missing->push_back({Printable(problem.subject()), problem.cause()});
         }
     }
+}
+
+}  // namespace
+
+Transfer::Transfer(TransferOptions options)
+    : options_(std::move(options)),
+      data_(options_.watch, options_.manner.sparse, options_.manner.reflink) {}
+
+Transfer::~Transfer() = default;
+
+// The destination need not be there for its volume's type to be known.
+Leg Transfer::LegFor(const Place& from, const Place& to) const {
+    const auto source = Inode::Open(from);
+    const Object object = ObjectAt(from, &source->info());
+    const Object target = AsReadable(ObjectAt(to, nullptr));
+    Sidecars sidecars = Sidecars::Find(object, Sidecars::Services::kFind);
+    Metadata wanted = ReadMetadata(object, *source, sidecars);
+    return {
+        object, target, source, std::move(sidecars), std::move(wanted), to.Status().has_value()};
+}
+
+Leg Transfer::LegWithoutMetadata(const Place& from, const File& source, const Place& to) const {
+    return {{from, -1},
+            AsReadable(ObjectAt(to, nullptr)),
+            Inode::Of(source),
+            {},
+            {},
+            to.Status().has_value()};
+}
+
+void Transfer::CopyObject(const Place& from, const Place& to, Links links) {
+    Leg leg = LegFor(from, to);
+    RequireNoMetadata(from, to);
+    RequireNotMade(from, to);
+    if (!CopyName(&leg, links)) {
+        if (S_ISREG(leg.source->info().st_mode)) {
+            CopyFile(&leg, nullptr);
+        } else {
+            CopyNode(&leg);
+        }
+        RememberName(leg, links);
+    }
+    Finish(&leg);
+}
+
+void Transfer::CopyContents(const Place& from, const File& source, const Place& to) {
+    Leg leg = LegWithoutMetadata(from, source, to);
+    RequireNotMade(from, to);
+    RequireUnlockedTarget(leg);
+    CopyFile(&leg, &source);
+    Finish(&leg);
+}
+
+void Transfer::CopyFile(Leg* leg, const File* stream) {
+    const std::shared_ptr<const File> own = stream == nullptr ? OpenSource(leg) : nullptr;
+    const File& source = own ? *own : *stream;
+    const Manner& manner = options_.manner;
+    // A move to another file system, over what is there.
+    const std::string moving = "inter-device move failed: " + Quoted(leg->from.path()) + " to " +
+                               Quoted(leg->to.path()) + "; unable to remove target";
+    const bool moves = options_.remembers && leg->replaces;
+    const std::string making = moves ? moving : Creating(leg->source->info(), leg->to.place);
+    const auto temporary = Made(making, [&] {
+        return std::make_unique<TemporaryFile>(leg->to.place,
+                                               FirstMode(leg->source->info(), manner));
+    });
+    const File& file = temporary->file();
+    leg->target = Inode::Of(temporary->shared_file());
+    CopyBytes(source, stream != nullptr, file);
+    CopyInodeTo(*leg, source.fd(), file.fd());
+    Made(making, [&] {
+        if (leg->replaces) {
+            temporary->GiveToTarget();
+        } else {
+            temporary->GiveToNewTarget();
+        }
+    });
+}
+
+void Transfer::CopyBytes(const File& source, bool stream, const File& target) {
+    if (!options_.manner.data) return;
+    Made("error writing " + Quoted(target.path()), [&] {
+        if (stream) {
+            data_.CopyStream(source, target);
+        } else {
+            data_.Copy(source, target);
+        }
+    });
+}
+
+void Transfer::Overwrite(const Place& from, const File* stream, const Place& to, const File& target,
+                         Links links) {
+    Leg leg = stream != nullptr ? LegWithoutMetadata(from, *stream, to) : LegFor(from, to);
+    RequireNoMetadata(from, to);
+    RequireNotMade(from, to);
+    if (stream == nullptr && CopyName(&leg, links)) return Finish(&leg);
+    const std::shared_ptr<const File> file = stream == nullptr ? OpenSource(&leg) : nullptr;
+    const File& source = file ? *file : *stream;
+    leg.target = Inode::Of(target);
+    leg.former_mode = leg.target->info().st_mode & kPermissionBits;
+    if (stream != nullptr) RequireUnlockedTarget(leg);
+    // Nobody sees more of it than he may of what it will be.
+    if (BeginsClosed(options_.manner)) {
+        (void)::fchmod(target.fd(), *leg.former_mode & (S_IRUSR | S_IWUSR));
+    }
+    if (options_.manner.data) target.Resize(0);
+    CopyBytes(source, stream != nullptr, target);
+    RemoveFormerAttributes(leg);
+    CopyInodeTo(leg, source.fd(), target.fd());
+    RememberName(leg, links);
+    Finish(&leg);
+}
+
+void Transfer::CopyNode(Leg* leg) {
+    const struct stat& info = leg->source->info();
+    Made(Creating(info, leg->to.place), [&] {
+        const auto node =
+            TemporaryNode::MakeBy(leg->to.place, [&](int directory, const char* name) {
+                if (S_ISLNK(info.st_mode)) {
+                    return ::symlinkat(LinkTarget(leg->from.place).c_str(), directory, name);
+                }
+                const mode_t mode = FirstMode(info, options_.manner);
+                return ::mknodat(directory, name, (info.st_mode & S_IFMT) | mode, info.st_rdev);
+            });
+        leg->target = node->inode();
+        CopyInodeTo(*leg, -1, -1);
+        if (!S_ISLNK(info.st_mode) && !options_.manner.keeps_mode) {
+            leg->target->SetMode(MadeMode(*leg, options_.manner));
+        }
+        node->GiveToTarget();
+    });
+}
+
+void Transfer::CarryMetadata(const Place& from, const Place& to) {
+    Leg leg = LegFor(from, to);
+    leg.target = Inode::Open(to);
+    leg.former_mode = leg.target->info().st_mode & kPermissionBits;
+    RequireUnlockedTarget(leg);
+    RemoveFormerAttributes(leg);
+    Finish(&leg);
+}
+
+void Transfer::LinkObject(const Place& from, const Place& to) {
+    Leg leg = LegFor(from, to);
+    RequireNoMetadata(from, to);
+    RequireNotMade(from, to);
+    RequireUnlockedTarget(leg);
+    const std::string what =
+        "cannot create hard link " + Quoted(to.path()) + " to " + Quoted(from.path());
+    const auto node = Made(what, [&] {
+        return TemporaryNode::MakeBy(to, [&](int directory, const char* name) {
+            return ::linkat(from.directory->fd(), from.name.c_str(), directory, name, 0);
+        });
+    });
+    leg.target = node->inode();
+    leg.is_link = true;
+    Made(what, [&] { node->GiveToTarget(); });
+    Finish(&leg);
+}
+
+void Transfer::MakeLink(const std::string& text, const Place& to) {
+    const std::string what =
+        "cannot create symbolic link " + Quoted(to.path()) + " to " + Quoted(text);
+    if (::symlinkat(text.c_str(), to.directory->fd(), to.name.c_str()) != 0) {
+        throw Refusal(what, errno);
+    }
+    NoteMade(to, StatusOf(to));
+}
+
+// One more name for what has been copied before. False when it has not, or cannot have that name,
+// or would take the metadata of the first one with it.
+bool Transfer::CopyName(Leg* leg, Links links) {
+    RequireUnlockedTarget(*leg);
+    const struct stat& info = leg->source->info();
+    const auto first = first_names_.find(IdOf(info));
+    // A file that has the number of one that has gone is another one.
+    if (links == Links::kNone || first == first_names_.end() ||
+        !SameState(first->second.source, info)) {
+        return false;
+    }
+    const Place& there = first->second.to;
+    if (!SharesMetadata(there, *leg)) {
+        leg->wanted.strays.push_back(
+            {"being one file with " + Printable(there.path()),
+             "names of one file have one metadata there, and here each has its own",
+             {}});
+        return false;
+    }
+    const auto node = TemporaryNode::TryToMake(leg->to.place, [&](int directory, const char* name) {
+        return ::linkat(there.directory->fd(), there.name.c_str(), directory, name, 0);
+    });
+    const bool impossible = !node && (errno == EXDEV || errno == EMLINK || errno == EPERM ||
+                                      errno == ENOTSUP || errno == ENOENT);
+    if (impossible) return false;
+    const std::string what =
+        "cannot create hard link " + Quoted(leg->to.path()) + " to " + Quoted(there.path());
+    if (!node) throw Refusal(what, errno);
+    leg->target = node->inode();
+    leg->is_link = true;
+    Made(what, [&] { node->GiveToTarget(); });
+    return true;
+}
+
+void Transfer::TakeForCopy(const Place& from, const Place& to, Links links) {
+    Leg leg = LegFor(from, to);
+    const auto there = first_names_.find(IdOf(leg.source->info()));
+    const bool known = there != first_names_.end();
+    if (known && SameFile(StatusOf(there->second.to), StatusOf(to))) return;
+    if (known && CopyName(&leg, links)) return Finish(&leg);
+    RememberName(leg, links);
+}
+
+void Transfer::RememberName(const Leg& leg, Links links) {
+    const struct stat& info = leg.source->info();
+    if (links == Links::kAll || (links == Links::kSeveral && info.st_nlink > 1)) {
+        first_names_.insert_or_assign(IdOf(info), FirstName{leg.to.place, info});
+    }
+}
+
+// Owner, mode, ACL and attributes, as far as they are kept.
+void Transfer::CopyInodeTo(const Leg& leg, int source, int target) const {
+    if (options_.manner.metadata_only) return;
+    const auto problem = CopyPermissions(
+        {leg.source, source}, {leg.target, target}, options_.manner,
+        [&](const std::string& name) { return !TravelsAsMetadata(name, leg.from, leg.to); });
+    if (problem) options_.on_note(Printable(leg.to.path()) + ": " + *problem);
+    if (!HoldsContents(leg.source->info())) return;
+    // The owner of a file or directory can still change it.
+    const mode_t mode = leg.target->Status().st_mode & kPermissionBits;
+    const mode_t least = S_ISDIR(leg.source->info().st_mode) ? S_IRWXU : S_IRUSR | S_IWUSR;
+    if ((mode & least) != least) leg.target->SetMode(mode | least);
+}
+
+// All that comes once the data is in its place. Mode and times are right also when the metadata
+// could not be copied.
+void Transfer::Finish(Leg* leg) {
+    const Manner& manner = options_.manner;
+    NoteMade(leg->to.place, leg->target->info());
+    volumes_.try_emplace(leg->target->info().st_dev, leg->to.place.directory);
+    const bool holds = HoldsContents(leg->source->info()) && !leg->is_link;
+    const FinalMode mode = holds ? FinalModeOf(*leg, manner) : FinalMode{0};
+    NoteOrphan(*leg);
+    const bool keeps = leg->to.kind() != VolumeKind::kNone;
+    std::vector<Missing> missing;
+    Arrival arrival;
+    std::optional<Failure> failure;
+    if (keeps && !leg->to.is_root()) {
+        WriteOptions write = {.durability = Durability::kLater,
+                              .is_new = !leg->former_mode && !leg->is_link};
+        if (holds) write.mode = mode.locks ? mode.mode & ~kWriteBits : mode.mode;
+        try {
+            const Writer& writer = WriterFor(leg->to);
+            arrival.fitting = writer.Fit(leg->wanted, leg->to, &missing);
+            arrival.written = writer.Write(leg->to, *leg->target, arrival.fitting, write);
+        } catch (const Failure& problem) {
+            failure = problem;
+        }
+    }
+    if (holds && mode.locks) {
+        LockMode(*leg->target, mode.mode);
+    } else if (holds && (leg->target->Status().st_mode & kPermissionBits) != mode.mode) {
+        leg->target->SetMode(mode.mode);
+    }
+    if (manner.keeps_times && !leg->is_link) SetTimes(*leg);
+    ReportNew(leg->to.place.location(), leg->source->info().st_mode);
+    if (failure) {
+        throw Incomplete(kFailed, leg->from.path(),
+                         "its metadata could not be copied: " + std::string(failure->what()),
+                         "see what is in the way, and copy it again");
+    }
+    if (keeps) {
+        AddWhatDidNotArrive(*leg, std::move(arrival), &missing);
+    } else {
+        AddUnkept(*leg, &missing);
+    }
+    NoteCopied(*leg);
     if (!missing.empty()) {
-        NoteCopied(*leg);
         throw Loss(kFailed, leg->from.path(),
                    "not all of its metadata arrived at " + Printable(leg->to.path()) + ": " +
                        Joined(missing),
@@ -352,10 +617,9 @@ void Transfer::Finish(Leg* leg) {
     }
     for (const std::string& path : leg->wanted.earlier) {
         options_.on_note(Printable(leg->to.path()) +
-                         ": has in the current layout what an earlier " + "version kept in " +
+                         ": has in the current layout what an earlier version kept in " +
                          Printable(path));
     }
-    NoteCopied(*leg);
 }
 
 // A "._" file of an object that had gone: it is nothing of this one's, and makes room.
@@ -373,10 +637,40 @@ void Transfer::NoteOrphan(const Leg& leg) const {
 
 void Transfer::NoteCopied(const Leg& leg) {
     if (!options_.remembers) return;
-    copied_.insert_or_assign(IdOf(leg.source->info()), leg.source->info());
-    for (const Sidecars::Found& file : leg.sidecars.Files()) {
-        copied_.insert_or_assign(IdOf(file.info), file.info);
-    }
+    Remember(leg.source->info());
+    for (const Sidecars::Found& file : leg.sidecars.Files()) Remember(file.info);
+}
+
+void Transfer::Remember(const struct stat& info) {
+    copied_.push_back(HashOf(info, info.st_nlink == 1));
+    sorted_ = false;
+}
+
+void Transfer::NoteMade(const Place& to, const struct stat& info) {
+    made_apple_double_ = made_apple_double_ || to.name.starts_with(AppleDoubleName({}));
+    if (S_ISLNK(info.st_mode)) made_links_.insert(IdOf(info));
+    const Directory* const directory = to.directory.get();
+    if (!fresh_.contains(directory)) made_[directory].insert_or_assign(IdOf(info), to.name);
+}
+
+// Under which name this has made in its directory what is at a place now; none when it has not.
+std::optional<std::string> Transfer::NameOfMade(const Place& to) const {
+    const auto info = to.Status();
+    if (!info) return std::nullopt;
+    // All that is in a directory that is new has been made here.
+    if (fresh_.contains(to.directory.get())) return to.directory->NameOf(*info, to.name);
+    const auto directory = made_.find(to.directory.get());
+    if (directory == made_.end()) return std::nullopt;
+    const auto found = directory->second.find(IdOf(*info));
+    if (found == directory->second.end()) return std::nullopt;
+    // Another name of the file is no other spelling of the one that was made.
+    const bool other = found->second != to.name && to.directory->NameOf(*info, to.name) == to.name;
+    return other ? std::nullopt : std::optional(found->second);
+}
+
+bool Transfer::HasMadeLink(const Place& to) const {
+    const auto info = to.Status();
+    return info && S_ISLNK(info->st_mode) && made_links_.contains(IdOf(*info));
 }
 
 // One file cannot be both: an object that was copied, and metadata of another one.
@@ -385,9 +679,7 @@ void Transfer::RequireNoMetadata(const Place& from, const Place& to) const {
     if (keeping != Keeping::kAppleDouble && keeping != Keeping::kEaDirectory) return;
     const Directory& there = *to.directory;
     const auto was_made = [&](const std::string& name) {
-        const auto info = there.StatusOf(name);
-        const auto found = info ? made_.find(IdOf(*info)) : made_.end();
-        return found != made_.end() && found->second == name;
+        return NameOfMade({to.directory, name}) == name;
     };
     const std::string prefix = AppleDoubleName({});
     const bool is_prefixed = to.name.starts_with(prefix);
@@ -412,62 +704,63 @@ void Transfer::RequireNoMetadata(const Place& from, const Place& to) const {
     }
 }
 
-// What this has just made there, under a name that the file system takes for the same.
 void Transfer::RequireNotMade(const Place& from, const Place& to) const {
-    const auto there = to.Status();
-    const auto found = there ? made_.find(IdOf(*there)) : made_.end();
-    if (found == made_.end()) return;
-    const bool same = found->second == to.name;
-    if (same && S_ISDIR(there->st_mode)) return;
-    const std::string other = Printable(to.directory->PathOf(found->second));
+    const auto made = NameOfMade(to);
+    if (!made) return;
+    const bool directory = S_ISDIR(StatusOf(to).st_mode);
+    if (*made == to.name && directory) return;
+    if (*made == to.name) {
+        throw Refusal(
+            "will not overwrite just-created " + Quoted(to.path()) + " with " + Quoted(from.path()),
+            "give it another name");
+    }
+    // The file system takes the two for one.
     throw Failure(kFailed, from.path(),
-                  same ? "it would overwrite '" + other + "', just made"
-                       : "its name is the same as that of '" + other + "', just made, there",
+                  "its name is the same as that of '" + Printable(to.directory->PathOf(*made)) +
+                      "', just made, there",
                   "give it another name");
 }
 
 DirectoryRef Transfer::MakeDirectory(const Place& from, const Place& to) {
-    RequireNotMade(from, to);
     RequireNoMetadata(from, to);
-    const auto there = to.Status();
-    if (there && !S_ISDIR(there->st_mode)) throw SystemFailure(to.path(), ENOTDIR);
-    DirectoryRef made = there ? to.directory->OpenIn(to.name) : to.directory->MakeIn(to.name);
-    made_.insert_or_assign(IdOf(made->Status()), to.name);
+    RequireNotMade(from, to);
+    if (DirectoryRef there = to.directory->FindIn(to.name)) {
+        NoteMade(to, there->Status());
+        return there;
+    }
+    const mode_t least = S_IRWXU;
+    const mode_t mode = FirstMode(StatusOf(from), options_.manner) | least;
+    DirectoryRef made = Made("cannot create directory " + Quoted(to.path()),
+                             [&] { return to.directory->MakeIn(to.name, mode); });
+    fresh_.insert(made.get());
+    NoteMade(to, made->Status());
     return made;
 }
 
 void Transfer::FinishDirectory(const Place& from, const Directory& inside, const Place& to,
-                               const DirectoryRef& made) {
+                               const DirectoryRef& made, bool is_new) {
+    made_.erase(made.get());
+    fresh_.erase(made.get());
     Leg leg = LegFor(from, to);
     const File source = inside.Reopened();
     const File target = made->Reopened();
     leg.source = Inode::Of(source);
     leg.target = Inode::Of(target);
     if (!SameFile(StatusOf(to), leg.target->info())) throw HasBecomeAnother(to);
-    std::optional<Failure> failure;
+    if (!is_new) leg.former_mode = leg.target->info().st_mode & kPermissionBits;
+    std::exception_ptr failure;
     for (const Directory::Entry& entry : inside.Entries()) {
         if (!IsMetadata(inside, entry, leg.from.type) || !S_ISDIR(entry.type)) continue;
         try {
             CopyLeftOvers(inside, made, entry);
-        } catch (const Failure& problem) {
-            failure = problem;
+        } catch (const Failure&) {
+            failure = std::current_exception();
         }
     }
-    if (leg.to.keeping() == Keeping::kXattr || leg.to.kind() == VolumeKind::kFileEA) {
-        for (const std::string& name : leg.target->AttributeNames()) {
-            // What is wanted of it is written anew.
-            const bool goes = leg.to.keeping() == Keeping::kXattr
-                                  ? TravelsAsMetadata(name, leg.to, Object()) && !IsMark(name)
-                                  : name == kNetatalkAttribute;
-            if (goes) (void)leg.target->RemoveAttribute(name);
-        }
-    }
-    NotePermissions(leg, CopyPermissions({leg.source, source.fd()}, {leg.target, target.fd()},
-                                         [&](const std::string& name) {
-                                             return !TravelsAsMetadata(name, leg.from, leg.to);
-                                         }));
+    RemoveFormerAttributes(leg);
+    CopyInodeTo(leg, source.fd(), target.fd());
     Finish(&leg);
-    if (failure) throw Failure(*failure);
+    if (failure) std::rethrow_exception(failure);
 }
 
 // What is in the EA directory of a directory and went with no object in it.
@@ -488,7 +781,7 @@ void Transfer::CopyLeftOvers(const Directory& inside, const DirectoryRef& made,
         } else {
             try {
                 if (CopyLeftOver(file, made)) {
-                    copied_.insert_or_assign(IdOf(info), info);
+                    Remember(info);
                 } else {
                     missing.push_back({item, "something of its name is at the destination"});
                 }
@@ -506,7 +799,7 @@ bool Transfer::Rename(const Place& from, const Place& to) {
     const auto there = to.Status();
     if (!there || !SameFile(*there, StatusOf(from))) RequireNotMade(from, to);
     if (!RenameObject(from, to)) return false;
-    made_.insert_or_assign(IdOf(StatusOf(to)), to.name);
+    NoteMade(to, StatusOf(to));
     return true;
 }
 
@@ -514,16 +807,14 @@ void Transfer::MakeDurable() {
     for (const auto& [device, directory] : volumes_) directory->SyncVolume();
 }
 
-bool Transfer::WasCopied(const struct stat& info) const {
-    const auto found = copied_.find(IdOf(info));
-    if (found == copied_.end()) return false;
-    const struct stat& then = found->second;
-    const auto same = [](const timespec& one, const timespec& other) {
-        return one.tv_sec == other.tv_sec && one.tv_nsec == other.tv_nsec;
+bool Transfer::WasCopied(const struct stat& info) {
+    if (!sorted_) std::sort(copied_.begin(), copied_.end());
+    sorted_ = true;
+    const auto has = [&](bool with_change_time) {
+        return std::binary_search(copied_.begin(), copied_.end(), HashOf(info, with_change_time));
     };
-    if (S_ISDIR(info.st_mode)) return true;  // what was in it has been removed
-    return then.st_size == info.st_size && same(then.st_mtim, info.st_mtim) &&
-           (then.st_nlink > 1 || same(then.st_ctim, info.st_ctim));
+    // The change time of a file with several names changes when one of them goes.
+    return has(true) || has(false);
 }
 
 }  // namespace mavoea::tool

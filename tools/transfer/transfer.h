@@ -8,91 +8,138 @@
 #include <cstdint>
 #include <functional>
 #include <map>
+#include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <utility>
+#include <vector>
 
 #include "tools/place/volume.h"
 #include "tools/store/sidecars.h"
 #include "tools/transfer/file_data.h"
+#include "tools/transfer/manner.h"
 
 namespace mavoea::tool {
 
 struct TransferOptions {
-    // Told of data as it is copied, in bytes since the last call.
-    std::function<void(std::uint64_t)> on_bytes = [](std::uint64_t) {};
-
-    // Asked while data is copied. Once it is true, the object in hand is given up with a Failure,
-    // and nothing of it stays.
-    std::function<bool()> give_up = [] { return false; };
+    DataWatch watch = {};
 
     // Told what people should know of an object with which nothing else is wrong.
     std::function<void(const std::string&)> on_note = [](const std::string&) {};
 
-    // Whether WasCopied() will be asked, which takes memory for every file.
+    Manner manner = {};
+
+    // Whether WasCopied() will be asked, which takes a little memory for every file.
     bool remembers = false;
 };
+
+// Of which files further names become names of the first one's copy: of none, of those that have
+// several, or of all, which can be reached by several links.
+enum class Links { kNone, kSeveral, kAll };
 
 struct Leg;
 
 // Carries one object after the other. What it has written it has read back and compared, byte by
-// byte, when a member returns. Objects that are names of one file become names of one file.
-// Symbolic links are not followed. All members throw Failure, whose text names the object; it is a
-// Loss when all went well, but something of the metadata could not arrive: the text names each item
-// and why.
+// byte, when a member returns. Symbolic links are not followed. All members throw Failure, whose
+// text names the object; it is Incomplete when the data is at `to`, and something of the metadata
+// is not: the text names each item and why.
 class Transfer {
  public:
     explicit Transfer(TransferOptions options = {});
+    ~Transfer();
 
     // Copies an object that is no directory: a regular file, a symbolic link, or a special file,
     // which is made anew. What stands at `to`, no directory, is replaced, and so is its metadata.
-    // Until the data is whole `to` is as it was; when only the metadata could not be copied, the
-    // data is at `to` nevertheless.
-    void CopyObject(const Place& from, const Place& to);
+    // Until the data is whole `to` is as it was.
+    void CopyObject(const Place& from, const Place& to, Links links);
 
-    // As CopyObject(), but the data is what reading `from` gives, be it a FIFO or a device.
-    void CopyContents(const Place& from, const Place& to);
+    // As CopyObject(), but the data is all that can be read from `source`, a FIFO or a device. It
+    // has no metadata.
+    void CopyContents(const Place& from, const File& source, const Place& to);
+
+    // Writes into the regular file at `to` what is in the one at `from`, or can be read from
+    // `source`, and gives it that one's metadata.
+    void Overwrite(const Place& from, const File* source, const Place& to, const File& target,
+                   Links links);
+
+    // What can be read from one into the other, and nothing else. Either of them is no regular
+    // file.
+    void CopyStream(const File& source, const File& target) { data_.CopyStream(source, target); }
+
+    // What is at `to` is as good as a copy: it becomes a name of what another name of the file was
+    // copied to, or others become names of it.
+    void TakeForCopy(const Place& from, const Place& to, Links links);
+
+    // Gives an object that is there, no directory, the metadata of `from`, and nothing else.
+    void CarryMetadata(const Place& from, const Place& to);
+
+    // One more name for the file at `from`.
+    void LinkObject(const Place& from, const Place& to);
+
+    // A symbolic link.
+    void MakeLink(const std::string& text, const Place& to);
 
     // A directory is copied in two steps, with what is in it between them: made, if none is there,
     // so that its owner may write to it; then given its attributes, metadata and times, and what
     // services keep in its EA directory that belongs to no object.
     DirectoryRef MakeDirectory(const Place& from, const Place& to);
     void FinishDirectory(const Place& from, const Directory& inside, const Place& to,
-                         const DirectoryRef& made);
+                         const DirectoryRef& made, bool is_new);
 
     // Renames an object, metadata and all, over what is there. False when that takes a copy,
     // because the two are on different file systems or kinds of volumes; nothing has changed then.
     // After a Failure the object is where it was, unless something stood in its new place.
     bool Rename(const Place& from, const Place& to);
 
+    // Failure when this has just made what is at `to`.
+    void RequireNotMade(const Place& from, const Place& to) const;
+    // Whether `to` is a symbolic link that this has made.
+    bool HasMadeLink(const Place& to) const;
+
     // All that has been copied is on disk.
     void MakeDurable();
 
     // Whether a file is one that has been copied, and still what it was then.
-    bool WasCopied(const struct stat& info) const;
+    bool WasCopied(const struct stat& info);
 
  private:
     using FileId = std::pair<dev_t, ino_t>;
 
+    // Where the first name of a file was copied to, and what that file was.
+    struct FirstName {
+        Place to;
+        struct stat source;
+    };
+
     Leg LegFor(const Place& from, const Place& to) const;
-    void CopyFile(Leg* leg, bool stream);
+    Leg LegWithoutMetadata(const Place& from, const File& source, const Place& to) const;
+    void CopyFile(Leg* leg, const File* stream);
+    void CopyBytes(const File& source, bool stream, const File& target);
     void CopyNode(Leg* leg);
-    bool CopyName(Leg* leg);
-    void NotePermissions(const Leg& leg, const std::optional<std::string>& problem) const;
+    bool CopyName(Leg* leg, Links links);
+    void RememberName(const Leg& leg, Links links);
+    void CopyInodeTo(const Leg& leg, int source, int target) const;
     void Finish(Leg* leg);
     void NoteOrphan(const Leg& leg) const;
     void NoteCopied(const Leg& leg);
-    void RequireNotMade(const Place& from, const Place& to) const;
+    void Remember(const struct stat& info);
+    void NoteMade(const Place& to, const struct stat& info);
+    std::optional<std::string> NameOfMade(const Place& to) const;
     void RequireNoMetadata(const Place& from, const Place& to) const;
     void CopyLeftOvers(const Directory& inside, const DirectoryRef& made,
                        const Directory::Entry& entry);
 
     TransferOptions options_;
-    DataWatch watch_;
-    std::map<FileId, Place> first_names_;   // of files with several names, where they are copied to
-    std::map<FileId, struct stat> copied_;  // files of sources
-    std::map<FileId, std::string> made_;    // and of destinations
-    bool made_apple_double_ = false;        // whether any of those has a name like "._x"
+    FileData data_;
+    std::map<FileId, FirstName> first_names_;
+    std::vector<std::uint64_t> copied_;  // of each file of sources a hash of what it was
+    bool sorted_ = true;                 // that
+    std::set<const Directory*> fresh_;   // directories that are new, and not finished
+    // In each other directory that is not finished, what has been made in it.
+    std::map<const Directory*, std::map<FileId, std::string>> made_;
+    std::set<FileId> made_links_;
+    bool made_apple_double_ = false;  // whether any of those has a name like "._x"
     std::map<dev_t, DirectoryRef> volumes_;
 };
 

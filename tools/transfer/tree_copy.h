@@ -1,36 +1,53 @@
-// Objects with all that is below them, one after the other, each reached through its directory.
+// The order in which trees are copied: a directory is made before what is in it is copied, and
+// finished afterwards.
 #ifndef MAVOEA_TOOLS_TRANSFER_TREE_COPY_H_
 #define MAVOEA_TOOLS_TRANSFER_TREE_COPY_H_
 
-#include <functional>
 #include <string>
+#include <vector>
 
+#include "tools/place/directory.h"
 #include "tools/say/messages.h"
-#include "tools/transfer/transfer.h"
 
 namespace mavoea::tool {
 
-struct TreeCopyHooks {
-    std::function<bool()> stopped = [] { return false; };  // nothing more is to be begun
+class TreeCopy {
+ public:
+    virtual ~TreeCopy() = default;
 
-    // Asked before an object, or a directory, is copied over `to`, which may be there. False: it is
-    // skipped, with all that is below it. May throw Failure.
-    std::function<bool(const Place& from, const struct stat& info, const Place& to)> may_take =
-        [](const Place&, const struct stat&, const Place&) { return true; };
+    // Copies an object with all that is below it, and goes on after what the members below throw.
+    void CopyTree(const Place& from, const Place& to);
 
-    std::function<void(const Place& from)> on_begin = [](const Place&) {};
-    std::function<void(const Place& from, const Place& to)> on_done = [](const Place&,
-                                                                         const Place&) {};
-    std::function<void(const std::string& path, const Failure&)> on_failure;
-    std::function<void()> on_skip = [] {};
+ protected:
+    // A directory that is being copied.
+    struct Level {
+        Place from;
+        Place to;
+        DirectoryRef inside;                         // the source
+        DirectoryRef made;                           // its copy
+        bool is_new = true;                          // nothing was there before
+        struct stat info = {};                       // of the source
+        std::vector<Directory::Entry> entries = {};  // what is in it that is to be copied
+        std::size_t next = 0;
+    };
 
-    // Without: a directory is copied by itself, and special files for what they give.
-    bool recursive = true;
+    // Whether nothing more is to be begun. What was begun is finished all the same.
+    virtual bool Stopped() const = 0;
+
+    // Copies what is no directory; or makes one: all of *level is set then, but for the entries
+    // that are not to be copied. What has no `made` is not entered.
+    virtual void Begin(const Place& from, const Place& to, Level* level) = 0;
+    virtual void Finish(const Level& level) = 0;
+    virtual void Fail(const Place& from, const Failure& failure) = 0;
+
+    // Those around the object in hand, the outermost first; none for what was named.
+    const std::vector<Level>& levels() const { return levels_; }
+
+ private:
+    void Try(const Place& from, const Place& to);
+
+    std::vector<Level> levels_;
 };
-
-// Goes on after a failure. Metadata of objects is no object of its own. No depth takes more than
-// the heap, and some descriptors for each level.
-void CopyTree(Transfer* transfer, const Place& from, const Place& to, const TreeCopyHooks& hooks);
 
 }  // namespace mavoea::tool
 

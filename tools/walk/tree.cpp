@@ -31,6 +31,7 @@ class Walk {
         Object object;
         try {
             object = FindObject(path);
+            visit_.on_named(object);
         } catch (const Failure& failure) {
             return visit_.on_failure(path, failure);
         }
@@ -46,14 +47,12 @@ class Walk {
     }
 
  private:
-    // Nothing is wrong with what has gone since its directory was read.
     template <class Work>
     void Guard(const Place& place, Work work) {
         try {
             work();
         } catch (const Failure& failure) {
-            if (failure.status() == kNotFound && !place.directory->Has(place.name)) return;
-            visit_.on_failure(place.path(), failure);
+            if (!HasGone(place, failure)) visit_.on_failure(place.path(), failure);
         }
     }
 
@@ -61,17 +60,14 @@ class Walk {
     // more than the heap.
     void DoDirectory(const Place& place) {
         const DirectoryRef directory = place.directory->OpenIn(place.name);
+        visit_.on_directory(directory);
         const std::size_t first = pending_.size();
         for (const Directory::Entry& entry : ObjectsIn(directory)) {
+            if (S_ISLNK(entry.type) || MAVOEAIsHiddenDirName(entry.name.c_str()) != 0) continue;
             const Place inner = {directory, entry.name};
             Guard(inner, [&] {
-                const auto info = inner.Status();
-                if (!info) return;
-                if (S_ISLNK(info->st_mode) || MAVOEAIsHiddenDirName(entry.name.c_str()) != 0) {
-                    return;
-                }
-                const bool descends = visit_.work(ObjectAt(inner, &*info), inner.path());
-                if (descends && S_ISDIR(info->st_mode)) pending_.push_back(inner);
+                const bool descends = visit_.work(ObjectAt(inner, entry.type), inner.path());
+                if (descends && S_ISDIR(entry.type)) pending_.push_back(inner);
             });
         }
         std::reverse(pending_.begin() + static_cast<std::ptrdiff_t>(first), pending_.end());
@@ -92,7 +88,9 @@ class Work {
             options.paths, options.recursive,
             {.work = [this](const Object& object, const std::string&) { return DoObject(object); },
              .on_failure = [this](const std::string& path,
-                                  const Failure& failure) { Add(path, failure); }});
+                                  const Failure& failure) { Add(path, failure); },
+             .on_named = task_.on_named,
+             .on_directory = task_.on_directory});
     }
 
     ExitStatus Summarize(bool json) {
@@ -115,7 +113,7 @@ class Work {
             suits = true;
             ++counts_[static_cast<std::size_t>(task_.work(object, &notes_))];
         } catch (const Failure& failure) {
-            Add(object.path(), failure);
+            if (!suits || !HasGone(object.place, failure)) Add(object.path(), failure);
         }
         return suits;
     }
@@ -168,6 +166,10 @@ class Work {
 };
 
 }  // namespace
+
+bool HasGone(const Place& place, const Failure& failure) {
+    return failure.status() == kNotFound && !place.directory->Has(place.name);
+}
 
 void VisitObjects(const std::vector<std::string>& paths, bool recursive, const Visit& visit) {
     if (recursive) RequireDescriptorPaths();

@@ -19,8 +19,17 @@ struct Visit {
     // looked at.
     std::function<bool(const Object&, const std::string& shown)> work;
     std::function<void(const std::string& path, const Failure&)> on_failure;
+
+    // Called for what was named, and for each directory before what is in it is listed: those who
+    // change things bring to its end what others began there.
+    std::function<void(const Object&)> on_named = [](const Object&) {};
+    std::function<void(const DirectoryRef&)> on_directory = [](const DirectoryRef&) {};
 };
 void VisitObjects(const std::vector<std::string>& paths, bool recursive, const Visit& visit);
+
+// Whether it failed because the object has gone since its directory was listed, with which nothing
+// is wrong.
+bool HasGone(const Place& place, const Failure& failure);
 
 // What became of an object.
 enum class Outcome { kDone, kCurrent, kNothing };
@@ -41,6 +50,10 @@ struct Task {
     std::function<void(const Object&)> check;
     // Throws Failure.
     std::function<Outcome(const Object&, Notes*)> work;
+
+    // As of a visit.
+    std::function<void(const Object&)> on_named = [](const Object&) {};
+    std::function<void(const DirectoryRef&)> on_directory = [](const DirectoryRef&) {};
 };
 
 struct TreeOptions {

@@ -1,0 +1,28 @@
+// The command lines of cp, mv and rm, which are those of the coreutils commands of these names.
+#ifndef MAVOEA_TOOLS_CLI_HABITS_H_
+#define MAVOEA_TOOLS_CLI_HABITS_H_
+
+#include <span>
+#include <string>
+#include <variant>
+#include <vector>
+
+#include "tools/move/options.h"
+
+namespace mavoea::tool {
+
+enum class Habit { kCopy, kMove, kDelete };
+
+struct HabitOptions {
+    CopyOptions copy;  // cp and mv
+    RemoveOptions remove;
+    std::vector<std::string> volumes;  // PATH=TYPE
+    bool json = false;
+};
+
+// What the words behind the command's say, or the exit status when everything has been said.
+std::variant<HabitOptions, int> ParseHabit(Habit habit, std::span<const char* const> words);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_CLI_HABITS_H_
