@@ -29,6 +29,8 @@ sh tests/packages.sh g++ cmake ninja-build pkg-config libacl1-dev libattr1-dev l
     googletest dpkg-dev make
 
 build_and_test release
+step "coreutils' tests of cp, mv and rm"
+sh tests/coreutils/run.sh -v || [ $? -eq 77 ] # nothing can be mounted here
 # What tests the tool runs it as a process: the programs of one build can test the tool of each.
 tool_tests=-DMAVOEA_TOOL_TESTS="$root/build/release/bin"
 build_and_test sanitize "$tool_tests"
