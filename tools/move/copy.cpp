@@ -36,10 +36,6 @@ JobOptions WithSourcesOnly(const CopyOptions& options) {
     return job;
 }
 
-bool IsNewer(const timespec& one, const timespec& other) {
-    return one.tv_sec != other.tv_sec ? one.tv_sec > other.tv_sec : one.tv_nsec > other.tv_nsec;
-}
-
 // "0644 (rw-r--r--)", for a question.
 std::string ModeText(mode_t mode) {
     constexpr char kLetters[] = "rwxrwxrwx";
@@ -291,21 +287,7 @@ class Placement final : private TreeCopy {
         const bool merges = source.is_directory() && target.is_directory();
         if (source.is_directory()) RequireApart(source, to);
         std::string backup;
-        if (target.info && !taken_) {
-            if (LeavesAlone(source)) return Skip();
-            switch (CompareEnds(source, target, task_, options_, follows)) {
-                case Sameness::kSame:
-                    throw AreTheSame(from, to);
-                case Sameness::kNothing:
-                    return;
-                case Sameness::kApart:
-                    break;
-            }
-            if (!MayTake(source, target)) return Skip();
-            RequireLikeTypes(source, target);
-            backup = MakeBackup(source, &target);
-        }
-        taken_ = false;
+        if (!std::exchange(taken_, false) && !MakeWay(source, &target, follows, &backup)) return;
         if (source.is_directory()) {
             Enter(source, target, merges, level);
         } else {
@@ -324,8 +306,9 @@ class Placement final : private TreeCopy {
         if (Copies()) job_.AddDone();
     }
 
-    void Skip() {
+    bool Leave() {
         if (!job_.stopped()) job_.AddSkipped();
+        return false;
     }
 
     // A name that was given twice, and goes to one place.
@@ -369,6 +352,24 @@ class Placement final : private TreeCopy {
 
     // ---- What is in the way ---------------------------------------------------------------------
 
+    // Of what is there. False when nothing is to be done; *backup is where it is kept, if it is.
+    bool MakeWay(const Source& source, Target* target, bool follows, std::string* backup) {
+        if (!target->info) return true;
+        if (LeavesAlone(source)) return Leave();
+        switch (CompareEnds(source, *target, task_, options_, follows)) {
+            case Sameness::kSame:
+                throw AreTheSame(source.named, target->named);
+            case Sameness::kNothing:
+                return false;
+            case Sameness::kApart:
+                break;
+        }
+        if (!MayTake(source, *target)) return Leave();
+        RequireLikeTypes(source, *target);
+        *backup = MakeBackup(source, target);
+        return true;
+    }
+
     // Whether nothing is to be said of what is there, even if it is the source itself.
     bool LeavesAlone(const Source& source) const {
         return options_.overwrite == Overwrite::kNever && !(Copies() && source.is_directory());
@@ -378,7 +379,7 @@ class Placement final : private TreeCopy {
     bool MayTake(const Source& source, const Target& target) {
         const struct stat& there = *target.info;
         const bool directory = source.is_directory();
-        if (options_.update && !directory && !IsNewer(source.info.st_mtim, there.st_mtim)) {
+        if (options_.update && !directory && !IsBefore(there.st_mtim, source.info.st_mtim)) {
             if (Copies()) transfer_.TakeForCopy(source.place, target.place, LinksOf(source));
             return false;
         }
@@ -465,7 +466,7 @@ class Placement final : private TreeCopy {
         const DirectoryRef made = transfer_.MakeDirectory(source.place, target.place);
         if (merges) (void)SettlePending(made);
         if (!SameFile(level->inside->Status(), source.info)) {
-            throw Failure(kFailed, source.place.path(), "it has become another file", "try again");
+            throw HasBecomeAnother(source.place);
         }
         if (!Copies() && removal_began_) {
             RemoveLeftMetadata(level->inside, *made, *removal_began_);
@@ -628,15 +629,7 @@ class Placement final : private TreeCopy {
         RequireNamedFromAbove(path, from, to);
         Target target = FindTarget(to, false, options_.force);
         std::string backup;
-        if (target.info) {
-            if (LeavesAlone(source)) return Skip();
-            if (CompareEnds(source, target, task_, options_, false) != Sameness::kApart) {
-                throw AreTheSame(from, to);
-            }
-            if (!MayTake(source, target)) return Skip();
-            RequireLikeTypes(source, target);
-            backup = MakeBackup(source, &target);
-        }
+        if (!MakeWay(source, &target, false, &backup)) return;
         const bool same = target.info && SameFile(*target.info, info);
         if (S_ISDIR(info.st_mode) && !same && IsInside(to, info)) {
             throw Refusal("cannot move " + Quoted(path) + " to a subdirectory of itself, " +

@@ -19,10 +19,6 @@ namespace fs = std::filesystem;
 // there for a file that was named.
 bool IsTrusted(const struct stat& link) { return ::geteuid() != 0 || link.st_uid == 0; }
 
-Failure HasBecomeAnother(const Place& place) {
-    return {kFailed, place.path(), "it has become another file", "try again"};
-}
-
 Refusal CannotStat(const Place& place, int error) {
     return {"cannot stat " + Quoted(place.path()), error};
 }

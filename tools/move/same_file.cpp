@@ -30,12 +30,6 @@ bool LeadsTo(const Place& link, const Place& to) {
     return error || SamePlace(PlaceOf(path.string(), Shown::kWhole), to);
 }
 
-bool IsListed(const Place& place) {
-    const auto entries = place.directory->Entries();
-    return std::any_of(entries.begin(), entries.end(),
-                       [&](const auto& entry) { return entry.name == place.name; });
-}
-
 // One entry under two spellings, on a file system that ignores case.
 bool IsRespelled(const Place& from, const Place& to, const struct stat& info) {
     if (SamePlace(from, to)) return false;

@@ -53,10 +53,6 @@ std::string TextIn(const File& file) {
     return {bytes.begin(), bytes.end()};
 }
 
-bool IsBefore(const timespec& one, const timespec& other) {
-    return one.tv_sec != other.tv_sec ? one.tv_sec < other.tv_sec : one.tv_nsec < other.tv_nsec;
-}
-
 }  // namespace
 
 UnfinishedMove::UnfinishedMove(const Place& to, const struct stat& source) : to_(to) {

@@ -398,6 +398,16 @@ std::uint64_t BirthOf(const Place& place) {
     return static_cast<std::uint64_t>(info.stx_btime.tv_sec) * kSecond + info.stx_btime.tv_nsec;
 }
 
+bool IsListed(const Place& place) {
+    const auto entries = place.directory->Entries();
+    return std::any_of(entries.begin(), entries.end(),
+                       [&](const auto& entry) { return entry.name == place.name; });
+}
+
+Failure HasBecomeAnother(const Place& place) {
+    return {kFailed, place.path(), "it has become another file", "try again"};
+}
+
 // ---- Inode --------------------------------------------------------------------------------------
 
 std::shared_ptr<const Inode> Inode::Find(const Place& place) {

@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "tools/place/file.h"
+#include "tools/say/messages.h"
 
 namespace mavoea::tool {
 
@@ -180,6 +181,12 @@ struct Place {
 
 // Of what is there; a Failure when nothing is.
 struct stat StatusOf(const Place& place);
+
+// Whether its directory lists the very name. Where case does not matter a file is found under
+// others, too.
+bool IsListed(const Place& place);
+
+Failure HasBecomeAnother(const Place& place);
 
 // When it was made, in nanoseconds since 1970; 0 where the file system does not say. No call
 // changes it, and so it tells a file from a later one of the same inode number.

@@ -71,6 +71,10 @@ inline bool SameFile(const struct stat& one, const struct stat& other) {
     return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
 }
 
+inline bool IsBefore(const timespec& one, const timespec& other) {
+    return one.tv_sec != other.tv_sec ? one.tv_sec < other.tv_sec : one.tv_nsec < other.tv_nsec;
+}
+
 // All that a descriptor has to give, such as standard input. Failure when it is more than `most`.
 Bytes ReadToEnd(int fd, const std::string& name, std::uint64_t most);
 

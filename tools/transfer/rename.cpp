@@ -21,12 +21,6 @@ namespace {
 using Found = Sidecars::Found;
 using Part = Pending::Part;
 
-bool IsListed(const Place& place) {
-    const auto entries = place.directory->Entries();
-    return std::any_of(entries.begin(), entries.end(),
-                       [&](const auto& entry) { return entry.name == place.name; });
-}
-
 // False with errno.
 bool TryToRename(const Place& from, const Place& to) {
     return ::renameat(from.directory->fd(), from.name.c_str(), to.directory->fd(),

@@ -45,10 +45,6 @@ bool HoldsContents(const struct stat& info) {
 
 std::pair<dev_t, ino_t> IdOf(const struct stat& info) { return {info.st_dev, info.st_ino}; }
 
-Failure HasBecomeAnother(const Place& place) {
-    return {kFailed, place.path(), "it has become another file", "try again"};
-}
-
 // ---- New links and special files ----------------------------------------------------------------
 
 // A name that is used by nothing else in the directory of `target`; it goes away at the end of its
@@ -203,13 +199,13 @@ std::string Creating(const struct stat& info, const Place& to) {
     }
 }
 
-// Says what cannot be made in the words of cp.
-template <class Make>
-auto Made(const std::string& what, Make make) {
+// Says what cannot be made in the words of cp, which nobody puts together before.
+template <class Words, class Make>
+auto Made(Words what, Make make) {
     try {
         return make();
     } catch (const SystemFailure& failure) {
-        throw Refusal(what, failure.error());
+        throw Refusal(what(), failure.error());
     }
 }
 
@@ -341,8 +337,6 @@ Transfer::Transfer(TransferOptions options)
     : options_(std::move(options)),
       data_(options_.watch, options_.manner.sparse, options_.manner.reflink) {}
 
-Transfer::~Transfer() = default;
-
 // The destination need not be there for its volume's type to be known.
 Leg Transfer::LegFor(const Place& from, const Place& to) const {
     const auto source = Inode::Open(from);
@@ -390,11 +384,14 @@ void Transfer::CopyFile(Leg* leg, const File* stream) {
     const std::shared_ptr<const File> own = stream == nullptr ? OpenSource(leg) : nullptr;
     const File& source = own ? *own : *stream;
     const Manner& manner = options_.manner;
-    // A move to another file system, over what is there.
-    const std::string moving = "inter-device move failed: " + Quoted(leg->from.path()) + " to " +
-                               Quoted(leg->to.path()) + "; unable to remove target";
-    const bool moves = options_.remembers && leg->replaces;
-    const std::string making = moves ? moving : Creating(leg->source->info(), leg->to.place);
+    const auto making = [&] {
+        // A move to another file system, over what is there.
+        if (options_.remembers && leg->replaces) {
+            return "inter-device move failed: " + Quoted(leg->from.path()) + " to " +
+                   Quoted(leg->to.path()) + "; unable to remove target";
+        }
+        return Creating(leg->source->info(), leg->to.place);
+    };
     const auto temporary = Made(making, [&] {
         return std::make_unique<TemporaryFile>(leg->to.place,
                                                FirstMode(leg->source->info(), manner));
@@ -414,13 +411,14 @@ void Transfer::CopyFile(Leg* leg, const File* stream) {
 
 void Transfer::CopyBytes(const File& source, bool stream, const File& target) {
     if (!options_.manner.data) return;
-    Made("error writing " + Quoted(target.path()), [&] {
-        if (stream) {
-            data_.CopyStream(source, target);
-        } else {
-            data_.Copy(source, target);
-        }
-    });
+    Made([&] { return "error writing " + Quoted(target.path()); },
+         [&] {
+             if (stream) {
+                 data_.CopyStream(source, target);
+             } else {
+                 data_.Copy(source, target);
+             }
+         });
 }
 
 void Transfer::Overwrite(const Place& from, const File* stream, const Place& to, const File& target,
@@ -448,22 +446,23 @@ void Transfer::Overwrite(const Place& from, const File* stream, const Place& to,
 
 void Transfer::CopyNode(Leg* leg) {
     const struct stat& info = leg->source->info();
-    Made(Creating(info, leg->to.place), [&] {
-        const auto node =
-            TemporaryNode::MakeBy(leg->to.place, [&](int directory, const char* name) {
-                if (S_ISLNK(info.st_mode)) {
-                    return ::symlinkat(LinkTarget(leg->from.place).c_str(), directory, name);
-                }
-                const mode_t mode = FirstMode(info, options_.manner);
-                return ::mknodat(directory, name, (info.st_mode & S_IFMT) | mode, info.st_rdev);
-            });
-        leg->target = node->inode();
-        CopyInodeTo(*leg, -1, -1);
-        if (!S_ISLNK(info.st_mode) && !options_.manner.keeps_mode) {
-            leg->target->SetMode(MadeMode(*leg, options_.manner));
-        }
-        node->GiveToTarget();
-    });
+    Made([&] { return Creating(info, leg->to.place); },
+         [&] {
+             const auto node = TemporaryNode::MakeBy(leg->to.place, [&](int directory,
+                                                                        const char* name) {
+                 if (S_ISLNK(info.st_mode)) {
+                     return ::symlinkat(LinkTarget(leg->from.place).c_str(), directory, name);
+                 }
+                 const mode_t mode = FirstMode(info, options_.manner);
+                 return ::mknodat(directory, name, (info.st_mode & S_IFMT) | mode, info.st_rdev);
+             });
+             leg->target = node->inode();
+             CopyInodeTo(*leg, -1, -1);
+             if (!S_ISLNK(info.st_mode) && !options_.manner.keeps_mode) {
+                 leg->target->SetMode(MadeMode(*leg, options_.manner));
+             }
+             node->GiveToTarget();
+         });
 }
 
 void Transfer::CarryMetadata(const Place& from, const Place& to) {
@@ -480,8 +479,9 @@ void Transfer::LinkObject(const Place& from, const Place& to) {
     RequireNoMetadata(from, to);
     RequireNotMade(from, to);
     RequireUnlockedTarget(leg);
-    const std::string what =
-        "cannot create hard link " + Quoted(to.path()) + " to " + Quoted(from.path());
+    const auto what = [&] {
+        return "cannot create hard link " + Quoted(to.path()) + " to " + Quoted(from.path());
+    };
     const auto node = Made(what, [&] {
         return TemporaryNode::MakeBy(to, [&](int directory, const char* name) {
             return ::linkat(from.directory->fd(), from.name.c_str(), directory, name, 0);
@@ -524,12 +524,14 @@ bool Transfer::CopyName(Leg* leg, Links links) {
     const auto node = TemporaryNode::TryToMake(leg->to.place, [&](int directory, const char* name) {
         return ::linkat(there.directory->fd(), there.name.c_str(), directory, name, 0);
     });
-    const bool impossible = !node && (errno == EXDEV || errno == EMLINK || errno == EPERM ||
-                                      errno == ENOTSUP || errno == ENOENT);
+    const int error = errno;
+    const bool impossible = !node && (error == EXDEV || error == EMLINK || error == EPERM ||
+                                      error == ENOTSUP || error == ENOENT);
     if (impossible) return false;
-    const std::string what =
-        "cannot create hard link " + Quoted(leg->to.path()) + " to " + Quoted(there.path());
-    if (!node) throw Refusal(what, errno);
+    const auto what = [&] {
+        return "cannot create hard link " + Quoted(leg->to.path()) + " to " + Quoted(there.path());
+    };
+    if (!node) throw Refusal(what(), error);
     leg->target = node->inode();
     leg->is_link = true;
     Made(what, [&] { node->GiveToTarget(); });
@@ -730,7 +732,7 @@ DirectoryRef Transfer::MakeDirectory(const Place& from, const Place& to) {
     }
     const mode_t least = S_IRWXU;
     const mode_t mode = FirstMode(StatusOf(from), options_.manner) | least;
-    DirectoryRef made = Made("cannot create directory " + Quoted(to.path()),
+    DirectoryRef made = Made([&] { return "cannot create directory " + Quoted(to.path()); },
                              [&] { return to.directory->MakeIn(to.name, mode); });
     fresh_.insert(made.get());
     NoteMade(to, made->Status());

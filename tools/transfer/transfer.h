@@ -47,7 +47,6 @@ struct Leg;
 class Transfer {
  public:
     explicit Transfer(TransferOptions options = {});
-    ~Transfer();
 
     // Copies an object that is no directory: a regular file, a symbolic link, or a special file,
     // which is made anew. What stands at `to`, no directory, is replaced, and so is its metadata.
