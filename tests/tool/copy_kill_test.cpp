@@ -1,6 +1,12 @@
 // Copies, conversions and moves between file systems that are killed: the same command again brings
 // everything to its place, and what it left off in has lost nothing.
 
+#include <signal.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <random>
+
 #include "tests/support/second_volume.h"
 #include "tests/tool/kills.h"
 
@@ -80,6 +86,19 @@ class CopyKillTest : public ::testing::TestWithParam<Way> {
         Make(From() + "/inner/green", "green");
         WriteFile(From() + "/plain", Ascii("without metadata"));
     }
+    void MakeMany() const {
+        constexpr int kDirectories = 3;
+        constexpr int kObjects = 15;
+        MakeAll();
+        for (int i = 0; i < kDirectories; ++i) {
+            const std::string directory = From() + "/inner/" + std::to_string(i);
+            MakeDir(directory);
+            for (int j = 0; j < kObjects; ++j) {
+                const std::string number = std::to_string(kObjects * i + j);
+                Make(directory + "/object " + number, number);
+            }
+        }
+    }
     void Make(const std::string& path, const std::string& colour) const {
         WriteFile(path, Ascii("data of " + colour));
         const int type = GetParam().from;
@@ -134,6 +153,34 @@ TEST_P(CopyKillTest, TheSameCommandAgainBringsItToItsEnd) {
             EXPECT_EQ(!Moves(), Exists(From()));
         },
         second_.path());
+}
+
+// A tree that takes long enough to be killed anywhere, by several runs one after the other.
+TEST_P(CopyKillTest, RunsThatAreKilledAtAnyTimeAreBroughtToTheirEnd) {
+    constexpr int kRounds = 6;
+    constexpr int kRuns = 3;
+    std::minstd_rand random(20240502);
+    MakeMany();
+    const auto began = std::chrono::steady_clock::now();
+    ASSERT_THAT(RunTool(arguments_).status, Eq(0));
+    const auto took = std::chrono::duration_cast<std::chrono::microseconds>(
+        std::chrono::steady_clock::now() - began);
+    const auto done = Everything(second_.path());
+    std::uniform_int_distribution<useconds_t> any_time(0, static_cast<useconds_t>(took.count()));
+    for (int round = 0; round < kRounds; round += static_cast<int>(SeriesStep())) {
+        SCOPED_TRACE(round);
+        MakeMany();
+        for (int run = 0; run < kRuns; ++run) {
+            RunningTool tool(arguments_);
+            usleep(any_time(random));
+            tool.Signal(SIGKILL);
+            (void)tool.Wait();
+        }
+        ExpectNothingLost();
+        EXPECT_GE(Moves() ? 1 : 0, RunTool(arguments_).status);
+        EXPECT_THAT(Differences(done, Everything(second_.path())), IsEmpty());
+        EXPECT_EQ(!Moves(), Exists(From()));
+    }
 }
 
 INSTANTIATE_TEST_SUITE_P(Ways, CopyKillTest, ::testing::ValuesIn(AllWays()),

@@ -15,6 +15,7 @@
 #include "tools/say/output.h"
 #include "tools/say/progress.h"
 #include "tools/transfer/comparison.h"
+#include "tools/transfer/pending.h"
 #include "tools/transfer/transfer.h"
 #include "tools/transfer/tree_copy.h"
 
@@ -97,6 +98,7 @@ class Conversion final : private TreeCopy {
         level->info = info;
         level->is_new = !to.Status();
         level->made = transfer_.MakeDirectory(from, to);
+        if (!level->is_new) (void)SettlePending(level->made);
         if (options_.recursive) level->entries = ObjectsIn(level->inside);
     }
 
