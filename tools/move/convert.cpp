@@ -90,7 +90,7 @@ class Conversion final : private TreeCopy {
         Show(from.path());
         const struct stat info = StatusOf(from);
         if (!S_ISDIR(info.st_mode)) {
-            transfer_.CopyObject(from, to, Links::kSeveral);
+            transfer_.CopyObject(from, info.st_mode, to, Links::kSeveral);
             ++converted_;
             return;
         }

@@ -514,7 +514,7 @@ class Placement final : private TreeCopy {
             throw Refusal("cannot create regular file " + Quoted(to.path()), ENOTDIR);
         }
         if (source.stream) return transfer_.CopyContents(source.place, *source.stream, to);
-        transfer_.CopyObject(source.place, to, LinksOf(source));
+        transfer_.CopyObject(source.place, source.info.st_mode, to, LinksOf(source));
     }
 
     Links LinksOf(const Source& source) const {

@@ -426,6 +426,16 @@ std::shared_ptr<const Inode> Inode::Open(const Place& place) {
     throw SystemFailure(place.path(), ENOENT);
 }
 
+std::shared_ptr<const Inode> Inode::OpenToRead(const Place& place) {
+    // Never waits for the other end of a FIFO, or for whoever holds a lease.
+    constexpr int kReadFlags = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
+    const auto file = std::make_shared<const File>(
+        OpenQuietly(place.directory->fd(), place.name.c_str(), kReadFlags), place.path());
+    if (file->fd() < 0) return Open(place);
+    auto inode = Of(file);
+    return S_ISREG(inode->info().st_mode) ? inode : Open(place);
+}
+
 std::shared_ptr<const Inode> Inode::Of(const std::shared_ptr<const File>& file) {
     return std::shared_ptr<const Inode>(new Inode(file, false));
 }

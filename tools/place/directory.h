@@ -198,6 +198,8 @@ class Inode {
     // Null when nothing is there. Throws Failure.
     static std::shared_ptr<const Inode> Find(const Place& place);
     static std::shared_ptr<const Inode> Open(const Place& place);  // a Failure when nothing is
+    // The same, but a regular file is opened for reading if it may be read.
+    static std::shared_ptr<const Inode> OpenToRead(const Place& place);
     // The file behind an open descriptor, shared with the caller.
     static std::shared_ptr<const Inode> Of(const std::shared_ptr<const File>& file);
     // The same with a descriptor of its own.
@@ -206,6 +208,8 @@ class Inode {
     const std::string& path() const { return file_->path(); }  // for people
     // That calls on open files take; -1 when there is none.
     int fd() const { return by_path_ ? -1 : file_->fd(); }
+    // To be read; null when it has not been opened for that.
+    std::shared_ptr<const File> file() const { return by_path_ ? nullptr : file_; }
     const struct stat& info() const { return info_; }  // when it was opened
     struct stat Status() const {
         return file_->Status();

@@ -58,9 +58,13 @@ std::uint64_t File::Size() const {
 }
 
 Bytes File::Read(std::uint64_t offset, std::uint64_t size) const {
-    const std::uint64_t file_size = Size();
-    if (offset >= file_size) return {};
-    size = std::min(size, file_size - offset);
+    // How large the file is matters only where more would be taken than that could be.
+    constexpr std::uint64_t kLittle = 4096;
+    if (contents_ || size > kLittle) {
+        const std::uint64_t file_size = Size();
+        if (offset >= file_size) return {};
+        size = std::min(size, file_size - offset);
+    }
     if (contents_) {
         const ByteView part =
             ByteView(*contents_)

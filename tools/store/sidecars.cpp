@@ -272,6 +272,20 @@ bool BelongsToAnObject(const Directory& directory, const std::string& name) {
     return !MayBelongTo(directory, name).empty();
 }
 
+namespace {
+
+// Whether one of the objects was there when the directory was listed. They are told by the list
+// where it can tell, and most metadata is of one.
+bool BelongedToAnObject(const Directory& directory, const std::string& name) {
+    if (!directory.listed()) return false;
+    for (std::size_t at = name.find('@', 1); at != std::string::npos; at = name.find('@', at + 1)) {
+        if (directory.HadAtFirst(name.substr(0, at))) return true;
+    }
+    return false;
+}
+
+}  // namespace
+
 std::vector<LeftOver> FindLeftOver(const Directory& directory, const Directory& ea_dir) {
     std::vector<LeftOver> all;
     const auto add = [&](const auto& self, const Directory& in, const std::string& prefix) -> void {
@@ -279,6 +293,7 @@ std::vector<LeftOver> FindLeftOver(const Directory& directory, const Directory& 
             const bool top = prefix.empty();
             if (top && entry.name == kCoverName && S_ISREG(entry.type)) continue;
             if (entry.name.starts_with(kOwnPrefix)) continue;
+            if (top && BelongedToAnObject(directory, entry.name)) continue;
             if (top && BelongsToAnObject(directory, entry.name)) continue;
             const auto info = in.StatusOf(entry.name);
             if (!info) continue;

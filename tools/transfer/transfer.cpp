@@ -244,18 +244,23 @@ bool SameState(const struct stat& one, const struct stat& other) {
     return HashOf(one, false) == HashOf(other, false);
 }
 
-// Of the object itself, which it may not be any more.
-std::shared_ptr<const File> OpenSource(Leg* leg) {
+// What is read of it. A Failure in the words of cp when nothing may be.
+std::shared_ptr<const File> ContentsOf(const Leg& leg) {
+    if (auto file = leg.source->file()) return file;
+    const Place& from = leg.from.place;
     constexpr int kFlags = O_RDONLY | O_CLOEXEC | O_NOCTTY | O_NONBLOCK | O_NOFOLLOW;
-    const Place& from = leg->from.place;
-    auto source = std::make_shared<File>(
-        OpenQuietly(from.directory->fd(), from.name.c_str(), kFlags), from.path());
-    if (source->fd() < 0) {
-        throw Refusal("cannot open " + Quoted(from.path()) + " for reading", errno);
-    }
-    leg->source = Inode::Of(std::shared_ptr<const File>(source));
-    if (!S_ISREG(leg->source->info().st_mode)) throw HasBecomeAnother(from);
-    return source;
+    const File again(OpenQuietly(from.directory->fd(), from.name.c_str(), kFlags), from.path());
+    if (again.fd() >= 0) throw HasBecomeAnother(from);
+    throw Refusal("cannot open " + Quoted(from.path()) + " for reading", errno);
+}
+
+std::shared_ptr<const Inode> OpenSource(const Place& from, mode_t type) {
+    return S_ISREG(type) ? Inode::OpenToRead(from) : Inode::Open(from);
+}
+
+// The destination need not be there for its volume's type to be known.
+Object TargetAt(const Place& to, mode_t type) {
+    return AsReadable(S_ISDIR(type) ? ObjectAt(to, nullptr) : ObjectAt(to, type));
 }
 
 // Whether the copy at `there` may have this object's metadata, too, where that is in the file
@@ -337,11 +342,15 @@ Transfer::Transfer(TransferOptions options)
     : options_(std::move(options)),
       data_(options_.watch, options_.manner.sparse, options_.manner.reflink) {}
 
-// The destination need not be there for its volume's type to be known.
 Leg Transfer::LegFor(const Place& from, const Place& to) const {
-    const auto source = Inode::Open(from);
-    const Object object = ObjectAt(from, &source->info());
-    const Object target = AsReadable(ObjectAt(to, nullptr));
+    return LegOf(from, Inode::Open(from), to);
+}
+
+Leg Transfer::LegOf(const Place& from, const std::shared_ptr<const Inode>& source,
+                    const Place& to) const {
+    const mode_t type = source->info().st_mode & S_IFMT;
+    const Object object = ObjectAt(from, type);
+    const Object target = TargetAt(to, type);
     Sidecars sidecars = Sidecars::Find(object, Sidecars::Services::kFind);
     Metadata wanted = ReadMetadata(object, *source, sidecars);
     return {
@@ -349,18 +358,12 @@ Leg Transfer::LegFor(const Place& from, const Place& to) const {
 }
 
 Leg Transfer::LegWithoutMetadata(const Place& from, const File& source, const Place& to) const {
-    return {{from, -1},
-            AsReadable(ObjectAt(to, nullptr)),
-            Inode::Of(source),
-            {},
-            {},
-            to.Status().has_value()};
+    return {{from, -1}, TargetAt(to, S_IFREG), Inode::Of(source), {}, {}, to.Status().has_value()};
 }
 
-void Transfer::CopyObject(const Place& from, const Place& to, Links links) {
-    Leg leg = LegFor(from, to);
-    RequireNoMetadata(from, to);
-    RequireNotMade(from, to);
+void Transfer::CopyObject(const Place& from, mode_t type, const Place& to, Links links) {
+    Leg leg = LegOf(from, OpenSource(from, type), to);
+    RequireMayCome(leg);
     if (!CopyName(&leg, links)) {
         if (S_ISREG(leg.source->info().st_mode)) {
             CopyFile(&leg, nullptr);
@@ -381,7 +384,7 @@ void Transfer::CopyContents(const Place& from, const File& source, const Place& 
 }
 
 void Transfer::CopyFile(Leg* leg, const File* stream) {
-    const std::shared_ptr<const File> own = stream == nullptr ? OpenSource(leg) : nullptr;
+    const std::shared_ptr<const File> own = stream == nullptr ? ContentsOf(*leg) : nullptr;
     const File& source = own ? *own : *stream;
     const Manner& manner = options_.manner;
     const auto making = [&] {
@@ -423,11 +426,11 @@ void Transfer::CopyBytes(const File& source, bool stream, const File& target) {
 
 void Transfer::Overwrite(const Place& from, const File* stream, const Place& to, const File& target,
                          Links links) {
-    Leg leg = stream != nullptr ? LegWithoutMetadata(from, *stream, to) : LegFor(from, to);
-    RequireNoMetadata(from, to);
-    RequireNotMade(from, to);
+    Leg leg = stream != nullptr ? LegWithoutMetadata(from, *stream, to)
+                                : LegOf(from, Inode::OpenToRead(from), to);
+    RequireMayCome(leg);
     if (stream == nullptr && CopyName(&leg, links)) return Finish(&leg);
-    const std::shared_ptr<const File> file = stream == nullptr ? OpenSource(&leg) : nullptr;
+    const std::shared_ptr<const File> file = stream == nullptr ? ContentsOf(leg) : nullptr;
     const File& source = file ? *file : *stream;
     leg.target = Inode::Of(target);
     leg.former_mode = leg.target->info().st_mode & kPermissionBits;
@@ -476,8 +479,7 @@ void Transfer::CarryMetadata(const Place& from, const Place& to) {
 
 void Transfer::LinkObject(const Place& from, const Place& to) {
     Leg leg = LegFor(from, to);
-    RequireNoMetadata(from, to);
-    RequireNotMade(from, to);
+    RequireMayCome(leg);
     RequireUnlockedTarget(leg);
     const auto what = [&] {
         return "cannot create hard link " + Quoted(to.path()) + " to " + Quoted(from.path());
@@ -563,7 +565,9 @@ void Transfer::CopyInodeTo(const Leg& leg, int source, int target) const {
     if (problem) options_.on_note(Printable(leg.to.path()) + ": " + *problem);
     if (!HoldsContents(leg.source->info())) return;
     // The owner of a file or directory can still change it.
-    const mode_t mode = leg.target->Status().st_mode & kPermissionBits;
+    const struct stat now =
+        BeginsClosed(options_.manner) ? leg.target->Status() : leg.target->info();
+    const mode_t mode = now.st_mode & kPermissionBits;
     const mode_t least = S_ISDIR(leg.source->info().st_mode) ? S_IRWXU : S_IRUSR | S_IWUSR;
     if ((mode & least) != least) leg.target->SetMode(mode | least);
 }
@@ -671,13 +675,20 @@ std::optional<std::string> Transfer::NameOfMade(const Place& to) const {
 }
 
 bool Transfer::HasMadeLink(const Place& to) const {
+    if (made_links_.empty()) return false;
     const auto info = to.Status();
     return info && S_ISLNK(info->st_mode) && made_links_.contains(IdOf(*info));
 }
 
+void Transfer::RequireMayCome(const Leg& leg) const {
+    RequireNoMetadata(leg.from.place, leg.to);
+    if (leg.replaces) RequireNotMade(leg.from.place, leg.to.place);
+}
+
 // One file cannot be both: an object that was copied, and metadata of another one.
-void Transfer::RequireNoMetadata(const Place& from, const Place& to) const {
-    const Keeping keeping = AsReadable(ObjectAt(to, nullptr)).keeping();
+void Transfer::RequireNoMetadata(const Place& from, const Object& target) const {
+    const Place& to = target.place;
+    const Keeping keeping = target.keeping();
     if (keeping != Keeping::kAppleDouble && keeping != Keeping::kEaDirectory) return;
     const Directory& there = *to.directory;
     const auto was_made = [&](const std::string& name) {
@@ -724,7 +735,7 @@ void Transfer::RequireNotMade(const Place& from, const Place& to) const {
 }
 
 DirectoryRef Transfer::MakeDirectory(const Place& from, const Place& to) {
-    RequireNoMetadata(from, to);
+    RequireNoMetadata(from, TargetAt(to, S_IFDIR));
     RequireNotMade(from, to);
     if (DirectoryRef there = to.directory->FindIn(to.name)) {
         NoteMade(to, there->Status());

@@ -50,8 +50,9 @@ class Transfer {
 
     // Copies an object that is no directory: a regular file, a symbolic link, or a special file,
     // which is made anew. What stands at `to`, no directory, is replaced, and so is its metadata.
-    // Until the data is whole `to` is as it was.
-    void CopyObject(const Place& from, const Place& to, Links links);
+    // Until the data is whole `to` is as it was. `type`: what has been seen at `from`, S_IFREG for
+    // instance; what that is not is not opened to be read.
+    void CopyObject(const Place& from, mode_t type, const Place& to, Links links);
 
     // As CopyObject(), but the data is all that can be read from `source`, a FIFO or a device. It
     // has no metadata.
@@ -112,6 +113,7 @@ class Transfer {
     };
 
     Leg LegFor(const Place& from, const Place& to) const;
+    Leg LegOf(const Place& from, const std::shared_ptr<const Inode>& source, const Place& to) const;
     Leg LegWithoutMetadata(const Place& from, const File& source, const Place& to) const;
     void CopyFile(Leg* leg, const File* stream);
     void CopyBytes(const File& source, bool stream, const File& target);
@@ -125,7 +127,8 @@ class Transfer {
     void Remember(const struct stat& info);
     void NoteMade(const Place& to, const struct stat& info);
     std::optional<std::string> NameOfMade(const Place& to) const;
-    void RequireNoMetadata(const Place& from, const Place& to) const;
+    void RequireMayCome(const Leg& leg) const;
+    void RequireNoMetadata(const Place& from, const Object& target) const;
     void CopyLeftOvers(const Directory& inside, const DirectoryRef& made,
                        const Directory::Entry& entry);
 
