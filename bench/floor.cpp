@@ -119,6 +119,12 @@ int CountHiddenFiles(std::span<const char* const> names) {
     return count;
 }
 
+int CountNamesWithColon(std::span<const char* const> names) {
+    int count = 0;
+    for (const char* name : names) count += strchr(name, ':') != nullptr ? 1 : 0;
+    return count;
+}
+
 int ReadValue(const char* path, std::string_view name, std::uint8_t* to, std::size_t size) {
     const int fd = open(path, O_RDONLY);
     const std::uint8_t* const head = fd < 0 ? nullptr : ReadHead(fd);

@@ -29,6 +29,9 @@ void AppleDoublePath(const char* path, char* to);
 int CountHiddenDirNames(std::span<const char* const> names);
 int CountHiddenFiles(std::span<const char* const> names);
 
+// How many have a ':'.
+int CountNamesWithColon(std::span<const char* const> names);
+
 // Opens the stream, reads header and table, finds `name` (its NUL not included) in the table, reads
 // its value and closes. Returns the value's length, -1 on failure.
 int ReadValue(const char* path, std::string_view name, std::uint8_t* to, std::size_t size);

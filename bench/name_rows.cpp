@@ -19,6 +19,7 @@ constexpr int kCount = 10000;
 // 1 in 50 another name that begins with '.' or '@'.
 constexpr int kHiddenDirs = kCount / 100;
 constexpr int kHiddenFiles = 4 * kCount / 100;
+constexpr int kLegacyNames = kCount / 100;  // with a ':'
 
 class Names {
  public:
@@ -46,6 +47,8 @@ class Names {
                 return ".profile " + std::to_string(i);
             case 5:
                 return "@home " + std::to_string(i);
+            case 6:
+                return "MAVO:Resource";
             default:
                 return photo;
         }
@@ -89,6 +92,17 @@ void AddNameRows(std::vector<Row>* rows) {
                          },
                          kHiddenFiles),
                      .floor = Counting(floor::CountHiddenFiles, kHiddenFiles)});
+    rows->push_back({.work = "10,000 names: legacy metadata or not",
+                     .where = "memory",
+                     .aim = 1.5,
+                     .library = Counting(
+                         [](std::span<const char* const> names) {
+                             int count = 0;
+                             for (const char* name : names) count += MAVOEAIsHiddenName(name);
+                             return count;
+                         },
+                         kLegacyNames),
+                     .floor = Counting(floor::CountNamesWithColon, kLegacyNames)});
 }
 
 }  // namespace mavoea::bench

@@ -23,7 +23,7 @@ int MAVOEAADPath(const char* szPath, char* szBuf, int cbBuf) {
     // The name as it was given: empty for a path that ends in '/'.
     if (SplitObject(szPath).name.size() > kNameMax) return unit.Fail(Err::kNameTooLong);
 
-    WorkingPath path(szPath);
+    const SourcePath path(szPath, szBuf, cbBuf);
     if (!path.ok()) return unit.Fail(Err::kMemory);
     const ObjectPath object = SplitObject(WithoutTrailingSlash(path.text()));
     CutShort out(szBuf, cbBuf);

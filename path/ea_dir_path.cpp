@@ -51,7 +51,7 @@ int MAVOEADirPath(int form, const char* szPath, char* szBuf, int cbBuf) {
         errno = ENOENT;
         return unit.Fail(Err::kBadArgument);
     }
-    WorkingPath path(szPath);
+    const SourcePath path(szPath, szBuf, cbBuf);
     if (!path.ok()) return unit.Fail(Err::kMemory);
     return DeriveDirPath(form, path.text(), szBuf, cbBuf) == nullptr ? -1 : 0;
 }

@@ -5,6 +5,7 @@
 #include <string.h>
 
 #include <cstdint>
+#include <optional>
 
 #include "include/mavoea.h"
 #include "path/ea_dir_path.h"
@@ -36,17 +37,26 @@ char CheckCharacter(std::string_view dropped) {
     return kCheckCharacters[sum % kCheckCharacters.size()];
 }
 
-// Shortens a name of more than kNameMax bytes in place, to exactly kNameMax.
-void Shorten(char* name, std::size_t size) {
-    // It stands for all from the last byte that has room on.
-    const char check = CheckCharacter({name + kNameMax - 1, size - (kNameMax - 1)});
-    const auto* const dot =
-        static_cast<const char*>(memrchr(name + size - kExtensionMax, '.', kExtensionMax));
-    const auto extension = dot == nullptr ? 0 : static_cast<std::size_t>(name + size - dot);
-    // The extension may overlap the place where it goes.
-    memmove(name + kNameMax - extension, name + size - extension, extension);
-    name[kNameMax - extension - 1] = check;
-}
+// What a name of more than kNameMax bytes is shortened to, in exactly kNameMax.
+class ShortName {
+ public:
+    explicit ShortName(std::string_view name) {
+        // It stands for all from the last byte that has room on.
+        const char check = CheckCharacter(name.substr(kNameMax - 1));
+        const std::string_view end = name.substr(name.size() - kExtensionMax);
+        const std::size_t dot = end.rfind('.');
+        const std::string_view extension =
+            dot == std::string_view::npos ? std::string_view() : end.substr(dot);
+        PathWriter(bytes_)
+            .Add(name.substr(0, kNameMax - 1 - extension.size()))
+            .Add({&check, 1})
+            .Add(extension);
+    }
+    std::string_view text() const { return {bytes_, kNameMax}; }
+
+ private:
+    char bytes_[kNameMax];
+};
 
 }  // namespace
 }  // namespace mavoea
@@ -57,9 +67,9 @@ int MAVOEAPathNoADFS(int form, const char* szPath, const char* szName, char* szB
     if (szPath == nullptr || szName == nullptr) return unit.Fail(Err::kBadArgument);
     if (*szPath == '\0') return unit.Fail(Err::kBadArgument);
 
-    WorkingPath copy(szPath);
-    if (!copy.ok()) return unit.Fail(Err::kMemory);
-    std::string_view path = WithoutTrailingSlash(copy.text());
+    const SourcePath source(szPath, szBuf, cbBuf);
+    if (!source.ok()) return unit.Fail(Err::kMemory);
+    std::string_view path = WithoutTrailingSlash(source.text());
 
     // Made on the name as it is; only the file form counts the NUL.
     const std::string_view kind(szName);
@@ -71,12 +81,13 @@ int MAVOEAPathNoADFS(int form, const char* szPath, const char* szName, char* szB
     }
 
     std::string_view name;
+    std::optional<ShortName> shortened;
     if (form == EA_FORM_FILE) {
         name = SplitObject(path).name;
         if (name.size() > kNameMax) {
-            Shorten(copy.data() + (name.data() - path.data()), name.size());
+            shortened.emplace(name);
             path.remove_suffix(name.size() - kNameMax);
-            name = {name.data(), kNameMax};
+            name = shortened->text();
         }
     }
     char* const dir_end = DeriveDirPath(form, path, szBuf, cbBuf);

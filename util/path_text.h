@@ -6,6 +6,8 @@
 
 #include <algorithm>
 #include <cstddef>
+#include <cstdint>
+#include <optional>
 #include <string_view>
 #include <type_traits>
 
@@ -51,8 +53,7 @@ constexpr std::string_view WithoutTrailingSlash(std::string_view path) {
 static_assert(WithoutTrailingSlash("/v/a/") == "/v/a" && WithoutTrailingSlash("/v/a//") == "/v/a/");
 static_assert(WithoutTrailingSlash("/").empty() && WithoutTrailingSlash("").empty());
 
-// A copy of a path to work on, so that a result may be written over the original. Short paths, as
-// all that the kernel takes are, stay on the stack.
+// A copy of a path to work on. Short paths, as all that the kernel takes are, stay on the stack.
 class WorkingPath {
  public:
     // cppcheck-suppress uninitMemberVar; clearing it would cost more than the rest of a derivation
@@ -69,6 +70,34 @@ class WorkingPath {
     std::size_t size_;
     Owned<char> heap_;
     char stack_[kShortPathMax + 1];
+};
+
+// A path from which a result is derived that may be written over it: a copy where the two overlap.
+// Paths that are too long for the stack are copied whatever, so that memory can always run out for
+// them, as callers have been told.
+class SourcePath {
+ public:
+    SourcePath(const char* path, const char* result, int result_size) : text_(path) {
+        if (text_.size() <= kShortPathMax && !Overlaps(result, result_size)) return;
+        copy_.emplace(path);
+        if (copy_->ok()) text_ = copy_->text();
+    }
+
+    bool ok() const { return !copy_ || copy_->ok(); }  // false: out of memory
+    std::string_view text() const { return text_; }
+
+ private:
+    // A result may have one byte more, its NUL. Addresses in 64 bits, in which no end passes the
+    // last one.
+    bool Overlaps(const char* result, int result_size) const {
+        const std::uint64_t from = reinterpret_cast<std::uintptr_t>(text_.data());
+        const std::uint64_t to = reinterpret_cast<std::uintptr_t>(result);
+        return result_size > 0 && from <= to + static_cast<unsigned>(result_size) &&
+               to <= from + text_.size();
+    }
+
+    std::string_view text_;
+    std::optional<WorkingPath> copy_;
 };
 
 // Writes text into a buffer of at least one byte as snprintf does: what does not fit is dropped,
