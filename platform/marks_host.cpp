@@ -6,6 +6,8 @@
 #include <sys/xattr.h>
 #include <unistd.h>
 
+#include <atomic>
+
 #include "platform/attribute_word.h"
 #include "platform/include/mavocore.h"
 #include "platform/marks.h"
@@ -54,11 +56,18 @@ bool FindChange(int command, Change* change) {
 // What kernels answer that have no such call, or another one under its number.
 bool MeansNoCall(int error) { return error == ENOSYS || error == EINVAL || error == EFAULT; }
 
+// A kernel that does not know a call will not learn it, and is not asked again.
+std::atomic<bool> sets_archive = true;
+std::atomic<bool> takes_commands = true;
+
 }  // namespace
 
 int SetArchiveBit(int fd) {
-    const int result = ::fcntl(fd, kSetArchive);
-    if (result >= 0 || errno != EINVAL) return result;
+    if (sets_archive.load(std::memory_order_relaxed)) {
+        const int result = ::fcntl(fd, kSetArchive);
+        if (result >= 0 || errno != EINVAL) return result;
+        sets_archive.store(false, std::memory_order_relaxed);
+    }
     return ChangeWord(
         {.set = MLIBC_ATTRIBUTE_ARCHIVE},
         [fd](void* bytes, size_t size) {
@@ -70,8 +79,11 @@ int SetArchiveBit(int fd) {
 }
 
 int FileCommand(const char* path, int command) {
-    const long result = ::syscall(kFileCommandCall, path, command);
-    if (result >= 0 || !MeansNoCall(errno)) return static_cast<int>(result);
+    if (takes_commands.load(std::memory_order_relaxed)) {
+        const long result = ::syscall(kFileCommandCall, path, command);
+        if (result >= 0 || !MeansNoCall(errno)) return static_cast<int>(result);
+        if (errno == ENOSYS) takes_commands.store(false, std::memory_order_relaxed);
+    }
     Change change;
     if (!FindChange(command, &change)) {
         errno = EINVAL;
