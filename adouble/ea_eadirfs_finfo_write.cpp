@@ -7,7 +7,9 @@
 
 #include "format/ea_stream.h"
 #include "include/mavoea.h"
+#include "path/ea_open.h"
 #include "util/file_io.h"
+#include "util/metadata_file.h"
 #include "util/owned.h"
 #include "util/path_text.h"
 #include "util/unit.h"
@@ -40,15 +42,37 @@ int WriteFinderInfo(EASHandle* h, const unsigned char finfo[kFinderInfoSize]) {
     return size == 0 ? WriteNewFile(*h) : EASWriteFinderInfo(h);
 }
 
-// Takes away a resource file that holds nothing, so that a failed call leaves none behind.
-void RemoveIfEmpty(int fd, const char* path) {
+// Takes away a resource file that this call has made and that holds nothing, so that a failed call
+// leaves none behind. Its lock is had, or taken for that: another process that has it may be about
+// to write, and one that waits for it looks afterwards whether the file is still there.
+void RemoveIfEmpty(int fd, const char* file) {
     const ErrnoKeeper keep;
-    if (kernel::Lseek(fd, 0, SEEK_END) != 0) return;
-    char file[kPathBufferSize];
-    if (MAVOEAPath(EA_FORM_FILE, path, MAVOEA_KIND_RESOURCE, file, kDerivedPathMax,
-                   EA_PLACE_EADIR) == 0) {
+    struct flock64 lock = {};
+    lock.l_type = F_WRLCK;
+    lock.l_whence = SEEK_SET;
+    if (kernel::SetLock(fd, &lock) == 0 && kernel::Lseek(fd, 0, SEEK_END) == 0 && Names(file, fd)) {
         (void)kernel::Unlink(file);
     }
+}
+
+enum class Outcome { kWritten, kFailed, kReplaced };
+
+// Once: kReplaced when another file, or none, had taken the place of the one that was opened.
+Outcome Write(const char* path, const char* file, const unsigned char finfo[kFinderInfoSize]) {
+    bool made = false;
+    const UniqueFd fd(OpenOrMakeMetadata(path, MAVOEA_KIND_RESOURCE, &made));
+    if (!fd) return Outcome::kFailed;
+    EASHandle* const h = MAVOEASOpen(fd.get(), F_WRLCK);
+    Outcome outcome = Outcome::kFailed;
+    if (h != nullptr && !Names(file, fd.get())) {
+        outcome = Outcome::kReplaced;
+    } else if (h != nullptr && WriteFinderInfo(h, finfo) == 0) {
+        outcome = Outcome::kWritten;
+    }
+    if (outcome == Outcome::kFailed && made) RemoveIfEmpty(fd.get(), file);
+    const ErrnoKeeper keep;
+    if (h != nullptr) (void)MAVOEASClose(h);
+    return outcome;
 }
 
 }  // namespace
@@ -58,14 +82,17 @@ using namespace mavoea;
 
 int MAVOEAEADirFSFInfoWrite(const char* path, const unsigned char finfo[32]) {
     if (path == nullptr || finfo == nullptr) return unit.Fail(Err::kBadArgument);
-    const UniqueFd fd(
-        MAVOEAOpen(EA_FORM_FILE, path, MAVOEA_KIND_RESOURCE, O_RDWR | O_CREAT, EA_PLACE_EADIR));
-    if (!fd) return -1;
-    EASHandle* const h = MAVOEASOpen(fd.get(), F_WRLCK);
-    const bool written = h != nullptr && WriteFinderInfo(h, finfo) == 0;
-    if (h != nullptr) (void)MAVOEASClose(h);
-    if (!written) RemoveIfEmpty(fd.get(), path);
-    return written ? 0 : -1;
+    char file[kPathBufferSize];
+    if (MAVOEAPath(EA_FORM_FILE, path, MAVOEA_KIND_RESOURCE, file, MAVOEA_PATH_SIZE,
+                   EA_PLACE_EADIR) != 0) {
+        return -1;
+    }
+    for (int tries = kOpenTries; tries > 0; --tries) {
+        const Outcome outcome = Write(path, file, finfo);
+        if (outcome != Outcome::kReplaced) return outcome == Outcome::kWritten ? 0 : -1;
+    }
+    errno = EAGAIN;
+    return unit.Fail(Err::kLock);
 }
 
 int EASWriteFinderInfo(EASHandle* h) {

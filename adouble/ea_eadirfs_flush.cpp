@@ -6,6 +6,7 @@
 #include "format/netatalk_record.h"
 #include "include/mavoea.h"
 #include "util/file_io.h"
+#include "util/metadata_file.h"
 #include "util/owned.h"
 #include "util/path_text.h"
 #include "util/unit.h"
@@ -33,24 +34,16 @@ int MAVOEAEADirAdoubleFlush(const void* buf, int len, const char* path) {
     }
     // The descriptor stays open on every way out: closing it would drop the process's record locks
     // on the file, which a caller may hold through a stream handle.
-    int fd = kernel::OpenRegular(file, O_RDWR | O_CLOEXEC, 0);
-    bool created = false;
-    if (fd < 0 && errno == ENOENT) {
-        fd = kernel::OpenRegular(file, O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, 0777);
-        created = fd >= 0;
-        // Another process may have made it meanwhile: then it is not removed below.
-        if (fd < 0 && errno == EEXIST) fd = kernel::OpenRegular(file, O_RDWR | O_CLOEXEC, 0);
-    }
+    bool made = false;
+    const int fd = OpenOrMake(file, &made);
     if (fd < 0) {
         unit.Log("%s:%d Error open path [%s] %s", path, strerror(errno));
         return unit.Fail(Err::kOpen);
     }
     if (WriteAt(fd, {static_cast<const std::uint8_t*>(buf), size}, 0) != size) {
         unit.Log("%s:%d Error: write path [%s] %s", path, strerror(errno));
-        if (created) {
-            const ErrnoKeeper keep;
-            (void)kernel::Unlink(file);
-        }
+        const ErrnoKeeper keep;
+        if (made && Names(file, fd)) (void)kernel::Unlink(file);
         return unit.Fail(Err::kWrite);
     }
     return 0;

@@ -374,9 +374,11 @@ MAVOEA_API int MAVOEAEADirAdoubleFlush(const void* buf, int len, const char* pat
  * record and the flush time give. */
 MAVOEA_API int MAVOEAFileEAFSFinfoEASync(const char* path, int checkFSType);
 
-/* Writes Finder info into the resource file, in place; one that is missing is created, of 82 bytes,
- * and removed again when nothing could be written. 0, or -1: 0xD00 NULL; 0x300, 0xB00 not written;
- * what MAVOEAOpen() and MAVOEASOpen() give. */
+/* Writes Finder info into the resource file, in place, under its write lock; one that is missing is
+ * created, of 82 bytes. One that is removed or replaced before it is locked is opened, or created,
+ * anew. When nothing could be written, an empty one is removed again if this call has made it and
+ * has its lock. 0, or -1: 0xD00 NULL; 0x300, 0xB00 not written; 0x400 it was replaced time and again
+ * (errno EAGAIN); what MAVOEAOpen() and MAVOEASOpen() give. */
 MAVOEA_API int MAVOEAEADirFSFInfoWrite(const char* path, const unsigned char finfo[32]);
 
 /* Writes the Finder info of h's header (bytes 50 to 81) into its file, where the file's Finder info

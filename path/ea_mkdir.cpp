@@ -6,6 +6,7 @@
 
 #include "include/mavoea.h"
 #include "platform/include/mavoacl.h"
+#include "util/metadata_file.h"
 #include "util/owned.h"
 #include "util/superuser_scope.h"
 #include "util/unit.h"
@@ -23,15 +24,6 @@ constexpr int kAttributeVolume = 7;
 // Finder info of a folder: the big-endian folder flags at byte 8 have the invisible bit, 0x4000.
 constexpr unsigned char kInvisible[32] = {0, 0, 0, 0, 0, 0, 0, 0, 0x40};
 
-// Whether path still names the directory on fd. Somebody else may have put a link in its place,
-// through which the superuser must not be led.
-bool Names(const char* path, int fd) {
-    struct stat opened;
-    struct stat named;
-    return kernel::Fstat(fd, &opened) == 0 && kernel::Lstat(path, &named) == 0 &&
-           opened.st_dev == named.st_dev && opened.st_ino == named.st_ino;
-}
-
 // Creates one directory; one that exists is left as it is. `parent` is the directory that holds it
 // when this process has just made that too, so that no link put there since leads elsewhere;
 // otherwise AT_FDCWD. *made is the new directory, empty when it existed.
@@ -45,6 +37,7 @@ int MakeDirectory(const char* path, int parent, UniqueFd* made) {
     // The umask must not narrow the mode.
     if (!*made || kernel::Fchmod(made->get(), kMode) != 0) return unit.Fail(Err::kSystemCall);
 
+    // Somebody else may have put a link in its place, through which the superuser must not be led.
     if (MAVOGetFSType(path, 0) == kAttributeVolume) {
         if (!Names(path, made->get()) ||
             MAVOEAXattrSet(path, "com.apple.FinderInfo", kInvisible, sizeof kInvisible, 0) != 0) {

@@ -1,9 +1,12 @@
 // Opens metadata files, and makes the EA directory where one is to be created.
 
+#include "path/ea_open.h"
+
 #include <errno.h>
 
 #include "include/mavoea.h"
 #include "platform/kernel.h"
+#include "util/metadata_file.h"
 #include "util/path_text.h"
 #include "util/unit.h"
 
@@ -28,12 +31,8 @@ int OpenAppleDouble(int form, const char* szPath, const char* szName, int oflag)
     return kernel::OpenRegular(path, oflag, kMode);
 }
 
-}  // namespace
-}  // namespace mavoea
-
-using namespace mavoea;
-
-int MAVOEAOpenNoADFS(int form, const char* szPath, const char* szName, int oflag) {
+// With `made`, that is told of OpenOrMake().
+int OpenInEADir(int form, const char* szPath, const char* szName, int oflag, bool* made) {
     if (szPath == nullptr || szName == nullptr) {
         errno = ENOENT;
         return unit.Fail(Err::kBadArgument);
@@ -52,7 +51,23 @@ int MAVOEAOpenNoADFS(int form, const char* szPath, const char* szName, int oflag
     if (fd >= 0 || errno != ENOENT) return fd;
     // Before it is missed, or made empty, it is looked for where earlier versions kept it.
     (void)MAVOEAUpgrade(szPath, szName);
+    if (made != nullptr) return OpenOrMake(path, made);
     return kernel::OpenRegular(path, oflag, kMode);
+}
+
+}  // namespace
+
+int OpenOrMakeMetadata(const char* szPath, const char* szName, bool* made) {
+    *made = false;
+    return OpenInEADir(EA_FORM_FILE, szPath, szName, O_RDWR | O_CREAT | O_CLOEXEC, made);
+}
+
+}  // namespace mavoea
+
+using namespace mavoea;
+
+int MAVOEAOpenNoADFS(int form, const char* szPath, const char* szName, int oflag) {
+    return OpenInEADir(form, szPath, szName, oflag, nullptr);
 }
 
 int MAVOEAOpen(int form, const char* szPath, const char* szName, int oflag, int place) {

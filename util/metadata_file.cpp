@@ -7,6 +7,26 @@
 
 namespace mavoea {
 
+int OpenOrMake(const char* path, bool* made) {
+    *made = false;
+    constexpr int kFlags = O_RDWR | O_CLOEXEC;
+    constexpr mode_t kMode = 0777;
+    for (int tries = kOpenTries;; --tries) {
+        int fd = kernel::OpenRegular(path, kFlags, kMode);
+        if (fd >= 0 || errno != ENOENT || tries == 0) return fd;
+        fd = kernel::OpenRegular(path, kFlags | O_CREAT | O_EXCL, kMode);
+        *made = fd >= 0;
+        if (fd >= 0 || errno != EEXIST) return fd;
+    }
+}
+
+bool Names(const char* path, int fd) {
+    struct stat opened;
+    struct stat named;
+    return kernel::Fstat(fd, &opened) == 0 && kernel::Lstat(path, &named) == 0 &&
+           opened.st_dev == named.st_dev && opened.st_ino == named.st_ino;
+}
+
 void SetMetadataMode(const char* path, mode_t mode) {
     const ErrnoKeeper keep;
     UniqueFd fd(kernel::OpenRegular(path, O_RDONLY | O_CLOEXEC, 0));

@@ -7,6 +7,17 @@
 
 namespace mavoea {
 
+// How often a file is opened, or made, that is replaced before it is locked; then it is given up.
+inline constexpr int kOpenTries = 16;
+
+// Opens the metadata file to read and write; one that is missing is made, of mode 0777. *made tells
+// whether this call did: nobody else may remove it. A descriptor, or -1 with errno.
+int OpenOrMake(const char* path, bool* made);
+
+// Whether `path` still names the file on `fd`, which may have been removed, or replaced by another,
+// since it was opened: before a lock on it was had, or by who may put a link there.
+bool Names(const char* path, int fd);
+
 // Gives the metadata file `mode`, through a descriptor. Best effort: others may own the file.
 void SetMetadataMode(const char* path, mode_t mode);
 

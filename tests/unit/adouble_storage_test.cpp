@@ -300,6 +300,37 @@ TEST_F(StorageTest, AFailedWriteRemovesTheFileThatItMadeAndNoOther) {
     EXPECT_EQ(Pattern(900), ReadFile(resource_));
 }
 
+TEST_F(StorageTest, AFileThatHasTakenThePlaceOfTheOneThatItMadeIsNotRemoved) {
+    mkdir((dir_ / "@eaDir").c_str(), 0777);
+    const Bytes block = Repeat(1, 741);
+    Hooks().before = [&](const std::string& name) {
+        if (name != "pwrite") return;
+        ASSERT_EQ(0, rename(resource_.c_str(), (dir_ / "former").c_str()));
+        WriteFile(resource_, Pattern(900));
+    };
+    const FailCall fault("pwrite", ENOSPC);
+    EXPECT_EQ(-1, MAVOEAEADirAdoubleFlush(block.data(), 741, object_.c_str()));
+    EXPECT_EQ(ENOSPC, errno);
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xB00, "ea_eadirfs_flush")));
+    EXPECT_EQ(1u, TakeLog().size());
+    EXPECT_EQ(Pattern(900), ReadFile(resource_));
+}
+
+TEST_F(StorageTest, AFileThatComesAndGoesIsMadeNevertheless) {
+    mkdir((dir_ / "@eaDir").c_str(), 0777);
+    const Bytes block = Repeat(1, 741);
+    int opens = 0;
+    Hooks().before = [&](const std::string& name) {
+        if (name != "open") return;
+        ++opens;
+        if (opens == 2) WriteFile(resource_, Pattern(900));
+        if (opens == 3) unlink(resource_.c_str());
+    };
+    EXPECT_EQ(0, MAVOEAEADirAdoubleFlush(block.data(), 741, object_.c_str()));
+    EXPECT_EQ(4, opens);
+    EXPECT_EQ(block, ReadFile(resource_));
+}
+
 TEST_F(StorageTest, AShortWriteIsAFailedOne) {
     FillResourceFile(Pattern(900));
     const Bytes block = Repeat(1, 741);

@@ -12,6 +12,7 @@
 
 #include <algorithm>
 #include <cstdint>
+#include <memory>
 #include <string>
 #include <utility>
 #include <vector>
@@ -841,12 +842,100 @@ TEST_F(FinderInfoTest, AResourceFileThatAnotherProcessUsesIsNotWritten) {
     EXPECT_EQ(0, Write(Pattern(32, 1)));
 }
 
-TEST_F(FinderInfoTest, AFailedCallRemovesAnEmptyResourceFileThatWasThereBefore) {
+TEST_F(FinderInfoTest, AFailedCallLeavesAnEmptyResourceFileThatWasThereBefore) {
     FillResourceFile({});
-    const FailCall fault("setlock", EAGAIN);
+    {
+        const FailCall fault("setlock", EAGAIN);
+        EXPECT_EQ(-1, Write(Pattern(32)));
+        ExpectOnly(0x400, "eas_lock_set");
+        EXPECT_EQ(Bytes(), ReadFile(resource_));
+    }
+    const FailCall fault("pwrite", ENOSPC);
+    EXPECT_EQ(-1, Write(Pattern(32)));
+    ExpectOnly(0xB00, kWrite);
+    EXPECT_EQ(Bytes(), ReadFile(resource_));
+}
+
+TEST_F(FinderInfoTest, AFileThatAnotherProcessHasMadeMeanwhileIsNotRemoved) {
+    bool made = false;
+    Hooks().fails = [&](const std::string& call) {
+        if (call.starts_with("open(" + resource_) && call.find("O_CREAT") != std::string::npos) {
+            WriteFile(resource_, {});
+            made = true;
+        }
+        return call.starts_with("pwrite") ? ENOSPC : 0;
+    };
+    EXPECT_EQ(-1, Write(Pattern(32)));
+    ExpectOnly(0xB00, kWrite);
+    EXPECT_TRUE(made);
+    EXPECT_EQ(Bytes(), ReadFile(resource_));
+}
+
+TEST_F(FinderInfoTest, AFileThatAnotherProcessHasLockedIsNotRemovedEvenByWhoMadeIt) {
+    std::unique_ptr<OtherProcess> other;
+    bool started = false;  // In the other process, too.
+    Hooks().before = [&](const std::string& name) {
+        if (name != "setlock" || std::exchange(started, true)) return;
+        other = std::make_unique<OtherProcess>(resource_, F_WRLCK);
+    };
     EXPECT_EQ(-1, Write(Pattern(32)));
     ExpectOnly(0x400, "eas_lock_set");
+    EXPECT_EQ(Bytes(), ReadFile(resource_));
+    ASSERT_NE(nullptr, other);
+    EXPECT_EQ(0, other->code());
+}
+
+TEST_F(FinderInfoTest, AFileThatIsRemovedBeforeItIsLockedIsMadeAnew) {
+    int locks = 0;
+    Hooks().before = [&](const std::string& name) {
+        if (name == "setlock" && ++locks == 1) unlink(resource_.c_str());
+    };
+    EXPECT_EQ(0, Write(Pattern(32)));
+    EXPECT_EQ(FreshResourceFile(Pattern(32)), ReadFile(resource_));
+}
+
+TEST_F(FinderInfoTest, AFileThatIsReplacedBeforeItIsLockedIsLeftForTheOneInItsPlace) {
+    const Bytes theirs = StreamImage{.attributes = {{"user.a", Pattern(9)}}}.Build();
+    for (const bool existed : {false, true}) {
+        SCOPED_TRACE(existed);
+        unlink(resource_.c_str());
+        if (existed) FillResourceFile(FreshResourceFile(kNone));
+        int locks = 0;
+        Hooks().before = [&](const std::string& name) {
+            if (name != "setlock" || ++locks != 1) return;
+            ASSERT_EQ(0, rename(resource_.c_str(), (dir_ / "former").c_str()));
+            WriteFile(resource_, theirs);
+        };
+        EXPECT_EQ(0, Write(Pattern(32)));
+        EXPECT_EQ(WithBytesAt(theirs, 50, Pattern(32)), ReadFile(resource_));
+        EXPECT_EQ(existed ? FreshResourceFile(kNone) : Bytes(), ReadFile(dir_ / "former"));
+    }
+}
+
+TEST_F(FinderInfoTest, AFileThatIsRemovedTimeAndAgainIsGivenUp) {
+    int locks = 0;
+    Hooks().before = [&](const std::string& name) {
+        if (name == "setlock" && Exists(resource_)) {
+            unlink(resource_.c_str());
+            ++locks;
+        }
+    };
+    EXPECT_EQ(-1, Write(Pattern(32)));
+    ExpectOnly(0x400, kWrite);
+    EXPECT_LT(1, locks);
+    EXPECT_GT(100, locks);
+}
+
+TEST_F(FinderInfoTest, AFileIsRemovedUnderItsLock) {
+    int locked = -1;
+    Hooks().before = [&](const std::string& name) {
+        if (name == "unlink") locked = LockInTheWay(resource_, F_RDLCK);
+    };
+    const FailCall fault("pwrite", ENOSPC);
+    EXPECT_EQ(-1, Write(Pattern(32)));
+    ExpectOnly(0xB00, kWrite);
     EXPECT_FALSE(Exists(resource_));
+    EXPECT_EQ(F_WRLCK, locked);
 }
 
 TEST_F(FinderInfoTest, ADamagedResourceFileIsNeitherWrittenNorRemoved) {
@@ -915,7 +1004,8 @@ TEST_P(FinderInfoWriteFaultTest, EveryFailingCallOfTheWriteLeavesTheFileAsItWasO
             if (exists) {
                 EXPECT_EQ(before.Build(), ReadFile(resource_));
             } else {
-                EXPECT_FALSE(Exists(resource_));
+                // What could not be locked may be another's by now.
+                EXPECT_TRUE(fault.name() == "setlock" || !Exists(resource_));
             }
         }
         ASSERT_EQ(descriptors_, OpenDescriptors());
