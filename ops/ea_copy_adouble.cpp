@@ -311,22 +311,21 @@ int Examine(const char* src, bool* rewrite) {
     return kDone;
 }
 
-int RewriteFile(const char* src, const char* dst) {
+// Opens src; *from stays empty when there is nothing to rewrite.
+int OpenSource(const char* src, UniqueFd* from) {
     bool rewrite = false;
     const int examined = Examine(src, &rewrite);
     if (!rewrite) return examined;
+    from->Reset(kernel::OpenRegular(src, kRead, 0));
+    return *from || errno == ENOENT ? kDone : EARewriteNotOpened(src);
+}
 
-    const UniqueFd from(kernel::OpenRegular(src, kRead, 0));
-    if (!from) {
-        if (errno == ENOENT) return kDone;
-        unit.Log("%s:%d(%s) failed to open %s, reason=%s.\n", kFunction, src, strerror(errno));
-        return kNotOpened;
-    }
+int RewriteFile(const char* src, const char* dst) {
+    UniqueFd from;
+    const int opened = OpenSource(src, &from);
+    if (!from) return opened;
     UniqueFd to(kernel::OpenRegular(dst, kWrite, 0600));
-    if (!to) {
-        unit.Log("%s:%d(%s) failed to open %s, reason=%s.\n", kFunction, dst, strerror(errno));
-        return kNotOpened;
-    }
+    if (!to) return EARewriteNotOpened(dst);
     const int result = Rewrite(src, from.get(), dst, to.get()).Run();
     if (result != kDone) {
         const ErrnoKeeper keep;
@@ -345,6 +344,17 @@ int EACopyAdoubleV2(const char* src, const char* dst, int mode) {
         if (named != kDone) return named;
     }
     return mode == kCopy || mode == kCopyChecked ? CopyAsItIs(src, dst) : RewriteFile(src, dst);
+}
+
+int EARewriteAdouble(const char* src, const char* dst, int to) {
+    UniqueFd from;
+    const int opened = OpenSource(src, &from);
+    return from ? Rewrite(src, from.get(), dst, to).Run() : opened;
+}
+
+int EARewriteNotOpened(const char* path, int line) {
+    unit.LogAt(line, "%s:%d(%s) failed to open %s, reason=%s.\n", kFunction, path, strerror(errno));
+    return kNotOpened;
 }
 
 }  // namespace mavoea

@@ -25,6 +25,14 @@ enum AdoubleCopyMode {
 // fchmod failed; -32, -33 dst's name. No codes; all but refused names and modes is logged.
 int EACopyAdoubleV2(const char* src, const char* dst, int mode);
 
+// The same with kRewrite into the empty file on `to`, which stays open, and stays when that fails;
+// `dst` is what it is called in the log.
+int EARewriteAdouble(const char* src, const char* dst, int to);
+
+// Logs that `path`, of a file to be rewritten or of what it becomes, could not be opened, and
+// errno. Returns -2.
+int EARewriteNotOpened(const char* path, int line = __builtin_LINE());
+
 }  // namespace mavoea
 
 #endif  // MAVOEA_OPS_EA_COPY_ADOUBLE_H_

@@ -23,8 +23,10 @@ int OpenOrMake(const char* path, bool* made) {
 bool Names(const char* path, int fd) {
     struct stat opened;
     struct stat named;
-    return kernel::Fstat(fd, &opened) == 0 && kernel::Lstat(path, &named) == 0 &&
-           opened.st_dev == named.st_dev && opened.st_ino == named.st_ino;
+    if (kernel::Fstat(fd, &opened) != 0 || kernel::Lstat(path, &named) != 0) return false;
+    if (opened.st_dev == named.st_dev && opened.st_ino == named.st_ino) return true;
+    errno = ESTALE;
+    return false;
 }
 
 void SetMetadataMode(const char* path, mode_t mode) {

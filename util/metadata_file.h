@@ -15,7 +15,8 @@ inline constexpr int kOpenTries = 16;
 int OpenOrMake(const char* path, bool* made);
 
 // Whether `path` still names the file on `fd`, which may have been removed, or replaced by another,
-// since it was opened: before a lock on it was had, or by who may put a link there.
+// since it was opened: before a lock on it was had, or by who may put a link there. Otherwise false
+// with errno, ESTALE when it names another.
 bool Names(const char* path, int fd);
 
 // Gives the metadata file `mode`, through a descriptor. Best effort: others may own the file.

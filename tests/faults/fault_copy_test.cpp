@@ -950,7 +950,7 @@ void FillToAppleDouble(Table* table, const Way& way) {
                              ", reason = " + std::to_string(result) + "."));
         return failed({}, lines, result);
     });
-    table->Add("fstat", "", {}, table->Done(), 1);
+    table->Add("fstat", "", {}, table->Done(), again ? 2 : 1);
     Outcome still_there = table->Gone();
     still_there.any_records = true;
     table->Add("unlink", kSrcResource, {ENOENT}, still_there, 1);
@@ -1051,6 +1051,9 @@ void AddFileSync(Table* table) {
     table->Add("open", open, {ENOENT}, table->Gone(), 1);
     AddExact(table, "open", open, failed({}, {}), 1);
     AddExact(table, "setlock", "(1)", failed({{0x400, "eas_lock_set"}}, {}), 1);
+    // A file that cannot be told to be the one that was opened is opened anew.
+    table->Add("fstat", "", {}, table->Done(), 1);
+    table->Add("lstat", Kept(std::string(kSrcResource) + ")"), {}, table->Done(), 1);
     AddExact(table, "pwrite", "(32, 50)", failed({{0xB00, "ea_eadirfs_finfo_write"}}, {}), 1);
     // A record that has been carried is not kept at both ends.
     table->Add("removexattr", "", {ENOENT, ENODATA}, table->Gone());

@@ -747,8 +747,9 @@ Outcome NotRepaired(Names made = {}) {
 
 const Outcome kRepaired = {.files = Files::kDone};
 
-// While the resource file is converted: `entries` and `finder_info` are the reads of those.
-Rules Converting(const char* entries, const char* finder_info) {
+// While the resource file is converted: `entries` and `finder_info` are the reads of those, `made`
+// is what there is before the converted file takes its place.
+Rules Converting(const char* entries, const char* finder_info, const Names& made) {
     Outcome defaults = kRepaired;
     defaults.torn = {kResource};
     defaults.log = {"ea_copy.c:LINE(EAGetEntriesBuf) failed to read, reason={error}."};
@@ -759,7 +760,7 @@ Rules Converting(const char* entries, const char* finder_info) {
     // Moved over nothing, since nothing was converted: the resource file stays.
     const Outcome nothing_there = {.files = Files::kEach};
     return {
-        {.call = "unlink", .with = kTemporary, .outcome = kRepaired},
+        {.call = "lstat", .with = "@MavoResource)", .outcome = NotRepaired()},
         {.call = "open",
          .with = "@MavoResource,",
          .ordinal = 1,
@@ -771,18 +772,18 @@ Rules Converting(const char* entries, const char* finder_info) {
          .errors = {ENOENT},
          .outcome = nothing_there},
         {.call = "open", .with = "@MavoResource,", .outcome = NotRepaired()},
-        {.call = "open", .with = "@MavoResourceTmp, O_WRONLY", .outcome = NotRepaired()},
-        // What has been converted is opened once more to be synced.
-        {.call = "open",
-         .with = "@MavoResourceTmp, O_RDONLY",
-         .errors = {ENOENT},
-         .outcome = kRepaired},
+        {.call = "open", .with = "@MavoResourceTmp,", .outcome = NotRepaired()},
+        // What cannot be locked is another's; what does not seem to be there is made again.
+        {.call = "setlock", .with = "(1)", .ordinal = 1, .outcome = NotRepaired({kTemporary})},
+        {.call = "lstat", .with = kTemporary, .ordinal = 1, .outcome = kRepaired},
+        // It is looked at before it is renamed, and behind that.
+        {.call = "lstat", .with = kTemporary, .ordinal = 2, .outcome = NotRepaired(made)},
+        {.call = "lstat", .with = kTemporary, .outcome = kRepaired},
+        {.call = "fstat", .ordinal = 3, .outcome = NotRepaired(made)},
         {.call = "fstat", .outcome = kRepaired},
         {.call = "fchmod", .outcome = NotRepaired()},
         // The conversion is not moved into place, and nobody is told.
-        {.call = "rename",
-         .with = kTemporary,
-         .outcome = {.files = Files::kEach, .made = {kTemporary}}},
+        {.call = "rename", .with = kTemporary, .outcome = nothing_there},
 
         TakenUpAgain("pread", 0),
         // Whether the fork is a blank one; a fork that cannot be looked at is not.
@@ -817,7 +818,7 @@ TEST(RepairFaults, AResourceFileWithoutAttributesIsConvertedOrStaysAsItIs) {
     cut_off.torn = {kResource};
     Outcome not_released = kRepaired;
     not_released.records = {kLock};
-    c.rules = Converting("(156, 26)", "(32, 182)") +
+    c.rules = Converting("(156, 26)", "(32, 182)", {}) +
               Rules{
                   {.call = "pread",
                    .with = "(8192, 0)",
@@ -832,7 +833,6 @@ TEST(RepairFaults, AResourceFileWithoutAttributesIsConvertedOrStaysAsItIs) {
                   {.call = "lseek", .outcome = NotRepaired()},
                   {.call = "setlock", .with = "(2)", .outcome = not_released},
                   {.call = "setlock", .outcome = NotRepaired()},
-                  {.call = "open", .with = "@MavoResourceTmp,", .outcome = NotRepaired()},
                   {.call = "fsync", .outcome = NotRepaired()},
               };
     SweepFaults(c);
@@ -857,7 +857,7 @@ TEST(RepairFaults, AResourceFileWithAttributesIsConvertedOrStaysAsItIs) {
         return not_synced;
     };
     c.rules =
-        Converting("(24, 26)", "(32, 50)") +
+        Converting("(24, 26)", "(32, 50)", {kStream}) +
         Rules{
             {.call = "pread", .with = "(3000,", .errors = {kNoneOnce}, .outcome = cut_off},
             // Header, table and not all values.
@@ -882,7 +882,7 @@ TEST(RepairFaults, AResourceFileWithAttributesIsConvertedOrStaysAsItIs) {
             {.call = "lseek", .ordinal = 3, .outcome = NotRepaired()},
             {.call = "lseek", .outcome = NotRepaired({kStream})},
             {.call = "setlock", .with = "(2)", .outcome = not_released},
-            {.call = "setlock", .ordinal = 1, .outcome = NotRepaired()},
+            {.call = "setlock", .with = "(0)", .ordinal = 1, .outcome = NotRepaired()},
             {.call = "setlock", .outcome = NotRepaired({kStream})},
             // The stream's directory is there, and its file is looked for in older layouts.
             {.call = "mkdir", .errors = {EEXIST}, .outcome = kRepaired},
@@ -899,7 +899,6 @@ TEST(RepairFaults, AResourceFileWithAttributesIsConvertedOrStaysAsItIs) {
             {.call = "fsync", .ordinal = 1, .outcome = syncs_after(2)},
             {.call = "fsync", .ordinal = 2, .outcome = syncs_after(1)},
             {.call = "fsync", .outcome = syncs_after(0)},
-            {.call = "open", .with = "@MavoResourceTmp,", .outcome = NotRepaired({kStream})},
         };
     SweepFaults(c);
 }

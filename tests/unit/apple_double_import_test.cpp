@@ -989,6 +989,106 @@ TEST_F(FixErrorTest, ATemporaryFileOfAnEarlierAttemptIsNoPartOfTheResult) {
     ExpectUnchanged(ThreeWithOneBroken());
 }
 
+TEST_F(FixErrorTest, ATemporaryFileThatAnotherRepairWritesIsLeftAlone) {
+    for (const Bytes& written : {Bytes(), PlainAppleDouble(Pattern(32), Ascii("fork"))}) {
+        SCOPED_TRACE(written.size());
+        WriteFile(resource_, Three().bytes);
+        WriteFile(temporary_, written);
+        OtherProcess other(temporary_, F_WRLCK);
+        ASSERT_EQ(0, other.code());
+        EXPECT_EQ(-1, Fix());
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
+        EXPECT_EQ(Three().bytes, ReadFile(resource_));
+        EXPECT_EQ(written, ReadFile(temporary_));
+        EXPECT_FALSE(Exists(stream_));
+        other.Release();
+        EXPECT_EQ(0, Fix());
+        EXPECT_EQ(Rewritten(Three()), ReadFile(resource_));
+        EXPECT_FALSE(Exists(temporary_));
+        unlink(stream_.c_str());
+    }
+}
+
+TEST_F(FixErrorTest, TheTemporaryFileIsLockedUntilItHasItsPlace) {
+    std::map<std::string, int> locks;
+    Hooks().before = [&](const std::string& name) {
+        if (name == "pwrite" && !Exists(stream_)) locks[name] = LockInTheWay(temporary_, F_RDLCK);
+        if (name == "fsync" || name == "rename") locks[name] = LockInTheWay(temporary_, F_RDLCK);
+    };
+    EXPECT_EQ(0, Fix(Three().bytes));
+    EXPECT_THAT(locks, ElementsAre(std::pair("fsync", F_WRLCK), std::pair("pwrite", F_WRLCK),
+                                   std::pair("rename", F_WRLCK)));
+
+    locks.clear();
+    Hooks().before = [&](const std::string& name) {
+        if (name == "unlink") locks[name] = LockInTheWay(temporary_, F_RDLCK);
+    };
+    EXPECT_EQ(-1, Fix(ThreeWithOneBroken()));
+    EXPECT_THAT(locks, ElementsAre(std::pair("unlink", F_WRLCK)));
+    TakeRecords();
+    ExpectUnchanged(ThreeWithOneBroken());
+}
+
+TEST_F(FixErrorTest, ATemporaryFileThatIsRemovedBeforeItIsLockedIsMadeAnew) {
+    int locks = 0;
+    Hooks().before = [&](const std::string& name) {
+        if (name == "setlock" && ++locks == 1) unlink(temporary_.c_str());
+    };
+    EXPECT_EQ(0, Fix(Three().bytes));
+    EXPECT_EQ(Rewritten(Three()), ReadFile(resource_));
+    EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("object@MavoEAStream", "object@MavoResource"));
+}
+
+TEST_F(FixErrorTest, ATemporaryFileThatGetsItsPlaceBeforeItIsLockedIsNotRemoved) {
+    // Another repair is done between our open of its file and our lock.
+    WriteFile(temporary_, Rewritten(Three()));
+    int locks = 0;
+    Hooks().before = [&](const std::string& name) {
+        if (name == "setlock" && ++locks == 1) rename(temporary_.c_str(), resource_.c_str());
+    };
+    EXPECT_EQ(0, Fix(Three().bytes));
+    EXPECT_EQ(Rewritten(Three()), ReadFile(resource_));
+    EXPECT_FALSE(Exists(temporary_));
+}
+
+TEST_F(FixErrorTest, ATemporaryFileThatIsRemovedTimeAndAgainIsGivenUp) {
+    int opens = 0;
+    Hooks().before = [&](const std::string& name) {
+        if (name == "setlock") unlink(temporary_.c_str());
+        if (name == "open") ++opens;
+    };
+    errno = 0;
+    EXPECT_EQ(-1, Fix(Three().bytes));
+    EXPECT_EQ(EAGAIN, errno);
+    EXPECT_LT(1, opens);
+    EXPECT_GT(100, opens);
+    ExpectUnchanged(Three().bytes);
+    EXPECT_FALSE(Exists(stream_));
+}
+
+TEST_F(FixErrorTest, OnlyItsOwnFileTakesThePlaceOfTheResourceFile) {
+    for (const Bytes& resource : {Three().bytes, ThreeWithOneBroken()}) {
+        unlink(temporary_.c_str());
+        int locks = 0;
+        Hooks().before = [&](const std::string& name) {
+            // Behind the conversion, whose reads take no lock.
+            if (name != "setlock" || ++locks != 2) return;
+            EXPECT_LT(0u, ReadFile(temporary_).size());
+            unlink(temporary_.c_str());
+            WriteFile(temporary_, Ascii("another's"));
+        };
+        errno = 0;
+        EXPECT_EQ(-1, Fix(resource));
+        TakeRecords();
+        EXPECT_EQ(resource, ReadFile(resource_));
+        EXPECT_EQ(Ascii("another's"), ReadFile(temporary_));
+        if (resource == Three().bytes) {
+            EXPECT_EQ(ESTALE, errno);
+        }
+    }
+    unlink(temporary_.c_str());
+}
+
 TEST_F(FixErrorTest, ALinkInThePlaceOfTheTemporaryFileIsNotFollowed) {
     const std::string victim = dir_ / "victim";
     WriteFile(victim, Ascii("of somebody else"));
@@ -1110,6 +1210,8 @@ TEST_F(FixErrorTest, WhicheverCallFailsNothingIsLost) {
                 EXPECT_EQ(Three().contents.attributes, AttributesIn(stream_));
             } else {
                 EXPECT_EQ(-1, result);
+                // What could not be locked may be another's by now.
+                if (fault.name() == "setlock") unlink(temporary_.c_str());
                 ExpectUnchanged(Three().bytes);
             }
             EXPECT_EQ(live_blocks_, TakeAllocations().live);
