@@ -11,23 +11,31 @@ namespace {
 
 constexpr Unit unit("ea_fileeafs_finfo_file_sync");
 
+// EAFileEAFSFinfoRead() behind its arguments. *found tells whether the record has Finder info.
+int ReadRecord(const char* path, unsigned char finfo[kFinderInfoSize], bool* found) {
+    EAAdouble record = {};
+    const int result = MAVOEAFileEAAdoubleRead(path, &record);
+    if (result != 0) return result;
+    const auto bytes = EntryBytes(record, Slot::kFinderInfo, kFinderInfoSize);
+    *found = !bytes.empty();
+    if (*found) memcpy(finfo, bytes.data(), bytes.size());
+    return 0;
+}
+
 }  // namespace
 
 int EAFileEAFSFinfoRead(const char* path, unsigned char finfo[32]) {
     if (path == nullptr || finfo == nullptr) return unit.Fail(Err::kBadArgument);
-    EAAdouble record = {};
-    const int found = MAVOEAFileEAAdoubleRead(path, &record);
-    if (found != 0) return found;
-    const auto bytes = EntryBytes(record, Slot::kFinderInfo, kFinderInfoSize);
-    if (!bytes.empty()) memcpy(finfo, bytes.data(), bytes.size());
-    return 0;
+    bool found = false;
+    return ReadRecord(path, finfo, &found);
 }
 
 int EAFileEAFSFinfoFileSync(const char* path) {
-    unsigned char finfo[kFinderInfoSize] = {};
-    const int found = EAFileEAFSFinfoRead(path, finfo);
-    if (found != 0) return found < 0 ? -1 : 0;
-    return MAVOEAEADirFSFInfoWrite(path, finfo);
+    if (path == nullptr) return unit.Fail(Err::kBadArgument);
+    unsigned char finfo[kFinderInfoSize];
+    bool found = false;
+    if (ReadRecord(path, finfo, &found) < 0) return -1;
+    return found ? MAVOEAEADirFSFInfoWrite(path, finfo) : 0;
 }
 
 }  // namespace mavoea

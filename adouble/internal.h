@@ -29,8 +29,9 @@ inline bool OnFileEAVolume(const char* path) {
     return VolumeKindOf(MAVOGetFSType(path, 1)) == VolumeKind::kFileEA;
 }
 
-// Finder info from the object's netatalk record into its resource file; nothing without a record.
-// 0 or -1, with the codes of the functions that it calls.
+// Finder info from the object's netatalk record into its resource file; nothing without a record,
+// or when that has none: the resource file's is not cleared. 0 or -1: 0xD00 NULL; otherwise with
+// the codes of the functions that it calls.
 int EAFileEAFSFinfoFileSync(const char* path);
 
 // The 32 bytes of Finder info in the object's netatalk record; finfo is left alone when the record

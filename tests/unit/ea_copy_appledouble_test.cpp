@@ -966,6 +966,23 @@ TEST_F(FileEAToDoubleTest, WithoutARecordTheResourceFileIsCopiedAsItIs) {
     }
 }
 
+TEST_F(FileEAToDoubleTest, WithARecordThatHasNoFinderInfoTheResourceFileIsCopiedAsItIs) {
+    Bytes record = AttributeRecord();
+    PutU32(record, 26 + 8, 31);  // too short
+    for (const int move : {0, 1}) {
+        Restart();
+        PutAll();
+        SetAttribute(src_, kRecord, record);
+        const Bytes resource = Content(SrcResource());
+        EXPECT_EQ(0, CopyFileEA(move));
+        EXPECT_EQ(Whole().Build(), Content(DstDouble()));
+        if (move == 0) {
+            EXPECT_EQ(resource, Content(SrcResource()));
+        }
+        ExpectNothingReported();
+    }
+}
+
 TEST_F(FileEAToDoubleTest, ARecordThatCannotBeReadIsLoggedAndNothingCopied) {
     PutAll();
     SetAttribute(src_, kRecord, Ascii("not one"));

@@ -648,13 +648,32 @@ TEST_F(FinderInfoTest, FinderInfoOfTheRecordReplacesTheOneOfEveryLayoutOfResourc
     }
 }
 
-TEST_F(FinderInfoTest, ARecordWhoseFinderInfoIsAbsentClearsTheOneOfTheResourceFile) {
-    Bytes record = AttributeRecord();
-    PutU32(record, 26 + 8, 31);  // too short
-    SetRecord(record);
-    FillResourceFile(FreshResourceFile(Pattern(32)));
+TEST_F(FinderInfoTest, ARecordWithoutFinderInfoLeavesTheResourceFileAsItIs) {
+    struct Case {
+        std::uint32_t offset;
+        std::uint32_t length;
+    };
+    // Too short, and over the header: over its magic, its last descriptor, its last byte.
+    constexpr Case kAbsent[] = {{122, 31}, {122, 0}, {1023, 1}, {1, 32}, {110, 32}, {121, 32}};
+    for (const Case& one : kAbsent) {
+        SCOPED_TRACE(testing::Message() << one.offset << ", " << one.length);
+        Bytes record = AttributeRecord();
+        PutU32(record, 26 + 4, one.offset);
+        PutU32(record, 26 + 8, one.length);
+        SetRecord(record);
+        for (const Layout& layout : Layouts(Pattern(32, 0xB0))) {
+            FillResourceFile(layout.file);
+            EXPECT_EQ(0, FileSync());
+            EXPECT_EQ(layout.file, ReadFile(resource_)) << layout.name;
+        }
+        unlink(resource_.c_str());
+        EXPECT_EQ(0, FileSync());
+        EXPECT_FALSE(Exists(resource_));
+    }
+    SetRecord(AttributeRecord());  // One that begins right behind the header is one.
+    FillResourceFile(FreshResourceFile(kNone));
     EXPECT_EQ(0, FileSync());
-    EXPECT_EQ(FreshResourceFile(kNone), ReadFile(resource_));
+    EXPECT_EQ(FreshResourceFile(Pattern(32, 0x40)), ReadFile(resource_));
 }
 
 TEST_F(FinderInfoTest, ABadRecordTouchesNoResourceFile) {
