@@ -174,8 +174,9 @@ MAVOEA_API int MAVOEAPath(int form, const char* szPath, const char* szName, char
  * afterwards.
  *
  * Codes: 0xD00 NULL, or no '/' in szEADirPath with blParentFirst; 0x3C00 mkdir or seteuid(0)
- * failed; 0x2A00 the mode or the Finder info could not be set (the directory stays); 0x100 out of
- * memory. The effective uid is changed for the duration, for the whole process. */
+ * failed; 0x2A00 the new directory could not be opened (it is removed again unless somebody has used
+ * it), or the mode or the Finder info could not be set (it stays); 0x100 out of memory. The effective
+ * uid is changed for the duration, for the whole process. */
 MAVOEA_API int MAVOEAMKDir(int blParentFirst, const char* szEADirPath);
 
 /* Opens the metadata file of kind szName of szPath's object with the open(2) flags oflag, and mode

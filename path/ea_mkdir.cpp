@@ -34,8 +34,15 @@ int MakeDirectory(const char* path, int parent, UniqueFd* made) {
     }
     made->Reset(kernel::OpenAt(parent, name,
                                O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC | O_NONBLOCK, 0));
+    if (!*made) {
+        // Without its mode and ACL it would be of no use to others for good: later calls leave it
+        // as it is. It stays if somebody has used it meanwhile.
+        const ErrnoKeeper keep;
+        (void)kernel::UnlinkAt(parent, name, AT_REMOVEDIR);
+        return unit.Fail(Err::kSystemCall);
+    }
     // The umask must not narrow the mode.
-    if (!*made || kernel::Fchmod(made->get(), kMode) != 0) return unit.Fail(Err::kSystemCall);
+    if (kernel::Fchmod(made->get(), kMode) != 0) return unit.Fail(Err::kSystemCall);
 
     // Somebody else may have put a link in its place, through which the superuser must not be led.
     if (MAVOGetFSType(path, 0) == kAttributeVolume) {

@@ -52,6 +52,7 @@ int MkdirAt(int dir, const char* path, mode_t mode) {
     return dir == AT_FDCWD ? ::mkdir(path, mode) : ::mkdirat(dir, path, mode);
 }
 int Unlink(const char* path) { return ::unlink(path); }
+int UnlinkAt(int dir, const char* path, int flags) { return ::unlinkat(dir, path, flags); }
 int Rmdir(const char* path) { return ::rmdir(path); }
 int Remove(const char* path) { return ::remove(path); }
 int Rename(const char* from, const char* to) { return ::rename(from, to); }

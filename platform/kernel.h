@@ -44,6 +44,7 @@ int GetLock(int fd, struct flock64* lock);        // F_GETLK, 64-bit
 
 int MkdirAt(int dir, const char* path, mode_t mode);
 int Unlink(const char* path);
+int UnlinkAt(int dir, const char* path, int flags);
 int Rmdir(const char* path);
 int Remove(const char* path);
 int Rename(const char* from, const char* to);

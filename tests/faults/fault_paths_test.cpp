@@ -92,7 +92,11 @@ Rules MakingOf(const char* name, std::vector<const char*> above = {}) {
          .with = mkdir,
          .errors = {EIO, ENOSPC, EACCES, EPERM, ENOENT, EROFS},
          .outcome = {.result = -1, .records = {kNotMade}, .error = kInjectedErrno, .made = above}},
-        {.call = "open", .with = open, .outcome = left},
+        // It is removed again.
+        {.call = "open",
+         .with = open,
+         .outcome =
+             {.result = -1, .records = {kNotOpened}, .error = kInjectedErrno, .made = above}},
         {.call = "lstat", .with = lstat, .outcome = left},
     };
 }

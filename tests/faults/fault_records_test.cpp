@@ -581,10 +581,10 @@ TEST(FaultRecordsTest, WritingFinderInfoIntoANewResourceFileLeavesNoEmptyOneWhen
                 // Said to be there: nothing can be created in it then.
                 {.call = "mkdir", .errors = {EEXIST}, .outcome = {.result = -1}},
                 {.call = "mkdir", .outcome = {.result = -1, .records = {{0x3C00, "ea_mkdir.c"}}}},
-                // The directory is left in place.
                 {.call = "open",
                  .with = "{dir}/@eaDir, ",
-                 .outcome = failed({{0x2A00, "ea_mkdir.c"}})},
+                 .outcome = {.result = -1, .records = {{0x2A00, "ea_mkdir.c"}}}},
+                // The directory is left in place.
                 {.call = "fchmod", .outcome = failed({{0x2A00, "ea_mkdir.c"}})},
                 {.call = "fstat", .ordinal = 1, .outcome = failed({{0x2A00, "ea_mkdir.c"}})},
                 // A file that cannot be told to be the one that was opened is opened anew.
@@ -683,6 +683,9 @@ TEST(FaultRecordsTest, WritingFinderInfoOnAnAttributeVolumeHidesTheNewDirectory)
                  .outcome = {.result = -1,
                              .records = {{0xB00, kWriteUnit}},
                              .made = {"@eaDir", kResource}}},
+                {.call = "open",
+                 .with = "{dir}/@eaDir, ",
+                 .outcome = {.result = -1, .records = {{0x2A00, "ea_mkdir.c"}}}},
                 // What else fails leaves the directory and no file in it.
                 {.call = "", .outcome = {.result = -1, .made = {"@eaDir"}, .any_records = true}},
             },

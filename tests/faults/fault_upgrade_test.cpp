@@ -348,7 +348,7 @@ TEST(FaultUpgradeTest, AnAppleDoubleFileBecomesTheStream) {
                  .errors = {EEXIST},
                  .outcome = {.result = -1, .records = {{0x2800, kUnit}}}},
                 {.call = "mkdir", .outcome = {.result = -1, .records = {{0x3C00, "ea_mkdir.c"}}}},
-                {.call = "open", .outcome = failed({{0x2A00, "ea_mkdir.c"}})},
+                {.call = "open", .outcome = {.result = -1, .records = {{0x2A00, "ea_mkdir.c"}}}},
                 {.call = "fchmod", .outcome = failed({{0x2A00, "ea_mkdir.c"}})},
                 {.call = "fstat", .outcome = failed({{0x2A00, "ea_mkdir.c"}})},
                 {.call = "lstat", .outcome = failed({{0x2A00, "ea_mkdir.c"}})},

@@ -448,6 +448,12 @@ int Unlink(const char* path) {
     return Call("unlink", Text(path), -1, [&] { return Removed(path, ::unlink(path)); });
 }
 
+int UnlinkAt(int dir, const char* path, int flags) {
+    const std::string whole = WholePath(dir, path);
+    return Call(flags == AT_REMOVEDIR ? "rmdir" : "unlink", whole, -1,
+                [&] { return Removed(whole.c_str(), ::unlinkat(dir, path, flags)); });
+}
+
 int Rmdir(const char* path) {
     return Call("rmdir", Text(path), -1, [&] { return Removed(path, ::rmdir(path)); });
 }

@@ -352,21 +352,58 @@ TEST_F(EaMkdirTest, WhenTheParentCannotBeMadeTheDirectoryIsNotTried) {
 }
 
 TEST_F(EaMkdirTest, AModeThatCannotBeSetFailsAndLeavesTheDirectory) {
-    for (const std::string call : {"open", "fchmod"}) {
-        SCOPED_TRACE(call);
-        const TempDir parent;
-        const std::string path = parent / "@eaDir";
-        BeUser(kUser);
-        const Umask umask(077);
-        const FailCall fault(call, EIO);
-        EXPECT_EQ(-1, MAVOEAMKDir(0, path.c_str()));
-        EXPECT_TRUE(fault.fired());
-        EXPECT_EQ(EIO, errno);
-        ExpectOnly(0x2A00);
-        EXPECT_EQ(0700, ModeOf(path));
-        EXPECT_THAT(TakePlatformCalls(), Not(Contains(StartsWith("MAVOACLSetEADirACL"))));
-        EXPECT_EQ(kUser, uid_);
+    BeUser(kUser);
+    const Umask umask(077);
+    const FailCall fault("fchmod", EIO);
+    EXPECT_EQ(-1, MAVOEAMKDir(0, ea_dir_.c_str()));
+    EXPECT_TRUE(fault.fired());
+    EXPECT_EQ(EIO, errno);
+    ExpectOnly(0x2A00);
+    EXPECT_EQ(0700, ModeOf(ea_dir_));
+    EXPECT_THAT(TakePlatformCalls(), Not(Contains(StartsWith("MAVOACLSetEADirACL"))));
+    EXPECT_EQ(kUser, uid_);
+}
+
+TEST_F(EaMkdirTest, ADirectoryThatCannotBeOpenedIsRemovedAgainAndMadeWholeTheNextTime) {
+    const Umask umask(077);
+    for (const int error : {EMFILE, ENFILE, ENOMEM}) {
+        for (const int nth : {1, 2}) {  // the parent, the directory in it
+            SCOPED_TRACE(testing::Message() << strerror(error) << " " << nth);
+            BeUser(kUser);
+            TakePlatformCalls();
+            {
+                const FailCall fault("open", error, nth);
+                errno = 0;
+                EXPECT_EQ(-1, MAVOEAMKDir(1, folder_.c_str()));
+                EXPECT_EQ(error, errno);
+            }
+            ExpectOnly(0x2A00);
+            EXPECT_FALSE(Exists(folder_));
+            EXPECT_EQ(nth == 2, Exists(ea_dir_));
+            EXPECT_EQ(kUser, uid_);
+            EXPECT_EQ(nth == 2 ? PlatformCallsFor(ea_dir_) : std::vector<std::string>(),
+                      TakePlatformCalls());
+
+            EXPECT_EQ(0, MAVOEAMKDir(1, folder_.c_str()));
+            EXPECT_EQ(0777, ModeOf(ea_dir_));
+            EXPECT_EQ(0777, ModeOf(folder_));
+            EXPECT_THAT(TakePlatformCalls(), Contains("MAVOACLSetEADirACL(" + folder_ + ")"));
+            ASSERT_EQ(0, rmdir(folder_.c_str()));
+            ASSERT_EQ(0, rmdir(ea_dir_.c_str()));
+        }
     }
+}
+
+TEST_F(EaMkdirTest, ADirectoryThatCannotBeOpenedStaysWhenSomebodyHasUsedIt) {
+    Hooks().before = [this](const std::string& name) {
+        if (name == "open") WriteFile(ea_dir_ + "/theirs", Ascii("theirs"));
+    };
+    const FailCall fault("open", EMFILE);
+    errno = 0;
+    EXPECT_EQ(-1, MAVOEAMKDir(0, ea_dir_.c_str()));
+    EXPECT_EQ(EMFILE, errno);
+    ExpectOnly(0x2A00);
+    EXPECT_EQ(Ascii("theirs"), ReadFile(ea_dir_ + "/theirs"));
 }
 
 TEST_F(EaMkdirTest, WhenTheModeOfTheParentCannotBeSetTheDirectoryIsNotTried) {
