@@ -231,8 +231,8 @@ MAVOEA_API int EASetSmbArchive(const char* szPath);
  * descriptor of the same file drops the process's locks on it.
  *
  * Returns a handle for MAVOEASClose(), or NULL: 0xD00 fd below 0, or more than 13 entry
- * descriptors; 0x200 out of memory; 0x400 another process holds a conflicting lock; 0xA00 the file
- * ends before what its header declares. */
+ * descriptors; 0x200 out of memory; 0x400 another process holds a conflicting lock; 0xA00 header or
+ * table cannot be read, or the file ends before what its header declares. */
 MAVOEA_API EASHandle* MAVOEASOpen(int fd, int lockType);
 
 /* Frees h and releases its lock; the descriptor stays open. -1 when the lock could not be released

@@ -27,37 +27,47 @@ std::int64_t FileSize(int fd) {
 // How a file begins, read once: most streams whole.
 class FirstBytes {
  public:
-    FirstBytes(int fd, std::uint64_t file_size) {
+    FirstBytes(int fd, std::uint64_t file_size) : fd_(fd) {
         const auto want = static_cast<std::size_t>(std::min<std::uint64_t>(file_size, kMost));
         const std::int64_t got = ReadAt(fd, {bytes_, want}, 0);
         size_ = got < 0 ? 0 : static_cast<std::size_t>(got);
     }
 
-    // `size` bytes at `offset`; none when they are not all here.
-    ByteView At(std::uint64_t offset, std::size_t size) const {
-        if (offset > size_ || size > size_ - offset) return {};
-        return {bytes_ + offset, size};
+    // Fills `to` with the file's bytes at `offset`. What is not here is read by itself: more than
+    // was needed may have been what could not be read.
+    bool Copy(std::uint64_t offset, ByteSpan to) const {
+        if (offset > size_ || to.size() > size_ - offset) {
+            return ReadAt(fd_, to, offset) == static_cast<std::int64_t>(to.size());
+        }
+        std::copy_n(bytes_ + offset, to.size(), to.begin());
+        return true;
     }
-    std::size_t size() const { return size_; }
+
+    // Those that are here from `offset` on.
+    ByteView From(std::size_t offset) const {
+        return ByteView(bytes_, size_).subspan(std::min(offset, size_));
+    }
 
  private:
     static constexpr std::size_t kMost = 8192;
 
+    int fd_;
     std::size_t size_ = 0;
     std::uint8_t bytes_[kMost];
 };
 
-int ReadHeader(int fd, const FirstBytes& first, StreamHeader* header) {
-    ByteView bytes = first.At(0, AppleDoubleHeader::kSize);
-    if (bytes.empty()) return unit.Fail(Err::kRead);
-    BeReader in(bytes);
+int ReadHeader(const FirstBytes& first, StreamHeader* header) {
+    std::uint8_t file[AppleDoubleHeader::kSize];
+    if (!first.Copy(0, file)) return unit.Fail(Err::kRead);
+    BeReader in(file);
     header->file = DecodeAppleDoubleHeader(in);
     const std::uint16_t count = header->file.entry_count;
     if (count > kStreamDescriptorMax) return unit.Fail(Err::kBadArgument);
 
-    bytes = first.At(0, DescriptorsEnd(count));
-    if (bytes.empty()) return unit.Fail(Err::kRead);
-    BeReader descriptors(bytes.subspan(AppleDoubleHeader::kSize));
+    std::uint8_t entries[kStreamDescriptorMax * EntryDescriptor::kSize];
+    const ByteSpan listed(entries, count * EntryDescriptor::kSize);
+    if (!first.Copy(AppleDoubleHeader::kSize, listed)) return unit.Fail(Err::kRead);
+    BeReader descriptors(listed);
     for (std::uint16_t i = 0; i < count; ++i) {
         const EntryDescriptor entry = DecodeEntryDescriptor(descriptors);
         if (entry.id == EntryId::kFinderInfo) header->finder_info = entry;
@@ -65,19 +75,16 @@ int ReadHeader(int fd, const FirstBytes& first, StreamHeader* header) {
     }
 
     const Range finder_info = header->finder_info.data;
-    bytes = first.At(finder_info.offset, kFinderInfoSize);
-    if (!bytes.empty()) {
-        std::copy(bytes.begin(), bytes.end(), header->finder_info_bytes.begin());
-    } else if (ReadAt(fd, header->finder_info_bytes, finder_info.offset) !=
-               std::int64_t{kFinderInfoSize}) {
-        return unit.Fail(Err::kRead);
-    }
+    if (!first.Copy(finder_info.offset, header->finder_info_bytes)) return unit.Fail(Err::kRead);
     if (finder_info.length == kFinderInfoSize) {
         header->attributes = NoAttributes();
         return 0;
     }
-    bytes = first.At(kAttributeHeaderOffset, kAttributeHeaderSize);
-    return DecodeAttributeHeader(bytes, &header->attributes) ? 0 : unit.Fail(Err::kRead);
+    std::uint8_t attributes[kAttributeHeaderSize];
+    return first.Copy(kAttributeHeaderOffset, attributes) &&
+                   DecodeAttributeHeader(attributes, &header->attributes)
+               ? 0
+               : unit.Fail(Err::kRead);
 }
 
 // The attribute table while it is read: its bytes from kStreamHeaderSize on, as many as its records
@@ -115,9 +122,11 @@ class TableReader {
     bool Reach(std::uint64_t size, std::uint64_t likely) {
         if (size <= size_) return true;
         if (size > most_) return false;
-        const std::uint64_t want =
-            std::min(most_, likely > size_ && likely >= size ? std::min(likely, size_ + 16 * kStep)
-                                                             : size + kStep);
+        std::uint64_t want = size;
+        if (!only_needed_) {
+            want = likely >= size ? std::min(likely, size_ + 16 * kStep) : size + kStep;
+        }
+        want = std::min(want, most_);
         void* const larger = kernel::Reallocate(table_.get(), want);
         if (larger == nullptr) {
             out_of_memory_ = true;
@@ -126,18 +135,25 @@ class TableReader {
         (void)table_.Release();
         table_ = Owned<std::uint8_t>(static_cast<std::uint8_t*>(larger));
         if (size_ == 0) {
-            const std::size_t here = first_.size() - kStreamHeaderSize;
-            size_ = static_cast<std::size_t>(std::min<std::uint64_t>(here, want));
-            memcpy(table_.get(), first_.At(kStreamHeaderSize, size_).data(), size_);
+            const ByteView here = first_.From(kStreamHeaderSize);
+            size_ = static_cast<std::size_t>(std::min<std::uint64_t>(here.size(), want));
+            memcpy(table_.get(), here.data(), size_);
         }
-        if (size_ < want) {
-            const std::int64_t got =
-                ReadAt(fd_, {table_.get() + size_, static_cast<std::size_t>(want - size_)},
-                       kStreamHeaderSize + size_);
-            if (got < 0) return false;
-            size_ += static_cast<std::size_t>(got);
+        if (size_ < want && !ReadTo(want)) {
+            only_needed_ = true;
+            if (size_ < size && !ReadTo(size)) return false;
         }
         return size <= size_;
+    }
+
+    // Reads the table on up to `end`, or as far as the file goes.
+    bool ReadTo(std::uint64_t end) {
+        const std::int64_t got =
+            ReadAt(fd_, {table_.get() + size_, static_cast<std::size_t>(end - size_)},
+                   kStreamHeaderSize + size_);
+        if (got < 0) return false;
+        size_ += static_cast<std::size_t>(got);
+        return true;
     }
 
     // Frees what a header that says too much has had read.
@@ -157,6 +173,7 @@ class TableReader {
     const FirstBytes& first_;
     Owned<std::uint8_t> table_;
     std::size_t size_ = 0;
+    bool only_needed_ = false;  // More than that could not be read.
     bool out_of_memory_ = false;
 };
 
@@ -211,7 +228,7 @@ int Load(EASHandle* h) {
     const auto file_size = static_cast<std::uint64_t>(size);
     const FirstBytes first(h->fd, file_size);
     StreamHeader header;
-    if (ReadHeader(h->fd, first, &header) != 0) return -1;
+    if (ReadHeader(first, &header) != 0) return -1;
     StoreHeader(header, h);
     return LoadTable(h, file_size, first, header.attributes);
 }
@@ -232,7 +249,7 @@ int EASGetEntryCount(int fd) {
     } else if (file_size > 0) {
         const FirstBytes first(fd, static_cast<std::uint64_t>(file_size));
         StreamHeader header;
-        count = ReadHeader(fd, first, &header) == 0 ? header.attributes.count : -1;
+        count = ReadHeader(first, &header) == 0 ? header.attributes.count : -1;
     }
     const ErrnoKeeper keep;
     (void)MAVOEASLockSet(&h, F_UNLCK);

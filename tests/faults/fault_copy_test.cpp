@@ -419,6 +419,10 @@ void AddWhatDoesNotMatter(Table* table) {
     for (const char* call : {"pread", "pwrite"}) {
         table->Add(call, "", {EINTR, kShortOnce}, table->Done());
     }
+    // Of a stream that cannot be read whole at first, what is needed to open it is read by itself.
+    for (const char* whole : {"(146, 0)", "(180, 0)", "(244, 0)"}) {
+        table->Add("pread", whole, {EIO, kNoneOnce}, table->Done());
+    }
     table->Add("setlock", "(2)", {}, table->Done({{0x400, "eas_lock_set"}}));
     for (const char* call : {"command", "archive", "MAVOACLSetEADirACL", "MAVOGetFSType"}) {
         table->Add(call, "", {}, table->Done());

@@ -483,6 +483,8 @@ TEST(FaultRecordsTest, BringingFinderInfoFromTheResourceFileIntoTheAttribute) {
                  .ordinal = 2,
                  .outcome = {.records = {{0x400, "eas_lock_set"}}, .files = Files::kDone}},
                 {.call = "lseek", .outcome = {.result = -1, .records = {{0xA00, "eas_open"}}}},
+                // What is needed of the file is read again by itself.
+                {.call = "pread", .errors = {EIO, kNoneOnce}, .outcome = {.files = Files::kDone}},
                 {.call = "pread", .outcome = {.result = -1, .records = {{0xA00, "eas_open"}}}},
             },
     });
@@ -742,6 +744,8 @@ TEST(FaultRecordsTest, WritingFinderInfoOverThatOfAResourceFile) {
                              .records = {{0xD00, kWriteUnit}},
                              .log = {"ea_eadirfs_finfo_write:LINE Error: lseek error ({error})"}}},
                 {.call = "lseek", .outcome = {.result = -1, .records = {{0xD00, kWriteUnit}}}},
+                // What is needed of the file is read again by itself.
+                {.call = "pread", .errors = {EIO, kNoneOnce}, .outcome = {.files = Files::kDone}},
                 {.call = "pread", .outcome = {.result = -1, .records = {{0xA00, "eas_open"}}}},
                 {.call = "pwrite",
                  .errors = {kShort},

@@ -109,9 +109,15 @@ const ExpectedRecord kOpenRead = {0xA00, "eas_open"};
 const ExpectedRecord kTableMemory = {0x200, "eas_alloc_entry"};
 const ExpectedRecord kLock = {0x400, "eas_lock_set"};
 
+// A read of more than is needed fails: what is needed is read by itself.
+FaultRule ReadByItself(const char* with, long long result = 0) {
+    return {
+        .call = "pread", .with = with, .errors = {EIO, kNoneOnce}, .outcome = {.result = result}};
+}
+
 // Any failure while the stream in kFile is read.
 Rules Reading(long long result) {
-    return {Refused("lseek", kOpenRead), TakenUpAgain("pread", result),
+    return {Refused("lseek", kOpenRead), TakenUpAgain("pread", result), ReadByItself("", result),
             Refused("pread", kOpenRead)};
 }
 
@@ -153,9 +159,7 @@ TEST(StreamOpenFaults, ALargeTableIsReadInPartsAndFreedInWhole) {
     const std::size_t name_end = image.RecordAt(5) + 11 + image.attributes[5].name.size();
     bytes[name_end] = '!';
     FaultCase c = Opening("open a stream of 600 attributes", bytes, F_WRLCK);
-    // Of a file that seems to end while its table is read, the rest is asked for once more.
-    c.rules = Rules{{.call = "pread", .with = ", 8192)", .errors = {kNoneOnce}}} + kOpenFailures +
-              Reading(0);
+    c.rules = kOpenFailures + Reading(0);
     SweepFaults(c);
 }
 
@@ -166,7 +170,8 @@ TEST(StreamOpenFaults, AHeaderThatCannotBeReadAgainIsRefused) {
     FaultCase c = Opening("open a stream, Finder info far behind", bytes, F_RDLCK);
     c.rules = {Refused("malloc", kOpenMemory, 1), Refused("malloc", kTableMemory, 2),
                Refused("setlock", kLock),         Refused("lseek", kOpenRead),
-               TakenUpAgain("pread", 0),          Refused("pread", kOpenRead)};
+               TakenUpAgain("pread", 0),          ReadByItself(", 0)"),
+               Refused("pread", kOpenRead)};
     SweepFaults(c);
 }
 
@@ -623,6 +628,8 @@ TEST(ImportFaults, EachAttributeThatFailsIsCountedAndTheOthersAreCopied) {
          .errors = {kShortThenNone},
          .bytes = 2610,
          .outcome = {.result = -1, .records = {kOpenRead}}},
+        // The streams are opened all the same.
+        {.call = "pread", .with = ", 0)", .errors = once, .outcome = {.files = Files::kDone}},
         Refused("pread", kOpenRead, 1),
         Refused("pread", kOpenRead, 2),
         // The values of the source: one read fails, or it and all later ones.
@@ -825,6 +832,10 @@ TEST(RepairFaults, AResourceFileWithoutAttributesIsConvertedOrStaysAsItIs) {
                    .errors = {kShortThenNone},
                    .bytes = 4096,  // more than the header, which is all that is looked at
                    .outcome = kRepaired},
+                  {.call = "pread",
+                   .with = "(8192, 0)",
+                   .errors = {EIO, kNoneOnce},
+                   .outcome = kRepaired},
                   {.call = "pread", .with = "(16384,", .errors = {kNoneOnce}, .outcome = cut_off},
                   {.call = "pread", .with = "(3616,", .errors = {kNoneOnce}, .outcome = cut_off},
                   {.call = "pread", .outcome = NotRepaired()},
@@ -865,6 +876,7 @@ TEST(RepairFaults, AResourceFileWithAttributesIsConvertedOrStaysAsItIs) {
              .with = "(3920,",
              .errors = {kShortThenNone},
              .outcome = {.result = -1, .free = {kStream}, .any_records = true}},
+            {.call = "pread", .with = "(3920,", .errors = {EIO, kNoneOnce}, .outcome = kRepaired},
             // Behind these reads the stream is there.
             {.call = "pread", .with = "(3920,", .ordinal = 1, .outcome = NotRepaired()},
             {.call = "pread", .with = "(3920,", .outcome = NotRepaired({kStream})},
