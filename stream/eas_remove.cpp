@@ -28,15 +28,15 @@ int MAVOEASRemove(EASHandle* h, const char* name) {
     if (SurveyStream(h, unit, &survey, &fork) != 0) return -1;
 
     const EASEntry& dropped = h->entries[index];
-    Range data = survey.header.attributes.data;  // as it will be
+    const Range old_data = survey.header.attributes.data;
+    Range data = old_data;  // as it will be
     data.offset -= RemovedRecordSize(dropped.nameLength);
     data.length -= dropped.length;
     StreamImage image(data.end());
     if (!image.ok()) return unit.Fail(Err::kMemory);
-    if (GatherValues(h, &survey.header, static_cast<unsigned>(index), image.At(data.offset),
-                     true) != 0) {
-        return -1;
-    }
+    const auto removed = static_cast<unsigned>(index);
+    if (GatherValues(*h, old_data, removed, image.At(data.offset), true) != 0) return -1;
+    MoveEntry(h, &survey.header, removed, true);
     image.PutHead(survey.header, h);
 
     if (EASShiftRFork(h, static_cast<unsigned>(data.end()), fork.offset, fork.length) != 0) {

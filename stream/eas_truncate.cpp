@@ -39,11 +39,11 @@ int MAVOEASTruncate(EASHandle* h, const char* name, unsigned length) {
     // The image has room for the value as it is, too: it is gathered whole.
     StreamImage image(std::max(total_size, data.end()));
     if (!image.ok()) return unit.Fail(Err::kMemory);
-    if (ReserveRoom(h->fd, data.end(), total_size, unit) != 0) return -1;
-    if (GatherValues(h, &survey.header, static_cast<unsigned>(index), image.At(data.offset),
-                     false) != 0) {
-        return -1;
-    }
+    const auto cut = static_cast<unsigned>(index);
+    if (GatherValues(*h, data, cut, image.At(data.offset), false) != 0) return -1;
+    Room room;
+    if (room.Reserve(h->fd, data.end(), total_size, unit) != 0) return -1;
+    MoveEntry(h, &survey.header, cut, false);
     if (length > old_length) memset(image.At(data.end()), 0, length - old_length);
     Attributes(*h).back().length = length;
     data.length = static_cast<std::uint32_t>(total_size - data.offset);
@@ -51,5 +51,6 @@ int MAVOEASTruncate(EASHandle* h, const char* name, unsigned length) {
     image.PutHead(survey.header, h);
 
     if (image.Write(h->fd, unit) != 0) return -1;
+    room.Keep();
     return MAVOEASFlush(h) != 0 ? unit.Fail(Err::kSystemCall) : 0;
 }

@@ -29,15 +29,16 @@ bool ReadValues(int fd, Range data, Range value, std::uint8_t* to, bool remove) 
 
 }  // namespace
 
-int GatherValues(EASHandle* h, StreamHeader* header, unsigned index, std::uint8_t* to,
-                 bool remove) {
+int GatherValues(const EASHandle& h, Range data, unsigned index, std::uint8_t* to, bool remove) {
+    const EASEntry& entry = h.entries[index];
+    return ReadValues(h.fd, data, {entry.offset, entry.length}, to, remove) ? 0
+                                                                            : unit.Fail(Err::kRead);
+}
+
+void MoveEntry(EASHandle* h, StreamHeader* header, unsigned index, bool remove) {
     Range& data = header->attributes.data;
     const std::span<EASEntry> attributes = Attributes(*h);
     const EASEntry moved = attributes[index];
-    if (!ReadValues(h->fd, data, {moved.offset, moved.length}, to, remove)) {
-        return unit.Fail(Err::kRead);
-    }
-
     const auto at = attributes.begin() + static_cast<std::ptrdiff_t>(index);
     std::rotate(at, at + 1, attributes.end());
     EASEntry& last = attributes.back();
@@ -46,7 +47,7 @@ int GatherValues(EASHandle* h, StreamHeader* header, unsigned index, std::uint8_
     }
     if (!remove) {
         last.offset = static_cast<std::uint32_t>(data.end() - moved.length);
-        return 0;
+        return;
     }
     const std::uint32_t record_size = RemovedRecordSize(moved.nameLength);
     for (EASEntry& entry : attributes) entry.offset -= record_size;
@@ -54,7 +55,6 @@ int GatherValues(EASHandle* h, StreamHeader* header, unsigned index, std::uint8_
     data.length -= moved.length;
     --header->attributes.count;
     FreeEntry(h, &last);
-    return 0;
 }
 
 }  // namespace mavoea
@@ -73,7 +73,8 @@ int MAVOEASUpdateEntry(EASHandle* h, unsigned index, unsigned char* buf, unsigne
     if (buf == nullptr && bufSize > 0) return unit.Fail(Err::kBadArgument);
     Survey survey;
     if (SurveyTable(h, unit, &survey) != 0) return -1;
-    if (GatherValues(h, &survey.header, index, buf, drop) != 0) return -1;
+    if (GatherValues(*h, survey.header.attributes.data, index, buf, drop) != 0) return -1;
+    MoveEntry(h, &survey.header, index, drop);
     StoreHeader(survey.header, h);
     return 0;
 }

@@ -19,10 +19,12 @@ namespace {
 constexpr Unit unit("eas_write");
 
 // Puts `image` on disk, the fork first: it still lies where the old header says while it moves.
-int Commit(EASHandle* h, const StreamImage& image, std::uint64_t total_size, Range fork) {
+int Commit(EASHandle* h, const StreamImage& image, std::uint64_t total_size, Range fork,
+           Room* room) {
     const auto fork_start = static_cast<unsigned>(total_size);
     if (EASShiftRFork(h, fork_start, fork.offset, fork.length) != 0) return -1;
     if (image.Write(h->fd, unit) != 0) return -1;
+    room->Keep();
     return MAVOEASFlush(h);
 }
 
@@ -48,13 +50,14 @@ int Create(EASHandle* h, const char* name, ByteView value, unsigned offset) {
     memcpy(own_name.get(), name, name_size);
     if (attributes.count == h->capacity && MAVOEASAllocEntry(h, 0) != 0) return -1;
 
-    if (ReserveRoom(h->fd, old_data.end() + fork.length, total_size + fork.length, unit) != 0) {
-        return -1;
-    }
     attributes.data.offset += record_size;
     std::uint8_t* const data = image.At(attributes.data.offset);
     if (ReadAt(h->fd, {data, old_data.length}, old_data.offset) != old_data.length) {
         return unit.Fail(Err::kRead);
+    }
+    Room room;
+    if (room.Reserve(h->fd, old_data.end() + fork.length, total_size + fork.length, unit) != 0) {
+        return -1;
     }
     memset(data + old_data.length, 0, offset);
     std::copy(value.begin(), value.end(), data + old_data.length + offset);
@@ -70,7 +73,7 @@ int Create(EASHandle* h, const char* name, ByteView value, unsigned offset) {
     attributes.data.length += static_cast<std::uint32_t>(length);
     ++attributes.count;
     image.PutHead(survey.header, h);
-    return Commit(h, image, total_size, fork);
+    return Commit(h, image, total_size, fork, &room);
 }
 
 int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
@@ -89,10 +92,12 @@ int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
 
     StreamImage image(total_size);
     if (!image.ok()) return unit.Fail(Err::kMemory);
-    if (ReserveRoom(h->fd, data.end() + fork.length, total_size + fork.length, unit) != 0) {
+    if (GatherValues(*h, data, index, image.At(data.offset), false) != 0) return -1;
+    Room room;
+    if (room.Reserve(h->fd, data.end() + fork.length, total_size + fork.length, unit) != 0) {
         return -1;
     }
-    if (GatherValues(h, &survey.header, index, image.At(data.offset), false) != 0) return -1;
+    MoveEntry(h, &survey.header, index, false);
     std::uint8_t* const at = image.At(data.end() - old_length);
     memset(at + old_length, 0, static_cast<std::size_t>(added));
     std::copy(value.begin(), value.end(), at + offset);
@@ -100,7 +105,7 @@ int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
     Attributes(*h).back().length = static_cast<std::uint32_t>(length);
     data.length += static_cast<std::uint32_t>(added);
     image.PutHead(survey.header, h);
-    return Commit(h, image, total_size, fork);
+    return Commit(h, image, total_size, fork, &room);
 }
 
 }  // namespace

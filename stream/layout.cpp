@@ -88,16 +88,25 @@ int SurveyFork(EASHandle* h, const Survey& survey, const Unit& unit, Range* fork
     return 0;
 }
 
-int ReserveRoom(int fd, std::uint64_t from, std::uint64_t to, const Unit& unit, int line) {
+int Room::Reserve(int fd, std::uint64_t from, std::uint64_t to, const Unit& unit, int line) {
     // What a volume gives room in; a file that ends within one has all of it.
     constexpr std::uint64_t kBlock = 512;
     from += (kBlock - from % kBlock) % kBlock;
     if (to <= from) return 0;
-    if (kernel::Reserve(fd, static_cast<off_t>(from), static_cast<off_t>(to - from)) == 0 ||
-        (errno != ENOSPC && errno != EDQUOT && errno != EFBIG)) {
+    if (kernel::Reserve(fd, static_cast<off_t>(from), static_cast<off_t>(to - from)) == 0) {
+        fd_ = fd;
         return 0;
     }
+    if (errno != ENOSPC && errno != EDQUOT && errno != EFBIG) return 0;
+    fd_ = fd;  // The file may have got what there was.
     return unit.Fail(Err::kWrite, line);
+}
+
+Room::~Room() {
+    if (fd_ < 0) return;
+    const ErrnoKeeper keep;
+    const off_t size = kernel::Lseek(fd_, 0, SEEK_END);
+    if (size >= 0) (void)kernel::Ftruncate(fd_, size);
 }
 
 bool FitsStream(std::uint64_t total_size, std::uint32_t fork_length) {

@@ -48,12 +48,26 @@ inline int SurveyStream(EASHandle* h, const Unit& unit, Survey* survey, Range* f
     return SurveyFork(h, *survey, unit, fork, line);
 }
 
-// Takes the room that the file needs to grow from `from` to `to`, before anything in it changes: a
-// rewrite that a full volume stops half-way would cost what the file had. 0, or -1 after recording
-// 0xB00 for `unit`, with errno ENOSPC, EDQUOT or EFBIG; volumes that cannot reserve are gone on
-// with.
-int ReserveRoom(int fd, std::uint64_t from, std::uint64_t to, const Unit& unit,
+// The room that a file needs to grow, taken before anything in it changes: a rewrite that a full
+// volume stops half-way would cost what the file had. Given back when it goes out of scope, unless
+// the rewrite has made it the file's.
+class Room {
+ public:
+    Room() = default;
+    ~Room();
+    Room(const Room&) = delete;
+    Room& operator=(const Room&) = delete;
+
+    // Takes it from `from` to `to`. 0, or -1 after recording 0xB00 for `unit`, with errno ENOSPC,
+    // EDQUOT or EFBIG; volumes that cannot reserve are gone on with.
+    int Reserve(int fd, std::uint64_t from, std::uint64_t to, const Unit& unit,
                 int line = __builtin_LINE());
+
+    void Keep() { fd_ = -1; }
+
+ private:
+    int fd_ = -1;  // of the file that has some behind its end
+};
 
 // Whether attributes that end there leave a fork of that length within a stream's 32-bit offsets.
 bool FitsStream(std::uint64_t total_size, std::uint32_t fork_length);
@@ -85,10 +99,11 @@ class StreamImage {
     std::uint64_t head_size_ = 0;
 };
 
-// MAVOEASUpdateEntry() for a stream that has been surveyed and a `to` that is large enough. What
-// changes in the header changes in *header, for the caller to store. Records failures for its own
-// unit; nothing has changed then.
-int GatherValues(EASHandle* h, StreamHeader* header, unsigned index, std::uint8_t* to, bool remove);
+// MAVOEASUpdateEntry() for a stream that has been surveyed, in its two steps. The first reads the
+// values into a `to` that is large enough, and records failures for its own unit. The second
+// changes memory: what it changes in the header is in *header, for the caller to store.
+int GatherValues(const EASHandle& h, Range data, unsigned index, std::uint8_t* to, bool remove);
+void MoveEntry(EASHandle* h, StreamHeader* header, unsigned index, bool remove);
 
 // How much shorter MAVOEASUpdateEntry() makes the table when it removes a record. Computed in 8
 // bits, which is too little for names of more than 240 bytes: a gap of 256 bytes then stays between

@@ -460,6 +460,94 @@ TEST_F(EasEntriesTest, EveryChangeIsSyncedOnce) {
     EXPECT_EQ("fsync", calls.back());
 }
 
+// ---- Room ---------------------------------------------------------------------------------------
+
+class EasRoomTest : public EasEntriesTest {
+ protected:
+    // The ways to make a stream longer by many blocks.
+    std::vector<std::function<int()>> Growths() {
+        return {
+            [this] { return Write(handle_, "new", Pattern(100'000)); },
+            [this] { return Write(handle_, "a", Pattern(100'000)); },
+            [this] { return MAVOEASTruncate(h(), "a", 100'000); },
+        };
+    }
+
+    blkcnt_t Blocks() const {
+        struct stat info;
+        return fstat(fd_, &info) == 0 ? info.st_blocks : -1;
+    }
+};
+
+TEST_F(EasRoomTest, NoneIsTakenBeforeTheValuesHaveBeenRead) {
+    for (const auto& grow : Growths()) {
+        OpenThree();
+        Hooks().fails = [](const std::string& call) { return call.starts_with("pread") ? EIO : 0; };
+        EXPECT_EQ(-1, grow());
+        Hooks().fails = nullptr;
+        EXPECT_THAT(TakeCodes(), ElementsAre(0xA00));
+        EXPECT_THAT(TakeCallNames(), ::testing::Not(Contains("fallocate")));
+    }
+}
+
+TEST_F(EasRoomTest, ItIsGivenBackWhenNothingIsWritten) {
+    for (const char* const failing : {"pwrite", "ftruncate(1"}) {
+        for (const auto& grow : Growths()) {
+            SCOPED_TRACE(failing);
+            OpenThree();
+            if (*failing == 'p') image_.fork.clear();
+            Reopen();
+            ASSERT_EQ(0, ::fsync(fd_));
+            const blkcnt_t before = Blocks();
+            Hooks().fails = [failing](const std::string& call) {
+                return call.starts_with(failing) ? EIO : 0;
+            };
+            const int result = grow();
+            const int error = errno;
+            Hooks().fails = nullptr;
+            TakeRecords();
+            if (result == 0) continue;  // A truncation moves no fork.
+            EXPECT_EQ(-1, result);
+            EXPECT_EQ(EIO, error);
+            EXPECT_THAT(TakeCallNames(), Contains("fallocate"));
+            EXPECT_EQ(image_.Build(), Contents());
+            EXPECT_EQ(before, Blocks());
+        }
+    }
+}
+
+TEST_F(EasRoomTest, WhatAVolumeHadOfItIsGivenBackToo) {
+    for (const auto& grow : Growths()) {
+        OpenThree();
+        const HandleState state = StateOf(*h());
+        {
+            const FailCall fault("fallocate", ENOSPC);
+            EXPECT_EQ(-1, grow());
+            EXPECT_EQ(ENOSPC, errno);
+        }
+        EXPECT_THAT(TakeCodes(), ElementsAre(0xB00));
+        const std::vector<std::string> calls = TakeCalls();
+        ASSERT_FALSE(calls.empty());
+        EXPECT_EQ("ftruncate(" + std::to_string(image_.End()) + ")", calls.back());
+        EXPECT_EQ(image_.Build(), Contents());
+        EXPECT_TRUE(state == StateOf(*h()));
+        EXPECT_EQ(6, Write(handle_, "a", "longer"));  // The handle is as good as it was.
+        EXPECT_EQ(Ascii("longer"), Read(handle_, "a"));
+    }
+}
+
+TEST_F(EasRoomTest, AStreamThatHasBeenWrittenKeepsIt) {
+    for (const auto& grow : Growths()) {
+        OpenThree();
+        image_.fork.clear();
+        Reopen();
+        EXPECT_LE(0, grow());
+        EXPECT_THAT(TakeCallNames(), ::testing::Not(Contains("ftruncate")));
+    }
+}
+
+// -------------------------------------------------------------------------------------------------
+
 TEST_F(EasEntriesTest, TheTableIsContiguousHoweverLong) {
     handle_ = Open();
     for (int i = 0; i < 60; ++i) {
