@@ -298,7 +298,9 @@ MAVOEA_API int MAVOEASTruncate(EASHandle* h, const char* name, unsigned length);
 MAVOEA_API int MAVOEASAllocEntry(EASHandle* h, int count);
 
 /* Writes header and table at the start of the file, and leaves the file position at the start of
- * the data area. -1: 0xD00; 0x200; 0xA00; 0xB00. */
+ * the data area. Total size, length of the Finder info and offset of the fork follow from the data
+ * area's start and length. -1: 0xD00; 0x200; 0x300 no write lock; 0xA00 table, start and length of
+ * the data area do not fit together, or the position could not be set; 0xB00. */
 MAVOEA_API int MAVOEASWriteHeader(EASHandle* h);
 
 /* Makes record `index` the last one in memory and gathers the data area in buf: with that value at

@@ -16,14 +16,15 @@ using namespace mavoea;
 
 int MAVOEASWriteHeader(EASHandle* h) {
     if (h == nullptr || h->fd < 0) return unit.Fail(Err::kBadArgument);
+    if (h->lockType != F_WRLCK) return unit.Fail(Err::kNotPermitted);
     const StreamHeader header = LoadHeader(*h);
     // Sizes that pass the format's 32 bits are no sizes.
-    if (!FitsStream(header.attributes.data.end(), 0)) return unit.Fail(Err::kRead);
+    const Range data = header.attributes.data;
+    if (!FitsTogether(*h, data) || !FitsStream(data.end(), 0)) return unit.Fail(Err::kRead);
 
     StreamImage image(TableEnd(*h));
     if (!image.ok()) return unit.Fail(Err::kMemory);
     image.PutHead(header, h);
     if (image.Write(h->fd, unit) != 0) return -1;
-    const off_t data_start = header.attributes.data.offset;
-    return kernel::Lseek(h->fd, data_start, SEEK_SET) < 0 ? unit.Fail(Err::kRead) : 0;
+    return kernel::Lseek(h->fd, data.offset, SEEK_SET) < 0 ? unit.Fail(Err::kRead) : 0;
 }

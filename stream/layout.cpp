@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <utility>
 
 #include "stream/internal.h"
 #include "util/file_io.h"
@@ -36,6 +37,19 @@ std::uint64_t TableEnd(const EASHandle& h) {
     return end;
 }
 
+bool FitsTogether(const EASHandle& h, Range data) {
+    const std::span<EASEntry> attributes = Attributes(h);
+    if (std::cmp_greater(attributes.size(), h.capacity)) return false;
+    std::uint64_t table_end = kStreamHeaderSize;
+    std::uint64_t next = data.offset;
+    for (const EASEntry& entry : attributes) {
+        if (entry.name == nullptr || (entry.length != 0 && entry.offset != next)) return false;
+        table_end += RecordSize(entry.nameLength);
+        next += entry.length;
+    }
+    return next == data.end() && data.offset >= table_end;
+}
+
 int SurveyTable(EASHandle* h, const Unit& unit, Survey* found, int line) {
     found->header = LoadHeader(*h);
     Range& data = found->header.attributes.data;
@@ -54,15 +68,10 @@ int SurveyTable(EASHandle* h, const Unit& unit, Survey* found, int line) {
         data.offset = kStreamHeaderSize;  // Whatever it was, nothing lies there.
         return 0;
     }
-    std::uint64_t next = data.offset;
-    for (const EASEntry& entry : attributes) {
-        if (entry.length != 0 && entry.offset != next) return unit.Fail(Err::kRead, line);
-        next += entry.length;
-    }
-    if (next != data.end() || data.offset < TableEnd(*h) || data.end() > found->file_size) {
+    if (!FitsTogether(*h, data) || data.end() > found->file_size) {
         return unit.Fail(Err::kRead, line);
     }
-    next = data.offset;
+    std::uint64_t next = data.offset;
     for (EASEntry& entry : attributes) {
         entry.offset = static_cast<std::uint32_t>(next);
         next += entry.length;

@@ -25,9 +25,12 @@ int FindAttribute(const EASHandle& h, const char* name);
 // Where the table of h's attributes ends.
 std::uint64_t TableEnd(const EASHandle& h);
 
+// Whether the table, and where `data` says that the values lie, fit together: values must lie one
+// behind the other in table order; between table and values there may be a gap.
+bool FitsTogether(const EASHandle& h, Range data);
+
 // What a rewrite starts from: h's header and the file's size, once offsets, lengths and counts have
-// been found to fit together and to lie in the file. Values must lie one behind the other in table
-// order; between table and values there may be a gap. Empty values, whose offset means nothing, are
+// been found to fit together and to lie in the file. Empty values, whose offset means nothing, are
 // given the one that their place calls for. 0, or -1 after recording 0xA00 for `unit`.
 struct Survey {
     StreamHeader header;

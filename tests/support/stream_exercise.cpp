@@ -391,6 +391,7 @@ std::string StreamExercise::DoWriteHeader() {
         return AfterUnsure({}, result == 0);
     }
     if (std::string fault = AfterChange(outcome, result); !fault.empty()) return fault;
+    if (result != 0) return {};
     if (lseek(fd_, 0, SEEK_CUR) != static_cast<off_t>(model_->data_start())) {
         return "the file position is not at the values";
     }

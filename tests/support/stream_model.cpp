@@ -362,6 +362,7 @@ Outcome StreamModel::UpdateEntry(unsigned index, unsigned size, bool remove, Byt
 }
 
 Outcome StreamModel::WriteHeader() {
+    if (lock_type_ != F_WRLCK) return Failed(0x300);
     if (!exact_) return Unsure(0);
     if (total_size() >= kSizeLimit) return Failed(0xA00);
     PutHead();

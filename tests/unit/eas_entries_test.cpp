@@ -407,9 +407,12 @@ TEST_F(EasEntriesTest, ChangesNeedTheWriteLock) {
         EXPECT_EQ(-1, Write(handle_, "a", "x"));
         EXPECT_EQ(-1, MAVOEASRemove(h(), "a"));
         EXPECT_EQ(-1, MAVOEASTruncate(h(), "a", 1));
-        EXPECT_THAT(TakeRecords(),
-                    ElementsAre(RecordOf(0x300, "eas_write"), RecordOf(0x300, "eas_remove"),
-                                RecordOf(0x300, "eas_truncate")));
+        h()->header[kFinderInfoAt] ^= 1;
+        EXPECT_EQ(-1, MAVOEASWriteHeader(h()));
+        EXPECT_THAT(
+            TakeRecords(),
+            ElementsAre(RecordOf(0x300, "eas_write"), RecordOf(0x300, "eas_remove"),
+                        RecordOf(0x300, "eas_truncate"), RecordOf(0x300, "eas_write_header")));
     }
     h()->lockType = F_WRLCK;
     EXPECT_THAT(TakeCallNames(), IsEmpty());
@@ -842,6 +845,74 @@ TEST_F(EasEntriesTest, WriteHeaderOfANewStreamWrites120Bytes) {
     EXPECT_EQ(0, MAVOEASWriteHeader(h()));
     EXPECT_EQ(StreamImage{}.Build(), Contents());
     EXPECT_EQ(120, ::lseek(fd_, 0, SEEK_CUR));
+}
+
+// Nobody could open, or rewrite, what it would leave.
+TEST_F(EasEntriesTest, WriteHeaderRefusesATableThatDoesNotFitTheDataArea) {
+    const auto refused = [&](const char* what) {
+        SCOPED_TRACE(what);
+        const HandleState before = StateOf(*h());
+        TakeCalls();
+        EXPECT_EQ(-1, MAVOEASWriteHeader(h()));
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_write_header")));
+        EXPECT_THAT(TakeCalls(), IsEmpty());
+        EXPECT_TRUE(before == StateOf(*h()));
+        EXPECT_EQ(image_.Build(), Contents());
+    };
+    OpenThree();
+    for (const std::uint32_t start : {0u, 120u, 167u, 169u, 0xFFFFFFFFu}) {
+        PutU32(h()->header, kDataStartAt, start);
+        refused("data start");
+    }
+    OpenThree();
+    for (const std::uint32_t length : {0u, 10u, 12u, 0xFFFFFFFFu}) {
+        PutU32(h()->header, kDataLengthAt, length);
+        refused("data length");
+    }
+    OpenThree();
+    ++h()->entries[1].offset;
+    refused("a value's offset");
+    OpenThree();
+    ++h()->entries[1].length;
+    refused("a value's length");
+    OpenThree();
+    ++h()->entries[2].length;
+    refused("the last value's length");
+    OpenThree();
+    PutU16(h()->header, kAttributeCountAt, 2);
+    refused("one record less");
+    OpenThree();
+    PutU16(h()->header, kAttributeCountAt, 4);
+    // More than there are; StateOf() would look at them.
+    EXPECT_EQ(-1, MAVOEASWriteHeader(h()));
+    ASSERT_EQ(0, MAVOEASAllocEntry(h(), 1));
+    EXPECT_EQ(-1, MAVOEASWriteHeader(h()));  // one without a name
+    PutU16(h()->header, kAttributeCountAt, 3);
+    EXPECT_THAT(TakeCodes(), ElementsAre(0xA00, 0xA00));
+    EXPECT_EQ(image_.Build(), Contents());
+    OpenThree();
+    h()->entries[0].nameLength += 4;
+    refused("a longer name");
+}
+
+TEST_F(EasEntriesTest, WriteHeaderNeedsNoValuesInTheFile) {
+    handle_ = Open();
+    ASSERT_EQ(3, Write(handle_, "a", "one"));
+    ASSERT_EQ(0, ftruncate(fd_, 0));
+    EXPECT_EQ(0, MAVOEASWriteHeader(h()));
+    image_.attributes = {{"a", Ascii("one")}};
+    EXPECT_EQ(136u, FileSize());
+    EXPECT_EQ(3, ::write(fd_, "one", 3));
+    EXPECT_EQ(image_.Build(), Contents());
+    // Where there are no values the data area may begin anywhere behind the table.
+    ASSERT_EQ(0, MAVOEASRemove(h(), "a"));
+    PutU32(h()->header, kDataStartAt, 376);
+    EXPECT_EQ(0, MAVOEASWriteHeader(h()));
+    EXPECT_EQ(376, ::lseek(fd_, 0, SEEK_CUR));
+    EXPECT_EQ(376u, U32At(Contents(), kForkOffsetAt));
+    PutU32(h()->header, kDataStartAt, 119);
+    EXPECT_EQ(-1, MAVOEASWriteHeader(h()));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_write_header")));
 }
 
 TEST_F(EasEntriesTest, WriteHeaderReportsWhatFails) {
