@@ -250,9 +250,9 @@ MAVOEA_API int MAVOEASLockSet(EASHandle* h, int lockType);
 MAVOEA_API int MAVOEASFlush(EASHandle* h);
 
 /* ---- EA streams: attributes ----------------------------------------------------------------- */
-/* Names are compared byte by byte and have at most 254 bytes; a stream holds at most 65,535
- * attributes and at most 4 GiB. What would pass a limit is refused with 0xD00, before anything has
- * changed. A stream whose offsets, lengths and counts do not fit together is refused with 0xA00 by
+/* Names are compared byte by byte and have at most 254 bytes, values that are written at most
+ * 2 GiB - 1; a stream holds at most 65,535 attributes and at most 4 GiB. What would pass a limit is
+ * refused with 0xD00, before anything has changed. A stream whose offsets, lengths and counts do not fit together is refused with 0xA00 by
  * whatever would rewrite it, before anything on disk has changed.
  *
  * A failed MAVOEASWrite, MAVOEASRemove or MAVOEASTruncate may leave memory ahead of the file:
@@ -267,8 +267,9 @@ MAVOEA_API int MAVOEASSearch(EASHandle* h, const char* name);
 MAVOEA_API int MAVOEASEnum(EASHandle* h, MLIBCSzList** ppList);
 
 /* Copies up to `size` bytes of the value, from `offset` on, into buf (never NULL) and returns their
- * number, 0 behind the end. With size 0 returns the value's length. -1: 0xD00; 0x300 no lock;
- * 0x2000; 0xA00. */
+ * number, 0 behind the end. With size 0 returns the value's length. Of values of 2 GiB and more,
+ * pieces can be read. -1: 0xD00; 0x300 no lock; 0x2000; 0xA00, also for a number of 2 GiB and
+ * more. */
 MAVOEA_API int MAVOEASRead(EASHandle* h, const char* name, void* buf, unsigned size,
                            unsigned offset);
 

@@ -1,7 +1,6 @@
 // Reads an attribute's value.
 
 #include <algorithm>
-#include <utility>
 
 #include "include/mavoea.h"
 #include "stream/layout.h"
@@ -28,11 +27,11 @@ int MAVOEASRead(EASHandle* h, const char* name, void* buf, unsigned size, unsign
 
     const EASEntry& entry = h->entries[index];
     if (entry.length < offset) return 0;
-    // A length that no result can tell.
-    if (!std::in_range<int>(entry.length)) return unit.Fail(Err::kRead);
-    if (size == 0) return static_cast<int>(entry.length);
+    const std::uint32_t count = size == 0 ? entry.length : std::min(size, entry.length - offset);
+    // More than a result can tell.
+    if (!IsValueLength(count)) return unit.Fail(Err::kRead);
+    if (size == 0) return static_cast<int>(count);
 
-    const std::uint32_t count = std::min(size, entry.length - offset);
     const std::int64_t got = ReadAt(h->fd, {static_cast<std::uint8_t*>(buf), count},
                                     std::uint64_t{entry.offset} + offset);
     return got == count ? static_cast<int>(count) : unit.Fail(Err::kRead);

@@ -34,7 +34,9 @@ int MAVOEASTruncate(EASHandle* h, const char* name, unsigned length) {
     const std::uint64_t total_size = value_offset + length;
     const auto fork_length = static_cast<std::uint32_t>(
         std::min<std::uint64_t>(survey.header.resource_fork.data.length, survey.file_size));
-    if (!FitsStream(total_size, fork_length)) return unit.Fail(Err::kBadArgument);
+    if (!IsValueLength(length) || !FitsStream(total_size, fork_length)) {
+        return unit.Fail(Err::kBadArgument);
+    }
 
     // The image has room for the value as it is, too: it is gathered whole.
     StreamImage image(std::max(total_size, data.end()));

@@ -5,7 +5,6 @@
 #include <string.h>
 
 #include <algorithm>
-#include <climits>
 
 #include "include/mavoea.h"
 #include "stream/internal.h"
@@ -40,7 +39,8 @@ int Create(EASHandle* h, const char* name, ByteView value, unsigned offset) {
     const std::uint32_t record_size = RecordSize(name_size);
     const std::uint64_t length = std::uint64_t{offset} + value.size();
     const std::uint64_t total_size = old_data.end() + record_size + length;
-    if (attributes.count == kAttributeCountMax || !FitsStream(total_size, fork.length)) {
+    if (attributes.count == kAttributeCountMax || !IsValueLength(length) ||
+        !FitsStream(total_size, fork.length)) {
         return unit.Fail(Err::kBadArgument);
     }
 
@@ -88,7 +88,9 @@ int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
         std::max(std::uint64_t{old_length}, std::uint64_t{offset} + value.size());
     const std::uint64_t added = length - old_length;
     const std::uint64_t total_size = data.end() + added;
-    if (!FitsStream(total_size, fork.length)) return unit.Fail(Err::kBadArgument);
+    if (!IsValueLength(length) || !FitsStream(total_size, fork.length)) {
+        return unit.Fail(Err::kBadArgument);
+    }
 
     StreamImage image(total_size);
     if (!image.ok()) return unit.Fail(Err::kMemory);
@@ -120,7 +122,7 @@ int MAVOEASWrite(EASHandle* h, const char* name, const void* data, unsigned size
     }
     // A name that the record's one byte cannot count, a size that the result could not tell from a
     // failure.
-    if (strlen(name) >= kNameSizeMax || size > INT_MAX) return unit.Fail(Err::kBadArgument);
+    if (strlen(name) >= kNameSizeMax || !IsValueLength(size)) return unit.Fail(Err::kBadArgument);
     if (h->lockType != F_WRLCK) return unit.Fail(Err::kNotPermitted);
 
     const ByteView value(static_cast<const std::uint8_t*>(data), size);

@@ -3,6 +3,7 @@
 #define MAVOEA_STREAM_LAYOUT_H_
 
 #include <cstdint>
+#include <utility>
 
 #include "format/ea_stream.h"
 #include "include/mavoea.h"
@@ -71,6 +72,9 @@ class Room {
  private:
     int fd_ = -1;  // of the file that has some behind its end
 };
+
+// Whether a value of that length can be told by results.
+constexpr bool IsValueLength(std::uint64_t length) { return std::in_range<int>(length); }
 
 // Whether attributes that end there leave a fork of that length within a stream's 32-bit offsets.
 bool FitsStream(std::uint64_t total_size, std::uint32_t fork_length);

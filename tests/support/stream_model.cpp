@@ -12,6 +12,7 @@ namespace mavoea::test {
 namespace {
 
 constexpr std::size_t kHeaderSize = 120;
+constexpr std::uint64_t kValueMost = 0x7FFFFFFF;  // that a result can tell
 constexpr std::uint64_t kSizeLimit = std::uint64_t{1} << 32;
 
 // Bytes at a place, big-endian; reading and writing of this file's own, so that nothing that is
@@ -282,6 +283,7 @@ Outcome StreamModel::Write(const std::string& name, std::span<const std::uint8_t
     const std::uint64_t total = total_size() + added + record;
     if (total >= kSizeLimit || total + fork_.size() > kSizeLimit) return Failed(0xD00);
     if (index < 0 && attributes_.size() == 0xFFFF) return Failed(0xD00);
+    if (old_length + added > kValueMost) return Failed(0xD00);
 
     ModelAttribute written;
     if (index < 0) {
@@ -325,6 +327,7 @@ Outcome StreamModel::Truncate(const std::string& name, unsigned length) {
     if (index < 0) return Failed(0x2000);
     if (!exact_) return Unsure(0);
 
+    if (length > kValueMost) return Failed(0xD00);
     const std::size_t at = static_cast<std::size_t>(index);
     const std::uint64_t total = total_size() - attributes_[at].value.size() + length;
     if (total >= kSizeLimit ||
@@ -423,9 +426,10 @@ Outcome StreamModel::Read(const std::string& name, unsigned size, unsigned offse
     if (index < 0) return Failed(0x2000);
     const ModelAttribute& attribute = attributes_[static_cast<std::size_t>(index)];
     if (attribute.length < offset) return {};
-    if (attribute.length > 0x7FFFFFFF) return Failed(0xA00);  // No result could tell it.
+    const std::uint32_t left = attribute.length - offset;
+    if ((size == 0 ? attribute.length : std::min(size, left)) > kValueMost) return Failed(0xA00);
     if (size == 0) return {.result = static_cast<int>(attribute.length)};
-    const std::uint32_t count = std::min(size, attribute.length - offset);
+    const std::uint32_t count = std::min(size, left);
     const std::uint64_t from = std::uint64_t{attribute.offset} + offset;
     if (count > 0 && (from > file_.size() || file_.size() - from < count)) return Failed(0xA00);
     if (count > 0) {

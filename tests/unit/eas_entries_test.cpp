@@ -244,19 +244,76 @@ TEST_F(EasEntriesTest, AShortOrFailedReadIsRecorded) {
     EXPECT_EQ(4, MAVOEASRead(h(), "b", buffer, 4, 0));  // these bytes are there
 }
 
-TEST_F(EasEntriesTest, AValueTooLongForAResultIsARefusedRead) {
+TEST_F(EasEntriesTest, OfAValueTooLongForAResultPiecesAreRead) {
     image_.attributes = {{"a", {}}};
-    for (const std::uint32_t length : {0x80000000u, 0xFFFFFFFFu}) {
+    for (const std::uint32_t length : {0x80000000u, 0xFFFFF000u}) {
         SCOPED_TRACE(length);
         Bytes bytes = image_.Build();
         PutU32(bytes, image_.RecordAt(0) + 4, length);
+        PutU32(bytes, kDataLengthAt, length);
         Fill(bytes);
+        const std::uint64_t start = image_.DataStart();
+        ASSERT_EQ(0, ftruncate(fd_, static_cast<off_t>(start + length)));
+        for (const std::uint64_t at : {std::uint64_t{0}, std::uint64_t{length} - 8}) {
+            ASSERT_EQ(8, ::pwrite(fd_, "abcdefgh", 8, static_cast<off_t>(start + at)));
+        }
         handle_ = Open();
         ASSERT_NE(nullptr, handle_);
-        char buffer[8];
+        char buffer[16] = {};
+        EXPECT_EQ(4, MAVOEASRead(h(), "a", buffer, 4, 0));
+        EXPECT_EQ(4, MAVOEASRead(h(), "a", buffer + 4, 4, length - 4));
+        EXPECT_STREQ("abcdefgh", buffer);
+        EXPECT_EQ(6, MAVOEASRead(h(), "a", buffer, sizeof buffer, length - 6));
+        EXPECT_STREQ("cdefghgh", buffer);
+        EXPECT_EQ(0, MAVOEASRead(h(), "a", buffer, sizeof buffer, length));
+        EXPECT_THAT(TakeRecords(), IsEmpty());
+        // Not its length, and not more than a result can tell.
         EXPECT_EQ(-1, MAVOEASRead(h(), "a", buffer, 0, 0));
-        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_read")));
+        EXPECT_EQ(-1, MAVOEASRead(h(), "a", buffer, 0x80000000u, 0));
+        EXPECT_THAT(TakeRecords(),
+                    ElementsAre(RecordOf(0xA00, "eas_read"), RecordOf(0xA00, "eas_read")));
     }
+}
+
+TEST_F(EasEntriesTest, AValueTooLongForAResultIsNotMade) {
+    OpenThree();
+    const HandleState before = StateOf(*h());
+    const auto refused = [&](const char* unit, int result) {
+        EXPECT_EQ(-1, result);
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, unit)));
+    };
+    for (const char* const name : {"b", "new"}) {
+        refused("eas_write", Write(handle_, name, "", 0x80000000u));
+        refused("eas_write", Write(handle_, name, "x", 0x7FFFFFFFu));
+        refused("eas_write", Write(handle_, name, "xy", 0x7FFFFFFEu));
+    }
+    refused("eas_truncate", MAVOEASTruncate(h(), "b", 0x80000000u));
+    refused("eas_truncate", MAVOEASTruncate(h(), "b", 0xC0000000u));
+    EXPECT_THAT(TakeWrites(), IsEmpty());
+    EXPECT_TRUE(before == StateOf(*h()));
+    EXPECT_EQ(image_.Build(), Contents());
+    // What is not written to has no length that could be wrong.
+    EXPECT_EQ(0, Write(handle_, "b", "", 0x80000000u, 0));
+    EXPECT_EQ(EEXIST, errno);
+    EXPECT_EQ(-1, Write(handle_, "new", "", 0x80000000u, EAS_WRITE_MUST_EXIST));
+    EXPECT_EQ(ENOENT, errno);
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+// One that another program has made.
+TEST_F(EasEntriesTest, AValueTooLongForAResultIsNotWrittenTo) {
+    image_.attributes = {{"a", {}}};
+    Bytes bytes = image_.Build();
+    PutU32(bytes, image_.RecordAt(0) + 4, 0x80000000u);
+    PutU32(bytes, kDataLengthAt, 0x80000000u);
+    Fill(bytes);
+    ASSERT_EQ(0, ftruncate(fd_, static_cast<off_t>(image_.DataStart() + 0x80000000ull)));
+    handle_ = Open();
+    ASSERT_NE(nullptr, handle_);
+    EXPECT_EQ(-1, Write(handle_, "a", "x", 5));
+    EXPECT_EQ(-1, MAVOEASTruncate(h(), "a", 0x80000000u));
+    EXPECT_THAT(TakeCodes(), ElementsAre(0xD00, 0xD00));
+    EXPECT_EQ(bytes, Contents(bytes.size()));
 }
 
 // ---- Write --------------------------------------------------------------------------------------
