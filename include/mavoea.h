@@ -98,7 +98,12 @@ typedef struct EAIndexFlags {
     int index;     /* 1: the search index, see MAVOIndex() */
 } EAIndexFlags;
 
-/* One attribute of an open EA stream. */
+/* One attribute of an open EA stream.
+ *
+ * A caller may put another name from malloc() in the place of one, of nameLength bytes; it is the
+ * handle's then. In a table of up to 32 attributes when it was opened, and of attributes written
+ * since, each name is from malloc() itself, and whoever replaces it frees it. In a larger one the
+ * names share a block, which is freed with the table, and must not be freed one by one. */
 typedef struct EASEntry {
     uint32_t offset;    /* of the value's first byte, from the start of the file */
     uint32_t length;    /* of the value, in bytes */
@@ -107,7 +112,8 @@ typedef struct EASEntry {
     char* name;         /* NUL-terminated, owned by the handle; NULL in unused records */
 } EASEntry;
 
-/* An open EA stream, from MAVOEASOpen(). */
+/* An open EA stream, from MAVOEASOpen(). A copy may be used in the place of the original, but not
+ * beside it. */
 typedef struct EASHandle {
     unsigned char header[120]; /* the file's first 120 bytes, as on disk */
     EASEntry* entries;         /* attribute table, owned by the handle */

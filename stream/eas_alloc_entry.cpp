@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "include/mavoea.h"
+#include "stream/names.h"
 #include "util/owned.h"
 #include "util/unit.h"
 
@@ -31,6 +32,7 @@ int MAVOEASAllocEntry(EASHandle* h, int count) {
     void* const table =
         kernel::Reallocate(h->entries, static_cast<std::uint64_t>(capacity) * sizeof(EASEntry));
     if (table == nullptr) return unit.Fail(Err::kMemory);
+    MoveNameBlock(h->entries, static_cast<EASEntry*>(table));
     h->entries = static_cast<EASEntry*>(table);
     h->capacity = static_cast<std::int32_t>(capacity);
     memset(h->entries + former, 0, static_cast<std::size_t>(added) * sizeof(EASEntry));

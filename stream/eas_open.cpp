@@ -3,12 +3,13 @@
 #include <string.h>
 
 #include <algorithm>
+#include <utility>
 
 #include "format/ea_stream.h"
 #include "include/mavoea.h"
 #include "stream/internal.h"
 #include "stream/layout.h"
-#include "stream/open_stream.h"
+#include "stream/names.h"
 #include "util/file_io.h"
 #include "util/owned.h"
 #include "util/unit.h"
@@ -91,101 +92,102 @@ int ReadHeader(const FirstBytes& first, StreamHeader* header) {
 // turn out to take.
 class TableReader {
  public:
-    TableReader(int fd, std::uint64_t file_size, const FirstBytes& first)
-        : fd_(fd), most_(file_size - kStreamHeaderSize), first_(first) {}
+    // The header says that the table ends at `end`. What it says decides how much is read at once
+    // and nothing else: never more than the file has, and little more than is needed.
+    TableReader(int fd, std::uint64_t file_size, const FirstBytes& first, std::uint64_t end)
+        : fd_(fd),
+          most_(file_size - kStreamHeaderSize),
+          likely_(end > kStreamHeaderSize ? end - kStreamHeaderSize : 0),
+          here_(first.From(kStreamHeaderSize)) {}
+    ~TableReader() { kernel::Free(block_); }
+    TableReader(const TableReader&) = delete;
+    TableReader& operator=(const TableReader&) = delete;
 
-    // Reads `count` records, which the header says end at `end`. What it says decides how much is
-    // read at once and nothing else: never more than the file has, and little more than is needed.
-    int Read(std::uint16_t count, std::uint64_t end) {
-        const std::uint64_t likely = end > kStreamHeaderSize ? end - kStreamHeaderSize : 0;
-        std::uint64_t at = 0;
-        for (std::uint16_t i = 0; i < count; ++i) {
-            if (!Reach(at + AttributeRecord::kFixedSize, likely)) return Refuse();
-            AttributeRecord record;
-            DecodeAttributeRecord({table_.get() + at, AttributeRecord::kFixedSize}, &record);
-            if (!Reach(at + AttributeRecord::kFixedSize + record.name_size, likely)) {
-                return Refuse();
-            }
-            at += RecordSize(record.name_size);
+    // Whether the table's first `size` bytes are here, or could be read.
+    bool Reach(std::uint64_t size) { return size <= here_.size() || Read(size); }
+    const std::uint8_t* At(std::uint64_t offset) const { return here_.data() + offset; }
+
+    // Reach() has failed.
+    int Refuse() const { return unit.Fail(out_of_memory_ ? Err::kMemory : Err::kRead); }
+
+    // The first `size` bytes in a block for names, which is the caller's. nullptr when memory ran
+    // out.
+    NameBlock* Release(std::uint64_t size) {
+        // What a header that says too much has had read is given back.
+        if (block_ == nullptr || here_.size() > size + kStep) {
+            NameBlock* const block = ResizeNameBlock(block_, size);
+            if (block == nullptr) return nullptr;
+            if (block_ == nullptr) memcpy(block->bytes(), here_.data(), block->size);
+            block_ = block;
         }
-        GiveBack(at);
-        return 0;
+        return std::exchange(block_, nullptr);
     }
-
-    std::size_t size() const { return size_; }
-    std::uint8_t* Release() { return table_.Release(); }
 
  private:
     static constexpr std::uint64_t kStep = std::uint64_t{1} << 16;
 
-    // Whether `size` bytes of the table are here, or could be read.
-    bool Reach(std::uint64_t size, std::uint64_t likely) {
-        if (size <= size_) return true;
+    bool Read(std::uint64_t size) {
         if (size > most_) return false;
         std::uint64_t want = size;
         if (!only_needed_) {
-            want = likely >= size ? std::min(likely, size_ + 16 * kStep) : size + kStep;
+            want = likely_ >= size ? std::min(likely_, here_.size() + 16 * kStep) : size + kStep;
         }
-        want = std::min(want, most_);
-        void* const larger = kernel::Reallocate(table_.get(), want);
-        if (larger == nullptr) {
-            out_of_memory_ = true;
-            return false;
-        }
-        (void)table_.Release();
-        table_ = Owned<std::uint8_t>(static_cast<std::uint8_t*>(larger));
-        if (size_ == 0) {
-            const ByteView here = first_.From(kStreamHeaderSize);
-            size_ = static_cast<std::size_t>(std::min<std::uint64_t>(here.size(), want));
-            memcpy(table_.get(), here.data(), size_);
-        }
-        if (size_ < want && !ReadTo(want)) {
+        NameBlock* const block = ResizeNameBlock(block_, std::min(want, most_));
+        out_of_memory_ = block == nullptr;
+        if (out_of_memory_) return false;
+        if (block_ == nullptr) memcpy(block->bytes(), here_.data(), here_.size());
+        block_ = block;
+        here_ = {block->bytes(), here_.size()};
+        if (!ReadTo(block->size)) {
             only_needed_ = true;
-            if (size_ < size && !ReadTo(size)) return false;
+            if (!ReadTo(size)) return false;
         }
-        return size <= size_;
+        return size <= here_.size();
     }
 
     // Reads the table on up to `end`, or as far as the file goes.
     bool ReadTo(std::uint64_t end) {
+        const std::size_t from = here_.size();
         const std::int64_t got =
-            ReadAt(fd_, {table_.get() + size_, static_cast<std::size_t>(end - size_)},
-                   kStreamHeaderSize + size_);
+            ReadAt(fd_, {block_->bytes() + from, static_cast<std::size_t>(end - from)},
+                   kStreamHeaderSize + from);
         if (got < 0) return false;
-        size_ += static_cast<std::size_t>(got);
+        here_ = {block_->bytes(), from + static_cast<std::size_t>(got)};
         return true;
     }
 
-    // Frees what a header that says too much has had read.
-    void GiveBack(std::uint64_t used) {
-        if (size_ <= used + kStep) return;
-        void* const smaller = kernel::Reallocate(table_.get(), used);
-        if (smaller == nullptr) return;
-        (void)table_.Release();
-        table_ = Owned<std::uint8_t>(static_cast<std::uint8_t*>(smaller));
-        size_ = static_cast<std::size_t>(used);
-    }
-
-    int Refuse() const { return unit.Fail(out_of_memory_ ? Err::kMemory : Err::kRead); }
-
     int fd_;
     std::uint64_t most_;
-    const FirstBytes& first_;
-    Owned<std::uint8_t> table_;
-    std::size_t size_ = 0;
-    bool only_needed_ = false;  // More than that could not be read.
+    std::uint64_t likely_;
+    ByteView here_;
+    NameBlock* block_ = nullptr;  // where they are once more than the first bytes are needed
+    bool only_needed_ = false;    // More than that could not be read.
     bool out_of_memory_ = false;
 };
 
-// The name of a record of the table as read: where it lies when it ends in a NUL, as all but
-// damaged ones do, else a copy that does; nullptr when memory ran out.
-char* NameOf(std::uint8_t* bytes, std::uint8_t size) {
-    if (size > 0 && bytes[size - 1] == '\0') return reinterpret_cast<char*>(bytes);
+// A copy of a record's name that ends in a NUL, as damaged ones do not; nullptr when memory ran
+// out.
+char* CopyName(const std::uint8_t* bytes, std::uint8_t size) {
     auto* const name = static_cast<char*>(kernel::Allocate(size + 1ULL));
     if (name == nullptr) return nullptr;
-    memcpy(name, bytes, size);
+    CopyShort(name, bytes, size);
     name[size] = '\0';
     return name;
+}
+
+// Gives the records their names, from the table's bytes. With `in_place` those stay, and the names
+// that end in a NUL stay in them. False when memory ran out.
+bool SetNames(std::span<EASEntry> attributes, const std::uint8_t* table, bool in_place) {
+    for (EASEntry& entry : attributes) {
+        const std::uint8_t* const name = table + AttributeRecord::kFixedSize;
+        const std::uint8_t size = entry.nameLength;
+        entry.name = in_place && size > 0 && name[size - 1] == '\0'
+                         ? const_cast<char*>(reinterpret_cast<const char*>(name))
+                         : CopyName(name, size);
+        if (entry.name == nullptr) return false;
+        table += RecordSize(size);
+    }
+    return true;
 }
 
 int LoadTable(EASHandle* h, std::uint64_t file_size, const FirstBytes& first,
@@ -196,26 +198,30 @@ int LoadTable(EASHandle* h, std::uint64_t file_size, const FirstBytes& first,
     }
     if (MAVOEASAllocEntry(h, count) != 0) return -1;
     if (count == 0) return 0;
-    TableReader reader(h->fd, file_size, first);
-    if (reader.Read(count, attributes.data.offset) != 0) return -1;
 
-    OpenStream* const stream = StreamOf(h);
-    stream->table_size = reader.size();
-    stream->table = reader.Release();
-    std::uint8_t* at = stream->table;
-    for (std::uint16_t i = 0; i < count; ++i) {
+    TableReader table(h->fd, file_size, first, attributes.data.offset);
+    std::uint64_t at = 0;
+    for (EASEntry& entry : Attributes(*h)) {
+        if (!table.Reach(at + AttributeRecord::kFixedSize)) return table.Refuse();
         AttributeRecord record;
-        DecodeAttributeRecord({at, AttributeRecord::kFixedSize}, &record);
-        char* const name = NameOf(at + AttributeRecord::kFixedSize, record.name_size);
-        if (name == nullptr) return unit.Fail(Err::kMemory);
-        h->entries[i] = {.offset = record.value.offset,
-                         .length = record.value.length,
-                         .flags = record.flags,
-                         .nameLength = record.name_size,
-                         .name = name};
+        DecodeAttributeRecord({table.At(at), AttributeRecord::kFixedSize}, &record);
+        if (!table.Reach(at + AttributeRecord::kFixedSize + record.name_size)) {
+            return table.Refuse();
+        }
+        entry = {.offset = record.value.offset,
+                 .length = record.value.length,
+                 .flags = record.flags,
+                 .nameLength = record.name_size,
+                 .name = nullptr};
         at += RecordSize(record.name_size);
     }
-    return 0;
+    if (count <= kOwnNamesMax) {
+        return SetNames(Attributes(*h), table.At(0), false) ? 0 : unit.Fail(Err::kMemory);
+    }
+    NameBlock* const block = table.Release(at);
+    if (block == nullptr) return unit.Fail(Err::kMemory);
+    KeepNameBlock(block, h->entries);
+    return SetNames(Attributes(*h), block->bytes(), true) ? 0 : unit.Fail(Err::kMemory);
 }
 
 int Load(EASHandle* h) {
@@ -265,18 +271,16 @@ EASHandle* MAVOEASOpen(int fd, int lockType) {
         unit.Fail(Err::kBadArgument);
         return nullptr;
     }
-    auto stream = Owned<OpenStream>::AllocateZeroed(1);
+    auto stream = Owned<EASHandle>::AllocateZeroed(1);
     if (!stream) {
         unit.Fail(Err::kMemory);
         return nullptr;
     }
-    EASHandle* const h = &stream->handle;
-    h->fd = fd;
-    h->lockType = F_UNLCK;
-    if (MAVOEASLockSet(h, lockType) != 0) return nullptr;
-    const bool loaded = Load(h) == 0;
-    (void)stream.Release();
-    if (loaded) return h;
+    stream->fd = fd;
+    stream->lockType = F_UNLCK;
+    if (MAVOEASLockSet(stream.get(), lockType) != 0) return nullptr;
+    EASHandle* const h = stream.Release();
+    if (Load(h) == 0) return h;
     const ErrnoKeeper keep;
     if (h->lockType != F_UNLCK) (void)MAVOEASLockSet(h, F_UNLCK);
     FreeStream(h);

@@ -5,7 +5,7 @@
 
 #include "include/mavoea.h"
 #include "stream/layout.h"
-#include "stream/open_stream.h"
+#include "stream/names.h"
 #include "util/file_io.h"
 #include "util/unit.h"
 
@@ -54,7 +54,7 @@ void MoveEntry(EASHandle* h, StreamHeader* header, unsigned index, bool remove) 
     data.offset -= record_size;
     data.length -= moved.length;
     --header->attributes.count;
-    FreeEntry(h, &last);
+    FreeEntry(&last);
 }
 
 }  // namespace mavoea

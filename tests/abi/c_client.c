@@ -61,6 +61,18 @@ static void names_are_told_apart(void) {
     MLIBCSzListFree(list);
 }
 
+/* The stream on fd has one attribute, "colour". */
+static void names_are_the_callers_to_replace(int fd) {
+    EASHandle* const h = MAVOEASOpen(fd, F_RDLCK);
+    CHECK(h != NULL);
+    if (h == NULL) return;
+    free(h->entries[0].name);
+    h->entries[0].name = strdup("couleur");
+    EASHandle copy = *h;
+    CHECK(MAVOEASSearch(&copy, "couleur") == 0);
+    CHECK(MAVOEASClose(h) == 0);
+}
+
 static void a_stream_keeps_attributes(const char* object) {
     char value[16] = {0};
     unsigned char data[16];
@@ -90,6 +102,7 @@ static void a_stream_keeps_attributes(const char* object) {
     lock.l_type = F_WRLCK;
     CHECK(MAVOEASLockGet(h, &lock) == 0 && lock.l_type == F_UNLCK);
     CHECK(MAVOEASClose(h) == 0);
+    names_are_the_callers_to_replace(fd);
     /* 120 bytes of header, a record of 20, and two bytes of value */
     CHECK(fstat(fd, &info) == 0 && info.st_size == 142);
     CHECK(close(fd) == 0);

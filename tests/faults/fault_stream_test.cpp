@@ -159,7 +159,12 @@ TEST(StreamOpenFaults, ALargeTableIsReadInPartsAndFreedInWhole) {
     const std::size_t name_end = image.RecordAt(5) + 11 + image.attributes[5].name.size();
     bytes[name_end] = '!';
     FaultCase c = Opening("open a stream of 600 attributes", bytes, F_WRLCK);
-    c.rules = kOpenFailures + Reading(0);
+    // The file seems to end while its table is read.
+    c.rules = Rules{{.call = "pread",
+                     .with = ", 8192)",
+                     .errors = {kNoneOnce},
+                     .outcome = {.result = -1, .records = {kOpenRead}}}} +
+              kOpenFailures + Reading(0);
     SweepFaults(c);
 }
 
@@ -607,13 +612,15 @@ TEST(ImportFaults, EachAttributeThatFailsIsCountedAndTheOthersAreCopied) {
         Refused("malloc", kTableMemory, 2),
         Refused("malloc", kOpenMemory, 3),
         Refused("malloc", kOpenMemory, 4),
-        Refused("malloc", kTableMemory, 5),
+        Refused("malloc", kOpenMemory, 5),
         Refused("malloc", kOpenMemory, 6),
+        Refused("malloc", kTableMemory, 7),
+        Refused("malloc", kOpenMemory, 8),
         // The buffer of 1024 bytes: the first value finds a smaller one.
-        {.call = "malloc", .ordinal = 7, .outcome = {.files = Files::kDone}},
+        {.call = "malloc", .ordinal = 9, .outcome = {.files = Files::kDone}},
         {.call = "malloc", .with = "(2000)", .outcome = Lost(1, {no_memory})},
         {.call = "malloc", .with = "(3000)", .outcome = Lost(1, {no_memory})},
-        {.call = "malloc", .ordinal = 10, .outcome = Lost(1, {kTableMemory, not_written})},
+        {.call = "malloc", .ordinal = 12, .outcome = Lost(1, {kTableMemory, not_written})},
         {.call = "malloc", .outcome = Lost(1, {write_memory, not_written})},
         // The releases of both locks at the end; the descriptors are closed next.
         {.call = "setlock", .with = "(2)", .outcome = {.records = {kLock}, .files = Files::kDone}},

@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "include/mavoea.h"
+#include "platform/kernel.h"
 #include "stream/internal.h"
 #include "tests/support/fake_platform.h"
 #include "tests/support/kernel_control.h"
@@ -28,8 +29,8 @@ using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 using ::testing::StartsWith;
 
-// The handle, its records, and the table that they were read from.
-constexpr int kBlocksOfAnOpenStream = 3;
+// The handle, its records, and three names.
+constexpr int kBlocksOfThree = 5;
 
 class EasEntriesTest : public StreamTest {
  protected:
@@ -1047,6 +1048,136 @@ TEST_F(EasEntriesTest, AWriteThatComesBackShortOnceIsGoneOnWith) {
     EXPECT_EQ(image_.Build(), Contents());
 }
 
+// ---- Names and copies ---------------------------------------------------------------------------
+
+class EasNamesTest : public EasEntriesTest {
+ protected:
+    // So many attributes, named "name0" and so on, with values of one byte.
+    void OpenMany(int count) {
+        image_ = {.fork = Pattern(50)};
+        for (int i = 0; i < count; ++i) {
+            image_.attributes.push_back({"name" + std::to_string(i), Ascii("v")});
+        }
+        live_ = TakeAllocations().live;
+        Reopen();
+    }
+
+    // What a caller does who gives an attribute another name.
+    static char* Copy(const std::string& name) {
+        auto* const copy = static_cast<char*>(kernel::Allocate(name.size() + 1));
+        std::copy_n(name.c_str(), name.size() + 1, copy);
+        return copy;
+    }
+
+    void Change(EASHandle* handle) {
+        EXPECT_EQ(0, MAVOEASRemove(handle, "name2"));
+        EXPECT_EQ(1, MAVOEASWrite(handle, "name1", "w", 1, 0, EAS_WRITE_OVERWRITE));
+        for (const char* const name : {"n1", "n2", "n3", "n4", "n5", "n6", "n7"}) {
+            EXPECT_EQ(1, MAVOEASWrite(handle, name, "x", 1, 0, 0)) << name;
+            image_.attributes.push_back({name, Ascii("x")});
+        }
+        EXPECT_EQ(0, MAVOEASRemove(handle, "n3"));
+        std::erase_if(image_.attributes, [](const Attribute& attribute) {
+            return attribute.name == "name2" || attribute.name == "name1" || attribute.name == "n3";
+        });
+        const auto at = std::find_if(image_.attributes.begin(), image_.attributes.end(),
+                                     [](const Attribute& each) { return each.name == "n1"; });
+        image_.attributes.insert(at, {"name1", Ascii("w")});
+        EXPECT_EQ(image_.Build(), Contents());
+    }
+
+    void ExpectNothingLeft() {
+        handle_.reset();
+        EXPECT_EQ(live_, TakeAllocations().live);
+        EXPECT_THAT(TakeRecords(), IsEmpty());
+    }
+
+    int live_ = 0;
+};
+
+constexpr int kFewAndMany[] = {3, 32, 33, 200, 600};
+
+TEST_F(EasNamesTest, OfAFewAttributesCanBeFreedAndReplaced) {
+    for (const int count : {3, 32}) {
+        SCOPED_TRACE(count);
+        OpenMany(count);
+        for (int i = 0; i < count; ++i) {
+            std::string& name = image_.attributes[static_cast<std::size_t>(i)].name;
+            kernel::Free(h()->entries[i].name);
+            if (i == 0) name[0] = 'N';
+            h()->entries[i].name = Copy(name);
+        }
+        EXPECT_EQ(0, MAVOEASWriteHeader(h()));
+        EXPECT_EQ(image_.Build(), Contents());
+        Change(h());
+        kernel::Free(h()->entries[0].name);
+        h()->entries[0].name = nullptr;
+        ExpectNothingLeft();
+    }
+}
+
+TEST_F(EasNamesTest, OfManyAttributesCanBeReplaced) {
+    for (const int count : {33, 200, 600}) {
+        SCOPED_TRACE(count);
+        OpenMany(count);
+        for (int i = 0; i<count; i += count> 100 ? 7 : 1) {
+            std::string& name = image_.attributes[static_cast<std::size_t>(i)].name;
+            if (i % 2 == 1) name[0] = 'N';
+            h()->entries[i].name = Copy(name);
+        }
+        if (count == 33) image_.attributes[1].name = "name1", h()->entries[1].name[0] = 'n';
+        EXPECT_EQ(0, MAVOEASWriteHeader(h()));
+        EXPECT_EQ(image_.Build(), Contents());
+        Change(h());
+        ExpectNothingLeft();
+    }
+}
+
+TEST_F(EasNamesTest, AreFreedWithTheTableWhicheverOfThemAreStillThere) {
+    for (const int count : kFewAndMany) {
+        SCOPED_TRACE(count);
+        OpenMany(count);
+        const int one = TakeAllocations().live - live_;
+        const Handle other = Open();
+        ASSERT_NE(nullptr, other);
+        live_ += one;
+        for (int i = 0; i < count; ++i) {
+            Bytes buffer(static_cast<std::size_t>(count));
+            ASSERT_EQ(0,
+                      MAVOEASUpdateEntry(h(), 0, buffer.data(), static_cast<unsigned>(count), 1));
+        }
+        EXPECT_THAT(Names(handle_), IsEmpty());
+        ExpectNothingLeft();
+        EXPECT_EQ(static_cast<std::size_t>(count), Names(other).size());
+        EXPECT_EQ(count - 1,
+                  MAVOEASSearch(other.get(), ("name" + std::to_string(count - 1)).c_str()));
+    }
+}
+
+TEST_F(EasNamesTest, ACopyOfAHandleIsAsGood) {
+    for (const int count : kFewAndMany) {
+        SCOPED_TRACE(count);
+        OpenMany(count);
+        EASHandle copy = *h();
+        Change(&copy);
+        *h() = copy;
+        ExpectNothingLeft();
+    }
+}
+
+TEST_F(EasNamesTest, ACopyOfAHandleCanBeClosedInItsPlace) {
+    for (const int count : kFewAndMany) {
+        SCOPED_TRACE(count);
+        OpenMany(count);
+        auto* const copy = static_cast<EASHandle*>(kernel::Allocate(sizeof(EASHandle)));
+        *copy = *h();
+        kernel::Free(handle_.release());
+        handle_.reset(copy);
+        Change(h());
+        ExpectNothingLeft();
+    }
+}
+
 // ---- Update entry -------------------------------------------------------------------------------
 
 TEST_F(EasEntriesTest, UpdateEntryPutsARecordLastAndItsValueBehindTheOthers) {
@@ -1090,7 +1221,7 @@ TEST_F(EasEntriesTest, UpdateEntryDropsARecord) {
     EXPECT_EQ(0u, h()->entries[2].offset + h()->entries[2].length + h()->entries[2].nameLength);
     EXPECT_EQ(before, Contents());
     handle_.reset();
-    EXPECT_EQ(live - kBlocksOfAnOpenStream, TakeAllocations().live);
+    EXPECT_EQ(live - kBlocksOfThree, TakeAllocations().live);
 }
 
 TEST_F(EasEntriesTest, UpdateEntryRefusesBadArgumentsAndSmallBuffers) {
