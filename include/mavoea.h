@@ -186,8 +186,9 @@ MAVOEA_API int MAVOEAPath(int form, const char* szPath, const char* szName, char
 MAVOEA_API int MAVOEAMKDir(int blParentFirst, const char* szEADirPath);
 
 /* Opens the metadata file of kind szName of szPath's object with the open(2) flags oflag, and mode
- * 0777 where it creates. With O_CREAT the EA directory is made as well. Returns a descriptor, which
- * the caller closes, or -1: a failed open(2) records no code and leaves its errno; 0xD00 NULL
+ * 0777 where it creates. With O_CREAT the EA directory is made as well. Waits, without O_NONBLOCK,
+ * for who has a lease on the file, and for nobody else. Returns a descriptor, which the caller
+ * closes, or -1: a failed open(2) records no code and leaves its errno; 0xD00 NULL
  * argument (errno ENOENT) or unknown place; otherwise the codes of the path functions and of
  * MAVOEAMKDir(). */
 MAVOEA_API int MAVOEAOpen(int form, const char* szPath, const char* szName, int oflag, int place);

@@ -20,9 +20,8 @@ namespace mavoea::kernel {
 static_assert(sizeof(off_t) == 8);
 
 int Open(const char* path, int flags, mode_t mode);
-// open(2) of a regular file, with O_NOFOLLOW and O_NONBLOCK added to `flags`: nothing else is
-// opened, and nobody waited for. ELOOP for a symbolic link, EISDIR for a directory, ENXIO for all
-// else.
+// open(2) of a regular file: nothing else is opened, and nobody waited for but who has a lease on
+// the file. ELOOP for a symbolic link, EISDIR for a directory, ENXIO for all else.
 int OpenRegular(const char* path, int flags, mode_t mode);
 int OpenAt(int dir, const char* path, int flags, mode_t mode);
 int Close(int fd);

@@ -698,8 +698,9 @@ void AddDirectory(Table* table, int result_of_none,
 // The upgrade's look for an earlier layout, before a file of the current one is made, and the mode
 // that the file is given.
 void AddNewFile(Table* table, const char* file) {
-    table->Add("open", Kept(std::string(file) + ", O_RDWR|O_NONBLOCK"), {ENOENT}, table->Done());
-    table->Add("open", Kept(std::string(file) + ", O_RDWR|O_TRUNC|O_NONBLOCK"), {ENOENT},
+    table->Add("open", Kept(std::string(file) + ", O_RDWR|O_CLOEXEC|O_NOFOLLOW"), {ENOENT},
+               table->Done());
+    table->Add("open", Kept(std::string(file) + ", O_RDWR|O_TRUNC|O_CLOEXEC|O_NOFOLLOW"), {ENOENT},
                table->Done());
     table->Add("access", Kept(std::string(file) + ", "), {}, table->Done());
     table->Add("opendir", "{dir}/dst/@eaDir/b)", {}, table->Done());

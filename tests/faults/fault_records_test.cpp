@@ -596,7 +596,7 @@ TEST(FaultRecordsTest, WritingFinderInfoIntoANewResourceFileLeavesNoEmptyOneWhen
                 {.call = "MAVOGetFSType", .outcome = {.files = Files::kDone}},
                 {.call = "MAVOACLSetEADirACL", .outcome = {.files = Files::kDone}},
                 {.call = "open",
-                 .with = "@MavoResource, O_RDWR|O_NONBLOCK",
+                 .with = "@MavoResource, O_RDWR|O_CLOEXEC|O_NOFOLLOW",
                  .errors = {ENOENT},
                  .outcome = {.files = Files::kDone}},
                 {.call = "open",
@@ -664,7 +664,7 @@ TEST(FaultRecordsTest, WritingFinderInfoOnAnAttributeVolumeHidesTheNewDirectory)
                              .records = {{0x2A00, "ea_mkdir.c"}},
                              .made = {"@eaDir"}}},
                 {.call = "open",
-                 .with = "@MavoResource, O_RDWR|O_NONBLOCK",
+                 .with = "@MavoResource, O_RDWR|O_CLOEXEC|O_NOFOLLOW",
                  .errors = {ENOENT},
                  .outcome = {.files = Files::kDone}},
                 // A file that cannot be told to be the one that was opened is opened anew.

@@ -318,7 +318,7 @@ int Open(const char* path, int flags, mode_t mode) {
 
 int OpenRegular(const char* path, int flags, mode_t mode) {
     return Call(
-        "open", Text(path) + ", " + Flags(flags | kRegularFileFlags) + ", " + Octal(mode), -1,
+        "open", Text(path) + ", " + Flags(RegularFileFlags(flags)) + ", " + Octal(mode), -1,
         [&] { return Opened(path, flags, [&] { return OpenRegularFile(path, flags, mode); }); });
 }
 

@@ -3,12 +3,14 @@
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <functional>
 #include <initializer_list>
 #include <string>
+#include <utility>
 
 #include "include/mavoea.h"
 #include "tests/support/stream_builder.h"
@@ -130,6 +132,35 @@ TEST_F(SystemCallsTest, OpeningAMissingStreamOfAnObjectWithoutLegacyMetadataTake
     EXPECT_LE(calls_.size(), 5u) << PrintToString(calls_);
     EXPECT_EQ(0, Reads()) << PrintToString(calls_);
     EXPECT_EQ(0, Count({"chdir", "fchdir", "rmdir", "mkdir", "mkdirat"})) << PrintToString(calls_);
+}
+
+// A file that is made with O_EXCL needs no look, one for reading and writing no change of its
+// flags.
+TEST_F(SystemCallsTest, MakingTheFileOfARecordTakesTwoOpensAndAWrite) {
+    const std::string object = dir_ / "a.txt";
+    WriteFile(object, Ascii("data"));
+    ASSERT_EQ(0, mkdir((dir_ / "@eaDir").c_str(), 0777));
+    const Bytes block = Pattern(741);
+    Trace([&] { return MAVOEAEADirAdoubleFlush(block.data(), 741, object.c_str()) == 0; });
+    if (IsSkipped() || HasFatalFailure()) return;
+    EXPECT_EQ(3u, calls_.size()) << PrintToString(calls_);
+    EXPECT_EQ(1, Writes()) << PrintToString(calls_);
+}
+
+TEST_F(SystemCallsTest, OpeningAStreamTakesOneLookAndForReadingOneChangeOfItsFlags) {
+    const std::string object = dir_ / "a.txt";
+    WriteFile(object, Ascii("data"));
+    ASSERT_EQ(0, mkdir((dir_ / "@eaDir").c_str(), 0777));
+    WriteFile(dir_ / "@eaDir/a.txt@MavoEAStream", {});
+    for (const auto& [flags, calls] : {std::pair{O_RDWR, 2u}, {O_RDONLY, 3u}}) {
+        SCOPED_TRACE(flags);
+        Trace([&, flags = flags] {
+            return MAVOEAOpen(EA_FORM_FILE, object.c_str(), MAVOEA_KIND_STREAM, flags,
+                              EA_PLACE_EADIR) >= 0;
+        });
+        if (IsSkipped() || HasFatalFailure()) return;
+        EXPECT_EQ(calls, calls_.size()) << PrintToString(calls_);
+    }
 }
 
 TEST_F(SystemCallsTest, ReadingOneValueOfAFewTakesAtMostNineAndTwoReads) {

@@ -2,18 +2,28 @@
 
 #include <errno.h>
 #include <fcntl.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
+#include <signal.h>
+#include <stddef.h>
 #include <stdio.h>
 #include <string.h>
+#include <sys/prctl.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <filesystem>
+#include <functional>
+#include <iterator>
 #include <map>
 #include <string>
 #include <vector>
 
 #include "include/mavoea.h"
+#include "tests/support/emulator.h"
 #include "tests/support/fake_platform.h"
 #include "tests/support/identity.h"
 #include "tests/support/kernel_control.h"
@@ -58,16 +68,19 @@ class EaOpenTest : public ::testing::Test, protected Identity {
     }
 
     // The open calls made for `path`, without the path: "O_RDWR|O_CREAT, 0777". All are made so
-    // that neither a link is followed nor a pipe waited for, which is left out.
+    // that neither a link is followed nor a pipe waited for, which is left out: one that is opened
+    // to be read and written does not wait by itself.
     static std::vector<std::string> OpensOf(const std::string& path) {
         const std::string start = "open(" + path + ", ";
         std::vector<std::string> opens;
         for (const std::string& call : TakeCalls()) {
             if (call.starts_with(start)) {
                 std::string open = call.substr(start.size(), call.size() - start.size() - 1);
+                const bool waits = !open.starts_with("O_RDWR");
                 for (const std::string guard : {"|O_NONBLOCK", "|O_NOFOLLOW"}) {
                     const std::size_t at = open.find(guard);
-                    EXPECT_NE(std::string::npos, at) << call;
+                    const bool wanted = waits || guard == "|O_NOFOLLOW";
+                    EXPECT_EQ(wanted, at != std::string::npos) << call;
                     if (at != std::string::npos) open.erase(at, guard.size());
                 }
                 opens.push_back(open);
@@ -108,6 +121,7 @@ class Fd {
     Fd& operator=(const Fd&) = delete;
 
     bool ok() const { return fd_ >= 0; }
+    int get() const { return fd_; }
     bool Write(const std::string& text) const {
         return ::write(fd_, text.data(), text.size()) == static_cast<ssize_t>(text.size());
     }
@@ -863,6 +877,126 @@ TEST_F(EaOpenTest, AnyOtherPlaceFailsWith0xD00) {
     EXPECT_THAT(TakeLog(), IsEmpty());
     EXPECT_THAT(NamesIn(dir_.path()), ElementsAre("a.txt"));
 }
+
+// ---- How the kernel is asked --------------------------------------------------------------------
+
+constexpr int kAccessModes[] = {O_RDONLY, O_WRONLY, O_RDWR};
+
+TEST_F(EaOpenTest, ADescriptorHasTheFlagsThatWereAskedForAndNoOthers) {
+    MakeEaDir();
+    WriteFile(stream_, Ascii("stream"));
+    WriteFile(sidecar_, Ascii("double"));
+    for (const int place : {0, 1}) {
+        for (const int mode : kAccessModes) {
+            for (const int more : {0, O_APPEND, O_NONBLOCK, O_APPEND | O_NONBLOCK, O_CREAT}) {
+                SCOPED_TRACE(testing::Message() << place << " " << mode << " " << more);
+                const Fd fd(MAVOEAOpen(1, object_.c_str(), kStream, mode | more, place));
+                ASSERT_TRUE(fd.ok());
+                const int kept = O_ACCMODE | O_APPEND | O_NONBLOCK;
+                EXPECT_EQ((mode | more) & kept, fcntl(fd.get(), F_GETFL) & kept);
+            }
+        }
+    }
+    for (const int mode : kAccessModes) {  // One that is made.
+        ASSERT_EQ(0, unlink(stream_.c_str()));
+        const Fd fd(MAVOEAOpen(1, object_.c_str(), kStream, mode | O_CREAT, 0));
+        ASSERT_TRUE(fd.ok());
+        EXPECT_EQ(mode, fcntl(fd.get(), F_GETFL) & (O_ACCMODE | O_NONBLOCK));
+    }
+}
+
+// Opens in a process of its own what this one has a lease on, and gives the lease up once it is
+// told that somebody waits. Whether that open succeeded.
+bool OpensOnceTheLeaseIsGone(const std::string& path, const std::function<int()>& open) {
+    sigset_t told;
+    sigset_t former;
+    sigemptyset(&told);
+    sigaddset(&told, SIGIO);
+    sigprocmask(SIG_BLOCK, &told, &former);
+    const Fd lease(::open(path.c_str(), O_RDWR));
+    EXPECT_EQ(0, fcntl(lease.get(), F_SETLEASE, F_WRLCK)) << strerror(errno);
+    fflush(nullptr);
+    const pid_t child = fork();
+    if (child == 0) {
+        alarm(20);
+        const int fd = open();
+        _exit(fd >= 0 && (fcntl(fd, F_GETFL) & O_NONBLOCK) == 0 ? 0 : 1);
+    }
+    // A child that does not wait is gone before the lease is.
+    const timespec most = {.tv_sec = 10, .tv_nsec = 0};
+    EXPECT_EQ(SIGIO, sigtimedwait(&told, nullptr, &most));
+    siginfo_t gone = {};
+    EXPECT_EQ(0, waitid(P_PID, static_cast<id_t>(child), &gone, WEXITED | WNOHANG | WNOWAIT));
+    EXPECT_EQ(0, fcntl(lease.get(), F_SETLEASE, F_UNLCK));
+    int status = 0;
+    EXPECT_EQ(child, waitpid(child, &status, 0));
+    sigprocmask(SIG_SETMASK, &former, nullptr);
+    return status == 0;
+}
+
+TEST_F(EaOpenTest, ALeaseIsWaitedForAsByAPlainOpen) {
+    MakeEaDir();
+    WriteFile(stream_, Ascii("stream"));
+    {
+        const Fd fd(::open(stream_.c_str(), O_RDWR));
+        if (fcntl(fd.get(), F_SETLEASE, F_WRLCK) != 0) GTEST_SKIP() << "no leases here";
+    }
+    for (const int mode : kAccessModes) {
+        for (const int more : {0, O_CREAT, O_TRUNC}) {
+            SCOPED_TRACE(testing::Message() << mode << " " << more);
+            EXPECT_TRUE(OpensOnceTheLeaseIsGone(
+                stream_, [&] { return MAVOEAOpen(1, object_.c_str(), kStream, mode | more, 0); }));
+        }
+    }
+    EXPECT_EQ(Bytes(), ReadFile(stream_));  // O_TRUNC did its work.
+}
+
+TEST_F(EaOpenTest, ALeaseIsNotWaitedForByWhoAsksNotTo) {
+    MakeEaDir();
+    WriteFile(stream_, Ascii("stream"));
+    const Fd lease(::open(stream_.c_str(), O_RDWR));
+    if (fcntl(lease.get(), F_SETLEASE, F_WRLCK) != 0) GTEST_SKIP() << "no leases here";
+    signal(SIGIO, SIG_IGN);
+    WithoutWaiting([&] {
+        for (const int mode : kAccessModes) {
+            ExpectFailed(EWOULDBLOCK,
+                         MAVOEAOpen(1, object_.c_str(), kStream, mode | O_NONBLOCK, 0));
+        }
+    });
+    signal(SIGIO, SIG_DFL);
+}
+
+#ifdef SYS_statx
+// As kernels and sandboxes that do not know the call refuse it: each with an errno of its own.
+bool RefuseStatx(int error) {
+    sock_filter code[] = {
+        BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr)),
+        BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, SYS_statx, 0, 1),
+        BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ERRNO | static_cast<unsigned>(error)),
+        BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW),
+    };
+    const sock_fprog program = {.len = std::size(code), .filter = code};
+    return prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
+           prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program) == 0;
+}
+
+TEST_F(EaOpenTest, WhereStatxIsRefusedTheKindIsAskedOtherwise) {
+    MAVOEA_SKIP_IN_EMULATOR("it has no filters of system calls");
+    MakeEaDir();
+    WriteFile(stream_, Ascii("stream"));
+    ASSERT_EQ(0, mkfifo(resource_.c_str(), 0666));
+    for (const int error : {ENOSYS, EPERM, EINVAL, EACCES}) {
+        SCOPED_TRACE(strerror(error));
+        WithoutWaiting([&] {
+            if (!RefuseStatx(error)) return;
+            for (const int mode : kAccessModes) {
+                EXPECT_TRUE(Fd(MAVOEAOpen(1, object_.c_str(), kStream, mode, 0)).ok());
+                ExpectFailed(ENXIO, MAVOEAOpen(1, object_.c_str(), kResource, mode, 0));
+            }
+        });
+    }
+}
+#endif
 
 }  // namespace
 }  // namespace mavoea::test
