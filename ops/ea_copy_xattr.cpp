@@ -81,6 +81,16 @@ Fetched Fetch(const char* path, const char* name, GrowingBuffer* buffer, std::ui
 
 // ---- From metadata files to extended attributes -------------------------------------------------
 
+// Opens a metadata file of src. When that fails errno tells why, whatever it was before: where the
+// path of a "._" file would be too long it is left alone.
+int OpenToRead(const char* src, const char* kind, int place) {
+    const int former = errno;
+    errno = ENAMETOOLONG;
+    const int fd = MAVOEAOpen(EA_FORM_FILE, src, kind, O_RDONLY | O_CLOEXEC, place);
+    if (fd >= 0) errno = former;
+    return fd;
+}
+
 // Sets the attributes of the stream on fd as dst's. How many failed, each with a code; -1 when
 // there is no stream.
 int SetAttributes(int fd, const char* dst, GrowingBuffer* value) {
@@ -109,8 +119,7 @@ constexpr int kStreamDone = -1;
 constexpr int kStreamFailed = -2;
 
 int StreamToXattrs(const char* src, const char* dst, int move, int place, GrowingBuffer* value) {
-    const UniqueFd fd(
-        MAVOEAOpen(EA_FORM_FILE, src, MAVOEA_KIND_STREAM, O_RDONLY | O_CLOEXEC, place));
+    const UniqueFd fd(OpenToRead(src, MAVOEA_KIND_STREAM, place));
     if (!fd) {
         if (errno == ENOENT) return kStreamDone;
         unit.Fail(Err::kOpen);
@@ -176,8 +185,7 @@ int SetFromFile(int fd, Range place, const char* dst, const char* name, GrowingB
 // The resource part. 0, also without a resource file, or -1 with a code.
 int ResourceFileToXattrs(const char* src, const char* dst, int move, int place,
                          GrowingBuffer* value) {
-    const UniqueFd fd(
-        MAVOEAOpen(EA_FORM_FILE, src, MAVOEA_KIND_RESOURCE, O_RDONLY | O_CLOEXEC, place));
+    const UniqueFd fd(OpenToRead(src, MAVOEA_KIND_RESOURCE, place));
     if (!fd) return errno == ENOENT ? 0 : unit.Fail(Err::kOpen);
     ResourceEntries entries;
     if (FindEntries(fd.get(), &entries) != 0) return -1;

@@ -11,12 +11,9 @@
 #include "util/metadata_file.h"
 #include "util/owned.h"
 #include "util/path_text.h"
-#include "util/unit.h"
 
 namespace mavoea {
 namespace {
-
-constexpr Unit unit("ea_fix_error_ad");
 
 bool LockForWriting(int fd) {
     EASHandle h = {};
@@ -63,8 +60,7 @@ class Replacement {
     bool TakePlaceOf(const char* file) const {
         const off_t size = kernel::Lseek(fd(), 0, SEEK_END);
         if (size == 0) return true;
-        if (size < 0 || kernel::Fsync(fd()) != 0) return unit.Fail(Err::kSystemCall) == 0;
-        if (!Names(path_, fd())) return false;
+        if (size < 0 || kernel::Fsync(fd()) != 0 || !Names(path_, fd())) return false;
         (void)kernel::Rename(path_, file);
         return true;
     }

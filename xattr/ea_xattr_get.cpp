@@ -12,6 +12,10 @@ namespace mavoea {
 namespace {
 
 constexpr Unit unit("ea_xattr_get");
+constexpr ForkLines fork_lines = {
+    .in = __builtin_LINE(),
+    .back = __builtin_LINE(),
+};
 
 int ReadFork(const char* szPath, void* szValue, int cbValue) {
     struct stat info;
@@ -20,7 +24,7 @@ int ReadFork(const char* szPath, void* szValue, int cbValue) {
     }
     if (S_ISDIR(info.st_mode)) return unit.Fail(Err::kNothingThere);
 
-    const ForkAccess fork(unit, szPath, info.st_mode);
+    const ForkAccess fork(unit, fork_lines, szPath, info.st_mode);
     if (fork.Stat(&info) != 0) {
         if (errno != ENOENT) unit.Log("%s:%d Fail to stat(%s). %m", fork.path());
         return -1;

@@ -7,6 +7,10 @@ namespace mavoea {
 namespace {
 
 constexpr Unit unit("ea_xattr_remove");
+constexpr ForkLines fork_lines = {
+    .in = __builtin_LINE(),
+    .back = __builtin_LINE(),
+};
 
 int ClearFork(const ForkAccess& fork) {
     const UniqueFile file(kernel::Fopen(fork.path(), "w+b"));  // opening it so empties it
@@ -27,7 +31,7 @@ int MAVOEAXattrRemove(const char* szPath, const char* szName) {
     if (szPath == nullptr) return unit.FailCheck("((void *)0) != szPath");
     if (szName == nullptr) return unit.FailCheck("NULL != szName");
     if (szName == kResourceForkName) {
-        return ChangeFork(unit, szPath, [](const ForkAccess& fork, off_t fork_size) {
+        return ChangeFork(unit, fork_lines, szPath, [](const ForkAccess& fork, off_t fork_size) {
             return fork_size == 0 ? 0 : ClearFork(fork);
         });
     }

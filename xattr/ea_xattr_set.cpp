@@ -11,6 +11,10 @@ namespace mavoea {
 namespace {
 
 constexpr Unit unit("ea_xattr_set");
+constexpr ForkLines fork_lines = {
+    .in = __builtin_LINE(),
+    .back = __builtin_LINE(),
+};
 
 int WriteFork(const ForkAccess& fork, bool absent, ByteView value, int flags) {
     if (absent && (flags & XATTR_REPLACE) != 0) {
@@ -51,7 +55,7 @@ int MAVOEAXattrSet(const char* szPath, const char* szName, const void* szValue, 
     const auto size = static_cast<std::size_t>(cbValue);
     if (szName == kResourceForkName) {
         const ByteView value(static_cast<const std::uint8_t*>(szValue), size);
-        return ChangeFork(unit, szPath, [&](const ForkAccess& fork, off_t fork_size) {
+        return ChangeFork(unit, fork_lines, szPath, [&](const ForkAccess& fork, off_t fork_size) {
             return WriteFork(fork, fork_size == 0, value, flags);
         });
     }

@@ -13,11 +13,11 @@ constexpr mode_t kPermissions = 07777;
 
 }  // namespace
 
-ForkAccess::ForkAccess(const Unit& unit, const char* object, mode_t mode, int line)
+ForkAccess::ForkAccess(const Unit& unit, const ForkLines& lines, const char* object, mode_t mode)
     : unit_(unit),
+      lines_(lines),
       object_(object),
       mode_(mode & kPermissions),
-      line_(line),
       opened_up_((mode & S_IXUSR) == 0) {
     constexpr std::string_view kView = "/rsrc";
     const std::string_view name(object);
@@ -27,19 +27,19 @@ ForkAccess::ForkAccess(const Unit& unit, const char* object, mode_t mode, int li
     if (!opened_up_) return;
     former_uid_ = kernel::Geteuid();
     if (former_uid_ != 0 && kernel::Seteuid(0) != 0) {
-        unit_.LogAt(line_, "%s:%d Fail to seteuid(0). %m");
+        unit_.LogAt(lines_.in, "%s:%d Fail to seteuid(0). %m");
     }
     if (kernel::Chmod(object_, mode_ | S_IXUSR) != 0) {
-        unit_.LogAt(line_, "%s:%d Fail to chmod. %m");
+        unit_.LogAt(lines_.in, "%s:%d Fail to chmod. %m");
     }
 }
 
 ForkAccess::~ForkAccess() {
     if (!opened_up_) return;
     const ErrnoKeeper keep;
-    if (kernel::Chmod(object_, mode_) != 0) unit_.LogAt(line_, "%s:%d Fail to chmod. %m");
+    if (kernel::Chmod(object_, mode_) != 0) unit_.LogAt(lines_.back, "%s:%d Fail to chmod. %m");
     if (kernel::Geteuid() != former_uid_ && kernel::Seteuid(former_uid_) != 0) {
-        unit_.LogAt(line_, "%s:%d Fail to seteuid() back. %m");
+        unit_.LogAt(lines_.back, "%s:%d Fail to seteuid() back. %m");
     }
 }
 

@@ -14,13 +14,18 @@ namespace mavoea {
 // The one attribute name that the attribute calls never see.
 inline constexpr std::string_view kResourceForkName = "com.apple.ResourceFork";
 
+// The lines of a unit that tell in the log which way it was that failed.
+struct ForkLines {
+    int in;    // the mode is changed
+    int back;  // and put back
+};
+
 // Makes the view reachable for as long as it lives: a file without the owner-execute bit gets it,
 // as the superuser, and both are put back at the end. What fails on the way is logged, in the name
-// of `unit` and the line that made this object, and goes on: the operation fails by itself where
-// access is denied.
+// of `unit` and its lines, and goes on: the operation fails by itself where access is denied.
 class ForkAccess {
  public:
-    ForkAccess(const Unit& unit, const char* object, mode_t mode, int line = __builtin_LINE());
+    ForkAccess(const Unit& unit, const ForkLines& lines, const char* object, mode_t mode);
     ~ForkAccess();
     ForkAccess(const ForkAccess&) = delete;
     ForkAccess& operator=(const ForkAccess&) = delete;
@@ -32,9 +37,9 @@ class ForkAccess {
 
  private:
     const Unit& unit_;
+    ForkLines lines_;
     const char* object_;
     mode_t mode_;
-    int line_;
     bool opened_up_;
     bool fits_;
     uid_t former_uid_ = 0;
@@ -45,14 +50,15 @@ class ForkAccess {
 // returns what that returns. -1 when there is no fork to be reached: reported for `unit` and the
 // line that called.
 template <class Change>
-int ChangeFork(const Unit& unit, const char* object, Change change, int line = __builtin_LINE()) {
+int ChangeFork(const Unit& unit, const ForkLines& lines, const char* object, Change change,
+               int line = __builtin_LINE()) {
     struct stat info;
     if (kernel::Stat(object, &info) != 0) {
         unit.LogAt(line, "%s:%d Fail to stat(%s). %m", object);
         return -1;
     }
     if (S_ISDIR(info.st_mode)) return unit.Fail(Err::kNothingThere, line);
-    const ForkAccess fork(unit, object, info.st_mode, line);
+    const ForkAccess fork(unit, lines, object, info.st_mode);
     if (fork.Stat(&info) != 0) {
         unit.LogAt(line, "%s:%d Fail to stat(%s). %m", fork.path());
         return -1;

@@ -4,6 +4,7 @@
 #include <spawn.h>
 #include <stdarg.h>
 #include <stdio.h>
+#include <stdlib.h>
 #include <string.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -25,6 +26,7 @@ struct State {
     std::vector<Record> records;  // since the last Take
     Record top;
     std::vector<std::string> log;
+    std::vector<int> log_lines;
     std::vector<std::string> calls;
 };
 
@@ -47,7 +49,13 @@ int NoteCall(const std::string& call) {
     return Refusal(call);
 }
 
-// Puts "LINE" for the digits behind the first ':', which the library's formats begin with.
+// The digits behind the first ':', which the library's formats begin with.
+int LineOf(const std::string& text) {
+    const auto colon = text.find(':');
+    return colon == std::string::npos ? 0 : atoi(text.c_str() + colon + 1);
+}
+
+// Puts "LINE" for those digits.
 std::string WithoutLine(std::string text) {
     const auto colon = text.find(':');
     if (colon == std::string::npos) return text;
@@ -75,6 +83,7 @@ std::vector<Record> TakeRecords() { return std::exchange(TheState().records, {})
 }
 
 std::vector<std::string> TakeLog() { return std::exchange(TheState().log, {}); }
+std::vector<int> TakeLogLines() { return std::exchange(TheState().log_lines, {}); }
 void ExpectNothingReported() {
     EXPECT_THAT(TakeRecords(), ::testing::IsEmpty());
     EXPECT_THAT(TakeLog(), ::testing::IsEmpty());
@@ -203,7 +212,10 @@ void syslog(int priority, const char* format, ...) {
     va_end(arguments);
     std::string line = WithoutLine(text);
     if (!line.empty() && line.back() == '\n') line.pop_back();
-    if (priority == LOG_ERR) TheState().log.push_back(line);
+    if (priority == LOG_ERR) {
+        TheState().log.push_back(line);
+        TheState().log_lines.push_back(LineOf(text));
+    }
     errno = EDOM;  // syslog is free to change errno.
 }
 

@@ -35,6 +35,9 @@ std::vector<Record> TakeRecords();
 // trailing newline, and with every line number as "LINE": "ea_mkdir.c:LINE Invaild Argument ...".
 std::vector<std::string> TakeLog();
 
+// Their line numbers, since the last time that these were taken; 0 where there is none.
+std::vector<int> TakeLogLines();
+
 // Expects no record and no line since the last time.
 void ExpectNothingReported();
 

@@ -968,6 +968,19 @@ TEST_F(FixErrorTest, AFailedRenameIsNoFailure) {
     EXPECT_EQ(Three().contents.attributes, AttributesIn(stream_));
 }
 
+TEST_F(FixErrorTest, AFailureOfItsOwnIsNotRecorded) {
+    const Bytes resource = NetatalkFile(Pattern(32, 1), Pattern(5000, 2)).bytes;
+    {
+        const FailCall fault("fsync", EIO);
+        errno = 0;
+        EXPECT_EQ(-1, Fix(resource));
+        EXPECT_TRUE(fault.fired());
+        EXPECT_EQ(EIO, errno);
+    }
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+    ExpectUnchanged(resource);
+}
+
 TEST_F(FixErrorTest, TheTemporaryFileStandsBesideTheResourceFile) {
     EXPECT_EQ(0, Fix(Three().bytes));
     EXPECT_THAT(TakeCalls(), Contains("rename(" + temporary_ + ", " + resource_ + ")"));

@@ -674,6 +674,43 @@ TEST_F(CopyDriverTest, ANameTooLongForAnAppleDoubleFileIsToldByItsOwnResult) {
     }
 }
 
+// Names of 254 bytes have no "._" file, and deriving its path leaves errno alone.
+TEST_F(CopyDriverTest, WhatErrnoWasBeforeDecidesNothing) {
+    struct Result {
+        int value;
+        std::vector<int> codes;
+
+        bool operator==(const Result&) const = default;
+    };
+    const auto copy = [this](const std::string& name, int from, int to, int error) {
+        const std::string src = world_ / ("src/" + name);
+        std::string dst = world_ / ("dst/" + name);
+        WriteFile(src, Ascii("data"));
+        WriteFile(dst, Ascii("data"));
+        TakeRecords();
+        errno = error;
+        const int value = MAVOEACopyEx(src.c_str(), dst.data(), 0, 0, from, to, 0, 0, nullptr);
+        Result result = {value, {}};
+        for (const Record& record : TakeRecords()) result.codes.push_back(record.code);
+        TakeLog();
+        return result;
+    };
+    for (const std::size_t size : {1u, 242u, 243u, 253u, 254u, 255u}) {
+        const std::string name(size, 'n');
+        for (const int from : {0, 1, 2, 7}) {
+            for (const int to : {0, 1, 2, 7, 12}) {
+                SCOPED_TRACE(::testing::Message() << size << ", " << from << " to " << to);
+                const Result expected = copy(name, from, to, 0);
+                for (const int error : {ENOENT, ENODATA, EEXIST, ERANGE, ENOTDIR, EINTR}) {
+                    EXPECT_TRUE(expected == copy(name, from, to, error)) << strerror(error);
+                }
+            }
+        }
+    }
+    EXPECT_EQ((Result{-1, {0xC300, 0x900, 0xC300, 0x900}}),
+              copy(std::string(254, 'n'), 0, 7, ENOENT));
+}
+
 TEST_F(CopyDriverTest, ACopyFromAppleDoubleToFileEANeedsItsAttributes) {
     const auto fail_after = [this](int sets) {
         int left = sets;

@@ -275,6 +275,11 @@ TEST_P(ResourceForkOperationTest, AFailedChmodIsOnlyLoggedBothTimes) {
     EXPECT_THAT(TakeLog(),
                 ElementsAre(Line("Fail to chmod.", EROFS), Line("Fail to chmod.", EROFS)));
     EXPECT_THAT(TakeRecords(), IsEmpty());
+    // The line tells which of the two it was.
+    const std::vector<int> lines = TakeLogLines();
+    ASSERT_EQ(2u, lines.size());
+    EXPECT_LT(0, lines[0]);
+    EXPECT_LT(lines[0], lines[1]);
     EXPECT_EQ(kUser, uid_);
 }
 
