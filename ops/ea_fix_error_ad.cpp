@@ -11,6 +11,7 @@
 #include "util/metadata_file.h"
 #include "util/owned.h"
 #include "util/path_text.h"
+#include "util/unit.h"
 
 namespace mavoea {
 namespace {

@@ -1125,6 +1125,22 @@ TEST_F(FixErrorTest, ALinkInThePlaceOfTheTemporaryFileIsNotFollowed) {
     }
 }
 
+TEST_F(FixErrorTest, AnotherNameOfALockedFileInThePlaceOfTheTemporaryOneCostsNoLock) {
+    const std::string held = dir_ / "held";
+    WriteFile(held, {});
+    const int fd = ::open(held.c_str(), O_RDWR | O_CLOEXEC);
+    EASHandle* const handle = MAVOEASOpen(fd, F_WRLCK);
+    ASSERT_NE(nullptr, handle);
+    ASSERT_EQ(0, link(held.c_str(), temporary_.c_str()));
+    EXPECT_EQ(0, Fix(Three().bytes));
+    // Closing a descriptor of it would have given up the lock.
+    EXPECT_EQ(F_WRLCK, LockInTheWay(held, F_RDLCK));
+    EXPECT_EQ(0, MAVOEASClose(handle));
+    ::close(fd);
+    EXPECT_EQ(Rewritten(Three()), ReadFile(resource_));
+    EXPECT_FALSE(Exists(temporary_));
+}
+
 TEST_F(FixErrorTest, AFolderInThePlaceOfTheTemporaryFileIsAFailure) {
     ASSERT_EQ(0, mkdir(temporary_.c_str(), 0777));
     EXPECT_EQ(-1, Fix(Three().bytes));

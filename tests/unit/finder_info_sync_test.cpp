@@ -945,6 +945,19 @@ TEST_F(FinderInfoTest, AFileThatIsRemovedTimeAndAgainIsGivenUp) {
     EXPECT_GT(100, locks);
 }
 
+TEST_F(FinderInfoTest, AFileThatHasTakenThePlaceOfTheOneThatCouldNotBeWrittenIsNotRemoved) {
+    Hooks().before = [this](const std::string& name) {
+        if (name != "pwrite") return;
+        ASSERT_EQ(0, rename(resource_.c_str(), (dir_ / "former").c_str()));
+        WriteFile(resource_, {});
+    };
+    const FailCall fault("pwrite", ENOSPC);
+    EXPECT_EQ(-1, Write(Pattern(32)));
+    ExpectOnly(0xB00, kWrite);
+    EXPECT_TRUE(Exists(resource_));
+    EXPECT_TRUE(Exists(dir_ / "former"));
+}
+
 TEST_F(FinderInfoTest, AFileIsRemovedUnderItsLock) {
     int locked = -1;
     Hooks().before = [&](const std::string& name) {
