@@ -180,9 +180,9 @@ MAVOEA_API int MAVOEAPath(int form, const char* szPath, const char* szName, char
  * afterwards.
  *
  * Codes: 0xD00 NULL, or no '/' in szEADirPath with blParentFirst; 0x3C00 mkdir or seteuid(0)
- * failed; 0x2A00 the new directory could not be opened (it is removed again unless somebody has used
- * it), or the mode or the Finder info could not be set (it stays); 0x100 out of memory. The effective
- * uid is changed for the duration, for the whole process. */
+ * failed; 0x2A00 the new directory could not be opened (it is removed again unless somebody has
+ * used it), or the mode or the Finder info could not be set (it stays); 0x100 out of memory. The
+ * effective uid is changed for the duration, for the whole process. */
 MAVOEA_API int MAVOEAMKDir(int blParentFirst, const char* szEADirPath);
 
 /* Opens the metadata file of kind szName of szPath's object with the open(2) flags oflag, and mode
@@ -388,8 +388,8 @@ MAVOEA_API int MAVOEAFileEAFSFinfoEASync(const char* path, int checkFSType);
 /* Writes Finder info into the resource file, in place, under its write lock; one that is missing is
  * created, of 82 bytes. One that is removed or replaced before it is locked is opened, or created,
  * anew. When nothing could be written, an empty one is removed again if this call has made it and
- * has its lock. 0, or -1: 0xD00 NULL; 0x300, 0xB00 not written; 0x400 it was replaced time and again
- * (errno EAGAIN); what MAVOEAOpen() and MAVOEASOpen() give. */
+ * has its lock. 0, or -1: 0xD00 NULL; 0x300, 0xB00 not written; 0x400 it was replaced time and
+ * again (errno EAGAIN); what MAVOEAOpen() and MAVOEASOpen() give. */
 MAVOEA_API int MAVOEAEADirFSFInfoWrite(const char* path, const unsigned char finfo[32]);
 
 /* Writes the Finder info of h's header (bytes 50 to 81) into its file, where the file's Finder info
