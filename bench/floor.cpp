@@ -156,8 +156,8 @@ int ListNames(const char* path, MLIBCSzList** list) {
     return static_cast<int>(count);
 }
 
-bool WriteDurably(int fd, std::span<const std::uint8_t> bytes) {
-    return pwrite(fd, bytes.data(), bytes.size(), 0) == static_cast<ssize_t>(bytes.size()) &&
+bool WriteDurably(int fd, std::span<const std::uint8_t> bytes, std::int64_t offset) {
+    return pwrite(fd, bytes.data(), bytes.size(), offset) == static_cast<ssize_t>(bytes.size()) &&
            fsync(fd) == 0;
 }
 

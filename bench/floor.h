@@ -40,8 +40,8 @@ int ReadValue(const char* path, std::string_view name, std::uint8_t* to, std::si
 // Returns their number, -1 on failure.
 int ListNames(const char* path, MLIBCSzList** list);
 
-// One pwrite at the start of the file, and an fsync.
-bool WriteDurably(int fd, std::span<const std::uint8_t> bytes);
+// One pwrite at `offset`, and an fsync.
+bool WriteDurably(int fd, std::span<const std::uint8_t> bytes, std::int64_t offset = 0);
 
 // Lengthens the file and moves the last `length` bytes up by `by`, from the back in steps of
 // 16 KiB; then WriteDurably() of `head`.

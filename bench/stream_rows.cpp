@@ -174,6 +174,60 @@ Prepare OverwritingByHand(const Place& place) {
     };
 }
 
+// The same value again, which is the last one then.
+struct Again {
+    const char* title;
+    int count;
+    std::size_t size;
+};
+
+constexpr Again kAgain[] = {{"durable overwrite of the last of 10 x 1 MB", 10, 1'000'000},
+                            {"durable overwrite of the last of 1,000 x 1 KiB", kMany, 1024}};
+
+StreamImage ImageOf(const Again& again, const Bytes& last) {
+    StreamImage image = ImageOf(again.count);
+    for (Attribute& attribute : image.attributes) attribute.value = test::Pattern(again.size);
+    image.attributes.back().value = last;
+    return image;
+}
+
+Prepare OverwritingTheLastThroughLibrary(const Place& place, const Again& again) {
+    return [place, again] {
+        const std::string path = place.NewPath();
+        test::WriteFile(path, ImageOf(again, test::Pattern(again.size, 1)).Build());
+        const auto stream = std::make_shared<Stream>(path, O_RDWR, F_WRLCK);
+        const Bytes value = test::Pattern(again.size, 99);
+        const auto overwrite = [stream, value, name = NameOf(again.count - 1)] {
+            Require(MAVOEASWrite(stream->handle(), name.c_str(), value.data(),
+                                 static_cast<unsigned>(value.size()), 0,
+                                 EAS_WRITE_OVERWRITE) == static_cast<int>(value.size()),
+                    "cannot overwrite an attribute");
+        };
+        overwrite();
+        Require(stream->Content() == ImageOf(again, value).Build(),
+                "not the stream that is due after an overwrite");
+        return Repeat(overwrite);
+    };
+}
+
+Prepare OverwritingTheLastByHand(const Place& place, const Again& again) {
+    return [place, again] {
+        const std::string path = place.NewPath();
+        test::WriteFile(path, ImageOf(again, test::Pattern(again.size, 1)).Build());
+        const auto file = std::make_shared<File>(path, O_RDWR);
+        const Bytes value = test::Pattern(again.size, 99);
+        const auto overwrite = [file, value,
+                                at = file->Size() - static_cast<std::int64_t>(again.size)] {
+            Require(floor::WriteDurably(file->fd(), value, at), "cannot write a file");
+        };
+        overwrite();
+        Require(
+            file->Read(0, static_cast<std::size_t>(file->Size())) == ImageOf(again, value).Build(),
+            "not the stream that is due after an overwrite");
+        return Repeat(overwrite);
+    };
+}
+
 // ---- Listing
 // --------------------------------------------------------------------------------------
 
@@ -335,6 +389,15 @@ void AddStreamRows(const Place& place, const Place& fast, std::vector<Row>* rows
                      .library = OverwritingThroughLibrary(place),
                      .floor = OverwritingByHand(place),
                      .waits = place.durable});
+    for (const Again& again : kAgain) {
+        if (!place.durable) break;  // beside a sync that does nothing, it is all memory
+        rows->push_back({.work = again.title,
+                         .where = place.name,
+                         .aim = 1.1,
+                         .library = OverwritingTheLastThroughLibrary(place, again),
+                         .floor = OverwritingTheLastByHand(place, again),
+                         .waits = true});
+    }
     rows->push_back({.work = "1,000 attributes one by one, each",
                      .where = place.name,
                      .aim = 1.2,

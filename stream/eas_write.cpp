@@ -76,6 +76,8 @@ int Create(EASHandle* h, const char* name, ByteView value, unsigned offset) {
     return Commit(h, image, total_size, fork, &room);
 }
 
+// Of a large stream the values before the one that is written stay where they are, and so does what
+// is not written of that one when it is the last.
 int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
     Survey survey;
     Range fork;
@@ -83,27 +85,41 @@ int Overwrite(EASHandle* h, unsigned index, ByteView value, unsigned offset) {
 
     // A value never shrinks.
     Range& data = survey.header.attributes.data;
-    const std::uint32_t old_length = h->entries[index].length;
-    const std::uint64_t length =
-        std::max(std::uint64_t{old_length}, std::uint64_t{offset} + value.size());
-    const std::uint64_t added = length - old_length;
+    const Range old = {h->entries[index].offset, h->entries[index].length};
+    const std::uint64_t written_end = std::uint64_t{offset} + value.size();
+    const std::uint64_t length = std::max(std::uint64_t{old.length}, written_end);
+    const std::uint64_t added = length - old.length;
     const std::uint64_t total_size = data.end() + added;
     if (!IsValueLength(length) || !FitsStream(total_size, fork.length)) {
         return unit.Fail(Err::kBadArgument);
     }
 
-    StreamImage image(total_size);
+    // What is written of the values.
+    std::uint64_t from = data.offset;
+    std::uint64_t to = total_size;
+    const bool large = data.end() > kSmallStream;
+    const bool last = index + 1U == survey.header.attributes.count;
+    if (large) from = old.offset;
+    if (large && last) {
+        from += std::min(offset, old.length);
+        to = old.offset + written_end;
+    }
+    StreamImage image(data.offset, from, to);
     if (!image.ok()) return unit.Fail(Err::kMemory);
-    if (GatherValues(*h, data, index, image.At(data.offset), false) != 0) return -1;
+    if (last) image.PutValuesFirst();
+    if (!large || !last) {
+        const Range moved = {static_cast<std::uint32_t>(from),
+                             static_cast<std::uint32_t>(data.end() - from)};
+        if (GatherValues(*h, moved, index, image.At(from), false) != 0) return -1;
+    }
     Room room;
     if (room.Reserve(h->fd, data.end() + fork.length, total_size + fork.length, unit) != 0) {
         return -1;
     }
-    MoveEntry(h, &survey.header, index, false);
-    std::uint8_t* const at = image.At(data.end() - old_length);
-    memset(at + old_length, 0, static_cast<std::size_t>(added));
-    std::copy(value.begin(), value.end(), at + offset);
+    if (added > 0) memset(image.At(data.end()), 0, static_cast<std::size_t>(added));
+    std::copy(value.begin(), value.end(), image.At(data.end() - old.length + offset));
 
+    MoveEntry(h, &survey.header, index, false);
     Attributes(*h).back().length = static_cast<std::uint32_t>(length);
     data.length += static_cast<std::uint32_t>(added);
     image.PutHead(survey.header, h);

@@ -14,9 +14,6 @@ namespace {
 
 constexpr Unit header_unit("eas_write_header");
 
-// Memory that a stream may take on the word of its header alone.
-constexpr std::uint64_t kSmallStream = std::uint64_t{1} << 16;
-
 }  // namespace
 
 std::span<EASEntry> Attributes(const EASHandle& h) {
@@ -143,14 +140,35 @@ void StreamImage::PutHead(StreamHeader header, EASHandle* h) {
         to += RecordSize(entry.nameLength);
     }
     const auto table_end = static_cast<std::uint64_t>(to - At(0));
-    head_size_ = std::clamp<std::uint64_t>(attributes.data.offset, table_end, size_);
+    head_size_ = std::clamp<std::uint64_t>(attributes.data.offset, table_end, all().size());
     std::memset(to, 0, static_cast<std::size_t>(head_size_ - table_end));
 }
 
+// Nothing to do when the file has them.
+int StreamImage::WriteHead(int fd) const {
+    const std::size_t size = head().size();
+    const auto there = Owned<std::uint8_t>::Allocate(size);
+    if (there && ReadAt(fd, {there.get(), size}, 0) == static_cast<std::int64_t>(size) &&
+        std::memcmp(there.get(), head().data(), size) == 0) {
+        return 0;
+    }
+    return WriteAt(fd, head(), 0) == size ? 0 : header_unit.Fail(Err::kWrite);
+}
+
+int StreamImage::WriteValues(int fd, const Unit& unit, int line) const {
+    const ByteView values = all().subspan(head().size());
+    return WriteAt(fd, values, behind_) == values.size() ? 0 : unit.Fail(Err::kWrite, line);
+}
+
 int StreamImage::Write(int fd, const Unit& unit, int line) const {
-    const std::uint64_t written = WriteAt(fd, {bytes_.get(), static_cast<std::size_t>(size_)}, 0);
-    if (written == size_) return 0;
-    return written < head_size_ ? header_unit.Fail(Err::kWrite) : unit.Fail(Err::kWrite, line);
+    if (kept_ == 0) {
+        const std::uint64_t written = WriteAt(fd, all(), 0);
+        if (written == all().size()) return 0;
+        return written < head_size_ ? header_unit.Fail(Err::kWrite) : unit.Fail(Err::kWrite, line);
+    }
+    if (values_first_ && WriteValues(fd, unit, line) != 0) return -1;
+    if (WriteHead(fd) != 0) return -1;
+    return values_first_ ? 0 : WriteValues(fd, unit, line);
 }
 
 }  // namespace mavoea

@@ -79,31 +79,56 @@ constexpr bool IsValueLength(std::uint64_t length) { return std::in_range<int>(l
 // Whether attributes that end there leave a fork of that length within a stream's 32-bit offsets.
 bool FitsStream(std::uint64_t total_size, std::uint32_t fork_length);
 
+// Streams up to this size, their fork left out, are rewritten whole: a part would cost as much, and
+// one write within a page is never seen half-way.
+constexpr std::uint64_t kSmallStream = std::uint64_t{1} << 16;
+
 // A stream's bytes before its resource fork, put together in memory before anything on disk
 // changes: header, table, values.
 class StreamImage {
  public:
-    explicit StreamImage(std::uint64_t total_size)
-        : bytes_(Owned<std::uint8_t>::Allocate(total_size)), size_(total_size) {}
+    explicit StreamImage(std::uint64_t end) : StreamImage(0, 0, end) {}
+
+    // Without the values from `from`, where they begin, to `to`: they are as they are on disk.
+    StreamImage(std::uint64_t from, std::uint64_t to, std::uint64_t end)
+        : kept_(to - from),
+          behind_(to),
+          end_(end),
+          bytes_(Owned<std::uint8_t>::Allocate(end - kept_)) {}
 
     bool ok() const { return static_cast<bool>(bytes_); }  // false: out of memory
-    std::uint8_t* At(std::uint64_t offset) const { return bytes_.get() + offset; }
+    std::uint8_t* At(std::uint64_t offset) const {
+        return bytes_.get() + (offset < behind_ ? offset : offset - kept_);
+    }
 
-    // Leaves out what lies behind total_size.
-    void Cut(std::uint64_t total_size) { size_ = total_size; }
+    // Leaves out what lies behind `end`.
+    void Cut(std::uint64_t end) { end_ = end; }
 
     // Makes `header` h's, with the sizes that follow from its data, and puts it and h's table into
     // the image. What lies between table and values is cleared.
     void PutHead(StreamHeader header, EASHandle* h);
 
-    // Writes the image at the start of the file. 0, or -1 after recording 0xB00: for the header's
-    // unit when not even header and table could be written, for `unit` otherwise.
+    // Where values are kept, the others are written before header and table: no record changes but
+    // for the last one's length.
+    void PutValuesFirst() { values_first_ = true; }
+
+    // Writes the image: all at once, or, where values are kept, header and table, unless the file
+    // has them, and the other values. 0, or -1 after recording 0xB00: for the header's unit when
+    // not even header and table could be written, for `unit` otherwise.
     int Write(int fd, const Unit& unit, int line = __builtin_LINE()) const;
 
  private:
+    ByteView all() const { return {bytes_.get(), static_cast<std::size_t>(end_ - kept_)}; }
+    ByteView head() const { return all().first(static_cast<std::size_t>(head_size_)); }
+    int WriteHead(int fd) const;
+    int WriteValues(int fd, const Unit& unit, int line) const;
+
+    std::uint64_t kept_;    // values, in bytes
+    std::uint64_t behind_;  // those, in the file
+    std::uint64_t end_;
     Owned<std::uint8_t> bytes_;
-    std::uint64_t size_;
     std::uint64_t head_size_ = 0;
+    bool values_first_ = false;
 };
 
 // MAVOEASUpdateEntry() for a stream that has been surveyed, in its two steps. The first reads the

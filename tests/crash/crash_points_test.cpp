@@ -1221,5 +1221,29 @@ TEST(CrashPointsTest, AWriteOfSeveralPagesThatIsCutShortMayCostEveryValue) {
                       "new; LOST a, c", "new; LOST c"});
 }
 
+// Beyond 64 KiB header and table go out first, then what changes of the values.
+constexpr std::size_t kVeryLarge = 30000;
+
+TEST(CrashPointsTest, AnOverwriteInALargeStreamCostsNothingBeforeWhatIsWritten) {
+    KillOnStream(
+        WriteOf("overwrite an attribute of a large stream", kVeryLarge, 0, kVeryLarge, kVeryLarge),
+        {{"", "old"}, {"pwrite", "LOST the value; LOST c", "0: new; LOST c"}, {"pwrite", "new"}});
+    KillOnStream(WriteOfLast("overwrite the last of a large stream", kVeryLarge, 0, kVeryLarge),
+                 {{"", "old"}, {"pwrite", "new"}});
+    KillOnStream(
+        WriteOfLast("make the last of a large stream longer", kVeryLarge, 0, kVeryLarge + 500),
+        {{"", "old"}, {"pwrite", "LOST the value"}, {"pwrite", "new"}});
+    KillOnStream(WriteOfLast("overwrite the last before a fork", kVeryLarge, kFork, kVeryLarge),
+                 {{"", "old"}, {"pwrite", "new"}});
+}
+
+TEST(CrashPointsTest, AnOverwriteInALargeStreamThatIsCutShortCostsWhatIsWrittenAndWhatMoves) {
+    KillWithinWrites(
+        WriteOf("overwrite an attribute of a large stream", kVeryLarge, 0, kVeryLarge, kVeryLarge),
+        {"LOST the value", "LOST the value; LOST c", "new"});
+    KillWithinWrites(WriteOfLast("overwrite the last of a large stream", kVeryLarge, 0, kVeryLarge),
+                     {"LOST the value", "new"});
+}
+
 }  // namespace
 }  // namespace mavoea::test

@@ -428,6 +428,17 @@ TEST(PowerLossTest, AChangeOfAStreamBeforeAForkMayCostTheForkToo) {
                        "LOST the value, new, old; LOST a, c, fork"));
 }
 
+TEST(PowerLossTest, AnOverwriteInALargeStreamCostsNothingBeforeWhatIsWritten) {
+    constexpr std::size_t kLarge = 30000;
+    LosePower(
+        OnStream(WriteOf("overwrite an attribute of a large stream", kLarge, 0, kLarge, kLarge),
+                 "LOST the value, new, old; LOST c"));
+    LosePower(OnStream(WriteOfLast("overwrite the last of a large stream", kLarge, 0, kLarge),
+                       "LOST the value, new, old"));
+    LosePower(OnStream(WriteOfLast("overwrite the last before a fork", kLarge, kFork, kLarge),
+                       "LOST the value, new, old"));
+}
+
 // What services do that write a stream's fork: its bytes first, then its length.
 int WriteFork(int fd, const Bytes& fork) {
     const Stream stream(fd);

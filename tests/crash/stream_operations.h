@@ -136,6 +136,22 @@ inline StreamOperation WriteOf(const std::string& name, std::size_t size, std::s
     return operation;
 }
 
+// The same of the one that is the last already: "c".
+inline StreamOperation WriteOfLast(const std::string& name, std::size_t size, std::size_t fork,
+                                   std::size_t new_size) {
+    const StreamImage image = ThreeAttributes(size, fork);
+    const Bytes value = Pattern(new_size, 0x77);
+    return {
+        .name = name,
+        .before = image.Build(),
+        .wanted = OthersOf(image, "c"),
+        .old_value = OfItem("c", size),
+        .new_value = value,
+        .run = [value](int fd) { return Stream(fd).Write("c", value); },
+        .item = "c",
+    };
+}
+
 inline StreamOperation RemovalOf(const std::string& name, std::size_t size, std::size_t fork) {
     const StreamImage image = ThreeAttributes(size, fork);
     return {

@@ -455,6 +455,47 @@ TEST(StreamWriteFaults, AnAttributeOfTheSameLengthMovesNoFork) {
     SweepFaults(c);
 }
 
+TEST(StreamWriteFaults, InALargeStreamTheLastValueIsWrittenAndTheOthersAreLeft) {
+    StreamImage image = ThreeAttributes(0);
+    image.attributes[2].value = Pattern(70'000, 4);
+    FaultCase c = Writing("write over the last value of a large stream", image.Build(), "third",
+                          Pattern(10), 4, EAS_WRITE_OVERWRITE);
+    const Outcome value_torn = Torn({{0xB00, "eas_write"}});
+    c.rules = Rules{Refused("malloc", {0x200, "eas_write"}, 1),
+                    Refused("lseek", {0xA00, "eas_write"}),
+                    // Header and table are written when they cannot be compared.
+                    {.call = "malloc", .outcome = {.result = 10, .files = Files::kDone}},
+                    {.call = "pread", .outcome = {.result = 10, .files = Files::kDone}},
+                    TakenUpAgain("pwrite", 10),
+                    {.call = "pwrite", .outcome = value_torn},
+                    NotSynced({{0x2A00, "eas_flush"}})};
+    SweepFaults(c);
+}
+
+TEST(StreamWriteFaults, InALargeStreamOnlyWhatLiesBehindAValueMoves) {
+    StreamImage image = ThreeAttributes(0);
+    image.attributes[2].value = Pattern(70'000, 4);
+    FaultCase c = Writing("write over another value of a large stream", image.Build(), "second",
+                          Pattern(10), 4, EAS_WRITE_OVERWRITE);
+    c.rules =
+        Rules{Refused("malloc", {0x200, "eas_write"}, 1),
+              Refused("lseek", {0xA00, "eas_write"}),
+              TakenUpAgain("preadv", 10),
+              Refused("preadv", {0xA00, "eas_update_entry"}),
+              {.call = "malloc", .outcome = {.result = 10, .files = Files::kDone}},
+              {.call = "pread", .outcome = {.result = 10, .files = Files::kDone}},
+              TakenUpAgain("pwrite", 10),
+              {.call = "pwrite",
+               .with = ", 0)",
+               .errors = {kShortThenNone},
+               .bytes = 1,
+               .outcome = Torn({{0xB00, "eas_write_header"}})},
+              {.call = "pwrite", .with = ", 0)", .outcome = Torn({{0xB00, "eas_write_header"}})},
+              {.call = "pwrite", .outcome = Torn({{0xB00, "eas_write"}})},
+              NotSynced({{0x2A00, "eas_flush"}})};
+    SweepFaults(c);
+}
+
 TEST(StreamRemoveFaults, AnAttributeIsRemovedOrTheFailureRecorded) {
     StreamImage image = ThreeAttributes(40'000);
     image.attributes[2].value = Pattern(300, 4);  // what stays outweighs header and table

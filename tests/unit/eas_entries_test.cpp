@@ -521,6 +521,140 @@ TEST_F(EasEntriesTest, EveryChangeIsSyncedOnce) {
     EXPECT_EQ("fsync", calls.back());
 }
 
+// ---- Large streams ------------------------------------------------------------------------------
+
+// Of more than 64 KiB: what does not change is neither read nor written.
+class EasLargeTest : public EasEntriesTest {
+ protected:
+    static constexpr unsigned kSize = 30'000;
+
+    void OpenLarge(std::size_t fork = 0) {
+        image_ = {.attributes = {{"a", Pattern(kSize, 1)},
+                                 {"b", Pattern(kSize, 2)},
+                                 {"c", Pattern(kSize, 3)}},
+                  .fork = Pattern(fork, 4)};
+        Reopen();
+    }
+    std::string Range(std::size_t size, std::uint64_t at) {
+        return "(" + std::to_string(size) + ", " + std::to_string(at) + ")";
+    }
+    // Where the values begin, and the one of that index.
+    std::uint64_t Start(unsigned index = 0) { return image_.DataStart() + index * kSize; }
+};
+
+TEST_F(EasLargeTest, OfTheLastOnlyTheNewBytesAreWritten) {
+    for (const std::size_t fork : {0u, 40'000u}) {
+        OpenLarge(fork);
+        const Bytes value = Pattern(kSize, 9);
+        ASSERT_EQ(static_cast<int>(kSize), Write(handle_, "c", value));
+        EXPECT_THAT(TakeFileCalls(), ElementsAre("pwrite" + Range(kSize, Start(2)),
+                                                 "pread" + Range(Start(), 0), "fsync()"));
+        image_.attributes[2].value = value;
+        EXPECT_EQ(image_.Build(), Contents());
+        ASSERT_EQ(4, Write(handle_, "c", "four", 100));
+        EXPECT_THAT(TakeFileCalls(), ElementsAre("pwrite" + Range(4, Start(2) + 100),
+                                                 "pread" + Range(Start(), 0), "fsync()"));
+        const Bytes four = Ascii("four");
+        std::copy(four.begin(), four.end(), image_.attributes[2].value.begin() + 100);
+        EXPECT_EQ(image_.Build(), Contents());
+        ASSERT_EQ(0, Write(handle_, "c", "", 100));
+        EXPECT_EQ(image_.Build(), Contents());
+    }
+}
+
+TEST_F(EasLargeTest, OfAnotherWhatLiesBeforeItIsNotTouched) {
+    OpenLarge(40'000);
+    const Bytes value = Pattern(100, 9);
+    ASSERT_EQ(100, Write(handle_, "b", value, 7));
+    EXPECT_THAT(TakeFileCalls(),
+                ElementsAre("preadv" + Range(2 * kSize, Start(1)), "pread" + Range(Start(), 0),
+                            "pwrite" + Range(Start(), 0), "pwrite" + Range(2 * kSize, Start(1)),
+                            "fsync()"));
+    std::copy(value.begin(), value.end(), image_.attributes[1].value.begin() + 7);
+    std::swap(image_.attributes[1], image_.attributes[2]);
+    EXPECT_EQ(image_.Build(), Contents());
+}
+
+TEST_F(EasLargeTest, RandomOverwritesComeToWhatTheyShould) {
+    std::mt19937 random(7);
+    const auto below = [&](unsigned count) { return static_cast<unsigned>(random()) % count; };
+    for (const std::size_t fork : {0u, 20'000u}) {
+        OpenLarge(fork);
+        for (int i = 0; i < 200; ++i) {
+            SCOPED_TRACE(i);
+            const std::size_t index = below(2) == 0 ? 2 : below(3);
+            Attribute attribute = image_.attributes[index];
+            const Bytes bytes =
+                Pattern(below(4) == 0 ? below(9'000) : below(40), static_cast<std::uint8_t>(i));
+            const auto length = static_cast<unsigned>(attribute.value.size());
+            const unsigned offset = below(3) == 0 ? length + below(20) : below(length);
+            ASSERT_EQ(static_cast<int>(bytes.size()),
+                      Write(handle_, attribute.name, bytes, offset));
+            if (length < offset + bytes.size()) attribute.value.resize(offset + bytes.size());
+            std::copy(bytes.begin(), bytes.end(), attribute.value.begin() + offset);
+            image_.attributes.erase(image_.attributes.begin() + static_cast<std::ptrdiff_t>(index));
+            image_.attributes.push_back(attribute);
+            ASSERT_TRUE(image_.Build() == Contents());
+        }
+        const HandleState state = StateOf(*h());
+        handle_ = Open();
+        EXPECT_TRUE(state == StateOf(*h()));
+    }
+}
+
+// Somebody else has written, without a lock: header and table are as this handle has them, values
+// as they are in the file.
+TEST_F(EasLargeTest, WhatHasChangedInTheFileIsFound) {
+    for (const std::uint64_t at : {std::uint64_t{60}, std::uint64_t{kTableAt} + 5}) {
+        OpenLarge();
+        ASSERT_EQ(1, ::pwrite(fd_, "?", 1, static_cast<off_t>(at)));
+        ASSERT_EQ(1, ::pwrite(fd_, "?", 1, static_cast<off_t>(Start(1))));
+        ASSERT_EQ(1, Write(handle_, "c", "!"));
+        image_.attributes[1].value[0] = '?';
+        image_.attributes[2].value[0] = '!';
+        EXPECT_EQ(image_.Build(), Contents());
+    }
+    ASSERT_EQ(0, ftruncate(fd_, static_cast<off_t>(Start(3) - 1)));
+    const Bytes before = Contents();
+    EXPECT_EQ(-1, Write(handle_, "c", "?"));
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_write")));
+    EXPECT_EQ(before, Contents());
+}
+
+TEST_F(EasLargeTest, AHeadThatCannotBeComparedIsWritten) {
+    for (const char* const call : {"pread(", "malloc(168)"}) {
+        SCOPED_TRACE(call);
+        OpenLarge();
+        Hooks().fails = [call](const std::string& made) {
+            return made.starts_with(call) ? ENOMEM : 0;
+        };
+        EXPECT_EQ(1, Write(handle_, "c", "!"));
+        Hooks().fails = nullptr;
+        EXPECT_THAT(TakeWrites(), ElementsAre("pwrite" + Range(1, Start(2)),
+                                              "pwrite" + Range(Start(), 0), "fsync()"));
+        image_.attributes[2].value[0] = '!';
+        EXPECT_EQ(image_.Build(), Contents());
+    }
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+TEST_F(EasLargeTest, AShortWriteIsRecordedByTheUnitWhosePartItCuts) {
+    struct Case {
+        int nth;
+        unsigned bytes;
+        const char* unit;
+    };
+    for (const Case& c : {Case{1, 0, "eas_write_header"}, Case{1, 167, "eas_write_header"},
+                          Case{2, 0, "eas_write"}, Case{2, 2 * kSize - 1, "eas_write"}}) {
+        OpenLarge();
+        const ShortCall fault("pwrite", c.nth, c.bytes);
+        EXPECT_EQ(-1, Write(handle_, "b", "!"));
+        EXPECT_TRUE(fault.fired());
+        EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xB00, c.unit)));
+        EXPECT_THAT(TakeCallNames(), ::testing::Not(Contains("fsync")));
+    }
+}
+
 // ---- Room ---------------------------------------------------------------------------------------
 
 class EasRoomTest : public EasEntriesTest {
