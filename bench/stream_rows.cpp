@@ -367,10 +367,10 @@ void AddStreamRows(const Place& place, const Place& fast, std::vector<Row>* rows
         int count;
         const char* title;
         double aim;
-    } const kinds[] = {{1, "open, read 1 of 1 value, close", 2},
-                       {10, "open, read 1 of 10 values, close", 2},
-                       {100, "open, read 1 of 100 values, close", 3},
-                       {kMany, "open, read 1 of 1,000 values, close", 6}};
+    } const kinds[] = {{1, "open, read 1 of 1 value, close", 1.6},
+                       {10, "open, read 1 of 10 values, close", 1.6},
+                       {100, "open, read 1 of 100 values, close", 1.75},
+                       {kMany, "open, read 1 of 1,000 values, close", 2.2}};
     for (const auto& kind : kinds) {
         rows->push_back({.work = kind.title,
                          .where = place.name,

@@ -71,7 +71,6 @@ int Closedir(DIR* dir) { return ::closedir(dir); }
 
 uid_t Geteuid() { return ::geteuid(); }
 int Seteuid(uid_t uid) { return ::seteuid(uid); }
-pid_t Getpid() { return ::getpid(); }
 time_t Time() { return ::time(nullptr); }
 // NOLINTNEXTLINE(cert-env33-c): callers quote what they pass on.
 int System(const char* command) { return ::system(command); }

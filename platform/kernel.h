@@ -62,7 +62,6 @@ int Closedir(DIR* dir);
 
 uid_t Geteuid();
 int Seteuid(uid_t uid);
-pid_t Getpid();
 time_t Time();
 int System(const char* command);
 

@@ -22,7 +22,6 @@ int MAVOEASLockSet(EASHandle* h, int lockType) {
     // What is no type at all must not become one by losing its upper half.
     lock.l_type = std::in_range<short>(lockType) ? static_cast<short>(lockType) : short{-1};
     lock.l_whence = SEEK_SET;
-    lock.l_pid = kernel::Getpid();
     if (kernel::SetLock(h->fd, &lock) < 0) return unit.Fail(Err::kLock);
     h->lockType = lockType;
     return 0;

@@ -14,6 +14,16 @@ namespace {
 
 constexpr Unit header_unit("eas_write_header");
 
+// Whether the last bytes of the first `size` of both are the same, where names that begin alike
+// differ.
+bool EndsAlike(const char* one, const char* other, std::size_t size) {
+    std::uint64_t ends[2];
+    if (size < sizeof ends[0]) return true;
+    std::memcpy(&ends[0], one + size - sizeof ends[0], sizeof ends[0]);
+    std::memcpy(&ends[1], other + size - sizeof ends[1], sizeof ends[1]);
+    return ends[0] == ends[1];
+}
+
 }  // namespace
 
 std::span<EASEntry> Attributes(const EASHandle& h) {
@@ -21,9 +31,14 @@ std::span<EASEntry> Attributes(const EASHandle& h) {
 }
 
 int FindAttribute(const EASHandle& h, const char* name) {
+    const std::size_t size = std::strlen(name) + 1;
     const std::span<EASEntry> attributes = Attributes(h);
     for (std::size_t i = attributes.size(); i-- > 0;) {
-        if (std::strcmp(attributes[i].name, name) == 0) return static_cast<int>(i);
+        const EASEntry& entry = attributes[i];
+        if (EndsAlike(entry.name, name, std::min<std::size_t>(entry.nameLength, size)) &&
+            std::strcmp(entry.name, name) == 0) {
+            return static_cast<int>(i);
+        }
     }
     return -1;
 }

@@ -249,9 +249,9 @@ constexpr bool kEveryPoint = !kEmulated;
 
 bool OnlyLooks(const std::string& call) {
     static const std::set<std::string>& calls = *new std::set<std::string>{
-        "access",  "close",   "closedir",  "fread",     "fstat", "fsync", "getcwd",  "geteuid",
-        "getlock", "getpid",  "getxattr",  "listxattr", "lseek", "lstat", "opendir", "pread",
-        "preadv",  "readdir", "rewinddir", "setlock",   "stat",  "sync",  "time",
+        "access",  "close",     "closedir",  "fread", "fstat", "fsync",   "getcwd", "geteuid",
+        "getlock", "getxattr",  "listxattr", "lseek", "lstat", "opendir", "pread",  "preadv",
+        "readdir", "rewinddir", "setlock",   "stat",  "sync",  "time",
     };
     return calls.contains(call);
 }

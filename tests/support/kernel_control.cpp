@@ -529,11 +529,6 @@ int Seteuid(uid_t uid) {
                 [&] { return Hooks().seteuid ? Hooks().seteuid(uid) : ::seteuid(uid); });
 }
 
-pid_t Getpid() {
-    Note("getpid", "getpid()");
-    return ::getpid();
-}
-
 time_t Time() {
     Note("time", "time()");
     return Hooks().time ? Hooks().time() : ::time(nullptr);

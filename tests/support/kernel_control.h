@@ -5,7 +5,7 @@
 // "pwritev", "lseek", "ftruncate", "fallocate", "fsync", "sync", "fstat", "stat", "lstat",
 // "access", "setlock", "getlock", "mkdir", "unlink", "rmdir", "remove", "rename", "chmod",
 // "fchmod", "getcwd", "chdir", "fchdir", "opendir", "readdir", "rewinddir", "closedir", "geteuid",
-// "seteuid", "getpid", "time", "system", "listxattr", "getxattr", "setxattr", "removexattr",
+// "seteuid", "time", "system", "listxattr", "getxattr", "setxattr", "removexattr",
 // "fopen", "fread", "fwrite", "fclose", "archive", "command" (the platform's system call 403),
 // "malloc" (every allocation).
 #ifndef MAVOEA_TESTS_SUPPORT_KERNEL_CONTROL_H_

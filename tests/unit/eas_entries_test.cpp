@@ -74,6 +74,28 @@ TEST_F(EasEntriesTest, SearchComparesByteByByte) {
     EXPECT_THAT(TakeCallNames(), IsEmpty());
 }
 
+TEST_F(EasEntriesTest, SearchTellsApartNamesThatBeginOrEndAlike) {
+    image_.attributes = {{"user.first.name", {}},  {"user.first.game", {}}, {"user.other.name", {}},
+                         {"user.first.name.", {}}, {"ser.first.name", {}},  {"1234567", {}},
+                         {"12345678", {}},         {"02345678", {}}};
+    Reopen();
+    for (std::size_t i = 0; i < image_.attributes.size(); ++i) {
+        EXPECT_EQ(static_cast<int>(i), MAVOEASSearch(h(), image_.attributes[i].name.c_str()));
+    }
+    for (const char* const name : {"user.first.nam", "User.first.name", "234567", "012345678"}) {
+        EXPECT_EQ(-1, MAVOEASSearch(h(), name)) << name;
+    }
+    // Names that a damaged table has: one that ends before its record does, one without an end.
+    Bytes bytes = image_.Build();
+    bytes[image_.RecordAt(0) + 11 + 12] = '\0';
+    bytes[image_.RecordAt(1) + 11 + 15] = '!';
+    Fill(bytes);
+    handle_ = Open();
+    EXPECT_EQ(0, MAVOEASSearch(h(), "user.first.n"));
+    EXPECT_EQ(1, MAVOEASSearch(h(), "user.first.game!"));
+    TakeRecords();
+}
+
 TEST_F(EasEntriesTest, SearchInAStreamWithoutAttributesFindsNone) {
     handle_ = Open();
     EXPECT_EQ(-1, MAVOEASSearch(h(), "a"));
