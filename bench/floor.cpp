@@ -161,6 +161,17 @@ bool WriteDurably(int fd, std::span<const std::uint8_t> bytes, std::int64_t offs
            fsync(fd) == 0;
 }
 
+bool LockAndReplace(const char* path, std::span<const std::uint8_t> bytes) {
+    const int fd = open(path, O_RDWR | O_CREAT, 0777);
+    struct flock lock = {};
+    lock.l_type = F_WRLCK;
+    std::uint8_t old[kFirstRead];
+    const bool done = fcntl(fd, F_SETLK, &lock) == 0 && pread(fd, old, sizeof old, 0) > 0 &&
+                      WriteDurably(fd, bytes);
+    close(fd);
+    return done;
+}
+
 bool MoveUpAndWriteDurably(int fd, std::int64_t from, std::int64_t length, std::int64_t by,
                            std::span<const std::uint8_t> head) {
     if (ftruncate(fd, from + by + length) != 0) return false;

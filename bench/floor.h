@@ -43,6 +43,10 @@ int ListNames(const char* path, MLIBCSzList** list);
 // One pwrite at `offset`, and an fsync.
 bool WriteDurably(int fd, std::span<const std::uint8_t> bytes, std::int64_t offset = 0);
 
+// Opens the stream to write, making it where it is missing, locks and reads it, writes `bytes` in
+// its place and syncs them, and closes it, which drops the lock.
+bool LockAndReplace(const char* path, std::span<const std::uint8_t> bytes);
+
 // Lengthens the file and moves the last `length` bytes up by `by`, from the back in steps of
 // 16 KiB; then WriteDurably() of `head`.
 bool MoveUpAndWriteDurably(int fd, std::int64_t from, std::int64_t length, std::int64_t by,

@@ -2,6 +2,7 @@
 
 #include <benchmark/benchmark.h>
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -174,6 +175,58 @@ Prepare OverwritingByHand(const Place& place) {
     };
 }
 
+// ---- Setting one value of an object
+// ---------------------------------------------------------------
+
+// As a service does that is asked to set an attribute.
+int SetThroughLibrary(const std::string& object, const std::string& name, const Bytes& value) {
+    const int fd = MAVOEAOpen(EA_FORM_FILE, object.c_str(), MAVOEA_KIND_STREAM, O_RDWR | O_CREAT,
+                              EA_PLACE_EADIR);
+    EASHandle* const h = MAVOEASOpen(fd, F_WRLCK);
+    const int put = MAVOEASWrite(h, name.c_str(), value.data(), static_cast<unsigned>(value.size()),
+                                 0, EAS_WRITE_OVERWRITE);
+    MAVOEASClose(h);
+    close(fd);
+    return put;
+}
+
+// The object whose stream has a few attributes.
+std::string NewObject(const Place& place) {
+    const std::string object = place.NewPath();
+    const std::size_t name = object.rfind('/') + 1;
+    const std::string dir = object.substr(0, name) + "@eaDir";
+    (void)mkdir(dir.c_str(), 0777);
+    test::WriteFile(dir + "/" + object.substr(name) + "@" MAVOEA_KIND_STREAM,
+                    ImageOf(kFew).Build());
+    return object;
+}
+
+Prepare SettingThroughLibrary(const Place& place) {
+    return [place] {
+        const std::string object = NewObject(place);
+        const Bytes value = test::Pattern(kValueSize, 99);
+        std::vector<std::string> names;
+        for (int i = 0; i < kFew; ++i) names.push_back(NameOf(i));
+        Require(SetThroughLibrary(object, names[0], value) == kValueSize,
+                "cannot set an attribute");
+        return Repeat([object, value, names, next = std::size_t{1}]() mutable {
+            Require(SetThroughLibrary(object, names[next], value) == kValueSize,
+                    "cannot set an attribute");
+            next = (next + 1) % names.size();
+        });
+    };
+}
+
+Prepare SettingByHand(const Place& place) {
+    return [place] {
+        const std::string path = NewStream(place, kFew);
+        const Bytes image = ImageAfterOverwrite(test::Pattern(kValueSize, 99)).Build();
+        return Repeat([path, image] {
+            Require(floor::LockAndReplace(path.c_str(), image), "cannot replace a stream");
+        });
+    };
+}
+
 // The same value again, which is the last one then.
 struct Again {
     const char* title;
@@ -289,7 +342,7 @@ Prepare EnumeratingByHand() {
 // One attribute at a time into a new stream; from an empty file again when all are written.
 class Filler {
  public:
-    explicit Filler(std::string path) : path_(std::move(path)), image_(ImageOf(kMany)) {}
+    Filler(std::string path, int count) : path_(std::move(path)), image_(ImageOf(count)) {}
 
     void WriteNext() {
         if (next_ == 0) {
@@ -297,7 +350,7 @@ class Filler {
             stream_ = std::make_unique<Stream>(path_, O_RDWR | O_CREAT | O_TRUNC, F_WRLCK);
         }
         const Attribute& attribute = image_.attributes[next_];
-        next_ = (next_ + 1) % kMany;
+        next_ = (next_ + 1) % image_.attributes.size();
         Require(MAVOEASWrite(stream_->handle(), attribute.name.c_str(), attribute.value.data(),
                              kValueSize, 0, 0) == kValueSize,
                 "cannot write an attribute");
@@ -315,18 +368,19 @@ class Filler {
 // As many bytes as the library writes each time: those that the last time leaves.
 class PlainFiller {
  public:
-    explicit PlainFiller(std::string path)
-        : path_(std::move(path)), bytes_(ImageOf(kMany).Build()) {}
+    PlainFiller(std::string path, int count)
+        : path_(std::move(path)),
+          bytes_(ImageOf(count).Build()),
+          count_(static_cast<std::size_t>(count)),
+          each_((bytes_.size() - test::kTableAt) / count_) {}
 
     void WriteNext() {
         if (next_ == 0) {
             file_.reset();
             file_ = std::make_unique<File>(path_, O_RDWR | O_CREAT | O_TRUNC);
         }
-        next_ = (next_ + 1) % kMany;
-        const std::size_t count = next_ == 0 ? kMany : next_;
-        const std::size_t each = test::RecordSize(NameOf(0).size() + 1) + kValueSize;
-        const std::size_t size = test::kTableAt + count * each;
+        next_ = (next_ + 1) % count_;
+        const std::size_t size = test::kTableAt + (next_ == 0 ? count_ : next_) * each_;
         Require(floor::WriteDurably(file_->fd(), std::span(bytes_).first(size)),
                 "cannot write a file");
     }
@@ -336,18 +390,20 @@ class PlainFiller {
  private:
     std::string path_;
     Bytes bytes_;
+    std::size_t count_;
+    std::size_t each_;  // what one of them takes
     std::unique_ptr<File> file_;
     std::size_t next_ = 0;
 };
 
 // The whole stream is written and looked at once, on the fast filesystem: a disk takes seconds.
 template <class AnyFiller>
-Prepare Filling(const Place& place, const Place& fast) {
-    return [place, fast] {
-        AnyFiller checked(fast.NewPath());
-        for (int i = 0; i < kMany; ++i) checked.WriteNext();
-        Require(checked.Content() == ImageOf(kMany).Build(), "not the stream that is due");
-        const auto filler = std::make_shared<AnyFiller>(place.NewPath());
+Prepare Filling(const Place& place, const Place& fast, int count) {
+    return [place, fast, count] {
+        AnyFiller checked(fast.NewPath(), count);
+        for (int i = 0; i < count; ++i) checked.WriteNext();
+        Require(checked.Content() == ImageOf(count).Build(), "not the stream that is due");
+        const auto filler = std::make_shared<AnyFiller>(place.NewPath(), count);
         return Repeat([filler] { filler->WriteNext(); });
     };
 }
@@ -389,6 +445,12 @@ void AddStreamRows(const Place& place, const Place& fast, std::vector<Row>* rows
                      .library = OverwritingThroughLibrary(place),
                      .floor = OverwritingByHand(place),
                      .waits = place.durable});
+    rows->push_back({.work = "open to write, set 1 of 10 values durably, close",
+                     .where = place.name,
+                     .aim = place.durable ? 1.15 : 1.5,
+                     .library = SettingThroughLibrary(place),
+                     .floor = SettingByHand(place),
+                     .waits = place.durable});
     for (const Again& again : kAgain) {
         if (!place.durable) break;  // beside a sync that does nothing, it is all memory
         rows->push_back({.work = again.title,
@@ -398,14 +460,17 @@ void AddStreamRows(const Place& place, const Place& fast, std::vector<Row>* rows
                          .floor = OverwritingTheLastByHand(place, again),
                          .waits = true});
     }
-    rows->push_back({.work = "1,000 attributes one by one, each",
-                     .where = place.name,
-                     .aim = 1.2,
-                     .library = Filling<Filler>(place, fast),
-                     .floor = Filling<PlainFiller>(place, fast),
-                     .waits = place.durable,
-                     .batch = kMany / 100,
-                     .goes = 100});
+    for (const int count : {100, kMany}) {
+        rows->push_back({.work = count == kMany ? "1,000 attributes one by one, each"
+                                                : "100 attributes one by one, each",
+                         .where = place.name,
+                         .aim = place.durable ? 1.2 : 1.3,
+                         .library = Filling<Filler>(place, fast, count),
+                         .floor = Filling<PlainFiller>(place, fast, count),
+                         .waits = place.durable,
+                         .batch = 10,
+                         .goes = count / 10});
+    }
 }
 
 }  // namespace mavoea::bench
