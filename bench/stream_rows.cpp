@@ -41,7 +41,7 @@ StreamImage ImageOf(int count) {
 
 // A stream of `count` attributes; the file is removed with its directory.
 std::string NewStream(const Place& place, int count) {
-    const std::string path = place.NewPath();
+    std::string path = place.NewPath();
     test::WriteFile(path, ImageOf(count).Build());
     return path;
 }
@@ -192,7 +192,7 @@ int SetThroughLibrary(const std::string& object, const std::string& name, const 
 
 // The object whose stream has a few attributes.
 std::string NewObject(const Place& place) {
-    const std::string object = place.NewPath();
+    std::string object = place.NewPath();
     const std::size_t name = object.rfind('/') + 1;
     const std::string dir = object.substr(0, name) + "@eaDir";
     (void)mkdir(dir.c_str(), 0777);
@@ -205,8 +205,8 @@ Prepare SettingThroughLibrary(const Place& place) {
     return [place] {
         const std::string object = NewObject(place);
         const Bytes value = test::Pattern(kValueSize, 99);
-        std::vector<std::string> names;
-        for (int i = 0; i < kFew; ++i) names.push_back(NameOf(i));
+        std::array<std::string, kFew> names;
+        for (int i = 0; i < kFew; ++i) names[static_cast<std::size_t>(i)] = NameOf(i);
         Require(SetThroughLibrary(object, names[0], value) == kValueSize,
                 "cannot set an attribute");
         return Repeat([object, value, names, next = std::size_t{1}]() mutable {

@@ -47,7 +47,7 @@ int Create(EASHandle* h, const char* name, ByteView value, unsigned offset) {
     auto own_name = Owned<char>::Allocate(name_size);
     StreamImage image(total_size);
     if (!own_name || !image.ok()) return unit.Fail(Err::kMemory);
-    memcpy(own_name.get(), name, name_size);
+    CopyShort(own_name.get(), name, name_size);
     if (attributes.count == h->capacity && MAVOEASAllocEntry(h, 0) != 0) return -1;
 
     attributes.data.offset += record_size;
