@@ -117,7 +117,10 @@ class TableReader {
         if (block_ == nullptr || here_.size() > size + kStep) {
             NameBlock* const block = ResizeNameBlock(block_, size);
             if (block == nullptr) return nullptr;
-            if (block_ == nullptr) memcpy(block->bytes(), here_.data(), block->size);
+            // The file may end before the last record's padding.
+            if (block_ == nullptr) {
+                memcpy(block->bytes(), here_.data(), std::min(block->size, here_.size()));
+            }
             block_ = block;
         }
         return std::exchange(block_, nullptr);

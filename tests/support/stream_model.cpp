@@ -140,6 +140,7 @@ bool StreamModel::FitsTogether() {
 
     fork_length_ = Get(&header_[46], 4);
     fork_start_ = std::uint64_t{Get(&header_[30], 4)} + Get(&header_[34], 4);
+    if (fork_start_ >= kSizeLimit) return false;
     if (fork_length_ != 0) {
         const bool plain = Get(&header_[34], 4) == 32;
         if (fork_start_ != Get(&header_[42], 4) || fork_start_ < (plain ? 82 : end)) return false;

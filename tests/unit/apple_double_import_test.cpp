@@ -349,7 +349,10 @@ TEST_F(WriteToFdTest, AFailedReadOfAValueCountsAndTheOthersAreCopied) {
         const int result = Copy();
         if (!fault.fired()) break;
         const auto records = TakeRecords();
-        ASSERT_THAT(records, Not(IsEmpty()));
+        if (records.empty()) {  // Of opening: what that needs is read by itself.
+            EXPECT_EQ(0, result);
+            continue;
+        }
         if (records[0].unit != "eas_write_to_fd") continue;  // of opening, or of writing
         EXPECT_EQ(-2, result);
         EXPECT_THAT(records, ElementsAre(RecordOf(0xA00, "eas_write_to_fd")));
