@@ -429,9 +429,8 @@ MAVOEA_API int MAVOEAFixErrorAD(const char* path);
  *   other "MAVO..."       a file of the legacy folder: its ':' becomes '@' there
  *
  * A legacy folder that is empty then is removed. MAVOEAOpen() calls this. Files that cannot be
- * converted stay where they are. The process's working directory changes for a moment; it is kept,
- * failures included, unless it can no longer be entered, which is 0x2A00 (and then the root
- * directory if it was left already).
+ * converted stay where they are. The process's working directory is neither used nor changed,
+ * unless szPath is relative to it.
  *
  * 0 converted; 1 the current layout is there already; 2 there is nothing of that kind; -1: 0xD00 an
  * unknown kind or NULL; 0x900 the stream could not be opened; 0x2800 rename; 0x3900 the legacy

@@ -43,13 +43,12 @@ bool Exists(const char* path) {
            (errno != ENOENT && errno != ENOTDIR && errno != ENAMETOOLONG);
 }
 
-// Whether the folder of the legacy file at `path` is one, and not a symbolic link that somebody put
-// there to have other files moved.
-bool IsInFolder(const char* path) {
+// The folder of the legacy file at `path`, for calls on what is in it; not one that a symbolic link
+// leads to, which somebody may have put there to have other files moved.
+UniqueFd FolderOf(const char* path) {
     char folder[kPathBufferSize];
     CutShort(folder, sizeof folder).Add(WithoutTrailingSlash(SplitObject(path).parent));
-    struct stat info;
-    return kernel::Lstat(folder, &info) == 0 && S_ISDIR(info.st_mode);
+    return UniqueFd(kernel::Open(folder, O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC, 0));
 }
 
 // Removes a legacy folder that has become empty; one that has not, stays. `result`, or kFailure.
@@ -71,56 +70,19 @@ const char* NextAttribute(Folder* folder) {
     return nullptr;
 }
 
-// The process in another directory, until Return().
-class WorkingDirectory {
- public:
-    // Whether there is a way back to the present one.
-    bool Remember() {
-        former_.Reset(kernel::Open(".", O_PATH | O_DIRECTORY | O_CLOEXEC, 0));
-        return former_ && kernel::Fchdir(former_.get()) == 0;
-    }
-
-    bool Enter(int dir) { return kernel::Fchdir(dir) == 0; }
-
-    // Tries more than once: callers rely on where they are. Should the way back have closed
-    // meanwhile, the process is left in the root directory, which nobody removes.
-    bool Return() {
-        for (int attempts = 3; attempts > 0; --attempts) {
-            if (kernel::Fchdir(former_.get()) == 0) return true;
-        }
-        const ErrnoKeeper keep;
-        (void)kernel::Chdir("/");
-        return false;
-    }
-
- private:
-    UniqueFd former_;
-};
-
 // When a file was last read, in seconds; 0 when it cannot be told.
-std::int64_t AccessTime(const char* path) {
+std::int64_t AccessTime(int dir, const char* path) {
     struct stat info;
-    if (kernel::Stat(path, &info) != 0) return 0;
+    if (kernel::FstatAt(dir, path, &info, 0) != 0) return 0;
     return std::max<std::int64_t>(info.st_atime, 0);
 }
 
 // When the attribute files of a legacy folder were last read: the latest counts, 0 when there are
-// none. Fails when the process cannot come back from the folder.
-std::optional<std::int64_t> LatestAccess(Folder* folder) {
-    WorkingDirectory directory;
-    if (!directory.Remember()) {
-        unit.Fail(Err::kSystemCall);
-        return std::nullopt;
-    }
+// none.
+std::int64_t LatestAccess(Folder* folder) {
     std::int64_t latest = 0;
-    if (directory.Enter(folder->fd())) {
-        while (const char* const name = NextAttribute(folder)) {
-            latest = std::max(latest, AccessTime(name));
-        }
-        if (!directory.Return()) {
-            unit.Fail(Err::kSystemCall);
-            return std::nullopt;
-        }
+    while (const char* const name = NextAttribute(folder)) {
+        latest = std::max(latest, AccessTime(folder->fd(), name));
     }
     return latest;
 }
@@ -128,12 +90,13 @@ std::optional<std::int64_t> LatestAccess(Folder* folder) {
 // Attribute files on their way into a stream.
 class AttributeImport {
  public:
-    AttributeImport(const char* object, AttributeWriter* stream)
-        : object_(object), stream_(stream) {}
+    AttributeImport(const char* object, int folder, AttributeWriter* stream)
+        : object_(object), folder_(folder), stream_(stream) {}
 
     // The attribute file `name`: into the stream and off the disk. One that fails stays where it
     // is, with a code.
     void Move(const char* name) {
+        // What no path leads to stays, too.
         char path[kPathBufferSize];
         if (MAVOEAPath(EA_FORM_FOLDER, object_, name, path, kDerivedPathMax, EA_PLACE_EADIR) != 0) {
             unit.Log("%s:%d cannot EAPath[%s][%s] MavoErr=[0x%04X %s:%d]", object_, name,
@@ -141,22 +104,25 @@ class AttributeImport {
             return;
         }
         std::uint32_t size = 0;
-        if (Read(path, &size) != 0) return;
+        if (Read(name, &size) != 0) return;
         if (!stream_->Write(name, value_.get(), size)) {
             unit.Log("%s:%d MAVOEASWrite error, MavoErr=[0x%04X %s:%d]", MLIBCErrGet(),
                      MLIBCErrorGetFile(), MLIBCErrorGetLine());
             return;
         }
-        (void)kernel::Unlink(path);
+        (void)kernel::UnlinkAt(folder_, name, 0);
     }
 
  private:
     // The file's bytes into value_. 0, or -1 after recording why.
-    int Read(const char* path, std::uint32_t* size) {
+    int Read(const char* name, std::uint32_t* size) {
         struct stat info;
-        if (kernel::Stat(path, &info) != 0) return unit.Fail(Err::kSystemCall);
+        if (kernel::FstatAt(folder_, name, &info, 0) != 0) return unit.Fail(Err::kSystemCall);
         if (S_ISDIR(info.st_mode)) return unit.Fail(Err::kRead);
-        const UniqueFd fd(kernel::OpenRegular(path, O_RDONLY | O_CLOEXEC, 0));
+        if (!S_ISREG(info.st_mode)) return unit.Fail(Err::kOpen);
+        // Should it have become something else meanwhile, nobody is waited for.
+        const UniqueFd fd(
+            kernel::OpenAt(folder_, name, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0));
         if (fd.get() <= 0) return unit.Fail(Err::kOpen);
         *size = static_cast<std::uint32_t>(info.st_size);
         if (!Reach(*size)) return unit.Fail(Err::kBufferMemory);
@@ -178,6 +144,7 @@ class AttributeImport {
     static constexpr std::uint32_t kValueMax = 0x7FFFFFFF;
 
     const char* object_;
+    int folder_;
     AttributeWriter* stream_;
     Owned<std::uint8_t> value_;
     std::uint32_t room_ = 0;
@@ -189,7 +156,7 @@ int ImportAttributeFiles(const char* szPath, const char* stream_path, Folder* fo
     AttributeWriter stream(fd.get());
     if (!stream) return kFailure;
     folder->Rewind();
-    AttributeImport import(szPath, &stream);
+    AttributeImport import(szPath, folder->fd(), &stream);
     while (const char* const name = NextAttribute(folder)) import.Move(name);
     return kConverted;
 }
@@ -205,19 +172,14 @@ int AdoptAppleDouble(const char* szPath, const char* apple_double, const char* s
 }
 
 int ConvertStream(const char* szPath, const char* stream_path, Folder* folder) {
-    std::int64_t folder_time = 0;
-    if (*folder) {
-        const auto latest = LatestAccess(folder);
-        if (!latest) return kFailure;
-        folder_time = *latest;
-    }
+    const std::int64_t folder_time = *folder ? LatestAccess(folder) : 0;
     char apple_double[kPathBufferSize];
     if (MAVOEAADPath(szPath, apple_double, kDerivedPathMax) != 0) {
         // Names that are too long for one have none.
         return MLIBCErrGet() == MAVOEA_ERR_NAME_TOO_LONG ? kConverted : kFailure;
     }
     // Its time first: looking into it is an access.
-    std::int64_t file_time = AccessTime(apple_double);
+    std::int64_t file_time = AccessTime(AT_FDCWD, apple_double);
     if (file_time != 0 && MAVOEACheckADFile(apple_double) != 0) file_time = 0;
     if (folder_time == 0 && file_time == 0) return kNothing;
     // Deliberately the time of the last access, not that of the last change.
@@ -332,8 +294,11 @@ int UpgradeResourceFile(const char* szPath) {
     }
     if (Exists(current)) return kCurrent;
     if (!Exists(legacy)) return kNothing;
-    if (!IsInFolder(legacy)) return unit.Fail(Err::kOpen);
-    if (kernel::Rename(legacy, current) != 0) return unit.Fail(Err::kRename);
+    const UniqueFd folder = FolderOf(legacy);
+    if (!folder) return unit.Fail(Err::kOpen);
+    if (kernel::RenameAt(folder.get(), MAVOEA_KIND_LEGACY_RESOURCE, AT_FDCWD, current) != 0) {
+        return unit.Fail(Err::kRename);
+    }
     CarryMarks(current, szPath);
     *strrchr(legacy, '/') = '\0';
     return RemoveFolder(legacy, kConverted);
@@ -351,7 +316,7 @@ int UpgradeReserved(const char* szPath, const char* szName) {
     if (char* const colon = strrchr(current, ':'); colon != nullptr) *colon = '@';
     if (Exists(current)) return kCurrent;
     if (!Exists(legacy)) return kNothing;
-    if (!IsInFolder(legacy)) return unit.Fail(Err::kOpen);
+    if (!FolderOf(legacy)) return unit.Fail(Err::kOpen);
     return MLIBCExec("/bin/mv", legacy, current, nullptr) == -1 ? kFailure : kConverted;
 }
 

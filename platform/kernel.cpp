@@ -44,6 +44,9 @@ void Sync() { ::sync(); }
 int Fstat(int fd, struct stat* info) { return ::fstat(fd, info); }
 int Stat(const char* path, struct stat* info) { return ::stat(path, info); }
 int Lstat(const char* path, struct stat* info) { return ::lstat(path, info); }
+int FstatAt(int dir, const char* path, struct stat* info, int flags) {
+    return ::fstatat(dir, path, info, flags);
+}
 int Access(const char* path, int mode) { return ::access(path, mode); }
 int SetLock(int fd, const struct flock64* lock) { return ::fcntl(fd, F_SETLK64, lock); }
 int GetLock(int fd, struct flock64* lock) { return ::fcntl(fd, F_GETLK64, lock); }
@@ -56,12 +59,13 @@ int UnlinkAt(int dir, const char* path, int flags) { return ::unlinkat(dir, path
 int Rmdir(const char* path) { return ::rmdir(path); }
 int Remove(const char* path) { return ::remove(path); }
 int Rename(const char* from, const char* to) { return ::rename(from, to); }
+int RenameAt(int from_dir, const char* from, int to_dir, const char* to) {
+    return ::renameat(from_dir, from, to_dir, to);
+}
 int Chmod(const char* path, mode_t mode) { return ::chmod(path, mode); }
 int Fchmod(int fd, mode_t mode) { return ::fchmod(fd, mode); }
 
 char* Getcwd(char* buffer, size_t size) { return ::getcwd(buffer, size); }
-int Chdir(const char* path) { return ::chdir(path); }
-int Fchdir(int dir) { return ::fchdir(dir); }
 DIR* Opendir(const char* path) { return ::opendir(path); }
 DIR* OpendirItself(const char* path) { return OpenDirectoryItself(path); }
 dirent* Readdir(DIR* dir) { return ::readdir(dir); }

@@ -37,6 +37,7 @@ void Sync();
 int Fstat(int fd, struct stat* info);
 int Stat(const char* path, struct stat* info);
 int Lstat(const char* path, struct stat* info);
+int FstatAt(int dir, const char* path, struct stat* info, int flags);
 int Access(const char* path, int mode);
 int SetLock(int fd, const struct flock64* lock);  // F_SETLK, 64-bit
 int GetLock(int fd, struct flock64* lock);        // F_GETLK, 64-bit
@@ -47,12 +48,11 @@ int UnlinkAt(int dir, const char* path, int flags);
 int Rmdir(const char* path);
 int Remove(const char* path);
 int Rename(const char* from, const char* to);
+int RenameAt(int from_dir, const char* from, int to_dir, const char* to);
 int Chmod(const char* path, mode_t mode);
 int Fchmod(int fd, mode_t mode);
 
 char* Getcwd(char* buffer, size_t size);
-int Chdir(const char* path);
-int Fchdir(int dir);
 DIR* Opendir(const char* path);
 DIR* OpendirItself(const char* path);  // ENOTDIR when it is a symbolic link
 dirent* Readdir(DIR* dir);

@@ -90,13 +90,6 @@ Rules UpToTheStream() {
         {.call = "access", .with = kStream, .outcome = {.result = 1}},
         // A folder that cannot be opened, or has nothing that can be looked at, has nothing.
         {.call = "opendir", .outcome = {.result = 2}},
-        {.call = "open",
-         .with = "open(., ",
-         .outcome = {.result = -1, .records = {{0x2A00, kUnit}}}},
-        {.call = "fchdir", .ordinal = 1, .outcome = {.result = -1, .records = {{0x2A00, kUnit}}}},
-        {.call = "fchdir", .ordinal = 2, .outcome = {.result = 2}},
-        // There is another way back.
-        {.call = "fchdir", .ordinal = 3, .outcome = {.files = Files::kDone}},
         {.call = "stat", .with = "{dir}/._a", .outcome = {.files = Files::kDone}},
         {.call = "open", .with = kStream, .outcome = {.result = -1, .records = {{0x900, kUnit}}}},
         {.call = "malloc",
@@ -142,7 +135,7 @@ TEST(FaultUpgradeTest, AFolderOfOneAttribute) {
             },
         .rules = UpToTheStream() +
                  Rules{
-                     {.call = "stat", .with = "stat(color)", .outcome = {.result = 2}},
+                     {.call = "stat", .with = kColor, .ordinal = 1, .outcome = {.result = 2}},
                      // The first walk ends early, or at its end; then the second.
                      {.call = "readdir", .ordinal = 4, .outcome = {.files = Files::kDone}},
                      {.call = "readdir", .ordinal = 8, .outcome = {.files = Files::kDone}},
@@ -218,8 +211,8 @@ TEST(FaultUpgradeTest, AFailureSkipsItsAttributeFileOnly) {
             UpToTheStream() +
             Rules{
                 // The latest access counts, and both are from just now.
-                {.call = "stat", .with = "stat(color)", .outcome = {.files = Files::kDone}},
-                {.call = "stat", .with = "stat(tags)", .outcome = {.files = Files::kDone}},
+                {.call = "stat", .with = kColor, .ordinal = 1, .outcome = {.files = Files::kDone}},
+                {.call = "stat", .with = kTags, .ordinal = 1, .outcome = {.files = Files::kDone}},
                 {.call = "readdir", .ordinal = 1, .outcome = {.result = 2}},
                 {.call = "readdir", .ordinal = 2, .outcome = {.result = 2}},
                 {.call = "readdir", .ordinal = 3, .outcome = {.result = 2}},
@@ -504,7 +497,9 @@ TEST(FaultUpgradeTest, AResourceFileAndItsMarks) {
                     {.call = "access", .with = kResource, .outcome = {.result = 1}},
                     {.call = "access", .errors = {ENOENT}, .outcome = {.result = 2}},
                     {.call = "access", .outcome = {.files = Files::kDone}},
-                    {.call = "lstat", .outcome = {.result = -1, .records = {{0x900, kUnit}}}},
+                    {.call = "open",
+                     .with = "@eaDir/a, ",
+                     .outcome = {.result = -1, .records = {{0x900, kUnit}}}},
                     {.call = "rename",
                      .outcome = {.result = -1,
                                  .records = {{0x2800, kUnit}},
@@ -561,7 +556,9 @@ TEST(FaultUpgradeTest, AnotherReservedName) {
                 {.call = "access", .with = "MAVO@x", .outcome = {.result = 1}},
                 {.call = "access", .errors = {ENOENT}, .outcome = {.result = 2}},
                 {.call = "access", .outcome = {.files = Files::kDone}},
-                {.call = "lstat", .outcome = {.result = -1, .records = {{0x900, kUnit}}}},
+                {.call = "open",
+                 .with = "@eaDir/a, ",
+                 .outcome = {.result = -1, .records = {{0x900, kUnit}}}},
                 {.call = "MLIBCExec", .errors = {kAnswer}, .outcome = {.result = -1}},
                 // Only that it could not be run is a failure.
                 {.call = "MLIBCExec"},

@@ -311,10 +311,7 @@ namespace mavoea::kernel {
 
 using namespace mavoea::test;
 
-int Open(const char* path, int flags, mode_t mode) {
-    return Call("open", Text(path) + ", " + Flags(flags) + ", " + Octal(mode), -1,
-                [&] { return Opened(path, flags, [&] { return ::open(path, flags, mode); }); });
-}
+int Open(const char* path, int flags, mode_t mode) { return OpenAt(AT_FDCWD, path, flags, mode); }
 
 int OpenRegular(const char* path, int flags, mode_t mode) {
     return Call(
@@ -324,7 +321,10 @@ int OpenRegular(const char* path, int flags, mode_t mode) {
 
 // Calls that take a directory are logged, and stood in for, under the whole path.
 int OpenAt(int dir, const char* path, int flags, mode_t mode) {
-    return Open(WholePath(dir, path).c_str(), flags, mode);
+    const std::string whole = WholePath(dir, path);
+    return Call("open", whole + ", " + Flags(flags) + ", " + Octal(mode), -1, [&] {
+        return Opened(whole.c_str(), flags, [&] { return ::openat(dir, path, flags, mode); });
+    });
 }
 
 int Close(int fd) {
@@ -415,6 +415,16 @@ int Lstat(const char* path, struct stat* info) {
                 [&] { return Hooks().lstat ? Hooks().lstat(path, info) : ::lstat(path, info); });
 }
 
+// A "stat" or, with AT_SYMLINK_NOFOLLOW, an "lstat" of the whole path.
+int FstatAt(int dir, const char* path, struct stat* info, int flags) {
+    const std::string whole = WholePath(dir, path);
+    const bool itself = (flags & AT_SYMLINK_NOFOLLOW) != 0;
+    const auto& hook = itself ? Hooks().lstat : Hooks().stat;
+    return Call(itself ? "lstat" : "stat", whole, -1, [&] {
+        return hook ? hook(whole.c_str(), info) : ::fstatat(dir, path, info, flags);
+    });
+}
+
 int Access(const char* path, int mode) {
     return Call("access", Text(path) + ", " + Number(mode), -1,
                 [&] { return ::access(path, mode); });
@@ -462,11 +472,15 @@ int Remove(const char* path) {
     return Call("remove", Text(path), -1, [&] { return Removed(path, ::remove(path)); });
 }
 
-int Rename(const char* from, const char* to) {
-    return Call("rename", Text(from) + ", " + Text(to), -1, [&] {
-        const int result = ::rename(from, to);
+int Rename(const char* from, const char* to) { return RenameAt(AT_FDCWD, from, AT_FDCWD, to); }
+
+int RenameAt(int from_dir, const char* from, int to_dir, const char* to) {
+    const std::string former = WholePath(from_dir, from);
+    const std::string now = WholePath(to_dir, to);
+    return Call("rename", former + ", " + now, -1, [&] {
+        const int result = ::renameat(from_dir, from, to_dir, to);
         Tell(result == 0,
-             [&] { return FileChange{.kind = FileChange::kRenamed, .path = from, .to = to}; });
+             [&] { return FileChange{.kind = FileChange::kRenamed, .path = former, .to = now}; });
         return result;
     });
 }
@@ -483,14 +497,6 @@ int Fchmod(int fd, mode_t mode) {
 char* Getcwd(char* buffer, size_t size) {
     return Call("getcwd", Number(static_cast<long long>(size)), static_cast<char*>(nullptr),
                 [&] { return ::getcwd(buffer, size); });
-}
-
-int Chdir(const char* path) {
-    return Call("chdir", Text(path), -1, [&] { return ::chdir(path); });
-}
-
-int Fchdir(int dir) {
-    return Call("fchdir", "", -1, [&] { return ::fchdir(dir); });
 }
 
 DIR* Opendir(const char* path) {

@@ -4,7 +4,7 @@
 // Call names are the C library's in lower case: "open", "close", "pread", "preadv", "pwrite",
 // "pwritev", "lseek", "ftruncate", "fallocate", "fsync", "sync", "fstat", "stat", "lstat",
 // "access", "setlock", "getlock", "mkdir", "unlink", "rmdir", "remove", "rename", "chmod",
-// "fchmod", "getcwd", "chdir", "fchdir", "opendir", "readdir", "rewinddir", "closedir", "geteuid",
+// "fchmod", "getcwd", "opendir", "readdir", "rewinddir", "closedir", "geteuid",
 // "seteuid", "time", "system", "listxattr", "getxattr", "setxattr", "removexattr",
 // "fopen", "fread", "fwrite", "fclose", "archive", "command" (the platform's system call 403),
 // "malloc" (every allocation).
