@@ -190,7 +190,9 @@ MAVOEA_API int MAVOEAMKDir(int blParentFirst, const char* szEADirPath);
  * for who has a lease on the file, and for nobody else. Returns a descriptor, which the caller
  * closes, or -1: a failed open(2) records no code and leaves its errno; 0xD00 NULL
  * argument (errno ENOENT) or unknown place; otherwise the codes of the path functions and of
- * MAVOEAMKDir(). */
+ * MAVOEAMKDir(). What is missing is first looked for in earlier layouts, by MAVOEAUpgrade(), whose
+ * codes are recorded. Where that fails, with O_CREAT, nothing is made over what it may have left:
+ * -1, with its errno and codes. */
 MAVOEA_API int MAVOEAOpen(int form, const char* szPath, const char* szName, int oflag, int place);
 
 /* MAVOEAOpen() for EA_PLACE_EADIR. */
@@ -421,22 +423,28 @@ MAVOEA_API int MAVOEAFixErrorAD(const char* path);
 /* Converts what earlier versions kept for the object at szPath into the current layout; szName is
  * what is about to be opened:
  *
- *   MAVOEA_KIND_STREAM    the files of the legacy folder "@eaDir/<name>/", one per attribute, each
- *                         removed once it is in the stream; or a "._" file, which becomes the
+ *   MAVOEA_KIND_STREAM    the files of the legacy folder "@eaDir/<name>/", one per attribute,
+ *                         removed once all are in the stream; or a "._" file, which becomes the
  *                         stream as it is when it was read no earlier than all of those
  *   MAVOEA_KIND_RESOURCE  the legacy "MAVO:Resource"; the object gets its marks: write permissions
  *                         for everybody or nobody, and the hidden bit
  *   other "MAVO..."       a file of the legacy folder: its ':' becomes '@' there
  *
- * A legacy folder that is empty then is removed. MAVOEAOpen() calls this. Files that cannot be
- * converted stay where they are. The process's working directory is neither used nor changed,
- * unless szPath is relative to it.
+ * A legacy folder that is empty then is removed. MAVOEAOpen() calls this. Attribute files that
+ * cannot be read, or that no stream can hold, stay where they are, with a code and a line in the
+ * log; the others are converted. The stream gets its name when it has all values and they are on
+ * disk: what fails before leaves everything as it was. The process's working directory is neither
+ * used nor changed, unless szPath is relative to it.
  *
  * 0 converted; 1 the current layout is there already; 2 there is nothing of that kind; -1: 0xD00 an
- * unknown kind or NULL; 0x900 the stream could not be opened; 0x2800 rename; 0x3900 the legacy
- * folder could not be removed; what the path and stream functions give. Codes are recorded for
- * files that stay, too: 0x2A00 stat, 0x900 open, 0x100 memory, 0xA00 read; and for marks: 0x900,
- * 0xA00, 0x4000 no AppleDouble file, or one without them. */
+ * unknown kind or NULL; 0x900 the stream could not be made, or what may be there (a file of either
+ * layout, the folder, the "._" file) could not be looked at; 0xA00 the folder could not be read to
+ * its end; 0x2A00 none of its files could be looked at; 0x2800 rename; 0x3900 the legacy folder
+ * could not be removed, all else is done; what the path and stream functions give. errno is that of
+ * the call that failed. Codes are recorded for files that stay, too: 0x2A00 stat, 0x900 open, 0x100
+ * memory, 0xA00 read, 0xD00 a name of 255 bytes; for the "._" file that objects with names of 254
+ * and 255 bytes cannot have: 0xC300; and for marks: 0x900, 0xA00, 0x4000 no AppleDouble file, or
+ * one without them. */
 MAVOEA_API int MAVOEAUpgrade(const char* szPath, const char* szName);
 
 /* ---- Remove, rename and copy ----------------------------------------------------------------- */

@@ -13,10 +13,12 @@
 #include "format/apple_double.h"
 #include "include/mavoea.h"
 #include "ops/folder.h"
+#include "ops/new_file.h"
 #include "platform/file_status.h"
 #include "platform/include/mavocore.h"
 #include "platform/marks.h"
 #include "stream/attribute_writer.h"
+#include "stream/layout.h"
 #include "util/file_io.h"
 #include "util/owned.h"
 #include "util/path_text.h"
@@ -37,10 +39,16 @@ constexpr mode_t kMode = 0777;
 constexpr mode_t kWritable = 0222;
 constexpr mode_t kPermissions = 07777;
 
-// Only what is known to be missing is: what cannot be looked at is not written over.
-bool Exists(const char* path) {
-    return kernel::Access(path, F_OK) == 0 ||
-           (errno != ENOENT && errno != ENOTDIR && errno != ENAMETOOLONG);
+// Whether a call that failed with `error` has said that there is no such file. After any other
+// failure there may be one, and nothing is decided.
+constexpr bool SaysMissing(int error) {
+    return error == ENOENT || error == ENOTDIR || error == ENAMETOOLONG;
+}
+
+// Whether something is at `path`: 1 or 0, or -1 after recording that it cannot be told.
+int IsThere(const char* path, int line = __builtin_LINE()) {
+    if (kernel::Access(path, F_OK) == 0) return 1;
+    return SaysMissing(errno) ? 0 : unit.Fail(Err::kOpen, line);
 }
 
 // The folder of the legacy file at `path`, for calls on what is in it; not one that a symbolic link
@@ -51,11 +59,15 @@ UniqueFd FolderOf(const char* path) {
     return UniqueFd(kernel::Open(folder, O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC, 0));
 }
 
-// Removes a legacy folder that has become empty; one that has not, stays. `result`, or kFailure.
+// Removes a legacy folder that has become empty; one that has not, stays. `result`, or kFailure. A
+// failure of the conversion stands as it was recorded.
 int RemoveFolder(const char* folder, int result, int line = __builtin_LINE()) {
-    const ErrnoKeeper keep;
-    if (kernel::Rmdir(folder) == 0 || errno == ENOTEMPTY || errno == ENOENT) return result;
-    return unit.Fail(Err::kRemove, line);
+    const int error = errno;
+    if (kernel::Rmdir(folder) != 0 && errno != ENOTEMPTY && errno != ENOENT && result != kFailure) {
+        return unit.Fail(Err::kRemove, line);
+    }
+    errno = error;
+    return result;
 }
 
 // ---- Attribute files ----------------------------------------------------------------------------
@@ -70,21 +82,28 @@ const char* NextAttribute(Folder* folder) {
     return nullptr;
 }
 
-// When a file was last read, in seconds; 0 when it cannot be told.
-std::int64_t AccessTime(int dir, const char* path) {
-    struct stat info;
-    if (kernel::FstatAt(dir, path, &info, 0) != 0) return 0;
+// When a file was last read, in seconds.
+std::int64_t AccessTime(const struct stat& info) {
     return std::max<std::int64_t>(info.st_atime, 0);
 }
 
 // When the attribute files of a legacy folder were last read: the latest counts, 0 when there are
-// none.
+// none. -1 after recording that the folder could not be read, or none of the files looked at.
 std::int64_t LatestAccess(Folder* folder) {
     std::int64_t latest = 0;
+    int unseen = 0;  // why one could not be looked at
     while (const char* const name = NextAttribute(folder)) {
-        latest = std::max(latest, AccessTime(folder->fd(), name));
+        struct stat info;
+        if (kernel::FstatAt(folder->fd(), name, &info, 0) == 0) {
+            latest = std::max(latest, AccessTime(info));
+        } else if (!SaysMissing(errno)) {
+            unseen = errno;
+        }
     }
-    return latest;
+    if (folder->failed()) return unit.Fail(Err::kRead);
+    if (latest != 0 || unseen == 0) return latest;
+    errno = unseen;
+    return unit.Fail(Err::kSystemCall);
 }
 
 // Attribute files on their way into a stream.
@@ -93,24 +112,27 @@ class AttributeImport {
     AttributeImport(const char* object, int folder, AttributeWriter* stream)
         : object_(object), folder_(folder), stream_(stream) {}
 
-    // The attribute file `name`: into the stream and off the disk. One that fails stays where it
-    // is, with a code.
-    void Move(const char* name) {
+    // The attribute file `name` into the stream. What cannot be read, or no stream can hold, is
+    // left out, with a code and a line. False when the stream could not be written, with both as
+    // well.
+    bool Add(const char* name) {
         // What no path leads to stays, too.
         char path[kPathBufferSize];
         if (MAVOEAPath(EA_FORM_FOLDER, object_, name, path, kDerivedPathMax, EA_PLACE_EADIR) != 0) {
             unit.Log("%s:%d cannot EAPath[%s][%s] MavoErr=[0x%04X %s:%d]", object_, name,
                      MLIBCErrGet(), MLIBCErrorGetFile(), MLIBCErrorGetLine());
-            return;
+            return true;
         }
         std::uint32_t size = 0;
-        if (Read(name, &size) != 0) return;
-        if (!stream_->Write(name, value_.get(), size)) {
-            unit.Log("%s:%d MAVOEASWrite error, MavoErr=[0x%04X %s:%d]", MLIBCErrGet(),
-                     MLIBCErrorGetFile(), MLIBCErrorGetLine());
-            return;
+        if (Read(name, &size) != 0) {
+            unit.Log("%s:%d cannot read[%s][%s] MavoErr=[0x%04X %s:%d]", object_, name,
+                     MLIBCErrGet(), MLIBCErrorGetFile(), MLIBCErrorGetLine());
+            return true;
         }
-        (void)kernel::UnlinkAt(folder_, name, 0);
+        if (stream_->Write(name, value_.get(), size)) return true;
+        unit.Log("%s:%d MAVOEASWrite error, MavoErr=[0x%04X %s:%d]", MLIBCErrGet(),
+                 MLIBCErrorGetFile(), MLIBCErrorGetLine());
+        return MLIBCErrGet() == MAVOEA_ERR_BAD_ARGUMENT;
     }
 
  private:
@@ -150,18 +172,47 @@ class AttributeImport {
     std::uint32_t room_ = 0;
 };
 
+// The stream gets its name when it has all values and they are on disk, and the files go after
+// that: each attribute is always where it is looked for.
 int ImportAttributeFiles(const char* szPath, const char* stream_path, Folder* folder) {
-    const UniqueFd fd(kernel::OpenRegular(stream_path, O_RDWR | O_CREAT | O_CLOEXEC, kMode));
-    if (!fd) return unit.Fail(Err::kOpen);
-    AttributeWriter stream(fd.get());
+    NewFile file(SplitObject(stream_path).parent, kMode);
+    if (!file) return unit.Fail(Err::kOpen);
+    AttributeWriter stream(file.fd());
     if (!stream) return kFailure;
     folder->Rewind();
     AttributeImport import(szPath, folder->fd(), &stream);
-    while (const char* const name = NextAttribute(folder)) import.Move(name);
+    while (const char* const name = NextAttribute(folder)) {
+        if (!import.Add(name)) return kFailure;
+    }
+    if (folder->failed()) return unit.Fail(Err::kRead);
+
+    // From its name on, others may want it.
+    (void)MAVOEASLockSet(stream.stream(), F_UNLCK);
+    if (!file.Name(stream_path)) {
+        const ErrnoKeeper keep;
+        const bool made_meanwhile = errno == EEXIST && kernel::Access(stream_path, F_OK) == 0;
+        return made_meanwhile ? kCurrent : unit.Fail(Err::kOpen);
+    }
+    // The name is on disk, too, before they go.
+    if (MAVOEASFlush(stream.stream()) != 0) return kConverted;
+    for (const EASEntry& attribute : Attributes(*stream.stream())) {
+        (void)kernel::UnlinkAt(folder->fd(), attribute.name, 0);
+    }
     return kConverted;
 }
 
 // ---- Streams ------------------------------------------------------------------------------------
+
+// When the "._" file at `path` was last read, in seconds; 0 when there is none. -1 after recording
+// that it cannot be told.
+std::int64_t AppleDoubleAccess(const char* path) {
+    struct stat info;
+    if (kernel::FstatAt(AT_FDCWD, path, &info, AT_SYMLINK_NOFOLLOW) != 0) {
+        return SaysMissing(errno) ? 0 : unit.Fail(Err::kOpen);
+    }
+    // Looking into it, which is an access, comes after its time.
+    return MAVOEACheckADFile(path) == 0 ? AccessTime(info) : 0;
+}
 
 // The "._" file becomes the stream as it is.
 int AdoptAppleDouble(const char* szPath, const char* apple_double, const char* stream_path) {
@@ -173,14 +224,15 @@ int AdoptAppleDouble(const char* szPath, const char* apple_double, const char* s
 
 int ConvertStream(const char* szPath, const char* stream_path, Folder* folder) {
     const std::int64_t folder_time = *folder ? LatestAccess(folder) : 0;
+    if (folder_time < 0) return kFailure;
     char apple_double[kPathBufferSize];
     if (MAVOEAADPath(szPath, apple_double, kDerivedPathMax) != 0) {
         // Names that are too long for one have none.
-        return MLIBCErrGet() == MAVOEA_ERR_NAME_TOO_LONG ? kConverted : kFailure;
+        if (MLIBCErrGet() != MAVOEA_ERR_NAME_TOO_LONG) return kFailure;
+        return folder_time == 0 ? kConverted : ImportAttributeFiles(szPath, stream_path, folder);
     }
-    // Its time first: looking into it is an access.
-    std::int64_t file_time = AccessTime(AT_FDCWD, apple_double);
-    if (file_time != 0 && MAVOEACheckADFile(apple_double) != 0) file_time = 0;
+    const std::int64_t file_time = AppleDoubleAccess(apple_double);
+    if (file_time < 0) return kFailure;
     if (folder_time == 0 && file_time == 0) return kNothing;
     // Deliberately the time of the last access, not that of the last change.
     return file_time < folder_time ? ImportAttributeFiles(szPath, stream_path, folder)
@@ -195,9 +247,10 @@ int UpgradeStream(const char* szPath) {
         MAVOEADirPath(EA_FORM_FOLDER, szPath, folder_path, kDerivedPathMax) != 0) {
         return kFailure;
     }
-    if (Exists(stream_path)) return kCurrent;
+    if (const int there = IsThere(stream_path); there != 0) return there;
 
     Folder folder(folder_path);
+    if (!folder && !SaysMissing(errno)) return unit.Fail(Err::kOpen);
     const bool missing = !folder && errno == ENOENT;
     const int result = ConvertStream(szPath, stream_path, &folder);
     return missing ? result : RemoveFolder(folder_path, result);
@@ -292,8 +345,8 @@ int UpgradeResourceFile(const char* szPath) {
                    EA_PLACE_EADIR) != 0) {
         return kFailure;
     }
-    if (Exists(current)) return kCurrent;
-    if (!Exists(legacy)) return kNothing;
+    if (const int there = IsThere(current); there != 0) return there;
+    if (const int there = IsThere(legacy); there != 1) return there == 0 ? kNothing : kFailure;
     const UniqueFd folder = FolderOf(legacy);
     if (!folder) return unit.Fail(Err::kOpen);
     if (kernel::RenameAt(folder.get(), MAVOEA_KIND_LEGACY_RESOURCE, AT_FDCWD, current) != 0) {
@@ -314,8 +367,8 @@ int UpgradeReserved(const char* szPath, const char* szName) {
     char current[kPathBufferSize];
     memcpy(current, legacy, sizeof legacy);
     if (char* const colon = strrchr(current, ':'); colon != nullptr) *colon = '@';
-    if (Exists(current)) return kCurrent;
-    if (!Exists(legacy)) return kNothing;
+    if (const int there = IsThere(current); there != 0) return there;
+    if (const int there = IsThere(legacy); there != 1) return there == 0 ? kNothing : kFailure;
     if (!FolderOf(legacy)) return unit.Fail(Err::kOpen);
     return MLIBCExec("/bin/mv", legacy, current, nullptr) == -1 ? kFailure : kConverted;
 }

@@ -5,6 +5,7 @@
 #include <errno.h>
 
 #include "include/mavoea.h"
+#include "platform/include/mavocore.h"
 #include "platform/kernel.h"
 #include "util/metadata_file.h"
 #include "util/path_text.h"
@@ -31,6 +32,15 @@ int OpenAppleDouble(int form, const char* szPath, const char* szName, int oflag)
     return kernel::OpenRegular(path, oflag, kMode);
 }
 
+// Whether an upgrade that has just failed may have left something that a new file would hide. It
+// has not when only the emptied folder could not be removed, and when there is no earlier layout of
+// the kind, or none of a path that long.
+bool MayHaveLeftSomething() {
+    const int code = MLIBCErrGet();
+    return code != MAVOEA_ERR_REMOVE && code != MAVOEA_ERR_BAD_ARGUMENT &&
+           code != MAVOEA_ERR_NAME_TOO_LONG;
+}
+
 // With `made`, that is told of OpenOrMake().
 int OpenInEADir(int form, const char* szPath, const char* szName, int oflag, bool* made) {
     if (szPath == nullptr || szName == nullptr) {
@@ -50,7 +60,9 @@ int OpenInEADir(int form, const char* szPath, const char* szName, int oflag, boo
     const int fd = kernel::OpenRegular(path, oflag & ~O_CREAT, kMode);
     if (fd >= 0 || errno != ENOENT) return fd;
     // Before it is missed, or made empty, it is looked for where earlier versions kept it.
-    (void)MAVOEAUpgrade(szPath, szName);
+    if (MAVOEAUpgrade(szPath, szName) == -1 && (oflag & O_CREAT) != 0 && MayHaveLeftSomething()) {
+        return -1;
+    }
     if (made != nullptr) return OpenOrMake(path, made);
     return kernel::OpenRegular(path, oflag, kMode);
 }

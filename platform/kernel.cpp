@@ -54,6 +54,9 @@ int GetLock(int fd, struct flock64* lock) { return ::fcntl(fd, F_GETLK64, lock);
 int MkdirAt(int dir, const char* path, mode_t mode) {
     return dir == AT_FDCWD ? ::mkdir(path, mode) : ::mkdirat(dir, path, mode);
 }
+int Link(const char* from, const char* to, int flags) {
+    return ::linkat(AT_FDCWD, from, AT_FDCWD, to, flags);
+}
 int Unlink(const char* path) { return ::unlink(path); }
 int UnlinkAt(int dir, const char* path, int flags) { return ::unlinkat(dir, path, flags); }
 int Rmdir(const char* path) { return ::rmdir(path); }
@@ -75,6 +78,7 @@ int Closedir(DIR* dir) { return ::closedir(dir); }
 
 uid_t Geteuid() { return ::geteuid(); }
 int Seteuid(uid_t uid) { return ::seteuid(uid); }
+pid_t Getpid() { return ::getpid(); }
 time_t Time() { return ::time(nullptr); }
 // NOLINTNEXTLINE(cert-env33-c): callers quote what they pass on.
 int System(const char* command) { return ::system(command); }

@@ -43,6 +43,7 @@ int SetLock(int fd, const struct flock64* lock);  // F_SETLK, 64-bit
 int GetLock(int fd, struct flock64* lock);        // F_GETLK, 64-bit
 
 int MkdirAt(int dir, const char* path, mode_t mode);
+int Link(const char* from, const char* to, int flags);  // linkat(2)
 int Unlink(const char* path);
 int UnlinkAt(int dir, const char* path, int flags);
 int Rmdir(const char* path);
@@ -62,6 +63,7 @@ int Closedir(DIR* dir);
 
 uid_t Geteuid();
 int Seteuid(uid_t uid);
+pid_t Getpid();
 time_t Time();
 int System(const char* command);
 

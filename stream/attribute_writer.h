@@ -25,6 +25,9 @@ class AttributeWriter {
     // MAVOEASWrite(), or of MAVOEASOpen().
     bool Write(const char* name, const void* value, std::uint32_t size);
 
+    // The stream as it was opened, with all that has been written since.
+    EASHandle* stream() const { return stream_; }
+
  private:
     void Close();
 

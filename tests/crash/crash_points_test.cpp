@@ -801,15 +801,11 @@ TEST(CrashPointsTest, ARenameOfLegacyMetadataHasEveryItemInOneOfThreePlaces) {
         {{"", "folder all; old none; new none; new folder none"},
          {"rename", "folder user.one, user.two; old Finder info, fork; new none; new folder none"},
          {"rename", "folder user.one, user.two; old none; new Finder info, fork; new folder none"},
-         {"open", "folder user.one, user.two; old none; new Finder info, fork; new folder none",
-          "0: folder none; old none; new Finder info, fork; new folder user.one, user.two"},
-         {"pwrite",
-          "folder user.one, user.two; old an attribute; new Finder info, fork; new folder none",
-          "0: folder none; old none; new Finder info, an attribute, fork; new folder user.one, "
-          "user.two"},
-         {"unlink", "folder an attribute; old an attribute; new Finder info, fork; new folder none",
-          "0: folder none; old none; new Finder info, an attribute, fork; new folder an attribute"},
-         {"pwrite",
+         {"link",
+          "folder user.one, user.two; old user.one, user.two; new Finder info, fork; new folder "
+          "none",
+          "0: folder none; old none; new all; new folder user.one, user.two"},
+         {"unlink",
           "folder an attribute; old user.one, user.two; new Finder info, fork; new folder none",
           "0: folder none; old none; new all; new folder an attribute"},
          {"unlink", "folder none; old user.one, user.two; new Finder info, fork; new folder none"},
@@ -845,9 +841,11 @@ Operation UpgradeOf(const std::string& name, const std::string& kind,
     };
 }
 
-Items AttributesOnly() {
-    Items items = Wanted();
-    std::erase_if(items, [](const auto& item) { return !IsAttribute(item.first); });
+// Attributes of several pages each, but for one.
+const Items& LegacyAttributes() {
+    static const Items& items = *new Items{{"user.one", Pattern(9000, 1)},
+                                           {"user.two", Pattern(50, 2)},
+                                           {"user.three", Pattern(13000, 3)}};
     return items;
 }
 Items ResourceOnly() {
@@ -856,30 +854,68 @@ Items ResourceOnly() {
     return items;
 }
 
-std::string CostOfUpgrade(const World& world, const Items& wanted) {
-    const Items now = World::Found(world.src(), 1);
-    const std::string text =
-        CostOfMoving({{"folder", FoundLegacy(world.src())}, {"current", now}}, wanted);
-    // Nothing in a folder is looked at once there is a stream.
-    const bool hidden = text != "folder none; current all" && Exists(world.src().stream());
-    return text + (hidden ? "; out of sight" : "");
+void FillLegacyAttributes(const World& world) {
+    world.src().MakeFolder();
+    for (const auto& [name, value] : LegacyAttributes()) {
+        WriteFile(world.src().folder() + "/" + name, value);
+    }
 }
 
-TEST(CrashPointsTest, AnUpgradeLosesNothingButMayLeaveAttributeFilesOutOfSight) {
-    Operation operation =
-        UpgradeOf("upgrade of attribute files", MAVOEA_KIND_STREAM, FillLegacy,
-                  [](const World& world) { return CostOfUpgrade(world, AttributesOnly()); },
-                  {{"", "folder all; current none"},
-                   {"open", "folder all; current none; out of sight",
-                    "0: folder all; current none; out of sight"},
-                   {"pwrite", "folder all; current an attribute; out of sight",
-                    "0: folder all; current an attribute; out of sight"},
-                   {"unlink", "folder an attribute; current an attribute; out of sight",
-                    "0: folder an attribute; current an attribute; out of sight"},
-                   {"pwrite", "folder an attribute; current all; out of sight",
-                    "0: folder an attribute; current all; out of sight"},
-                   {"unlink", "folder none; current all"}});
-    KillEverywhere(operation);
+// Nothing in a folder is looked at once there is a stream: what that lacks is out of sight.
+std::string CostOfUpgrade(const World& world) {
+    const Items& wanted = LegacyAttributes();
+    const bool current = Exists(world.src().stream());
+    const Items now = current ? LookAtStream(world.src().stream()).items : Items{};
+    std::size_t files = 0;
+    for (const auto& [name, value] : wanted) {
+        const std::string file = world.src().folder() + "/" + name;
+        const bool is_file = Exists(file) && ReadFile(file) == value;
+        files += is_file ? 1 : 0;
+        const auto at = now.find(name);
+        const bool is_attribute = at != now.end() && at->second == value;
+        if (!is_file && !is_attribute) return "LOST " + name;
+        if (current && !is_attribute) return "out of sight: " + name;
+    }
+    return std::to_string(files) + " files" + (current ? " and the stream" : "");
+}
+
+Operation UpgradeOfAttributes() {
+    return UpgradeOf("upgrade of attribute files", MAVOEA_KIND_STREAM, FillLegacyAttributes,
+                     CostOfUpgrade,
+                     {{"", "3 files"},
+                      {"link", "3 files and the stream", "0: 3 files and the stream"},
+                      {"unlink", "2 files and the stream", "0: 2 files and the stream"},
+                      {"unlink", "1 files and the stream", "0: 1 files and the stream"},
+                      {"unlink", "0 files and the stream"}});
+}
+
+TEST(CrashPointsTest, AnUpgradeLosesNothingAndPutsNothingOutOfSight) {
+    KillEverywhere(UpgradeOfAttributes());
+}
+
+// The file has no name yet.
+TEST(CrashPointsTest, AnUpgradeThatIsCutShortWithinAWriteHasDoneNothing) {
+    const Operation operation = UpgradeOfAttributes();
+    std::set<std::string> found;
+    int points = 0;
+    bool more = true;
+    for (int nth = 1; more; ++nth) {
+        for (std::size_t bytes = 4096; bytes < 23000; bytes += 4096) {
+            const World world;
+            operation.prepare(world);
+            CrashRun crash;
+            ASSERT_NO_FATAL_FAILURE(
+                crash.DieWithin(nth, bytes, [&] { return operation.run(world); }));
+            more = crash.writes() >= nth;
+            if (!more) break;
+            ++points;
+            found.insert(operation.cost(world));
+            EXPECT_EQ(1u, NamesIn(world.src().ea_dir()).size());
+            (void)TakeCallNames();
+        }
+    }
+    EXPECT_EQ((std::set<std::string>{"3 files"}), found);
+    printf("crash points: within the writes of: %s: %d\n", operation.name.c_str(), points);
 }
 
 TEST(CrashPointsTest, AnUpgradeOfOneFileIsDoneOrNot) {

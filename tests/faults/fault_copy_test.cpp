@@ -429,13 +429,10 @@ void AddWhatDoesNotMatter(Table* table) {
     }
     table->Add("open", "{dir}/dst/b, ", {}, table->Done());  // for the archive bit
     table->Add("rmdir", "{dir}/src/@eaDir)", {}, table->Gone());
-    // A legacy file that cannot be looked for is left alone.
     table->Add("access", "MAVO:Resource", {ENOENT}, table->Done());
-    Outcome legacy = table->Done();
-    legacy.any_records = true;
-    table->Add("access", "MAVO:Resource", {}, legacy);
     // Whether a directory is there is asked once more by making it.
-    table->Add("access", "{dir}/dst/@eaDir", {}, table->Done());
+    table->Add("access", "{dir}/dst/@eaDir, ", {}, table->Done());
+    table->Add("access", "{dir}/dst/@eaDir/b, ", {}, table->Done());
 }
 
 // The locked state, which the copy's result does not depend on; but what follows it is left out.
@@ -695,16 +692,21 @@ void AddDirectory(Table* table, int result_of_none,
     AddExact(table, "lstat", "{dir}/dst/@eaDir)", failed({{0x2A00, "ea_mkdir.c"}}));
 }
 
-// The upgrade's look for an earlier layout, before a file of the current one is made, and the mode
-// that the file is given.
+// The upgrade's look for an earlier layout, before a file of the current one is made over it, and
+// the mode that the file is given.
 void AddNewFile(Table* table, const char* file) {
     table->Add("open", Kept(std::string(file) + ", O_RDWR|O_CLOEXEC|O_NOFOLLOW"), {ENOENT},
                table->Done());
     table->Add("open", Kept(std::string(file) + ", O_RDWR|O_TRUNC|O_CLOEXEC|O_NOFOLLOW"), {ENOENT},
                table->Done());
-    table->Add("access", Kept(std::string(file) + ", "), {}, table->Done());
-    table->Add("opendir", "{dir}/dst/@eaDir/b)", {}, table->Done());
-    table->Add("stat", "{dir}/dst/._b)", {}, table->Done());
+    for (const auto& [call, with] : {std::pair{"access", Kept(std::string(file) + ", ")},
+                                     {"access", "{dir}/dst/@eaDir/b/MAVO:Resource, "},
+                                     {"opendir", "{dir}/dst/@eaDir/b)"},
+                                     {"lstat", "{dir}/dst/._b)"}}) {
+        table->Add(call, with, {ENOENT, ENOTDIR, ENAMETOOLONG}, table->Done());
+        table->Add(call, with, {},
+                   {.result = -1, .files = Files::kAnything, .any_log = true, .any_records = true});
+    }
     table->Add("mkdir", "{dir}/dst/@eaDir,", {EEXIST}, table->Done());
     table->Add("fchmod", Kept(std::string(file) + ", "), {}, table->Gone());
 }
@@ -755,6 +757,10 @@ void AddSyncRead(Table* table, const char* complaint, int ordinal) {
 
 // Anything else that fails makes the whole fail, and that is logged.
 void AddTheRest(Table* table) {
+    // A legacy file that cannot be looked for is left alone.
+    Outcome legacy = table->Done();
+    legacy.any_records = true;
+    table->Add("access", "MAVO:Resource", {}, legacy);
     const Outcome failed = {
         .result = -1, .files = Files::kAnything, .any_log = true, .any_records = true};
     for (const char* call : {"malloc", "open", "setlock", "lseek", "pread", "pwrite", "fstat",
@@ -825,8 +831,14 @@ Outcome NotCopied(const Records& records) {
 
 // The upgrade of the source looks for each of its files first.
 void AddUpgrade(Table* table) {
-    table->Add("access", kSrcResource, {}, table->Done(), 1);
-    table->Add("access", kSrcStream, {}, table->Done(), 1);
+    for (const auto& [file, what] :
+         {std::pair{kSrcResource, "MavoResource"}, {kSrcStream, "eastream"}}) {
+        table->Add("access", file, {ENOENT, ENOTDIR, ENAMETOOLONG}, table->Done(), 1);
+        Outcome logged = table->Done({{0x900, "ea_upgrade"}});
+        logged.log = {Kept(std::string("ea_copy.c:LINE Fail to upgrde ") + what +
+                           " of {dir}/src/a.[0x0900 ea_upgrade:LINE]")};
+        table->Add("access", file, {}, logged, 1);
+    }
 }
 
 TEST(FaultCopyTest, BetweenEADirectories) {
@@ -986,12 +998,9 @@ void FillToAppleDouble(Table* table, const Way& way) {
     Outcome cleaned = table->Gone();
     cleaned.any_log = true;
     cleaned.any_records = true;
-    for (const char* call :
-         {"opendir", "readdir", "chdir", "fchdir", "rmdir", "MLIBCExec", "lstat"}) {
+    for (const char* call : {"opendir", "readdir", "rmdir", "MLIBCExec", "lstat"}) {
         table->Add(call, "", {}, cleaned);
     }
-    table->Add("open", "(., ", {}, cleaned);
-    table->Add("stat", "._a", {}, cleaned);
     table->Add("access", kSrcStream, {}, cleaned);
 }
 

@@ -300,6 +300,10 @@ TEST(OpenFaults, AStreamIsMadeWithItsDirectoryOrErrnoTells) {
     c.clean = {.any_log = true, .any_records = true};
     const Outcome left = {.result = -1, .records = {kNotOpened}, .made = {"@eaDir"}};
     const Outcome not_opened = {.result = -1, .error = kInjectedErrno, .made = {"@eaDir"}};
+    const Outcome unseen = {.result = -1,
+                            .records = {{0x900, "ea_upgrade"}},
+                            .error = kInjectedErrno,
+                            .made = {"@eaDir"}};
     c.rules =
         Rules{{.call = "malloc", .ordinal = 1, .outcome = {.result = -1, .records = {kNoMemory}}}} +
         MakingOf("@eaDir") +
@@ -321,7 +325,17 @@ TEST(OpenFaults, AStreamIsMadeWithItsDirectoryOrErrnoTells) {
              .ordinal = 1,
              .errors = {EIO, EACCES, EPERM, EMFILE, EINTR, ENOMEM, EROFS, ENOSPC},
              .outcome = not_opened},
-            // The search in older layouts, and what the platform says.
+            // The search in older layouts, which must not miss what a new file would hide.
+            {.call = "access", .errors = {ENOENT}, .outcome = {.files = Files::kDone}},
+            {.call = "access", .outcome = unseen},
+            {.call = "opendir", .errors = {ENOENT}, .outcome = {.files = Files::kDone}},
+            {.call = "opendir", .outcome = unseen},
+            {.call = "lstat",
+             .with = "{dir}/._a)",
+             .errors = {ENOENT},
+             .outcome = {.files = Files::kDone}},
+            {.call = "lstat", .with = "{dir}/._a)", .outcome = unseen},
+            // What the platform says.
             {.call = "", .outcome = {.files = Files::kDone, .any_log = true, .any_records = true}}};
     SweepFaults(c);
 }

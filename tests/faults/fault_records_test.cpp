@@ -496,20 +496,17 @@ TEST(FaultRecordsTest, BringingNoFinderInfoIntoTheAttribute) {
         .prepare = PrepareForSync,
         .run = [](FaultWorld& w) { return MAVOEAFileEAFSFinfoEASync((w / "a").c_str(), 0); },
         .check = ExpectTheOtherAttribute,
-        .rules =
-            SettingBothAttributes() +
-            Rules{
-                {.call = "open", .errors = {ENOENT}, .outcome = {.files = Files::kDone}},
-                {.call = "open", .outcome = {.result = -1, .error = kInjectedErrno}},
-                {.call = "access", .with = "@MavoResource", .outcome = {.files = Files::kDone}},
-                {.call = "access",
-                 .errors = {ENOENT, ENOTDIR, ENAMETOOLONG},
-                 .outcome = {.files = Files::kDone}},
-                // A legacy file that may be there and is not is a failed upgrade, which is passed
-                // over.
-                {.call = "access",
-                 .outcome = {.records = {{0x900, "ea_upgrade"}}, .files = Files::kDone}},
-            },
+        .rules = SettingBothAttributes() +
+                 Rules{
+                     {.call = "open", .errors = {ENOENT}, .outcome = {.files = Files::kDone}},
+                     {.call = "open", .outcome = {.result = -1, .error = kInjectedErrno}},
+                     {.call = "access",
+                      .errors = {ENOENT, ENOTDIR, ENAMETOOLONG},
+                      .outcome = {.files = Files::kDone}},
+                     // A failed upgrade is passed over where no file is made.
+                     {.call = "access",
+                      .outcome = {.records = {{0x900, "ea_upgrade"}}, .files = Files::kDone}},
+                 },
     });
 }
 
@@ -602,12 +599,10 @@ TEST(FaultRecordsTest, WritingFinderInfoIntoANewResourceFileLeavesNoEmptyOneWhen
                 {.call = "open",
                  .with = "@MavoResource",
                  .outcome = {.result = -1, .error = kInjectedErrno, .made = {"@eaDir"}}},
-                {.call = "access", .with = "@MavoResource", .outcome = {.files = Files::kDone}},
                 {.call = "access",
                  .errors = {ENOENT, ENOTDIR, ENAMETOOLONG},
                  .outcome = {.files = Files::kDone}},
-                {.call = "access",
-                 .outcome = {.records = {{0x900, "ea_upgrade"}}, .files = Files::kDone}},
+                {.call = "access", .outcome = failed({{0x900, "ea_upgrade"}})},
                 {.call = "malloc", .ordinal = 2, .outcome = failed({{0x200, "eas_open"}})},
                 {.call = "malloc", .outcome = failed({{0x200, "eas_alloc_entry"}})},
                 {.call = "setlock", .ordinal = 1, .outcome = failed({{0x400, "eas_lock_set"}})},
@@ -673,10 +668,12 @@ TEST(FaultRecordsTest, WritingFinderInfoOnAnAttributeVolumeHidesTheNewDirectory)
                 {.call = "open",
                  .with = "@MavoResource",
                  .outcome = {.result = -1, .error = kInjectedErrno, .made = {"@eaDir"}}},
-                {.call = "access", .with = "@MavoResource", .outcome = {.files = Files::kDone}},
                 {.call = "access", .errors = {ENOENT}, .outcome = {.files = Files::kDone}},
                 {.call = "access",
-                 .outcome = {.records = {{0x900, "ea_upgrade"}}, .files = Files::kDone}},
+                 .outcome = {.result = -1,
+                             .records = {{0x900, "ea_upgrade"}},
+                             .error = kInjectedErrno,
+                             .made = {"@eaDir"}}},
                 {.call = "setlock",
                  .ordinal = 2,
                  .outcome = {.records = {{0x400, "eas_lock_set"}}, .files = Files::kDone}},

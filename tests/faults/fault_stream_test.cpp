@@ -907,9 +907,6 @@ TEST(RepairFaults, AResourceFileWithAttributesIsConvertedOrStaysAsItIs) {
     cut_off.torn = {kResource};
     Outcome not_released = kRepaired;
     not_released.records = {kLock};
-    Outcome searched = kRepaired;
-    searched.any_log = true;
-    searched.any_records = true;
     Outcome not_synced = NotRepaired({kStream});
     const auto syncs_after = [&](int count) {
         not_synced.fsyncs_after = count;
@@ -950,9 +947,12 @@ TEST(RepairFaults, AResourceFileWithAttributesIsConvertedOrStaysAsItIs) {
             {.call = "open", .with = "@MavoEAStream, O_RDWR|O_CREAT", .outcome = NotRepaired()},
             {.call = "open", .with = "@MavoEAStream,", .errors = {ENOENT}, .outcome = kRepaired},
             {.call = "open", .with = "@MavoEAStream,", .outcome = NotRepaired()},
-            {.call = "access", .outcome = searched},
-            {.call = "opendir", .outcome = searched},
-            {.call = "stat", .outcome = searched},
+            {.call = "access", .errors = {ENOENT}, .outcome = kRepaired},
+            {.call = "access", .outcome = NotRepaired()},
+            {.call = "opendir", .errors = {ENOENT}, .outcome = kRepaired},
+            {.call = "opendir", .outcome = NotRepaired()},
+            {.call = "lstat", .errors = {ENOENT}, .outcome = kRepaired},
+            {.call = "lstat", .outcome = NotRepaired()},
             {.call = "malloc", .ordinal = 1, .outcome = NotRepaired()},
             {.call = "malloc", .with = "(1024)", .outcome = kRepaired},
             {.call = "malloc", .outcome = NotRepaired({kStream})},

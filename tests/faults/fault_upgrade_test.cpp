@@ -8,6 +8,7 @@
 
 #include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "include/mavoea.h"
@@ -25,7 +26,9 @@ constexpr char kTags[] = "@eaDir/a/tags";
 constexpr char kStream[] = "@eaDir/a@MavoEAStream";
 constexpr char kResource[] = "@eaDir/a@MavoResource";
 
-// A line about a value that could not be written, which quotes the record of the cause.
+// Lines about a value that could not be read or written, which quote the record of the cause.
+#define READ_LINE(name, code) \
+    "ea_upgrade:LINE cannot read[{dir}/a][" name "] MavoErr=[" code " ea_upgrade:LINE]"
 #define WRITE_LINE(record) "ea_upgrade:LINE MAVOEASWrite error, MavoErr=[" record ":LINE]"
 
 void MakeObject(FaultWorld& w) {
@@ -78,34 +81,51 @@ long long UpgradeStream(FaultWorld& w) {
 
 // ---- A folder becomes a stream ------------------------------------------------------------------
 
-// Up to the stream's being open. What fails here leaves everything as it is, but that an empty
-// stream may have been made.
-Rules UpToTheStream() {
+// What fails leaves all as it was: nothing is decided by half of a look, and a stream that is not
+// whole has no name.
+Outcome Refused(ExpectedRecord record) { return {.result = -1, .records = {record}}; }
+
+// The same of a value that could not be written.
+Outcome NotWritten(ExpectedRecord record, const char* line) {
+    return {.result = -1, .records = {record}, .log = {line}};
+}
+
+// A stream that cannot be given its name; that something has it cannot be, since nothing has.
+Rules NotNamed(std::vector<int> errors = {}) {
+    return {{.call = "link", .errors = std::move(errors), .outcome = Refused({0x900, kUnit})}};
+}
+
+// Beside the attribute files themselves.
+Rules AroundTheAttributes() {
     return {
         {.call = "access",
          .with = kStream,
          .errors = {ENOENT, ENOTDIR, ENAMETOOLONG},
          .outcome = {.files = Files::kDone}},
-        // A stream that cannot be looked at is not written over.
-        {.call = "access", .with = kStream, .outcome = {.result = 1}},
-        // A folder that cannot be opened, or has nothing that can be looked at, has nothing.
-        {.call = "opendir", .outcome = {.result = 2}},
-        {.call = "stat", .with = "{dir}/._a", .outcome = {.files = Files::kDone}},
-        {.call = "open", .with = kStream, .outcome = {.result = -1, .records = {{0x900, kUnit}}}},
-        {.call = "malloc",
-         .ordinal = 1,
-         .outcome = {.result = -1, .records = {{0x200, "eas_open"}}, .free = {kStream}}},
-        {.call = "malloc",
-         .ordinal = 2,
-         .outcome = {.result = -1, .records = {{0x200, "eas_alloc_entry"}}, .free = {kStream}}},
+        {.call = "access", .with = kStream, .outcome = Refused({0x900, kUnit})},
+        {.call = "opendir", .errors = {ENOENT, ENOTDIR}, .outcome = {.result = 2}},
+        {.call = "opendir", .outcome = Refused({0x900, kUnit})},
+        {.call = "readdir", .outcome = Refused({0xA00, kUnit})},
+        {.call = "lstat",
+         .with = "{dir}/._a",
+         .errors = {ENOENT, ENOTDIR, ENAMETOOLONG},
+         .outcome = {.files = Files::kDone}},
+        {.call = "lstat", .with = "{dir}/._a", .outcome = Refused({0x900, kUnit})},
+        // Then the new file has a name meanwhile.
+        {.call = "access", .with = "/proc/", .outcome = {.files = Files::kDone}},
+        {.call = "open", .with = "O_TMPFILE", .outcome = {.files = Files::kDone}},
+        {.call = "malloc", .ordinal = 1, .outcome = Refused({0x200, "eas_open"})},
+        {.call = "malloc", .ordinal = 2, .outcome = Refused({0x200, "eas_alloc_entry"})},
+        {.call = "setlock", .with = "(1)", .outcome = Refused({0x400, "eas_lock_set"})},
+        {.call = "lseek", .outcome = Refused({0xA00, "eas_open"})},
+        // It ends with the descriptor.
         {.call = "setlock",
-         .ordinal = 1,
-         .outcome = {.result = -1, .records = {{0x400, "eas_lock_set"}}, .free = {kStream}}},
-        {.call = "lseek",
-         .outcome = {.result = -1, .records = {{0xA00, "eas_open"}}, .free = {kStream}}},
-        {.call = "setlock",
-         .ordinal = 2,
          .outcome = {.records = {{0x400, "eas_lock_set"}}, .files = Files::kDone}},
+        {.call = "pwrite", .errors = {EINTR, kShortOnce}, .outcome = {.files = Files::kDone}},
+        {.call = "pwrite",
+         .outcome = NotWritten({0xB00, "eas_write_header"}, WRITE_LINE("0x0B00 eas_write_header"))},
+        {.call = "fsync",
+         .outcome = NotWritten({0x2A00, "eas_flush"}, WRITE_LINE("0x2A00 eas_flush"))},
         {.call = "rmdir",
          .errors = {ENOTEMPTY, ENOENT},
          .outcome = {.files = Files::kDone, .made = {kFolder}}},
@@ -115,6 +135,41 @@ Rules UpToTheStream() {
                      .files = Files::kDone,
                      .made = {kFolder}}},
     };
+}
+
+// Those of "color", which is the only one.
+Rules OneAttribute() {
+    // It stays where it is, and the stream is empty.
+    const auto skipped = [](ExpectedRecord record, const char* line) {
+        return Outcome{.records = {record}, .log = {line}, .made = {kStream}};
+    };
+    return Rules{
+               {.call = "stat",
+                .with = kColor,
+                .ordinal = 1,
+                .errors = {ENOENT},
+                .outcome = {.result = 2}},
+               {.call = "stat", .with = kColor, .ordinal = 1, .outcome = Refused({0x2A00, kUnit})},
+               {.call = "stat",
+                .with = kColor,
+                .outcome = skipped({0x2A00, kUnit}, READ_LINE("color", "0x2A00"))},
+               {.call = "open",
+                .with = kColor,
+                .outcome = skipped({0x900, kUnit}, READ_LINE("color", "0x0900"))},
+               {.call = "malloc",
+                .ordinal = 3,
+                .outcome = skipped({0x100, kUnit}, READ_LINE("color", "0x0100"))},
+               {.call = "pread", .errors = {EINTR, kShortOnce}, .outcome = {.files = Files::kDone}},
+               {.call = "pread", .outcome = skipped({0xA00, kUnit}, READ_LINE("color", "0x0A00"))},
+               // Its name may not be on disk: it is in both places.
+               {.call = "fsync",
+                .ordinal = 2,
+                .outcome = {.records = {{0x2A00, "eas_flush"}}, .made = {kStream}}},
+               {.call = "unlink", .outcome = {.made = {kStream}}},
+           } +
+           AroundTheAttributes() +
+           Rules{{.call = "malloc",
+                  .outcome = NotWritten({0x200, "eas_write"}, WRITE_LINE("0x0200 eas_write"))}};
 }
 
 TEST(FaultUpgradeTest, AFolderOfOneAttribute) {
@@ -133,69 +188,20 @@ TEST(FaultUpgradeTest, AFolderOfOneAttribute) {
                     EXPECT_EQ(std::vector<std::string>{"a@MavoEAStream"}, NamesIn(w / "@eaDir"));
                 }
             },
-        .rules = UpToTheStream() +
-                 Rules{
-                     {.call = "stat", .with = kColor, .ordinal = 1, .outcome = {.result = 2}},
-                     // The first walk ends early, or at its end; then the second.
-                     {.call = "readdir", .ordinal = 4, .outcome = {.files = Files::kDone}},
-                     {.call = "readdir", .ordinal = 8, .outcome = {.files = Files::kDone}},
-                     {.call = "readdir", .ordinal = 5, .outcome = {.free = {kStream}}},
-                     {.call = "readdir", .ordinal = 6, .outcome = {.free = {kStream}}},
-                     {.call = "readdir", .ordinal = 7, .outcome = {.free = {kStream}}},
-                     {.call = "readdir", .outcome = {.result = 2}},
-                     // What fails for the file leaves it where it is.
-                     {.call = "stat",
-                      .with = kColor,
-                      .outcome = {.records = {{0x2A00, kUnit}}, .free = {kStream}}},
-                     {.call = "open",
-                      .with = kColor,
-                      .outcome = {.records = {{0x900, kUnit}}, .free = {kStream}}},
-                     {.call = "malloc",
-                      .ordinal = 3,
-                      .outcome = {.records = {{0x100, kUnit}}, .free = {kStream}}},
-                     {.call = "pread",
-                      .errors = {EINTR, kShortOnce},
-                      .outcome = {.files = Files::kDone}},
-                     {.call = "pread", .outcome = {.records = {{0xA00, kUnit}}, .free = {kStream}}},
-                     {.call = "malloc",
-                      .outcome = {.records = {{0x200, "eas_write"}},
-                                  .log = {WRITE_LINE("0x0200 eas_write")},
-                                  .free = {kStream}}},
-                     {.call = "pwrite",
-                      .errors = {EINTR, kShortOnce},
-                      .outcome = {.files = Files::kDone}},
-                     {.call = "pwrite",
-                      .outcome = {.records = {{0xB00, "eas_write_header"}},
-                                  .log = {WRITE_LINE("0x0B00 eas_write_header")},
-                                  .free = {kStream}}},
-                     // It is in the stream, and may not be on the disk.
-                     {.call = "fsync",
-                      .outcome = {.records = {{0x2A00, "eas_flush"}},
-                                  .log = {WRITE_LINE("0x2A00 eas_flush")},
-                                  .made = {kStream}}},
-                     {.call = "unlink", .outcome = {.made = {kStream}}},
-                 },
+        .rules = NotNamed() + OneAttribute(),
     });
 }
 
-TEST(FaultUpgradeTest, AFailureSkipsItsAttributeFileOnly) {
-    // Of the two files, "color" is read first.
-    const auto without_color = [](std::vector<ExpectedRecord> records,
-                                  std::vector<const char*> log = {}) {
-        return Outcome{.records = std::move(records),
-                       .log = std::move(log),
-                       .made = {kStream},
-                       .gone = {kTags}};
+TEST(FaultUpgradeTest, AFileThatCannotBeReadIsSkippedAlone) {
+    const auto without_color = [](ExpectedRecord record, const char* line) {
+        return Outcome{.records = {record}, .log = {line}, .made = {kStream}, .gone = {kTags}};
     };
-    const auto without_tags = [](std::vector<ExpectedRecord> records,
-                                 std::vector<const char*> log = {}) {
-        return Outcome{.records = std::move(records),
-                       .log = std::move(log),
-                       .made = {kStream},
-                       .gone = {kColor}};
+    const auto without_tags = [](ExpectedRecord record, const char* line) {
+        return Outcome{.records = {record}, .log = {line}, .made = {kStream}, .gone = {kColor}};
     };
     SweepFaults({
         .name = "MAVOEAUpgrade, stream, two attribute files",
+        // Of the two files, "color" is read first.
         .prepare =
             [](FaultWorld& w) {
                 MakeObject(w);
@@ -208,81 +214,88 @@ TEST(FaultUpgradeTest, AFailureSkipsItsAttributeFileOnly) {
                 ExpectNothingLost(w, run, {"color", "tags"});
             },
         .rules =
-            UpToTheStream() +
             Rules{
                 // The latest access counts, and both are from just now.
                 {.call = "stat", .with = kColor, .ordinal = 1, .outcome = {.files = Files::kDone}},
                 {.call = "stat", .with = kTags, .ordinal = 1, .outcome = {.files = Files::kDone}},
-                {.call = "readdir", .ordinal = 1, .outcome = {.result = 2}},
-                {.call = "readdir", .ordinal = 2, .outcome = {.result = 2}},
-                {.call = "readdir", .ordinal = 3, .outcome = {.result = 2}},
-                {.call = "readdir", .ordinal = 4, .outcome = {.files = Files::kDone}},
-                {.call = "readdir", .ordinal = 5, .outcome = {.files = Files::kDone}},
-                {.call = "readdir", .ordinal = 9, .outcome = without_tags({})},
-                {.call = "readdir", .ordinal = 10, .outcome = {.files = Files::kDone}},
-                {.call = "readdir", .outcome = {.free = {kStream}}},
-                {.call = "stat", .with = kColor, .outcome = without_color({{0x2A00, kUnit}})},
-                {.call = "stat", .with = kTags, .outcome = without_tags({{0x2A00, kUnit}})},
-                {.call = "open", .with = kColor, .outcome = without_color({{0x900, kUnit}})},
-                {.call = "open", .with = kTags, .outcome = without_tags({{0x900, kUnit}})},
-                {.call = "malloc", .ordinal = 3, .outcome = without_color({{0x100, kUnit}})},
+                {.call = "stat",
+                 .with = kColor,
+                 .outcome = without_color({0x2A00, kUnit}, READ_LINE("color", "0x2A00"))},
+                {.call = "stat",
+                 .with = kTags,
+                 .outcome = without_tags({0x2A00, kUnit}, READ_LINE("tags", "0x2A00"))},
+                {.call = "open",
+                 .with = kColor,
+                 .outcome = without_color({0x900, kUnit}, READ_LINE("color", "0x0900"))},
+                {.call = "open",
+                 .with = kTags,
+                 .outcome = without_tags({0x900, kUnit}, READ_LINE("tags", "0x0900"))},
                 {.call = "malloc",
-                 .ordinal = 4,
-                 .outcome =
-                     without_color({{0x200, "eas_write"}}, {WRITE_LINE("0x0200 eas_write")})},
-                {.call = "malloc",
-                 .ordinal = 5,
-                 .outcome =
-                     without_color({{0x200, "eas_write"}}, {WRITE_LINE("0x0200 eas_write")})},
-                {.call = "malloc",
-                 .outcome = without_tags({{0x200, "eas_write"}}, {WRITE_LINE("0x0200 eas_write")})},
+                 .ordinal = 3,
+                 .outcome = without_color({0x100, kUnit}, READ_LINE("color", "0x0100"))},
                 {.call = "pread",
                  .errors = {EINTR, kShortOnce},
                  .outcome = {.files = Files::kDone}},
                 {.call = "pread",
                  .ordinal = 1,
                  .errors = {EIO, kNoneOnce},
-                 .outcome = without_color({{0xA00, kUnit}})},
+                 .outcome = without_color({0xA00, kUnit}, READ_LINE("color", "0x0A00"))},
                 // Nothing can be read any more.
                 {.call = "pread",
                  .ordinal = 1,
-                 .outcome = {.records = {{0xA00, kUnit}, {0xA00, kUnit}}, .free = {kStream}}},
-                {.call = "pread", .ordinal = 2, .outcome = without_tags({{0xA00, kUnit}})},
+                 .outcome = {.records = {{0xA00, kUnit}, {0xA00, kUnit}},
+                             .log = {READ_LINE("color", "0x0A00"), READ_LINE("tags", "0x0A00")},
+                             .made = {kStream}}},
                 {.call = "pread",
-                 .outcome = without_tags({{0xA00, "eas_write"}}, {WRITE_LINE("0x0A00 eas_write")})},
-                {.call = "pwrite",
-                 .errors = {EINTR, kShortOnce},
-                 .outcome = {.files = Files::kDone}},
-                {.call = "pwrite",
-                 .ordinal = 1,
-                 .errors = {EIO, ENOSPC, kNoneOnce},
-                 .outcome = without_color({{0xB00, "eas_write_header"}},
-                                          {WRITE_LINE("0x0B00 eas_write_header")})},
-                // Nothing can be written any more.
-                {.call = "pwrite",
-                 .ordinal = 1,
-                 .outcome = {.free = {kStream}, .any_log = true, .any_records = true}},
-                {.call = "pwrite",
-                 .outcome = without_tags({{0xB00, "eas_write_header"}},
-                                         {WRITE_LINE("0x0B00 eas_write_header")})},
+                 .ordinal = 2,
+                 .outcome = without_tags({0xA00, kUnit}, READ_LINE("tags", "0x0A00"))},
+                {.call = "pread",
+                 .outcome = NotWritten({0xA00, "eas_write"}, WRITE_LINE("0x0A00 eas_write"))},
                 {.call = "fsync",
-                 .ordinal = 1,
-                 .outcome = {.records = {{0x2A00, "eas_flush"}},
-                             .log = {WRITE_LINE("0x2A00 eas_flush")},
-                             .files = Files::kKept,
-                             .made = {kStream},
-                             .gone = {kTags},
-                             .fsyncs_after = 1}},
-                {.call = "fsync",
-                 .outcome =
-                     without_tags({{0x2A00, "eas_flush"}}, {WRITE_LINE("0x2A00 eas_flush")})},
+                 .ordinal = 3,
+                 .outcome = {.records = {{0x2A00, "eas_flush"}}, .made = {kStream}}},
                 {.call = "unlink",
                  .with = kColor,
                  .outcome = {.files = Files::kDone, .made = {kFolder, kColor}}},
                 {.call = "unlink",
                  .with = kTags,
                  .outcome = {.files = Files::kDone, .made = {kFolder, kTags}}},
+            } +
+            NotNamed() + AroundTheAttributes() +
+            Rules{{.call = "malloc",
+                   .outcome = NotWritten({0x200, "eas_write"}, WRITE_LINE("0x0200 eas_write"))}},
+    });
+}
+
+TEST(FaultUpgradeTest, AFolderWhereThereAreNoFilesWithoutAName) {
+    SweepFaults({
+        .name = "MAVOEAUpgrade, stream, under a temporary name",
+        .prepare =
+            [](FaultWorld& w) {
+                MakeObject(w);
+                MakeAttribute(w, "color");
             },
+        .run =
+            [](FaultWorld& w) {
+                const auto injected = Hooks().fails;
+                Hooks().fails = [&](const std::string& call) {
+                    const int error = injected(call);
+                    const bool nameless = call.find("O_TMPFILE") != std::string::npos;
+                    return error == 0 && nameless ? EOPNOTSUPP : error;
+                };
+                const long long result = UpgradeStream(w);
+                Hooks().fails = injected;
+                return result;
+            },
+        .check = [](FaultWorld& w, const FaultRun& run) { ExpectNothingLost(w, run, {"color"}); },
+        .rules = NotNamed({EEXIST}) +
+                 Rules{// A file system without links.
+                       {.call = "link", .outcome = {.files = Files::kDone}},
+                       {.call = "open", .with = ".mavoea-", .outcome = Refused({0x900, kUnit})},
+                       {.call = "unlink",
+                        .with = ".mavoea-",
+                        .outcome = {.files = Files::kDone, .free = {"@eaDir/.mavoea-*"}}}} +
+                 OneAttribute(),
     });
 }
 
@@ -322,10 +335,17 @@ TEST(FaultUpgradeTest, AnAppleDoubleFileBecomesTheStream) {
                 {.call = "access",
                  .errors = {ENOENT, ENOTDIR, ENAMETOOLONG},
                  .outcome = {.files = Files::kDone}},
-                {.call = "access", .outcome = {.result = 1}},
-                {.call = "opendir", .outcome = {.files = Files::kDone}},
+                {.call = "access", .outcome = Refused({0x900, kUnit})},
+                {.call = "opendir",
+                 .errors = {ENOENT, ENOTDIR},
+                 .outcome = {.files = Files::kDone}},
+                {.call = "opendir", .outcome = Refused({0x900, kUnit})},
+                {.call = "lstat",
+                 .with = "{dir}/._a)",
+                 .errors = {ENOENT, ENOTDIR, ENAMETOOLONG},
+                 .outcome = {.result = 2}},
+                {.call = "lstat", .with = "{dir}/._a)", .outcome = Refused({0x900, kUnit})},
                 // One that cannot be told to be an AppleDouble file is none.
-                {.call = "stat", .outcome = {.result = 2}},
                 {.call = "open", .with = "{dir}/._a, ", .outcome = {.result = 2}},
                 {.call = "pread",
                  .errors = {EINTR, kShortOnce},
@@ -413,9 +433,8 @@ TEST(FaultUpgradeTest, NothingToConvert) {
         .clean = {.result = 2},
         .rules =
             {
-                {.call = "access", .errors = {ENOENT}, .outcome = {.result = 2}},
-                {.call = "access", .outcome = {.result = 1}},
-                {.call = "", .outcome = {.result = 2}},
+                {.call = "", .errors = {ENOENT, ENOTDIR, ENAMETOOLONG}, .outcome = {.result = 2}},
+                {.call = "", .outcome = Refused({0x900, kUnit})},
             },
     });
 }
@@ -494,9 +513,9 @@ TEST(FaultUpgradeTest, AResourceFileAndItsMarks) {
                      .with = kResource,
                      .errors = {ENOENT},
                      .outcome = {.files = Files::kDone}},
-                    {.call = "access", .with = kResource, .outcome = {.result = 1}},
+                    {.call = "access", .with = kResource, .outcome = Refused({0x900, kUnit})},
                     {.call = "access", .errors = {ENOENT}, .outcome = {.result = 2}},
-                    {.call = "access", .outcome = {.files = Files::kDone}},
+                    {.call = "access", .outcome = Refused({0x900, kUnit})},
                     {.call = "open",
                      .with = "@eaDir/a, ",
                      .outcome = {.result = -1, .records = {{0x900, kUnit}}}},
@@ -553,9 +572,9 @@ TEST(FaultUpgradeTest, AnotherReservedName) {
                  .with = "MAVO@x",
                  .errors = {ENOENT},
                  .outcome = {.files = Files::kDone}},
-                {.call = "access", .with = "MAVO@x", .outcome = {.result = 1}},
+                {.call = "access", .with = "MAVO@x", .outcome = Refused({0x900, kUnit})},
                 {.call = "access", .errors = {ENOENT}, .outcome = {.result = 2}},
-                {.call = "access", .outcome = {.files = Files::kDone}},
+                {.call = "access", .outcome = Refused({0x900, kUnit})},
                 {.call = "open",
                  .with = "@eaDir/a, ",
                  .outcome = {.result = -1, .records = {{0x900, kUnit}}}},

@@ -60,6 +60,7 @@ const std::vector<CallErrors>& ErrorTable() {
         {"unlink", {EIO, EACCES, EPERM, ENOENT, EROFS}},
         {"rmdir", {EIO, EACCES, EPERM, ENOENT, ENOTEMPTY, EROFS}},
         {"remove", {EIO, EACCES, EPERM, ENOENT, EROFS}},
+        {"link", {EEXIST, EIO, ENOSPC, EACCES, EPERM}},
         {"rename", {EIO, ENOSPC, EACCES, EPERM, ENOENT, EROFS}},
         {"chmod", {EIO, EACCES, EPERM, ENOENT, EROFS}},
         {"fchmod", {EIO, EPERM, EROFS}},

@@ -146,9 +146,10 @@ std::string Flags(int flags) {
                        : (flags & O_ACCMODE) == O_WRONLY ? "O_WRONLY"
                                                          : "O_RDONLY";
     constexpr std::pair<int, const char*> kNames[] = {
-        {O_CREAT, "O_CREAT"},         {O_EXCL, "O_EXCL"},       {O_TRUNC, "O_TRUNC"},
-        {O_NONBLOCK, "O_NONBLOCK"},   {O_CLOEXEC, "O_CLOEXEC"}, {O_NOFOLLOW, "O_NOFOLLOW"},
-        {O_DIRECTORY, "O_DIRECTORY"},
+        {O_CREAT, "O_CREAT"},         {O_EXCL, "O_EXCL"},
+        {O_TRUNC, "O_TRUNC"},         {O_NONBLOCK, "O_NONBLOCK"},
+        {O_CLOEXEC, "O_CLOEXEC"},     {O_NOFOLLOW, "O_NOFOLLOW"},
+        {O_DIRECTORY, "O_DIRECTORY"}, {O_TMPFILE & ~O_DIRECTORY, "O_TMPFILE"},
     };
     for (const auto& [bit, name] : kNames) {
         if ((flags & bit) != 0) text += std::string("|") + name;
@@ -235,11 +236,14 @@ ssize_t NoteWritten(int fd, const iovec* parts, int count, off_t offset, ssize_t
 template <class Real>
 int Opened(const char* path, int flags, Real open) {
     struct stat info;
+    const bool nameless = (flags & O_TMPFILE) == O_TMPFILE;
     const bool made =
-        Hooks().changed && (flags & O_CREAT) != 0 && ::lstat(path, &info) != 0 && errno == ENOENT;
+        Hooks().changed &&
+        (nameless || ((flags & O_CREAT) != 0 && ::lstat(path, &info) != 0 && errno == ENOENT));
     const int fd = open();
-    Tell(fd >= 0 && made,
-         [&] { return FileChange{.kind = FileChange::kCreated, .fd = fd, .path = path}; });
+    Tell(fd >= 0 && made, [&] {
+        return FileChange{.kind = FileChange::kCreated, .fd = fd, .path = nameless ? "" : path};
+    });
     Tell(fd >= 0 && !made && (flags & O_TRUNC) != 0,
          [&] { return FileChange{.kind = FileChange::kResized, .fd = fd}; });
     return NoteOpened(fd);
@@ -449,6 +453,15 @@ int MkdirAt(int dir, const char* path, mode_t mode) {
     });
 }
 
+int Link(const char* from, const char* to, int flags) {
+    return Call("link", Text(from) + ", " + Text(to), -1, [&] {
+        const int result = ::linkat(AT_FDCWD, from, AT_FDCWD, to, flags);
+        Tell(result == 0,
+             [&] { return FileChange{.kind = FileChange::kLinked, .path = from, .to = to}; });
+        return result;
+    });
+}
+
 static int Removed(const char* path, int result) {
     Tell(result == 0, [&] { return FileChange{.kind = FileChange::kRemoved, .path = path}; });
     return result;
@@ -533,6 +546,11 @@ uid_t Geteuid() {
 int Seteuid(uid_t uid) {
     return Call("seteuid", Number(uid), -1,
                 [&] { return Hooks().seteuid ? Hooks().seteuid(uid) : ::seteuid(uid); });
+}
+
+pid_t Getpid() {
+    Note("getpid", "getpid()");
+    return ::getpid();
 }
 
 time_t Time() {

@@ -3,9 +3,9 @@
 //
 // Call names are the C library's in lower case: "open", "close", "pread", "preadv", "pwrite",
 // "pwritev", "lseek", "ftruncate", "fallocate", "fsync", "sync", "fstat", "stat", "lstat",
-// "access", "setlock", "getlock", "mkdir", "unlink", "rmdir", "remove", "rename", "chmod",
+// "access", "setlock", "getlock", "mkdir", "link", "unlink", "rmdir", "remove", "rename", "chmod",
 // "fchmod", "getcwd", "opendir", "readdir", "rewinddir", "closedir", "geteuid",
-// "seteuid", "time", "system", "listxattr", "getxattr", "setxattr", "removexattr",
+// "seteuid", "getpid", "time", "system", "listxattr", "getxattr", "setxattr", "removexattr",
 // "fopen", "fread", "fwrite", "fclose", "archive", "command" (the platform's system call 403),
 // "malloc" (every allocation).
 #ifndef MAVOEA_TESTS_SUPPORT_KERNEL_CONTROL_H_
@@ -87,7 +87,8 @@ struct FileChange {
         kResized,        // the file on `fd` has `offset` bytes
         kSynced,         // the file on `fd`
         kAllSynced,      // every file
-        kCreated,        // `path`, a file that was not there, open on `fd`
+        kCreated,        // `path`, a file that was not there, open on `fd`; empty: without a name
+        kLinked,         // `path` has the further name, or its first, `to`
         kRenamed,        // `path`, which is now `to`
         kRemoved,        // `path`
         kMadeDirectory,  // `path`

@@ -415,7 +415,7 @@ TEST_P(EaOpenInEaDirTest, ThePathMayFillTheBufferOf4096Bytes) {
     ExpectOnly(0xC300, "ea_path");
 }
 
-// A call of the upgrade that fails is no failure: its result is ignored.
+// A call of the upgrade that fails may have missed what a new file would hide.
 TEST_P(EaOpenInEaDirTest, EveryFailingCallIsReportedOnceAndLeavesNothingOpen) {
     for (const int form : {1, 0}) {
         int before_the_file = 0;
@@ -452,10 +452,9 @@ TEST_P(EaOpenInEaDirTest, EveryFailingCallIsReportedOnceAndLeavesNothingOpen) {
             }
             EXPECT_EQ(kUser, uid_);
             if (fd >= 0) {
-                ++in_the_upgrade;
                 EXPECT_THAT(opens, ElementsAre("O_RDWR, 0777", "O_RDWR|O_CREAT, 0777"));
                 EXPECT_TRUE(Exists(file));
-                for (const Record& record : TakeRecords()) EXPECT_EQ("ea_upgrade", record.unit);
+                ExpectNothingReported();
                 continue;
             }
             EXPECT_EQ(-1, fd);
@@ -464,6 +463,9 @@ TEST_P(EaOpenInEaDirTest, EveryFailingCallIsReportedOnceAndLeavesNothingOpen) {
             if (opens.empty()) {
                 ++before_the_file;
                 EXPECT_EQ(1u, TakeRecords().size());
+            } else if (fault.name() != "open") {
+                ++in_the_upgrade;
+                ExpectOnly(0x900, "ea_upgrade");
             } else {
                 ++at_the_file;
                 EXPECT_EQ("open", fault.name());
@@ -624,7 +626,7 @@ TEST_P(EaOpenUpgradeTest, AFailureOtherThanEnoentIsFinalWithoutAnUpgrade) {
     EXPECT_FALSE(Exists(stream_));
 }
 
-TEST_P(EaOpenUpgradeTest, AFailureOfTheUpgradeIsIgnored) {
+TEST_P(EaOpenUpgradeTest, AFailureOfTheUpgradeThatHidesNothingIsIgnored) {
     {
         const FailCall fault("rmdir", EBUSY);
         const int fd = OpenStream(0);
@@ -637,16 +639,75 @@ TEST_P(EaOpenUpgradeTest, AFailureOfTheUpgradeIsIgnored) {
         const FailCall fault("rename", EIO);
         ExpectFailedAfter(0x2800, ENOENT, Open(1, object_.c_str(), kResource, 0));
     }
-    {
-        const FailCall fault("rename", EIO);
-        const Fd fd(Open(1, object_.c_str(), kResource, O_RDWR | O_CREAT));
-        ExpectOnly(0x2800, "ea_upgrade");
-        EXPECT_EQ("", fd.Read());
-        EXPECT_EQ(Ascii("resource"), ReadFile(legacy_));
-    }
     const Fd fd(Open(1, object_.c_str(), "kind", O_RDWR | O_CREAT));
     ExpectOnly(0xD00, "ea_upgrade");
     EXPECT_TRUE(fd.ok());
+    std::filesystem::remove_all(folder_);
+    WriteFile(folder_, Ascii("in the folder's place"));
+    const Fd new_fd(OpenStream(O_RDWR | O_CREAT));
+    std::filesystem::remove(stream_);
+    const Fd another_fd(OpenStream(O_RDWR | O_CREAT));
+    EXPECT_TRUE(another_fd.ok());
+    EXPECT_THAT(TakeRecords(), ::testing::Each(RecordOf(0x3900, "ea_upgrade")));
+}
+
+TEST_P(EaOpenUpgradeTest, NothingIsMadeOverWhatAFailedUpgradeLeaves) {
+    {
+        const FailCall fault("rename", EIO);
+        ExpectFailedAfter(0x2800, EIO, Open(1, object_.c_str(), kResource, O_RDWR | O_CREAT));
+    }
+    {
+        const FailCall fault("opendir", EMFILE);
+        ExpectFailedAfter(0x900, EMFILE, OpenStream(O_RDWR | O_CREAT));
+    }
+    {
+        const FailCall fault("readdir", EIO);
+        ExpectFailedAfter(0xA00, EIO, OpenStream(O_RDWR | O_CREAT));
+    }
+    ExpectLegacyMetadataUntouched();
+    EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("a.txt"));
+
+    std::filesystem::remove_all(folder_);
+    WriteFile(sidecar_, MacSidecar({.attributes = values_}).bytes);
+    const FailCall fault("rename", EIO);
+    ExpectFailedAfter(0x2800, EIO, OpenStream(O_RDWR | O_CREAT));
+    EXPECT_EQ(MacSidecar({.attributes = values_}).bytes, ReadFile(sidecar_));
+    EXPECT_THAT(NamesIn(ea_dir_), IsEmpty());
+}
+
+// Whatever fails, a descriptor is one of a stream that has what could be read.
+TEST_P(EaOpenUpgradeTest, WhateverFailsNoFileIsMadeOverAttributes) {
+    std::filesystem::remove(legacy_);
+    const auto make = [this] {
+        std::filesystem::remove_all(ea_dir_);
+        std::filesystem::create_directories(folder_);
+        for (const auto& [name, value] : values_) WriteFile(folder_ + "/" + name, value);
+    };
+    int refused = 0;
+    for (int nth = 1;; ++nth) {
+        SCOPED_TRACE(nth);
+        ASSERT_LT(nth, 200);
+        make();
+        TakeRecords();
+        const FailNthCall fault(nth, EIO);
+        errno = 0;
+        const Fd fd(OpenStream(O_RDWR | O_CREAT));
+        const int error = errno;
+        if (!fault.fired()) break;
+        SCOPED_TRACE(fault.name());
+        if (!fd.ok()) {
+            ++refused;
+            EXPECT_EQ(EIO, error);
+            const bool whole = Exists(stream_);  // the last open failed
+            EXPECT_EQ(whole ? 0u : values_.size(), Exists(folder_) ? NamesIn(folder_).size() : 0);
+            continue;
+        }
+        const auto contents = ReadMacFile(ReadFile(stream_));
+        ASSERT_TRUE(contents);
+        EXPECT_LE(values_.size() - 1, contents->attributes.size());
+    }
+    EXPECT_LT(10, refused);
+    TakeLog();
 }
 
 // ---- As another user ------------------------------------------------------------------------
