@@ -415,6 +415,16 @@ TEST_P(EaOpenInEaDirTest, ThePathMayFillTheBufferOf4096Bytes) {
     ExpectOnly(0xC300, "ea_path");
 }
 
+TEST_P(EaOpenInEaDirTest, AFileOfTheLongestPathIsMade) {
+    const std::size_t size = 4096 - 9 - strlen(kStream);
+    std::string object = dir_.path() + (dir_.path().size() % 2 == 0 ? "" : "/");
+    while (object.size() + 2 < size - 2) object += "/.";
+    object += "/" + std::string(size - object.size() - 1, 'a');
+    const Fd fd(Open(1, object.c_str(), kStream, O_RDWR | O_CREAT));
+    EXPECT_TRUE(fd.ok()) << strerror(errno);
+    ExpectOnly(0xC300, "ea_path");  // the upgrade's, which knows no path that long
+}
+
 // A call of the upgrade that fails may have missed what a new file would hide.
 TEST_P(EaOpenInEaDirTest, EveryFailingCallIsReportedOnceAndLeavesNothingOpen) {
     for (const int form : {1, 0}) {

@@ -1295,6 +1295,18 @@ TEST_F(EaUpgradeTest, TheFolderIsRemovedAfterAFailureToo) {
     EXPECT_FALSE(Exists(folder_));
 }
 
+TEST_F(EaUpgradeTest, AFailureOfTheConversionStandsWhateverBecomesOfTheFolder) {
+    MakeFolder({});
+    MakeSidecar(SmallSidecar(), 200);
+    Hooks().fails = [](const std::string& call) {
+        return call.starts_with("rename(") ? EIO : call.starts_with("rmdir(") ? EBUSY : 0;
+    };
+    errno = 0;
+    EXPECT_EQ(-1, UpgradeStream());
+    EXPECT_EQ(EIO, errno);
+    ExpectOnly(0x2800, kUnit);
+}
+
 TEST_F(EaUpgradeTest, WhatIsNoFolderCannotBeRemoved) {
     std::filesystem::create_directory(ea_dir_);
     WriteFile(folder_, Ascii("a file in place of the folder"));
