@@ -412,12 +412,13 @@ MAVOEA_API int MAVOEAFileEAWriteFlushTime(const char* path, int checkFSType);
 MAVOEA_API int MAVOEACheckADFile(const char* path);
 
 /* Repairs the resource file of the object at path, should it hold attributes: they go into the
- * object's EA stream, over those of the same name, and the resource file is rewritten with Finder
- * info and resource fork only, by way of "<resource file>Tmp", which is locked meanwhile: one that
- * another repair has locked is left alone (0x400), one that nobody has is made anew. 0, also when
- * there were none and the file was only rewritten; -1 with the resource file unchanged, while
- * attributes that were copied stay in the stream: it is missing, is not an AppleDouble file of
- * version 2 with 2 or 13 entries, or an attribute failed. No code of its own. */
+ * object's EA stream, in the place of those of the same name there, whatever their length, and the
+ * resource file is rewritten with Finder info and resource fork only, by way of
+ * "<resource file>Tmp", which is locked meanwhile: one that another repair has locked is left alone
+ * (0x400), one that nobody has is made anew. 0, also when there were none and the file was only
+ * rewritten; -1 with the resource file unchanged, while attributes that were copied stay in the
+ * stream: it is missing, is not an AppleDouble file of version 2 with 2 or 13 entries, or an
+ * attribute failed. No code of its own. */
 MAVOEA_API int MAVOEAFixErrorAD(const char* path);
 
 /* Converts what earlier versions kept for the object at szPath into the current layout; szName is

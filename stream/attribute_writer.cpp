@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 
+#include "stream/internal.h"
 #include "util/unit.h"
 
 namespace mavoea {
@@ -14,14 +15,18 @@ void AttributeWriter::Close() {
     stream_ = nullptr;
 }
 
+void AttributeWriter::OpenAnew() {
+    EASHandle* const former = stream_;
+    stream_ = MAVOEASOpen(fd_, F_WRLCK);
+    former->lockType = F_UNLCK;  // to the kernel it is one lock, which is the new one's
+    const ErrnoKeeper keep;
+    (void)MAVOEASClose(former);
+}
+
 bool AttributeWriter::Write(const char* name, const void* value, std::uint32_t size) {
-    if (stale_ && stream_ != nullptr) {
-        Close();
-        const ErrnoKeeper keep;
-        stream_ = MAVOEASOpen(fd_, F_WRLCK);
-    }
-    stale_ =
-        stream_ == nullptr || MAVOEASWrite(stream_, name, value, size, 0, EAS_WRITE_OVERWRITE) < 0;
+    if (stale_ && stream_ != nullptr) OpenAnew();
+    stale_ = stream_ == nullptr ||
+             EASReplace(stream_, name, {static_cast<const std::uint8_t*>(value), size}) != 0;
     return !stale_;
 }
 

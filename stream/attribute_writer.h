@@ -9,7 +9,8 @@
 namespace mavoea {
 
 // After a write that failed, the memory of a handle may be ahead of the file and must not be
-// written from: the next write opens the stream anew. errno stays with it, and on the way out.
+// written from: the next write opens the stream anew, under the same lock. Should that fail,
+// nothing more is written: the lock may be gone. errno stays on the way out.
 class AttributeWriter {
  public:
     // On the stream on fd, which stays the caller's, under a write lock. Empty after a code of
@@ -21,8 +22,8 @@ class AttributeWriter {
 
     explicit operator bool() const { return stream_ != nullptr; }
 
-    // Creates or overwrites the attribute. Whether it is on disk; not: after a code of
-    // MAVOEASWrite(), or of MAVOEASOpen().
+    // Creates or replaces the attribute. Whether it is on disk; not: after a code of
+    // MAVOEASWrite(), or of MAVOEASOpen() when it is opened anew.
     bool Write(const char* name, const void* value, std::uint32_t size);
 
     // The stream as it was opened, with all that has been written since.
@@ -30,6 +31,7 @@ class AttributeWriter {
 
  private:
     void Close();
+    void OpenAnew();
 
     int fd_;
     EASHandle* stream_;

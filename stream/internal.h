@@ -3,6 +3,7 @@
 #define MAVOEA_STREAM_INTERNAL_H_
 
 #include "include/mavoea.h"
+#include "util/bytes.h"
 
 namespace mavoea {
 
@@ -28,11 +29,17 @@ int EASShiftRFork(EASHandle* h, unsigned newStart, unsigned oldStart, unsigned l
 // no code.
 int EASMoveRFork(int fd, unsigned length, unsigned newStart, unsigned oldStart, int backwards);
 
-// Copies every attribute of the stream on srcFd into the one on dstFd, one rewrite and fsync each.
-// Attributes of the same name are overwritten (a longer value keeps its end), others, Finder info
-// and fork are kept. 0; -1 when a stream could not be opened (codes of MAVOEASOpen(), none for a
-// negative descriptor); else -1 less the number of attributes that failed, with a code for each:
-// 0x100 out of memory, 0xA00 not read, 0xB00 not written, behind MAVOEASWrite()'s own.
+// Gives the attribute that value, in place of any that it has, in one rewrite; where it had one,
+// the file then ends where its fork ends. h has the write lock. 0, or -1 with what MAVOEASWrite()
+// gives.
+int EASReplace(EASHandle* h, const char* name, ByteView value);
+
+// Copies every attribute of the stream on srcFd into the one on dstFd, one rewrite and fsync each,
+// both locked throughout. Attributes of the same name are replaced, of two of one name in the
+// source by the second; others, Finder info and fork are kept. 0; -1 when a stream could not be
+// opened (codes of MAVOEASOpen(), none for a negative descriptor); else -1 less the number of
+// attributes that failed, with a code for each: 0x100 out of memory, 0xA00 not read, 0xB00 not
+// written, behind MAVOEASWrite()'s own.
 int EASWriteToFd(int srcFd, int dstFd);
 
 }  // namespace mavoea

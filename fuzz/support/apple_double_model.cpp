@@ -133,10 +133,8 @@ int Import(View file, const std::vector<TableEntry>& table, Attributes* to) {
             ++failures;
             continue;
         }
-        Bytes& value = (*to)[entry.name];
-        if (value.size() < entry.length) value.resize(entry.length);
         const View bytes = entry.length == 0 ? View() : file.subspan(entry.offset, entry.length);
-        std::copy(bytes.begin(), bytes.end(), value.begin());
+        (*to)[entry.name] = Bytes(bytes.begin(), bytes.end());
     }
     return failures;
 }

@@ -55,8 +55,8 @@ OpenedStream OpenStreamHeader(View file);
 
 using Attributes = std::map<std::string, Bytes>;
 
-// Writes the table's attributes over `to`, in order: a longer value keeps its end. How many could
-// not be.
+// Puts the table's attributes into `to`, in order, in the place of those of the same name. How many
+// could not be.
 int Import(View file, const std::vector<TableEntry>& table, Attributes* to);
 
 }  // namespace mavoea::fuzz

@@ -1191,6 +1191,22 @@ TEST(CrashPointsTest, AForkThatMovesMayBeLostAndSoMayTheLastValues) {
                   {"pwrite", "new"}});
 }
 
+// Which is what imports and repairs do.
+TEST(CrashPointsTest, AReplacementHasOneOfTheTwoValues) {
+    for (const std::size_t size : {100u, 300u, 500u}) {
+        KillOnStream(ReplacementOf("replace an attribute", kSize, 0, size),
+                     {{"", "old"}, {"pwrite", "new"}});
+    }
+    KillOnStream(ReplacementOf("replace an attribute before a fork", kSize, kFork, kSize),
+                 {{"", "old"}, {"pwrite", "new"}});
+    KillOnStream(
+        ReplacementOf("replace an attribute before a fork by a longer one", kSize, kFork, 500),
+        {{"", "old"}, {"pwrite", "old; LOST fork", "0: new; LOST fork"}, {"pwrite", "new"}});
+    KillOnStream(
+        ReplacementOf("replace an attribute before a fork by a shorter one", kSize, kFork, 100),
+        {{"", "old"}, {"pwrite", "new; LOST fork", "0: new; LOST fork"}, {"pwrite", "new"}});
+}
+
 TEST(CrashPointsTest, FinderInfoIsWrittenInOneCall) {
     KillEverywhere({
         .name = "write Finder info",

@@ -413,6 +413,10 @@ TEST(PowerLossTest, AChangeOfAStreamMayCostAnyOfItsValues) {
                        "LOST the value, new, old; LOST c"));
     LosePower(OnStream(TruncationOf("make an attribute shorter", kSize, 0, 700),
                        "LOST the value, new, old; LOST c"));
+    LosePower(OnStream(ReplacementOf("replace an attribute by a longer one", kSize, 0, 2000),
+                       "LOST the value, new, old; LOST c"));
+    LosePower(OnStream(ReplacementOf("replace an attribute by a shorter one", kSize, 0, 700),
+                       "LOST the value, new, old; LOST c"));
     LosePower(OnStream(RemovalOf("remove an attribute", kSize, 0),
                        "LOST the value, new, old; LOST a, c"));
 }
@@ -426,6 +430,10 @@ TEST(PowerLossTest, AChangeOfAStreamBeforeAForkMayCostTheForkToo) {
     LosePower(OnStream(WriteOf("make an attribute before a fork longer", kSize, kFork, kSize, 2000),
                        "LOST the value, new, old; LOST c, fork"));
     LosePower(OnStream(TruncationOf("make an attribute before a fork shorter", kSize, kFork, 700),
+                       "LOST the value, new, old; LOST c, fork"));
+    LosePower(OnStream(ReplacementOf("replace one by a longer one", kSize, kFork, 2000),
+                       "LOST the value, new, old; LOST c, fork"));
+    LosePower(OnStream(ReplacementOf("replace one by a shorter one", kSize, kFork, 700),
                        "LOST the value, new, old; LOST c, fork"));
     LosePower(OnStream(RemovalOf("remove an attribute before a fork", kSize, kFork),
                        "LOST the value, new, old; LOST a, c, fork"));

@@ -12,6 +12,7 @@
 
 #include "include/mavoea.h"
 #include "platform/kernel.h"
+#include "stream/internal.h"
 #include "tests/crash/metadata.h"
 #include "tests/support/stream_builder.h"
 #include "tests/support/temp_dir.h"
@@ -48,6 +49,9 @@ class Stream {
                             static_cast<unsigned>(value.size()), 0, EAS_WRITE_OVERWRITE) < 0
                    ? -1
                    : 0;
+    }
+    int Replace(const std::string& name, const Bytes& value) const {
+        return EASReplace(handle_, name.c_str(), value);
     }
     int Remove(const std::string& name) const { return MAVOEASRemove(handle_, name.c_str()); }
     int Truncate(const std::string& name, unsigned length) const {
@@ -150,6 +154,15 @@ inline StreamOperation WriteOfLast(const std::string& name, std::size_t size, st
         .run = [value](int fd) { return Stream(fd).Write("c", value); },
         .item = "c",
     };
+}
+
+inline StreamOperation ReplacementOf(const std::string& name, std::size_t size, std::size_t fork,
+                                     std::size_t new_size) {
+    StreamOperation operation = WriteOf(name, size, fork, size, new_size);
+    operation.run = [value = *operation.new_value](int fd) {
+        return Stream(fd).Replace(kItem, value);
+    };
+    return operation;
 }
 
 inline StreamOperation RemovalOf(const std::string& name, std::size_t size, std::size_t fork) {

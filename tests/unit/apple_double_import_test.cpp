@@ -190,11 +190,127 @@ TEST_F(WriteToFdTest, WhatTheDestinationHasBesidesIsKept) {
     EXPECT_EQ(from.Build(), ReadFile(source_path_));
 }
 
-TEST_F(WriteToFdTest, ALongerValueOfTheSameNameKeepsItsEnd) {
-    Fill(StreamImage{.attributes = {{"a", Ascii("a longer value")}, {"b", {}}}});
-    SetSource(StreamImage{.attributes = {{"a", Ascii("one")}, {"b", Ascii("two")}}});
+// Whatever its length, wherever it lies, and whatever lies behind: the result is the file that a
+// stream with these values is.
+TEST_F(WriteToFdTest, AValueOfTheSameNameIsReplacedWhole) {
+    for (const std::size_t fork : {0u, 700u, 40000u}) {
+        for (const std::size_t place : {0u, 1u, 2u}) {
+            for (const std::size_t former : {0u, 1u, 300u, 5000u, 70000u}) {
+                for (const std::size_t now : {0u, 1u, 299u, 300u, 301u, 5000u, 70000u}) {
+                    SCOPED_TRACE(::testing::Message()
+                                 << fork << " " << place << " " << former << " -> " << now);
+                    StreamImage image = Three();
+                    image.fork = Pattern(fork, 5);
+                    image.finder_info = Pattern(32, 6);
+                    image.attributes[place].value = Pattern(former, 7);
+                    Fill(image);
+                    Attribute attribute = image.attributes[place];
+                    attribute.value = Pattern(now, 8);
+                    SetSource(StreamImage{.attributes = {attribute}});
+                    EXPECT_EQ(0, Copy());
+                    image.attributes.erase(image.attributes.begin() +
+                                           static_cast<std::ptrdiff_t>(place));
+                    image.attributes.push_back(attribute);
+                    EXPECT_EQ(image.Build(), Contents());
+                }
+            }
+        }
+    }
+}
+
+TEST_F(WriteToFdTest, AReplacementIsOneRewriteBehindWhichTheFileEndsWithItsFork) {
+    Bytes before = StreamImage{.attributes = {{"a", Pattern(700)}}}.Build();
+    Fill(before + Repeat(0xEE, 100));
+    SetSource(StreamImage{.attributes = {{"a", Ascii("short")}}});
+    TakeCallNames();
     EXPECT_EQ(0, Copy());
-    ExpectCopied({{"a", Ascii("oneonger value")}, {"b", Ascii("two")}});
+    const auto calls = TakeCallNames();
+    EXPECT_EQ(1, std::count(calls.begin(), calls.end(), "pwrite"));
+    EXPECT_EQ(1, std::count(calls.begin(), calls.end(), "fsync"));
+    EXPECT_EQ((StreamImage{.attributes = {{"a", Ascii("short")}}}.Build()), Contents());
+}
+
+TEST_F(WriteToFdTest, OfTwoOfOneNameTheSecondCounts) {
+    SetSource(StreamImage{.attributes = {{"a", Ascii("the longer first")},
+                                         {"b", Ascii("between")},
+                                         {"a", Ascii("second")}}});
+    EXPECT_EQ(0, Copy());
+    EXPECT_EQ(
+        (StreamImage{.attributes = {{"b", Ascii("between")}, {"a", Ascii("second")}}}.Build()),
+        Contents());
+}
+
+TEST_F(WriteToFdTest, WhateverFailsAReplacedValueIsOldOrNewAndTheOthersStay) {
+    for (const std::size_t size : {100u, 300u, 20000u}) {
+        const StreamImage before = {.attributes = {{"a", Pattern(300, 1)}, {"own", Pattern(50, 2)}},
+                                    .fork = Pattern(700, 3)};
+        SetSource(StreamImage{.attributes = {{"a", Pattern(size, 4)}}});
+        for (int nth = 1;; ++nth) {
+            SCOPED_TRACE(::testing::Message() << size << " " << nth);
+            ASSERT_LT(nth, 100);
+            Fill(before);
+            const FailNthCall fault(nth, EIO);
+            const int result = Copy();
+            const auto contents = ReadMacFile(Contents());
+            ASSERT_TRUE(contents);
+            const Bytes& value = contents->attributes.at("a");
+            EXPECT_EQ(Pattern(50, 2), contents->attributes.at("own"));
+            if (!fault.fired()) {
+                EXPECT_EQ(0, result);
+                EXPECT_EQ(Pattern(size, 4), value);
+                EXPECT_EQ(before.fork, contents->fork);
+                ExpectNothingReported();
+                break;
+            }
+            SCOPED_TRACE(fault.name());
+            EXPECT_TRUE(value == Pattern(300, 1) || value == Pattern(size, 4));
+            if (result == 0) {
+                EXPECT_EQ(Pattern(size, 4), value);
+            }
+            // Only while it moves.
+            const bool moving = fault.name() == "pread" || fault.name() == "pwrite";
+            EXPECT_TRUE(moving || contents->fork == before.fork);
+            TakeRecords();
+            TakeLog();
+        }
+    }
+}
+
+// Also when what has failed is taken up again, from a stream that is opened anew.
+TEST_F(WriteToFdTest, TheDestinationStaysLockedFromTheFirstWriteToTheLast) {
+    for (int nth = 0; nth <= 3; ++nth) {
+        SCOPED_TRACE(nth);
+        Fill(StreamImage{.attributes = {{"b", Pattern(100)}}});
+        SetSource(Three());
+        int syncs = 0;
+        bool writes = false;
+        Hooks().before = [&](const std::string& name) {
+            if (name == "pwrite") writes = true;
+            if (!writes || syncs == 3) return;
+            EXPECT_EQ(F_WRLCK, LockInTheWay(path_, F_RDLCK)) << name;
+        };
+        Hooks().fsync = [&](int) { return ++syncs == nth ? (errno = EIO, -1) : 0; };
+        EXPECT_EQ(nth == 0 ? 0 : -2, Copy());
+        Hooks().before = nullptr;
+        EXPECT_EQ(3, syncs);
+        ExpectCopied({{"a", Ascii("first")}, {"b", Ascii("second")}, {"c", Ascii("third")}});
+        TakeRecords();
+        EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
+    }
+}
+
+TEST_F(WriteToFdTest, NothingIsWrittenOnceTheLockMayBeGone) {
+    SetSource(Three());
+    Hooks().fsync = [](int) { return errno = EIO, -1; };
+    int locks = 0;
+    Hooks().fails = [&](const std::string& call) {
+        // The second is that of the stream opened anew.
+        return call.starts_with("setlock(1)") && ++locks == 2 ? ENOLCK : 0;
+    };
+    EXPECT_EQ(-4, Copy());
+    EXPECT_EQ(2, locks);
+    ExpectCopied({{"a", Ascii("first")}});
+    TakeRecords();
 }
 
 TEST_F(WriteToFdTest, ValuesOfEverySizeAreCopied) {
@@ -848,6 +964,16 @@ TEST_F(FixErrorTest, WhatTheStreamHasBesidesIsKept) {
                            Pattern(32, 6),
                            Pattern(300, 5)}),
               *contents);
+}
+
+TEST_F(FixErrorTest, LongerValuesInTheStreamLeaveNothing) {
+    StreamImage stream = {.attributes = {{"b", Ascii("longer than the second")}, {"own", {}}},
+                          .fork = Pattern(300, 5)};
+    WriteFile(stream_, stream.Build());
+    EXPECT_EQ(0, Fix(Three().bytes));
+    stream.attributes = {
+        {"own", {}}, {"a", Ascii("first")}, {"b", Ascii("second")}, {"c", Ascii("third")}};
+    EXPECT_EQ(stream.Build(), ReadFile(stream_));
 }
 
 TEST_F(FixErrorTest, AFolderHasAResourceFileToo) {

@@ -261,9 +261,9 @@ TEST_F(DoubleToEADirTest, AnEmptyDoubleConvertsToNothing) {
 
 TEST_F(DoubleToEADirTest, AttributesJoinThoseOfTheStreamThatExistsAndReplaceThemByName) {
     Put(SrcDouble(), Whole().Build());
-    Put(DstStream(),
-        StreamImage{.attributes = {{"user.one", Ascii("x")}, {"user.kept", Ascii("kept")}}}
-            .Build());
+    Put(DstStream(), StreamImage{.attributes = {{"user.one", Ascii("longer than 1")},
+                                                {"user.kept", Ascii("kept")}}}
+                         .Build());
     EXPECT_EQ(0, Copy(0));
     EXPECT_EQ((StreamImage{.attributes = {{"user.kept", Ascii("kept")},
                                           {"user.one", Ascii("1")},
