@@ -51,6 +51,12 @@ int IsThere(const char* path, int line = __builtin_LINE()) {
     return SaysMissing(errno) ? 0 : unit.Fail(Err::kOpen, line);
 }
 
+// Whether something is there by now: another process may have been quicker. errno stays.
+bool IsThereNow(const char* path) {
+    const ErrnoKeeper keep;
+    return kernel::Access(path, F_OK) == 0;
+}
+
 // The folder of the legacy file at `path`, for calls on what is in it; not one that a symbolic link
 // leads to, which somebody may have put there to have other files moved.
 UniqueFd FolderOf(const char* path) {
@@ -189,9 +195,7 @@ int ImportAttributeFiles(const char* szPath, const char* stream_path, Folder* fo
     // From its name on, others may want it.
     (void)MAVOEASLockSet(stream.stream(), F_UNLCK);
     if (!file.Name(stream_path)) {
-        const ErrnoKeeper keep;
-        const bool made_meanwhile = errno == EEXIST && kernel::Access(stream_path, F_OK) == 0;
-        return made_meanwhile ? kCurrent : unit.Fail(Err::kOpen);
+        return IsThereNow(stream_path) ? kCurrent : unit.Fail(Err::kOpen);
     }
     // The name is on disk, too, before they go.
     if (MAVOEASFlush(stream.stream()) != 0) return kConverted;
@@ -219,7 +223,8 @@ int AdoptAppleDouble(const char* szPath, const char* apple_double, const char* s
     char dir[kPathBufferSize];
     if (MAVOEADirPath(EA_FORM_FILE, szPath, dir, kDerivedPathMax) != 0) return kFailure;
     if (MAVOEAMKDir(0, dir) != 0) return kFailure;
-    return kernel::Rename(apple_double, stream_path) == 0 ? kConverted : unit.Fail(Err::kRename);
+    if (kernel::Rename(apple_double, stream_path) == 0) return kConverted;
+    return IsThereNow(stream_path) ? kCurrent : unit.Fail(Err::kRename);
 }
 
 int ConvertStream(const char* szPath, const char* stream_path, Folder* folder) {
@@ -233,7 +238,9 @@ int ConvertStream(const char* szPath, const char* stream_path, Folder* folder) {
     }
     const std::int64_t file_time = AppleDoubleAccess(apple_double);
     if (file_time < 0) return kFailure;
-    if (folder_time == 0 && file_time == 0) return kNothing;
+    if (folder_time == 0 && file_time == 0) {
+        return *folder && IsThereNow(stream_path) ? kCurrent : kNothing;
+    }
     // Deliberately the time of the last access, not that of the last change.
     return file_time < folder_time ? ImportAttributeFiles(szPath, stream_path, folder)
                                    : AdoptAppleDouble(szPath, apple_double, stream_path);
@@ -350,7 +357,7 @@ int UpgradeResourceFile(const char* szPath) {
     const UniqueFd folder = FolderOf(legacy);
     if (!folder) return unit.Fail(Err::kOpen);
     if (kernel::RenameAt(folder.get(), MAVOEA_KIND_LEGACY_RESOURCE, AT_FDCWD, current) != 0) {
-        return unit.Fail(Err::kRename);
+        return IsThereNow(current) ? kCurrent : unit.Fail(Err::kRename);
     }
     CarryMarks(current, szPath);
     *strrchr(legacy, '/') = '\0';

@@ -54,7 +54,13 @@ bool NewFile::Name(const char* path) {
         return kernel::Link(self, path, AT_SYMLINK_FOLLOW) == 0;
     }
     if (kernel::Link(temporary_, path, 0) == 0) return true;
-    if (errno == EEXIST || kernel::Rename(temporary_, path) != 0) return false;
+    if (errno == EEXIST) return false;
+    // A file system without links.
+    if (kernel::Access(path, F_OK) == 0) {
+        errno = EEXIST;
+        return false;
+    }
+    if (kernel::Rename(temporary_, path) != 0) return false;
     *temporary_ = '\0';
     return true;
 }

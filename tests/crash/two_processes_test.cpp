@@ -1,5 +1,6 @@
 // Two processes that change the same stream at the same time, each by calls of its own that open
-// it, do one thing and close it again. Whoever finds it locked is told so and has changed nothing.
+// it, do one thing and close it again: whoever finds it locked is told so and has changed nothing.
+// And two that open the same object's while it is still to be converted.
 
 #include <errno.h>
 #include <fcntl.h>
@@ -12,7 +13,10 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
 #include <cstdint>
+#include <filesystem>
+#include <new>
 #include <optional>
 #include <random>
 #include <string>
@@ -25,6 +29,7 @@
 #include "tests/support/fake_platform.h"
 #include "tests/support/kernel_control.h"
 #include "tests/support/mac_files.h"
+#include "tests/support/object_files.h"
 #include "tests/support/stream_builder.h"
 #include "tests/support/temp_dir.h"
 
@@ -339,6 +344,98 @@ TEST(TwoProcessesTest, EveryCallDoesItsWorkOrIsToldThatTheStreamIsLocked) {
     EXPECT_TRUE(contents->fork == Signed(shared->fork_seed, shared->fork_size));
     EXPECT_EQ(0, LookAtStream(dir / "stream").refusal);
     munmap(page, sizeof(Shared));
+    ResetKernel();
+    ResetPlatform();
+}
+
+// ---- Two opens of an object with metadata of earlier versions
+// --------------------------------------
+
+constexpr int kRounds = kEmulated ? 200 : 2000;
+
+// Where the parent and its two children are: a child works on round n when `round` is n, and has
+// done it when its `done` is n.
+struct Rounds {
+    std::atomic<int> round;
+    std::atomic<int> done[2];
+    std::atomic<int> failed;
+};
+
+const Items& Legacy() {
+    static const Items& items =
+        *new Items{{"color", Ascii("blue")}, {"icon", Signed(3, 6000)}, {"tags", Ascii("work")}};
+    return items;
+}
+
+// Each opens the stream to write into it, as soon as the round begins.
+[[noreturn]] void OpenEachRound(const ObjectFiles& object, int self, Rounds* rounds) {
+    alarm(100);
+    for (int round = 1; round <= kRounds; ++round) {
+        while (rounds->round != round) sched_yield();
+        const int fd = MAVOEAOpen(EA_FORM_FILE, object.object().c_str(), MAVOEA_KIND_STREAM,
+                                  O_RDWR | O_CREAT, EA_PLACE_EADIR);
+        if (fd < 0) ++rounds->failed;
+        ::close(fd);
+        (void)TakeCallNames();
+        (void)TakeRecords();
+        (void)TakeLog();
+        rounds->done[self] = round;
+    }
+    _exit(0);
+}
+
+// What two processes find at the same time is converted once, and whole, by whichever it is.
+TEST(TwoProcessesTest, OfTwoOpensAtOnceNeitherHidesWhatEarlierVersionsKept) {
+    for (const std::string& place : {FastDirectory(), std::string("/tmp")}) {
+        ResetKernel();
+        ResetPlatform();
+        Hooks().fsync = [](int) { return 0; };
+        const TempDir dir(place);
+        const ObjectFiles object = {dir / "share", "object"};
+        MakeDir(object.parent);
+        object.MakeObject();
+        void* const page = mmap(nullptr, sizeof(Rounds), PROT_READ | PROT_WRITE,
+                                MAP_SHARED | MAP_ANONYMOUS, -1, 0);
+        ASSERT_NE(MAP_FAILED, page);
+        auto* const rounds = new (page) Rounds{};
+        fflush(nullptr);
+        pid_t children[2];
+        for (int self = 0; self < 2; ++self) {
+            children[self] = fork();
+            if (children[self] == 0) OpenEachRound(object, self, rounds);
+        }
+        int lost = 0;
+        for (int round = 1; round <= kRounds; ++round) {
+            std::filesystem::remove_all(object.ea_dir());
+            const bool sidecar = round % 4 == 0;
+            if (sidecar) {
+                StreamImage image;
+                for (const auto& [name, value] : Legacy()) {
+                    image.attributes.push_back({name, value});
+                }
+                WriteFile(object.sidecar(), image.Build());
+            } else {
+                object.MakeFolder();
+                for (const auto& [name, value] : Legacy()) {
+                    WriteFile(object.folder() + "/" + name, value);
+                }
+            }
+            rounds->round = round;
+            while (rounds->done[0] != round || rounds->done[1] != round) sched_yield();
+            const Bytes stream = Exists(object.stream()) ? ReadFile(object.stream()) : Bytes{};
+            const auto contents = stream.empty() ? std::nullopt : ReadMacFile(stream);
+            lost += contents && contents->attributes == Legacy() ? 0 : 1;
+        }
+        for (const pid_t child : children) {
+            int status = 0;
+            EXPECT_EQ(child, waitpid(child, &status, 0));
+            EXPECT_EQ(0, status);
+        }
+        EXPECT_EQ(0, lost);
+        EXPECT_EQ(0, rounds->failed);
+        printf("two processes: %d rounds of two opens in %s\n", kRounds, place.c_str());
+        munmap(page, sizeof(Rounds));
+    }
     ResetKernel();
     ResetPlatform();
 }

@@ -1213,7 +1213,7 @@ TEST_F(EaUpgradeNewStreamTest, ThatCannotBeLockedFailsWithItsCode) {
 }
 
 TEST_F(EaUpgradeNewStreamTest, DoesNotReplaceOneThatIsMadeMeanwhile) {
-    for (const Lack lack : {Lack::kNone, Lack::kNameless, Lack::kProc}) {
+    for (const Lack lack : kLacks) {
         SCOPED_TRACE(static_cast<int>(lack));
         StartAgain();
         MakeFolder(values_);
@@ -1228,6 +1228,37 @@ TEST_F(EaUpgradeNewStreamTest, DoesNotReplaceOneThatIsMadeMeanwhile) {
         EXPECT_EQ(values_, InFolder());
         ExpectNothingReported();
     }
+}
+
+// Another process converts what this one has just found.
+TEST_F(EaUpgradeTest, WhatAnotherProcessConvertsMeanwhileIsCurrent) {
+    const auto at_the_first = [this](const std::string& call,
+                                     const std::function<void()>& convert) {
+        Hooks().before = [=](const std::string& name) {
+            if (name != call) return;
+            Hooks().before = nullptr;
+            convert();
+        };
+    };
+    MakeFolder(two_);
+    at_the_first("readdir", [this] {
+        MakeStream(Ascii("stream"));
+        for (const auto& [name, value] : two_) std::filesystem::remove(folder_ + "/" + name);
+    });
+    EXPECT_EQ(1, UpgradeStream());
+
+    StartAgain();
+    MakeSidecar(SmallSidecar(), 200);
+    at_the_first("rename", [this] { std::filesystem::rename(sidecar_, stream_); });
+    EXPECT_EQ(1, UpgradeStream());
+    EXPECT_EQ(SmallSidecar(), ContentsOf(stream_));
+
+    StartAgain();
+    MakeFolder({{"MAVO:Resource", Ascii("resource")}});
+    at_the_first("rename", [this] { std::filesystem::rename(legacy_resource_, resource_); });
+    EXPECT_EQ(1, MAVOEAUpgrade(object_.c_str(), kResource));
+    EXPECT_EQ(Ascii("resource"), ContentsOf(resource_));
+    ExpectNothingReported();
 }
 
 TEST_F(EaUpgradeNewStreamTest, IsMadeBesideWhatAnEarlierProcessOfItsNumberLeft) {
