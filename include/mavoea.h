@@ -261,8 +261,9 @@ MAVOEA_API int MAVOEASFlush(EASHandle* h);
 /* ---- EA streams: attributes ----------------------------------------------------------------- */
 /* Names are compared byte by byte and have at most 254 bytes, values that are written at most
  * 2 GiB - 1; a stream holds at most 65,535 attributes and at most 4 GiB. What would pass a limit is
- * refused with 0xD00, before anything has changed. A stream whose offsets, lengths and counts do not fit together is refused with 0xA00 by
- * whatever would rewrite it, before anything on disk has changed.
+ * refused with 0xD00, before anything has changed. A stream whose offsets, lengths and counts do
+ * not fit together is refused with 0xA00 by whatever would rewrite it, before anything on disk has
+ * changed.
  *
  * A failed MAVOEASWrite, MAVOEASRemove or MAVOEASTruncate may leave memory ahead of the file:
  * close the handle and open the stream again. */
