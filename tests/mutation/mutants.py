@@ -35,7 +35,7 @@ SURVIVORS = ROOT / "tests/mutation/survivors.txt"
 LEAST_KILLED = 90  # of 100
 
 # They take long and look for what the others do not: crashes, and bounds of time and memory.
-LEFT_OUT = {"stream_random_test", "sweep_test", "two_processes_test"}
+LEFT_OUT = {"made_files_test", "stream_random_test", "sweep_test", "two_processes_test"}
 
 SWITCH_HEADER = """#ifdef __cplusplus
 extern "C" {
