@@ -41,7 +41,7 @@ constexpr mode_t kPermissions = 07777;
 
 // Whether a call that failed with `error` has said that there is no such file. After any other
 // failure there may be one, and nothing is decided.
-constexpr bool SaysMissing(int error) {
+bool SaysMissing(int error) {
     return error == ENOENT || error == ENOTDIR || error == ENAMETOOLONG;
 }
 

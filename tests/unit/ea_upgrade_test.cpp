@@ -1232,8 +1232,7 @@ TEST_F(EaUpgradeNewStreamTest, DoesNotReplaceOneThatIsMadeMeanwhile) {
 
 // Another process converts what this one has just found.
 TEST_F(EaUpgradeTest, WhatAnotherProcessConvertsMeanwhileIsCurrent) {
-    const auto at_the_first = [this](const std::string& call,
-                                     const std::function<void()>& convert) {
+    const auto at_the_first = [](const std::string& call, const std::function<void()>& convert) {
         Hooks().before = [=](const std::string& name) {
             if (name != call) return;
             Hooks().before = nullptr;
