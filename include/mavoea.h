@@ -10,10 +10,10 @@
  *   real extended attributes       on volumes that keep them
  *
  * Results. Unless a function says otherwise it returns 0, a count or a size on success and -1 on
- * failure. A failure records exactly one code (MAVOEA_ERR_...) with the unit and line that decided
- * it on the calling thread's error stack, where MLIBCErrGet() of libmavocore finds it. Where a
- * function sets `errno`, its comment says so; elsewhere a failure leaves the `errno` of the system
- * call that failed.
+ * failure, and a failure records exactly one code (MAVOEA_ERR_...) with the unit and line that
+ * decided it on the calling thread's error stack, where MLIBCErrGet() of libmavocore finds it.
+ * Where a function sets `errno`, its comment says so; elsewhere a failure leaves the `errno` of the
+ * system call that failed.
  *
  * Ownership. The caller owns every descriptor, handle, buffer and string list that it passes in or
  * gets back. The library closes only descriptors that it opened.
@@ -133,8 +133,8 @@ typedef struct EAAdouble {
     uint32_t magic;   /* host order */
     uint32_t version; /* host order */
     uint8_t filler[16];
-    EAAdoubleEntry entries[20];
-    uint8_t data[1024]; /* the block as on disk */
+    EAAdoubleEntry entries[20]; /* ids 1 to 15 at their number, netatalk's own from 16 on */
+    uint8_t data[1024];         /* the block as on disk */
 } EAAdouble;
 
 /* ---- Paths ---------------------------------------------------------------------------------- */
@@ -180,19 +180,22 @@ MAVOEA_API int MAVOEAPath(int form, const char* szPath, const char* szName, char
  * afterwards.
  *
  * Codes: 0xD00 NULL, or no '/' in szEADirPath with blParentFirst; 0x3C00 mkdir or seteuid(0)
- * failed; 0x2A00 the new directory could not be opened (it is removed again unless somebody has
- * used it), or the mode or the Finder info could not be set (it stays); 0x100 out of memory. The
- * effective uid is changed for the duration, for the whole process. */
+ * failed, the latter also where the directory exists; 0x2A00 the new directory could not be opened
+ * (it is removed again unless somebody has used it), or the mode or the Finder info could not be
+ * set (it stays); 0x100 out of memory. The effective uid is changed for the duration, for the whole
+ * process. */
 MAVOEA_API int MAVOEAMKDir(int blParentFirst, const char* szEADirPath);
 
 /* Opens the metadata file of kind szName of szPath's object with the open(2) flags oflag, and mode
- * 0777 where it creates. With O_CREAT the EA directory is made as well. Waits, without O_NONBLOCK,
- * for who has a lease on the file, and for nobody else. Returns a descriptor, which the caller
- * closes, or -1: a failed open(2) records no code and leaves its errno; 0xD00 NULL
- * argument (errno ENOENT) or unknown place; otherwise the codes of the path functions and of
- * MAVOEAMKDir(). What is missing is first looked for in earlier layouts, by MAVOEAUpgrade(), whose
- * codes are recorded. Where that fails, with O_CREAT, nothing is made over what it may have left:
- * -1, with its errno and codes. */
+ * 0777 where it creates. With O_CREAT the EA directory is made as well: who cannot become the
+ * superuser gets 0x3C00, even where directory and file exist. Waits, without O_NONBLOCK, for who
+ * has a lease on the file, and for nobody else. What is missing is first looked for in earlier
+ * layouts, by MAVOEAUpgrade(), but not in EA_FORM_FOLDER; its failures leave their codes. Where it
+ * fails, with O_CREAT, nothing is made over what it may have left: -1, with its errno and codes.
+ * Returns a descriptor, which the caller closes, or -1: a failed open(2) records no code and leaves
+ * its errno, ELOOP for a link, EISDIR for a directory and ENXIO for anything else that is no
+ * regular file; 0xD00 NULL argument (errno ENOENT) or unknown place; otherwise the codes of the path
+ * functions and of MAVOEAMKDir(). */
 MAVOEA_API int MAVOEAOpen(int form, const char* szPath, const char* szName, int oflag, int place);
 
 /* MAVOEAOpen() for EA_PLACE_EADIR. */
@@ -248,11 +251,13 @@ MAVOEA_API EASHandle* MAVOEASOpen(int fd, int lockType);
  * (0x400; h is freed all the same) or h is NULL (0xD00). */
 MAVOEA_API int MAVOEASClose(EASHandle* h);
 
-/* Asks the kernel whether *lock could be placed (F_GETLK), and fills it in. 0xD00, 0x2A00. */
+/* Asks the kernel whether *lock could be placed (F_GETLK), and fills it in. 0xD00, 0x2A00.
+ * <fcntl.h> has struct flock64 under _GNU_SOURCE only; nothing else here needs that. */
 MAVOEA_API int MAVOEASLockGet(EASHandle* h, struct flock64* lock);
 
-/* Changes the handle's lock without waiting. 0xD00; 0x400 when another process is in the way, the
- * lock then stays as it was. */
+/* Changes the handle's lock without waiting. The file is not read again: who had no lock until then
+ * writes over what others have changed since MAVOEASOpen(). 0xD00; 0x400 when another process is in
+ * the way, the lock then stays as it was. */
 MAVOEA_API int MAVOEASLockSet(EASHandle* h, int lockType);
 
 /* fsync(2). 0xD00, 0x2A00. */
@@ -277,9 +282,9 @@ MAVOEA_API int MAVOEASSearch(EASHandle* h, const char* name);
 MAVOEA_API int MAVOEASEnum(EASHandle* h, MLIBCSzList** ppList);
 
 /* Copies up to `size` bytes of the value, from `offset` on, into buf (never NULL) and returns their
- * number, 0 behind the end. With size 0 returns the value's length. Of values of 2 GiB and more,
- * pieces can be read. -1: 0xD00; 0x300 no lock; 0x2000; 0xA00, also for a number of 2 GiB and
- * more. */
+ * number, 0 behind the end. With size 0 returns the value's length (0 if `offset` is behind it). Of
+ * values of 2 GiB and more, pieces can be read. -1: 0xD00; 0x300 no lock; 0x2000; 0xA00, also for a
+ * number of 2 GiB and more. */
 MAVOEA_API int MAVOEASRead(EASHandle* h, const char* name, void* buf, unsigned size,
                            unsigned offset);
 
@@ -326,20 +331,21 @@ MAVOEA_API int MAVOEASUpdateEntry(EASHandle* h, unsigned index, unsigned char* b
  * followed. "com.apple.ResourceFork" is the file "rsrc" beneath the object, on filesystems that
  * offer it; an empty fork counts as absent. While a fork is used, a file without the owner-execute
  * bit gets it, as the superuser, and loses it again. Failures of the attribute calls themselves
- * record no code and leave errno. NULL and negative arguments: a log line and 0xD00. */
+ * record no code and leave errno; so do those of a fork that have none below, which are logged.
+ * NULL and negative arguments: a log line and 0xD00. */
 
 /* Appends all attribute names to *ppList; empties it when there are none. 0, or -1: 0xD00; 0x2A00;
  * 0x100; or the list takes no more. */
 MAVOEA_API int MAVOEAXattrEnum(const char* szPath, MLIBCSzList** ppList);
 
 /* Reads a value into szValue and returns its length; with cbValue 0 only the length. -1: 0xD00;
- * for the fork also 0x700 missing, a directory or empty (errno ENODATA), 0x2700, 0xBF00 it does
- * not fit (errno ERANGE). */
+ * for the fork also 0x700 the object is missing or a directory, or the fork empty (errno ENODATA);
+ * 0x2700; 0xBF00 it does not fit (errno ERANGE). A missing fork is ENOENT alone, and not logged. */
 MAVOEA_API int MAVOEAXattrGet(const char* szPath, const char* szName, void* szValue, int cbValue);
 
 /* Sets a value; flags as setxattr(2): 1 create only, 2 replace only. szValue must not be NULL, even
  * for cbValue 0. -1: 0xD00; for the fork of a directory 0x700, and errno EEXIST or ENODATA by
- * flags. A fork is written with sync(2) behind it. */
+ * flags alone, not logged. A fork is written with sync(2) behind it. */
 MAVOEA_API int MAVOEAXattrSet(const char* szPath, const char* szName, const void* szValue,
                               int cbValue, int flags);
 
@@ -391,8 +397,8 @@ MAVOEA_API int MAVOEAFileEAFSFinfoEASync(const char* path, int checkFSType);
 /* Writes Finder info into the resource file, in place, under its write lock; one that is missing is
  * created, of 82 bytes. One that is removed or replaced before it is locked is opened, or created,
  * anew. When nothing could be written, an empty one is removed again if this call has made it and
- * has its lock. 0, or -1: 0xD00 NULL; 0x300, 0xB00 not written; 0x400 it was replaced time and
- * again (errno EAGAIN); what MAVOEAOpen() and MAVOEASOpen() give. */
+ * has its lock. 0, or -1: 0xD00 NULL, or no Finder info in the file; 0xB00 not written; 0x400 it
+ * was replaced time and again (errno EAGAIN); what MAVOEAOpen() and MAVOEASOpen() give. */
 MAVOEA_API int MAVOEAEADirFSFInfoWrite(const char* path, const unsigned char finfo[32]);
 
 /* Writes the Finder info of h's header (bytes 50 to 81) into its file, where the file's Finder info
@@ -455,10 +461,13 @@ MAVOEA_API int MAVOEAUpgrade(const char* szPath, const char* szName);
  */
 
 /* Removes the metadata of szPath's object and, should nothing else be in it, its EA directory. On
- * types 0 and 5 that is the "._" file, on 1, 2, 3, 6 and 10 what is in the EA directory in both
- * forms (and the object's archive bit is set), on 7 nothing; other types do nothing at all. 0, or
- * -1, with all done that could be: 0xD00 NULL; 0x2A00 the type (of the parent directory's volume)
- * could not be told; 0x3900 something could not be removed; the path functions' codes. */
+ * types 0 and 5 that is the "._" file and, should it go, the legacy folder (whatever becomes of
+ * that one), on 1, 2, 3, 6 and 10 what is in the EA directory in both forms (and the object's
+ * archive bit is set), on 7 nothing; other types do nothing at all. 0, or -1, with all done that
+ * could be: 0xD00 NULL; 0x2A00 the type (of the parent directory's volume) could not be told;
+ * 0x3900 something could not be removed; the path functions' codes. What is in the way in a legacy
+ * folder, or the current directory if it cannot be told, is logged and has no code; each of the two
+ * forms may record one. */
 MAVOEA_API int MAVOEARemove(const char* szPath, int fsType, EAIndexFlags* pFlags);
 
 /* The same, for both indexes, but the EA stream stays. */
@@ -479,10 +488,12 @@ MAVOEA_API void MAVOEARemoveDanglingEADir(const char* szDir);
 
 /* Moves the metadata of an object that has been renamed from szOldPath to szNewPath, over what is
  * there; legacy layouts become current ones on the way. The type is that of szNewPath, which must
- * be absolute for it to be asked. Types 0 and 5: 0, whatever became of the "._" file. Types 1, 2,
- * 3, 6, 7 and 10: the sum of three moves, each 0, -1 or the exit status of "/bin/mv" where it takes
- * that to reach another volume; the archive bit is set at szNewPath. Other types do nothing.
- * Negative: 0xD00 NULL; 0x2800 rename; the codes of paths, EA directories and the upgrade. */
+ * be absolute for it to be asked: if it cannot be told, that is -1, logged, with no code. Types 0
+ * and 5: 0, whatever became of the "._" file and of the legacy folder, which follows it. Types 1,
+ * 2, 3, 6, 7 and 10: the sum of three moves, each 0, -1 or the exit status of "/bin/mv" where it
+ * takes that to reach another volume; the archive bit is set at szNewPath. Each move that fails
+ * records a code, by "/bin/mv" two, or is logged. Other types do nothing. Negative: 0xD00 NULL;
+ * 0x2800 rename; the codes of paths, EA directories and the upgrade. */
 MAVOEA_API int MAVOEARename(const char* szOldPath, const char* szNewPath, int fsType,
                             EAIndexFlags* pFlags);
 
@@ -500,7 +511,7 @@ MAVOEA_API int MAVOEARename(const char* szOldPath, const char* szNewPath, int fs
  * 0 when it is done, also when the destination's type takes no metadata and when only what follows
  * the copy failed, which is logged; -1 or less: -1 failed, -3 the name is too long for a "._" file,
  * -4 the source's type has no metadata, -32 and -33 a "._" name that clients do not take. What has
- * been done stays done. */
+ * been done stays done. A failure may record no code, one or several; 0xD00 is NULL. */
 MAVOEA_API int MAVOEACopyEx(const char* szSrc, char* szDst, int move, int copyEADir, int srcFSType,
                             int dstFSType, int updateFileIndex, int updateIndex,
                             int (*copyFn)(const char* from, const char* to));

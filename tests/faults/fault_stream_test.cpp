@@ -137,6 +137,7 @@ TEST(StreamOpenFaults, ANewStreamOpensOrLeavesNeitherMemoryNorLock) {
     SweepFaults(c);
 }
 
+// Promise: "MAVOEASOpen: 0x200"
 TEST(StreamOpenFaults, AStreamOpensOrLeavesNeitherMemoryNorLock) {
     FaultCase c = Opening("open a stream", ThreeAttributes(5000).Build(), F_RDLCK);
     c.rules = Rules{HalfIsEnough(2960)} + kOpenFailures + Reading(0);
@@ -237,6 +238,7 @@ TEST(StreamCountFaults, ACountLeavesNoLock) {
 
 // ---- The table ----
 
+// Promise: "MAVOEASAllocEntry: 0x200"
 TEST(StreamTableFaults, ATableThatCannotGrowStaysValid) {
     FaultCase c = OnHandle("make room for attributes", ThreeAttributes(0).Build(),
                            [](FaultWorld& w) { return MAVOEASAllocEntry(w.handle, 10); });
@@ -388,6 +390,7 @@ FaultCase Writing(const char* name, const Bytes& stream, const char* attribute, 
     return c;
 }
 
+// Promise: "MAVOEASWrite: 0x200"
 TEST(StreamWriteFaults, TheFirstAttributeIsWrittenOrTheFailureRecorded) {
     FaultCase c = Writing("write a first attribute", {}, "a", Pattern(300), 0, 0);
     c.rules = Rules{Refused("malloc", {0x200, "eas_write"}), NotSynced({{0x2A00, "eas_flush"}})} +
@@ -395,6 +398,7 @@ TEST(StreamWriteFaults, TheFirstAttributeIsWrittenOrTheFailureRecorded) {
     SweepFaults(c);
 }
 
+// Promise: "EA streams: attributes: A failed MAVOEASWrite"
 TEST(StreamWriteFaults, ANewAttributeLeavesAllAsItIsUntilTheForkMoves) {
     FaultCase c = Writing("write a new attribute", ThreeAttributes(40'000).Build(), "new",
                           Pattern(300), 4, EAS_WRITE_OVERWRITE);
@@ -431,6 +435,7 @@ TEST(StreamWriteFaults, ATableThatMustGrowGrowsBeforeAnythingElseChanges) {
     SweepFaults(c);
 }
 
+// Promise: "MAVOEASWrite: 0xA00"
 TEST(StreamWriteFaults, AnAttributeThatGrowsLeavesAllAsItIsUntilTheForkMoves) {
     FaultCase c = Writing("write more of an attribute", ThreeAttributes(40'000).Build(), "first",
                           Pattern(300), 4, EAS_WRITE_OVERWRITE);
@@ -496,6 +501,8 @@ TEST(StreamWriteFaults, InALargeStreamOnlyWhatLiesBehindAValueMoves) {
     SweepFaults(c);
 }
 
+// Promise: "MAVOEASRemove: 0x200"
+// Promise: "MAVOEASRemove: 0xA00"
 TEST(StreamRemoveFaults, AnAttributeIsRemovedOrTheFailureRecorded) {
     StreamImage image = ThreeAttributes(40'000);
     image.attributes[2].value = Pattern(300, 4);  // what stays outweighs header and table
@@ -521,6 +528,8 @@ TEST(StreamRemoveFaults, AnAttributeIsRemovedOrTheFailureRecorded) {
     SweepFaults(c);
 }
 
+// Promise: "MAVOEASTruncate: 0x200"
+// Promise: "MAVOEASTruncate: 0xA00"
 TEST(StreamTruncateFaults, ATruncatedValueIsWrittenOrTheFailureRecorded) {
     struct Length {
         const char* name;

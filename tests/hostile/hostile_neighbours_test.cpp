@@ -799,6 +799,7 @@ class HostileFileTest : public HostileNeighboursTest {
     static inline bool keeps_what_is_there = true;
 };
 
+// Promise: "MAVOEAOpen: Returns a descriptor"
 TEST_F(HostileFileTest, AMetadataFileThatIsNoRegularFileIsNotOpened) {
     for (const OpenedFile& file : kOpenedFiles) {
         WithEach(file.place, Layout::kCurrent, [&](const Share& share, Kind kind) {

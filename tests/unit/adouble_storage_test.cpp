@@ -62,6 +62,8 @@ class StorageTest : public ::testing::Test {
 // ---- The attribute
 // -------------------------------------------------------------------------------
 
+// Promise: "MAVOEAFileEAAdoubleRead: The record"
+// Promise: "MAVOEAFileEAAdoubleRead: 0"
 TEST_F(StorageTest, ARecordInTheAttributeIsRead) {
     SetAttribute(AttributeRecord());
     EXPECT_EQ(0, ReadFileEA());
@@ -69,11 +71,13 @@ TEST_F(StorageTest, ARecordInTheAttributeIsRead) {
     EXPECT_EQ(Pattern(32, 0x40), Bytes(ad_.data + 122, ad_.data + 154));
 }
 
+// Promise: "MAVOEAFileEAAdoubleRead: 1 there is none"
 TEST_F(StorageTest, AnObjectWithoutTheAttributeHasNoRecord) {
     EXPECT_EQ(1, ReadFileEA());
     EXPECT_EQ(1, MAVOEAFileEAAdoubleRead((dir_ / "missing").c_str(), &ad_));
 }
 
+// Promise: "MAVOEAFileEAAdoubleRead: -1, logged: 0xD00"
 TEST_F(StorageTest, NullIsABadArgumentToTheReads) {
     EXPECT_EQ(-1, MAVOEAFileEAAdoubleRead(nullptr, &ad_));
     EXPECT_EQ(-1, MAVOEAFileEAAdoubleRead(object_.c_str(), nullptr));
@@ -85,6 +89,7 @@ TEST_F(StorageTest, NullIsABadArgumentToTheReads) {
                                            RecordOf(0xD00, "ea_eadirfs_adouble_read")));
 }
 
+// Promise: "MAVOEAFileEAAdoubleRead: 0xA00"
 TEST_F(StorageTest, AnAttributeOfAnotherSizeIsRefused) {
     Bytes record = AttributeRecord();
     record.resize(401);
@@ -101,6 +106,7 @@ TEST_F(StorageTest, AnAttributeOfAnotherSizeIsRefused) {
                                        object_ + "] " + strerror(ERANGE)));
 }
 
+// Promise: "MAVOEAFileEAAdoubleRead: 0xA00"
 TEST_F(StorageTest, AnAttributeThatDoesNotParseIsRefused) {
     Bytes record = AttributeRecord();
     record[0] = 1;
@@ -113,6 +119,7 @@ TEST_F(StorageTest, AnAttributeThatDoesNotParseIsRefused) {
     EXPECT_EQ("ea_fileafs_adouble_read:LINE MAVOEAAdoubleRead failed", log[1]);
 }
 
+// Promise: "MAVOEAFileEAAdoubleRead: 0xA00"
 TEST_F(StorageTest, AnAttributeHasItsEightEntries) {
     const Bytes whole = AttributeRecord();
     Bytes record = whole;
@@ -136,6 +143,7 @@ TEST_F(StorageTest, AnAttributeHasItsEightEntries) {
     }
 }
 
+// Promise: "MAVOEAFileEAAdoubleRead: 0xA00"
 TEST_F(StorageTest, AFailedReadOfTheAttributeIsLogged) {
     const FailCall fault("getxattr", EIO);
     EXPECT_EQ(-1, ReadFileEA());
@@ -144,6 +152,8 @@ TEST_F(StorageTest, AFailedReadOfTheAttributeIsLogged) {
                                        object_ + "] " + strerror(EIO)));
 }
 
+// Promise: "Netatalk record: The AFP service's"
+// Promise: "MAVOEAFileEAAdoubleFlush: Stores"
 TEST_F(StorageTest, ARecordIsStoredAsTheAttributeAndReplacesTheOneBefore) {
     SetAttribute(Repeat(9, 1000));
     const Bytes record = AttributeRecord();
@@ -154,6 +164,8 @@ TEST_F(StorageTest, ARecordIsStoredAsTheAttributeAndReplacesTheOneBefore) {
     EXPECT_EQ(largest, Attribute());
 }
 
+// Promise: "MAVOEAFileEAAdoubleFlush: Stores"
+// Promise: "MAVOEAFileEAAdoubleFlush: 0, or -1: 0xD00"
 TEST_F(StorageTest, BadArgumentsToTheFlushesTouchNothing) {
     const Bytes block(1025);
     using Flush = int (*)(const void*, int, const char*);
@@ -172,6 +184,8 @@ TEST_F(StorageTest, BadArgumentsToTheFlushesTouchNothing) {
     EXPECT_THAT(TakeCallNames(), IsEmpty());
 }
 
+// Promise: "MAVOEAFileEAAdoubleFlush: 0x300"
+// Promise: "MAVOEAFileEAAdoubleFlush: 0xB00"
 TEST_F(StorageTest, WhyTheAttributeCouldNotBeSetIsToldByTheCode) {
     const Bytes record = AttributeRecord();
     for (const auto& [error, code] : {std::pair{EPERM, 0x300}, {ENOSPC, 0xB00}, {EACCES, 0xB00}}) {
@@ -185,6 +199,9 @@ TEST_F(StorageTest, WhyTheAttributeCouldNotBeSetIsToldByTheCode) {
 // ---- The resource file
 // ---------------------------------------------------------------------------
 
+// Promise: "Netatalk record: The AFP service's"
+// Promise: "MAVOEAFileEAAdoubleRead: The record"
+// Promise: "MAVOEAFileEAAdoubleRead: 0"
 TEST_F(StorageTest, TheHeadOfAResourceFileIsRead) {
     const long before = OpenDescriptors();
     FillResourceFile(OneEntry(9, 100, 32) + Pattern(5000));
@@ -194,6 +211,7 @@ TEST_F(StorageTest, TheHeadOfAResourceFileIsRead) {
     EXPECT_EQ(before, OpenDescriptors());
 }
 
+// Promise: "MAVOEAFileEAAdoubleRead: 1 there is none"
 TEST_F(StorageTest, AShorterOrMissingResourceFileHasNoRecord) {
     EXPECT_EQ(1, ReadEADir());
     Bytes bytes = OneEntry(9, 100, 32);
@@ -213,6 +231,7 @@ TEST_F(StorageTest, AResourceFileThatDoesNotParseIsRefusedWithTheParsersCode) {
     EXPECT_EQ("ea_eadirfs_adouble_read:LINE EAAdoubleRead failed", log[1]);
 }
 
+// Promise: "MAVOEAFileEAAdoubleRead: 0x900"
 TEST_F(StorageTest, AResourceFileThatCannotBeOpenedOrReadIsLogged) {
     FillResourceFile(OneEntry(9, 100, 32));
     {
@@ -229,6 +248,7 @@ TEST_F(StorageTest, AResourceFileThatCannotBeOpenedOrReadIsLogged) {
                                        "] " + strerror(EIO)));
 }
 
+// Promise: "MAVOEAFileEAAdoubleRead: the path functions' codes"
 TEST_F(StorageTest, APathThatIsTooLongIsLogged) {
     const std::string path = "/" + std::string(4090, 'p');
     const Bytes block(741);
@@ -241,6 +261,7 @@ TEST_F(StorageTest, APathThatIsTooLongIsLogged) {
                             "ea_eadirfs_flush:LINE Fail to generate path of " + path + "."));
 }
 
+// Promise: "MAVOEAFileEAAdoubleFlush: of one that exists"
 TEST_F(StorageTest, OnlyTheHeadOfAResourceFileIsReplaced) {
     const Bytes before = Pattern(5000);
     FillResourceFile(before);
@@ -249,6 +270,7 @@ TEST_F(StorageTest, OnlyTheHeadOfAResourceFileIsReplaced) {
     EXPECT_EQ(block + Bytes(before.begin() + 741, before.end()), ReadFile(resource_));
 }
 
+// Promise: "MAVOEAFileEAAdoubleFlush: The resource file"
 TEST_F(StorageTest, AMissingResourceFileIsCreated) {
     mkdir((dir_ / "@eaDir").c_str(), 0777);
     const Umask umask(022);
@@ -258,6 +280,7 @@ TEST_F(StorageTest, AMissingResourceFileIsCreated) {
     EXPECT_EQ(0755, ModeOf(resource_));
 }
 
+// Promise: "MAVOEAFileEAAdoubleFlush: MAVOEAEADirAdoubleFlush()"
 TEST_F(StorageTest, EveryFlushKeepsTheDescriptorThatItOpened) {
     FillResourceFile(Pattern(800));
     const Bytes block(741);
@@ -268,6 +291,7 @@ TEST_F(StorageTest, EveryFlushKeepsTheDescriptorThatItOpened) {
     EXPECT_EQ(before + 3, OpenDescriptors());
 }
 
+// Promise: "MAVOEAFileEAAdoubleFlush: and, logged, 0x900"
 TEST_F(StorageTest, AResourceFileThatCouldNotBeMadeOrOpenedIsLogged) {
     const Bytes block(741);
     // There is no EA directory to make it in.
@@ -282,6 +306,8 @@ TEST_F(StorageTest, AResourceFileThatCouldNotBeMadeOrOpenedIsLogged) {
                                        strerror(EACCES)));
 }
 
+// Promise: "MAVOEAFileEAAdoubleFlush: 0xB00"
+// Promise: "MAVOEAFileEAAdoubleFlush: The resource file"
 TEST_F(StorageTest, AFailedWriteRemovesTheFileThatItMadeAndNoOther) {
     mkdir((dir_ / "@eaDir").c_str(), 0777);
     const Bytes block = Repeat(1, 741);

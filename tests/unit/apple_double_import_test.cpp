@@ -699,6 +699,8 @@ class CheckAdFileTest : public ::testing::Test {
     const Bytes magic_ = Hex("00 05 16 07");
 };
 
+// Promise: "MAVOEACheckADFile: Whether"
+// Promise: "MAVOEACheckADFile: 0 it is"
 TEST_F(CheckAdFileTest, AFileWithTheMagicAndACompanionIsValid) {
     const std::string sidecar = dir_ / "._a";
     WriteFile(sidecar, magic_);
@@ -715,6 +717,7 @@ TEST_F(CheckAdFileTest, EveryMacLayoutIsValid) {
     }
 }
 
+// Promise: "MAVOEACheckADFile: and, with no code"
 TEST_F(CheckAdFileTest, NothingButTheMagicIsLookedAt) {
     WriteFile("a", {});
     WriteFile("._a", magic_ + Hex("FF*4") + Pattern(1000));
@@ -734,6 +737,7 @@ TEST_F(CheckAdFileTest, AFileShorterThanTheMagicIsNone) {
     EXPECT_EQ(-3, Check("._a"));
 }
 
+// Promise: "MAVOEACheckADFile: and, with no code"
 TEST_F(CheckAdFileTest, WhatCannotBeOpenedIsNone) {
     EXPECT_EQ(-3, Check("._missing"));
     EXPECT_EQ(-3, Check(dir_ / "missing/._a"));
@@ -742,6 +746,7 @@ TEST_F(CheckAdFileTest, WhatCannotBeOpenedIsNone) {
     EXPECT_EQ(-3, Check("/._no such name in the root"));
 }
 
+// Promise: "MAVOEACheckADFile: and, with no code"
 TEST_F(CheckAdFileTest, OtherNamesAreRefusedUnopened) {
     WriteFile("a", magic_);
     WriteFile("_.a", magic_);
@@ -772,6 +777,7 @@ TEST_F(CheckAdFileTest, APathWithoutSlashHasItsCompanionInTheCurrentDirectory) {
     EXPECT_EQ(0, Check(".//._a"));
 }
 
+// Promise: "MAVOEACheckADFile: and, with no code"
 TEST_F(CheckAdFileTest, ACompanionIsLookedForBesideTheFileOnly) {
     ASSERT_EQ(0, mkdir("d", 0777));
     WriteFile("d/._a", magic_);
@@ -781,6 +787,7 @@ TEST_F(CheckAdFileTest, ACompanionIsLookedForBesideTheFileOnly) {
     EXPECT_EQ(0, Check("d/._a"));
 }
 
+// Promise: "MAVOEACheckADFile: and, with no code"
 TEST_F(CheckAdFileTest, WhateverHasTheNameIsACompanion) {
     WriteFile("._a", magic_);
     ASSERT_EQ(0, mkdir("a", 0777));
@@ -810,6 +817,7 @@ TEST_F(CheckAdFileTest, ANamedPipeDoesNotKeepTheCallerWaiting) {
     WithoutWaiting([] { EXPECT_EQ(-3, Check("._p")); });
 }
 
+// Promise: "MAVOEACheckADFile: -1 0xD00"
 TEST_F(CheckAdFileTest, NullAndEmptyAreBadArguments) {
     EXPECT_EQ(-1, MAVOEACheckADFile(nullptr));
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "ea_check_ad_file")));
@@ -818,6 +826,7 @@ TEST_F(CheckAdFileTest, NullAndEmptyAreBadArguments) {
     EXPECT_THAT(TakeCallNames(), IsEmpty());
 }
 
+// Promise: "MAVOEACheckADFile: -1 0xD00"
 TEST_F(CheckAdFileTest, WithoutMemoryForALongPathItFails) {
     const std::string path = "._" + std::string(5000, 'x');
     EXPECT_EQ(-3, Check(path));
@@ -907,6 +916,7 @@ class FixErrorTest : public ::testing::Test, protected Identity {
     long descriptors_ = 0;
 };
 
+// Promise: "MAVOEAFixErrorAD: Repairs"
 TEST_F(FixErrorTest, AttributesGoToTheStreamAndTheRestStays) {
     EXPECT_EQ(0, Fix(Three().bytes));
     EXPECT_EQ(Rewritten(Three()), ReadFile(resource_));
@@ -941,6 +951,7 @@ TEST_F(FixErrorTest, ARepairedFileIsRepairedToItself) {
     EXPECT_EQ(stream, ReadFile(stream_));
 }
 
+// Promise: "MAVOEAFixErrorAD: 0, also"
 TEST_F(FixErrorTest, AResourceFileWithoutAttributesIsReplacedAllTheSame) {
     const MacFile file = NetatalkFile(Pattern(32, 1), Pattern(5000, 2));
     EXPECT_EQ(0, Fix(file.bytes));
@@ -949,6 +960,7 @@ TEST_F(FixErrorTest, AResourceFileWithoutAttributesIsReplacedAllTheSame) {
     EXPECT_EQ(0777, ModeOf(resource_));
 }
 
+// Promise: "MAVOEAFixErrorAD: Repairs"
 TEST_F(FixErrorTest, WhatTheStreamHasBesidesIsKept) {
     WriteFile(stream_, StreamImage{.attributes = {{"own", Ascii("kept")}, {"b", Ascii("old")}},
                                    .fork = Pattern(300, 5),
@@ -992,6 +1004,8 @@ TEST_F(FixErrorTest, AnEmptyResourceFileStaysEmpty) {
     EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("object@MavoResource"));
 }
 
+// Promise: "MAVOEAFixErrorAD: -1 with"
+// Promise: "MAVOEAFixErrorAD: No code of its own"
 TEST_F(FixErrorTest, WithoutAResourceFileThereIsNothingToRepair) {
     EXPECT_EQ(-1, Fix());
     EXPECT_THAT(NamesIn(ea_dir_), IsEmpty());
@@ -1010,6 +1024,7 @@ TEST_F(FixErrorTest, APathThatCannotBeIsAFailure) {
     EXPECT_THAT(TakeCallNames(), Not(Contains("open")));
 }
 
+// Promise: "MAVOEAFixErrorAD: -1 with"
 TEST_F(FixErrorTest, OneFailingAttributeAmongSeveralLeavesTheResourceFileAsItIs) {
     EXPECT_EQ(-1, Fix(ThreeWithOneBroken()));
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_write_to_fd")));
@@ -1021,6 +1036,7 @@ TEST_F(FixErrorTest, OneFailingAttributeAmongSeveralLeavesTheResourceFileAsItIs)
     EXPECT_EQ(Three().contents.attributes, AttributesIn(stream_));
 }
 
+// Promise: "MAVOEAFixErrorAD: -1 with"
 TEST_F(FixErrorTest, AResourceFileThatCannotBeRewrittenStaysAsItIs) {
     const Bytes three_entries = PlainAppleDouble(Pattern(32), Ascii("fork"), 3);
     EXPECT_EQ(-1, Fix(three_entries));
@@ -1115,6 +1131,7 @@ TEST_F(FixErrorTest, TheTemporaryFileStandsBesideTheResourceFile) {
     EXPECT_THAT(TakeCalls(), Contains("rename(" + temporary_ + ", " + resource_ + ")"));
 }
 
+// Promise: "MAVOEAFixErrorAD: Repairs"
 TEST_F(FixErrorTest, ATemporaryFileOfAnEarlierAttemptIsNoPartOfTheResult) {
     WriteFile(temporary_, Pattern(100000));
     EXPECT_EQ(0, Fix(Three().bytes));
@@ -1131,6 +1148,7 @@ TEST_F(FixErrorTest, ATemporaryFileOfAnEarlierAttemptIsNoPartOfTheResult) {
     ExpectUnchanged(ThreeWithOneBroken());
 }
 
+// Promise: "MAVOEAFixErrorAD: Repairs"
 TEST_F(FixErrorTest, ATemporaryFileThatAnotherRepairWritesIsLeftAlone) {
     for (const Bytes& written : {Bytes(), PlainAppleDouble(Pattern(32), Ascii("fork"))}) {
         SCOPED_TRACE(written.size());
@@ -1151,6 +1169,7 @@ TEST_F(FixErrorTest, ATemporaryFileThatAnotherRepairWritesIsLeftAlone) {
     }
 }
 
+// Promise: "MAVOEAFixErrorAD: Repairs"
 TEST_F(FixErrorTest, TheTemporaryFileIsLockedUntilItHasItsPlace) {
     std::map<std::string, int> locks;
     Hooks().before = [&](const std::string& name) {

@@ -38,6 +38,13 @@ class AdoubleReadTest : public ::testing::Test {
     EAAdouble ad_ = {};
 };
 
+// Promise: "offset: into the record's data"
+// Promise: "length: in bytes"
+// Promise: "magic: host order"
+// Promise: "version: host order"
+// Promise: "data: the block as on disk"
+// Promise: "MAVOEAAdoubleRead: Parses"
+// Promise: "entries: ids 1 to 15"
 TEST_F(AdoubleReadTest, EveryEntryOfAnAttributeRecordIsInItsSlot) {
     const Bytes block = AttributeRecord();
     ASSERT_EQ(402u, block.size());
@@ -71,6 +78,7 @@ TEST_F(AdoubleReadTest, TheFillerIsLeftAlone) {
     EXPECT_EQ(7, ad_.filler[3]);
 }
 
+// Promise: "MAVOEAAdoubleRead: 0, or -1"
 TEST_F(AdoubleReadTest, NullAndLengthsOutsideTheDataAreBadArguments) {
     const Bytes block = Repeat(0x77, 1025);
     EXPECT_EQ(-1, MAVOEAAdoubleRead(nullptr, 402, &ad_));
@@ -89,6 +97,7 @@ TEST_F(AdoubleReadTest, ABlockOf1024BytesIsTakenWhole) {
     EXPECT_EQ(992, ad_.entries[9].offset);
 }
 
+// Promise: "MAVOEAAdoubleRead: 0xA00"
 TEST_F(AdoubleReadTest, AnotherMagicOrVersionIsRefused) {
     Bytes block = AttributeRecord();
     block[5] = 1;  // AppleDouble version 1
@@ -107,11 +116,14 @@ TEST_F(AdoubleReadTest, AnotherMagicOrVersionIsRefused) {
                 ElementsAre("ea_adouble_read:LINE ad magic[333312] and ad version[131072] error"));
 }
 
+// Promise: "EAAdoubleEntry: absent when"
+// Promise: "MAVOEAAdoubleRead: Parses"
 TEST_F(AdoubleReadTest, ARecordWithoutEntriesSetsNoSlot) {
     EXPECT_EQ(0, Read(Hex("00 05 16 07  00 02 00 00  00*16  00 00")));
     for (const EAAdoubleEntry& entry : ad_.entries) EXPECT_EQ(0, entry.offset);
 }
 
+// Promise: "entries: ids 1 to 15"
 TEST_F(AdoubleReadTest, StandardIdsAreTheirOwnSlots) {
     for (std::uint32_t id = 1; id <= 15; ++id) {
         SCOPED_TRACE(id);
@@ -128,6 +140,7 @@ TEST_F(AdoubleReadTest, OtherIdsAreRejected) {
     }
 }
 
+// Promise: "MAVOEAAdoubleRead: Entries lie"
 TEST_F(AdoubleReadTest, EntriesEndWithinTheData) {
     EXPECT_EQ(0, Read(OneEntry(9, 1023, 1)));
     EXPECT_EQ(0, Read(OneEntry(9, 800, 224)));  // behind the block, inside the data
@@ -139,6 +152,7 @@ TEST_F(AdoubleReadTest, EntriesEndWithinTheData) {
     ExpectRejected(OneEntry(0x8053567E, 0xFFFFFFFF, 2), "eid: 19, off: 4294967295, len: 2");
 }
 
+// Promise: "MAVOEAAdoubleRead: Entries lie"
 TEST_F(AdoubleReadTest, OnlyTheResourceForkMayRunPastTheData) {
     EXPECT_EQ(0, Read(OneEntry(2, 741, 1000000)));
     EXPECT_EQ(741, ad_.entries[2].offset);
@@ -147,6 +161,7 @@ TEST_F(AdoubleReadTest, OnlyTheResourceForkMayRunPastTheData) {
     ExpectRejected(OneEntry(2, 1024, 0), "eid: 2, off: 1024, len: 0");
 }
 
+// Promise: "MAVOEAAdoubleRead: 0, or -1"
 TEST_F(AdoubleReadTest, EntriesBehindARejectedOneAreNotRead) {
     Bytes block = AttributeRecord();
     PutU32(block, 38 + 4, 1024);  // the second descriptor: comment

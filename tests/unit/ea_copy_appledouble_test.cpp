@@ -341,6 +341,7 @@ TEST_F(DoubleToEADirTest, AnEADirectoryThatCannotBeMadeIsLoggedWithItsRecord) {
     EXPECT_TRUE(Exists(SrcDouble()));
 }
 
+// Promise: "MAVOEACopyEx: What has been done"
 TEST_F(DoubleToEADirTest, AStreamThatCannotBeOpenedFailsWith0x900AndTheResourceFileStays) {
     Put(SrcDouble(), Whole().Build());
     PutLoop(DstStream());

@@ -359,6 +359,8 @@ void ExpectOutcome(const Outcome& expected, const CopyWorld& world, int result) 
 
 class CopyTableTest : public ::testing::TestWithParam<int> {};
 
+// Promise: "MAVOEACopyEx: Carries"
+// Promise: "MAVOEACopyEx: What was moved"
 TEST_P(CopyTableTest, EachDestinationTypeGetsWhatItTakesInEveryKindOfCopy) {
     for (int dst = -1; dst <= 13; ++dst) {
         for (int move = 0; move <= 2; ++move) {
@@ -423,6 +425,7 @@ class CopyDriverTest : public ::testing::Test {
     CopyWorld world_;
 };
 
+// Promise: "MAVOEACopyEx: A failure may record"
 TEST_F(CopyDriverTest, ASourceTypeThatCannotBeToldEndsItBeforeTheDestinationIsAsked) {
     world_.src_type = -1;
     EXPECT_EQ(-1, world_.Copy({}));
@@ -450,6 +453,7 @@ TEST_F(CopyDriverTest, ADestinationTypeThatCannotBeToldEndsItWithItsPathWhole) {
     ExpectNotFinished();
 }
 
+// Promise: "MAVOEACopyEx: szDst is written to"
 TEST_F(CopyDriverTest, TheDestinationsParentIsAskedForTheType) {
     std::string asked;
     Platform().fs_type = [&](const std::string& path, int) {
@@ -492,6 +496,8 @@ TEST_F(CopyDriverTest, AnUnknownSourceStillHasTheDestinationAsked) {
     EXPECT_EQ(-4, world_.Copy({.src_type = 4}));
 }
 
+// Promise: "MAVOEACopyEx: 0xD00 is NULL"
+// Promise: "MAVOEACopyEx: A failure may record"
 TEST_F(CopyDriverTest, NullPathsAreRefused) {
     std::string dst = world_.dst();
     for (const int type : {-1, 0, 1, 2, 4, 7}) {
@@ -524,6 +530,7 @@ TEST_F(CopyDriverTest, ACopyToNowhereIsReportedToTheIndexesAsItIs) {
 
 // ---- The plain form -----------------------------------------------------------------------------
 
+// Promise: "MAVOEACopy"
 TEST_F(CopyDriverTest, TheFormWithoutACopierPassesItsEightArgumentsOn) {
     std::string dst = world_.dst();
     const std::string thumb_to_thumb = "src/@eaDir/object/MAVOThumb, dst/@eaDir/object/MAVOThumb)";
@@ -560,6 +567,7 @@ TEST_F(CopyDriverTest, TheRealCommandsCopyAndMove) {
 
 // ---- Types that take nothing --------------------------------------------------------------------
 
+// Promise: "MAVOEACopyEx: 0 when"
 TEST_F(CopyDriverTest, AnUnsupportedDestinationHasOnlyTheLockCarried) {
     for (const auto& [src, dst] : {std::pair{0, 4}, {5, 12}, {7, 12}, {7, 13}, {1, 8}, {2, 9}}) {
         SCOPED_TRACE(::testing::Message() << src << " to " << dst);
@@ -589,6 +597,7 @@ TEST_F(CopyDriverTest, AnUnsupportedDestinationWhoseLockFailsGivesMinusFour) {
     ExpectNotFinished();
 }
 
+// Promise: "MAVOEACopyEx: -1 or less"
 TEST_F(CopyDriverTest, AnUnknownSourceEndsItAtOnce) {
     for (const int type : {4, 8, 9, 11, 12, 13, 14, 100}) {
         SCOPED_TRACE(type);
@@ -633,6 +642,7 @@ TEST_F(CopyDriverTest, ALockThatCannotBeSetEndsAMoveWithTheSourcesFolderInPlace)
     }
 }
 
+// Promise: "MAVOEACopyEx: Carries"
 TEST_F(CopyDriverTest, ALockedFileIsLockedAtTheOtherEnd) {
     ASSERT_EQ(0, chmod(world_.src().c_str(), 0444));
     EXPECT_EQ(0, world_.Copy({.src_type = 7, .dst_type = 0}));
@@ -655,6 +665,7 @@ TEST_F(CopyDriverTest, AFailedCopyFromAppleDoubleIsToldWithItsOwnResult) {
     ExpectNotFinished();
 }
 
+// Promise: "MAVOEACopyEx: -1 or less"
 TEST_F(CopyDriverTest, ANameTooLongForAnAppleDoubleFileIsToldByItsOwnResult) {
     const std::string name(254, 'n');
     const std::string src = world_ / ("src/" + name);
@@ -767,6 +778,7 @@ TEST_F(CopyDriverTest, TwoAttributesThatFailAreOneFailureOfTheCopy) {
     }
 }
 
+// Promise: "MAVOEACopyEx: on types 7"
 TEST_F(CopyDriverTest, OnlyAMoveOfOneRemovesTheResourceFileOfASourceWithAttributes) {
     for (const int dst : {0, 5, 7}) {
         for (const int move : {-1, 0, 2, 3}) {
@@ -878,6 +890,7 @@ TEST_F(CopyDriverTest, OnlySourcesWithEADirectoriesAloneAreUpgraded) {
     }
 }
 
+// Promise: "MAVOEACopyEx: -1 or less"
 TEST_F(CopyDriverTest, AFailedCopyOfAnEADirectoryFileIsTheCopysResult) {
     const std::string cp =
         "Failed to cp -f src/@eaDir/object@MavoResource dst/@eaDir/object@MavoResource. ";
@@ -903,6 +916,7 @@ TEST_F(CopyDriverTest, AFailedCopyOfAnEADirectoryFileIsTheCopysResult) {
     EXPECT_THAT(world_.copied, ::testing::SizeIs(5));
 }
 
+// Promise: "MAVOEACopyEx: -1 or less"
 TEST_F(CopyDriverTest, NamesThatClientsDoNotTakeAreToldByTheirOwnResults) {
     for (const auto& [name, result] : {std::pair{"._Icon\r", -32}, {"._a?b", -33}}) {
         Platform().fat_replace = [name = std::string(name)](const auto&) { return name; };
@@ -1264,6 +1278,7 @@ std::vector<WayOut> WaysOut() {
     };
 }
 
+// Promise: "MAVOEACopyEx: updateFileIndex"
 TEST(CopyIndexTest, EveryWayOutIsToldToTheIndexesThatAreAskedFor) {
     for (const WayOut& way : WaysOut()) {
         for (const int move : {0, 1, 2}) {

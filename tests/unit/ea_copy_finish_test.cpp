@@ -192,6 +192,8 @@ TEST_F(SourceFilesTest, ACopyRemovesNothing) {
 
 // ---- Whether the folder is carried over ---------------------------------------------------------
 
+// Promise: "MAVOEACopyEx: Carries"
+// Promise: "MAVOEACopyEx: copyEADir not 0"
 TEST_F(CopyFinishTest, BesideAppleDoubleVolumesTheFolderIsCarriedOnlyWhenAskedFor) {
     for (const auto& [src, dst] : {std::pair{0, 0}, {0, 1}, {5, 7}, {3, 0}, {7, 0}, {2, 5}}) {
         SCOPED_TRACE(::testing::Message() << src << " to " << dst);
@@ -203,6 +205,7 @@ TEST_F(CopyFinishTest, BesideAppleDoubleVolumesTheFolderIsCarriedOnlyWhenAskedFo
     }
 }
 
+// Promise: "MAVOEACopyEx: between volumes none"
 TEST_F(CopyFinishTest, ElsewhereItAlwaysIs) {
     for (const auto& [src, dst] : {std::pair{1, 1}, {1, 12}, {2, 2}, {7, 7}, {7, 2}, {2, 7}}) {
         SCOPED_TRACE(::testing::Message() << src << " to " << dst);
@@ -280,6 +283,7 @@ TEST_F(CopyFinishTest, AFolderThatCannotBeOpenedIsLoggedAndLeft) {
 
 // ---- The destination's folder -------------------------------------------------------------------
 
+// Promise: "MAVOEACopyEx: between volumes none"
 TEST_F(CopyFinishTest, AFolderAtTheDestinationIsReplaced) {
     world_.Put("dst/@eaDir/object/old", Ascii("old"));
     world_.Put("dst/@eaDir/other/file", Ascii("other"));
@@ -426,6 +430,7 @@ TEST_F(CopyFinishTest, AModeThatCannotBeSetIsIgnored) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEACopyEx: NULL runs"
 TEST_F(CopyFinishTest, AMoveRunsMvAndThenCpOfTheMissingFile) {
     EXPECT_EQ(0, Move());
     auto commands = TakeCommands();
@@ -478,6 +483,7 @@ TEST_F(CopyFinishTest, AFileIsNotCopiedThroughALinkAndTheLineSaysSo) {
     ExpectFinished();
 }
 
+// Promise: "MAVOEACopyEx: 0 when"
 TEST_F(CopyFinishTest, AFailedCpIsLoggedAndTheOthersGoOn) {
     world_.Put("src/@eaDir/object/another", Ascii("another"));
     FailExec("/bin/cp", -1, "MAVOThumb");
@@ -496,6 +502,7 @@ TEST_F(CopyFinishTest, APositiveResultOfCpIsNoFailure) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEACopyEx: copyFn copies"
 TEST_F(CopyFinishTest, ACopierStandsInForMvAndCp) {
     world_.Put("src/@eaDir/object/another", Ascii("another"));
     EXPECT_EQ(0, world_.Copy({.move = 1, .src_type = 7, .dst_type = 1, .with_copier = true}));
@@ -528,6 +535,7 @@ TEST_F(CopyFinishTest, ACopierThatFailsIsLoggedAndAMoveLosesTheFile) {
     }
 }
 
+// Promise: "MAVOEACopyEx: copyFn copies"
 TEST_F(CopyFinishTest, ACopierThatGivesAPositiveResultHasNotFailed) {
     world_.copier = [](const std::string& from, const std::string& to) {
         (void)CopyWorld::CopyOver(from, to);

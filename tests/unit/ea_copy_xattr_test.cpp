@@ -771,6 +771,7 @@ TEST_F(ToXattrTest, AResourceFileThatCannotBeOpenedFailsWith0x900BehindTheStream
     EXPECT_THAT(NamesIn(EADir(from_)), ElementsAre("a@MavoResource"));
 }
 
+// Promise: "MAVOEACopyEx: A failure may record"
 TEST_F(ToXattrTest, AnAppleDoubleFileThatCannotBeOpenedFailsTwice) {
     PutLoop(SrcDouble());
     EXPECT_EQ(-2, Copy(1, EA_PLACE_APPLEDOUBLE));

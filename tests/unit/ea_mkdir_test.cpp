@@ -86,6 +86,7 @@ class EaMkdirTest : public ::testing::Test, protected Identity {
 
 // ---- What it makes --------------------------------------------------------------------------
 
+// Promise: "MAVOEAMKDir: Creates the EA directory"
 TEST_F(EaMkdirTest, MakesADirectoryForEveryone) {
     EXPECT_EQ(0, MAVOEAMKDir(0, ea_dir_.c_str()));
     struct stat info;
@@ -117,6 +118,7 @@ TEST_F(EaMkdirTest, AsksForMode0777BeforeItWidensIt) {
     EXPECT_THAT(TakeCalls(), Contains("mkdir(" + ea_dir_ + ", 0777)"));
 }
 
+// Promise: "MAVOEAMKDir: Creates the EA directory"
 TEST_F(EaMkdirTest, WithParentFirstMakesBothOutermostFirst) {
     EXPECT_EQ(0, MAVOEAMKDir(1, folder_.c_str()));
     EXPECT_EQ(0777, ModeOf(ea_dir_));
@@ -183,6 +185,7 @@ TEST_F(EaMkdirTest, TheAclComesAfterModeAndFinderInfo) {
 
 // ---- What exists ----------------------------------------------------------------------------
 
+// Promise: "MAVOEAMKDir: A directory that exists"
 TEST_F(EaMkdirTest, ADirectoryThatExistsKeepsItsModeAndGetsNoAcl) {
     ASSERT_EQ(0, ::mkdir(ea_dir_.c_str(), 0700));
     Platform().fs_type = [](const std::string&, int) { return 7; };
@@ -204,6 +207,7 @@ TEST_F(EaMkdirTest, AParentThatExistsKeepsItsModeWhileTheDirectoryInItIsMade) {
     EXPECT_EQ(PlatformCallsFor(folder_), TakePlatformCalls());
 }
 
+// Promise: "MAVOEAMKDir: Returns 0 when it exists"
 TEST_F(EaMkdirTest, WhateverHasTheNameCountsAsThere) {
     WriteFile(ea_dir_, Ascii("a file"));
     EXPECT_EQ(0, MAVOEAMKDir(0, ea_dir_.c_str()));
@@ -221,6 +225,7 @@ TEST_F(EaMkdirTest, ASymbolicLinkThatWasThereBeforeIsLeftAlone) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAMKDir: Returns 0 when it exists"
 TEST_F(EaMkdirTest, LosingTheRaceWithAnotherProcessIsSuccess) {
     Hooks().mkdir = [](const char* path, mode_t mode) {
         EXPECT_EQ(0, ::mkdir(path, 0700));  // the other process is first
@@ -235,6 +240,7 @@ TEST_F(EaMkdirTest, LosingTheRaceWithAnotherProcessIsSuccess) {
 
 // ---- Arguments ------------------------------------------------------------------------------
 
+// Promise: "MAVOEAMKDir: Codes: 0xD00"
 TEST_F(EaMkdirTest, ANullPathIsLoggedAndRecorded) {
     BeUser(kUser);
     for (const int parent_first : {0, 1}) {
@@ -247,6 +253,7 @@ TEST_F(EaMkdirTest, ANullPathIsLoggedAndRecorded) {
     EXPECT_THAT(TakeCallNames(), Not(Contains("seteuid")));
 }
 
+// Promise: "MAVOEAMKDir: Codes: 0xD00"
 TEST_F(EaMkdirTest, ParentFirstWithoutASlashFailsAndMakesNothing) {
     char before[4096];
     ASSERT_NE(nullptr, getcwd(before, sizeof before));
@@ -282,6 +289,7 @@ TEST_F(EaMkdirTest, TheParentOfANameInTheRootIsTheEmptyPath) {
 
 // ---- Finder info ----------------------------------------------------------------------------
 
+// Promise: "MAVOEAMKDir: Creates the EA directory"
 TEST_F(EaMkdirTest, OnAttributeVolumesTheFinderInfoHidesTheDirectory) {
     Platform().fs_type = [](const std::string&, int flag) {
         EXPECT_EQ(0, flag);
@@ -314,6 +322,7 @@ TEST_F(EaMkdirTest, OtherVolumesGetNoFinderInfo) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAMKDir: 0x2A00"
 TEST_F(EaMkdirTest, AFinderInfoThatCannotBeSetFailsAndLeavesTheDirectoryWithoutAcl) {
     Platform().fs_type = [](const std::string&, int) { return 7; };
     BeUser(kUser);
@@ -328,6 +337,7 @@ TEST_F(EaMkdirTest, AFinderInfoThatCannotBeSetFailsAndLeavesTheDirectoryWithoutA
 
 // ---- Failures -------------------------------------------------------------------------------
 
+// Promise: "MAVOEAMKDir: 0x3C00"
 TEST_F(EaMkdirTest, ADirectoryThatCannotBeMadeFailsWith0x3C00) {
     for (const int error : {EACCES, ENOSPC, EROFS, ENAMETOOLONG}) {
         SCOPED_TRACE(strerror(error));
@@ -351,6 +361,7 @@ TEST_F(EaMkdirTest, WhenTheParentCannotBeMadeTheDirectoryIsNotTried) {
     EXPECT_EQ(1, std::count(names.begin(), names.end(), "mkdir"));
 }
 
+// Promise: "MAVOEAMKDir: 0x2A00"
 TEST_F(EaMkdirTest, AModeThatCannotBeSetFailsAndLeavesTheDirectory) {
     BeUser(kUser);
     const Umask umask(077);
@@ -364,6 +375,7 @@ TEST_F(EaMkdirTest, AModeThatCannotBeSetFailsAndLeavesTheDirectory) {
     EXPECT_EQ(kUser, uid_);
 }
 
+// Promise: "MAVOEAMKDir: 0x2A00"
 TEST_F(EaMkdirTest, ADirectoryThatCannotBeOpenedIsRemovedAgainAndMadeWholeTheNextTime) {
     const Umask umask(077);
     for (const int error : {EMFILE, ENFILE, ENOMEM}) {
@@ -394,6 +406,7 @@ TEST_F(EaMkdirTest, ADirectoryThatCannotBeOpenedIsRemovedAgainAndMadeWholeTheNex
     }
 }
 
+// Promise: "MAVOEAMKDir: 0x2A00"
 TEST_F(EaMkdirTest, ADirectoryThatCannotBeOpenedStaysWhenSomebodyHasUsedIt) {
     Hooks().before = [this](const std::string& name) {
         if (name == "open") WriteFile(ea_dir_ + "/theirs", Ascii("theirs"));
@@ -415,6 +428,7 @@ TEST_F(EaMkdirTest, WhenTheModeOfTheParentCannotBeSetTheDirectoryIsNotTried) {
     EXPECT_FALSE(Exists(folder_));
 }
 
+// Promise: "MAVOEAMKDir: 0x100"
 TEST_F(EaMkdirTest, LackOfMemoryForTheCopyOfThePathFailsWith0x100AndMakesNothing) {
     BeUser(kUser);
     const FailCall fault("malloc", ENOMEM);
@@ -425,6 +439,7 @@ TEST_F(EaMkdirTest, LackOfMemoryForTheCopyOfThePathFailsWith0x100AndMakesNothing
     EXPECT_EQ(kUser, uid_);
 }
 
+// Promise: "mavoea.h: Results."
 TEST_F(EaMkdirTest, EveryFailingCallIsRecordedOnceAndRestoresTheUser) {
     Platform().fs_type = [](const std::string&, int) { return 7; };
     std::map<std::string, int> seen;
@@ -478,6 +493,8 @@ TEST_F(EaMkdirTest, AsTheSuperuserNoSeteuidIsCalledAtAll) {
     EXPECT_THAT(TakeCallNames(), Not(Contains("seteuid")));
 }
 
+// Promise: "mavoea.h: The other functions share process-wide state"
+// Promise: "MAVOEAMKDir: The effective uid is changed"
 TEST_F(EaMkdirTest, AnotherUserIsTheSuperuserFromBeforeTheFirstDirectoryUntilAfterTheLast) {
     BeUser(kUser);
     Platform().acl = [this](const std::string&) {
@@ -495,6 +512,7 @@ TEST_F(EaMkdirTest, AnotherUserIsTheSuperuserFromBeforeTheFirstDirectoryUntilAft
                                    "mkdir(" + folder_ + ", 0777)", "seteuid(1000)"));
 }
 
+// Promise: "MAVOEAMKDir: 0x3C00"
 TEST_F(EaMkdirTest, AFailedSwitchToTheSuperuserFailsWith0x3C00AndMakesNothing) {
     BeUser(kUser);
     TakeCallNames();
@@ -517,6 +535,7 @@ TEST_F(EaMkdirTest, AFailedSwitchBackIsNotLookedAt) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAMKDir: Creates the EA directory"
 TEST_F(EaMkdirTest, AProcessWithASavedUidOf0MakesThemAsTheSuperuserAndComesBack) {
     MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();

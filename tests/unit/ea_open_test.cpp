@@ -151,6 +151,9 @@ INSTANTIATE_TEST_SUITE_P(With, EaOpenInEaDirTest, ::testing::Bool(), [](const au
     return through.param ? "MAVOEAOpen" : "MAVOEAOpenNoADFS";
 });
 
+// Promise: "MAVOEAOpen: Opens the metadata file"
+// Promise: "MAVOEAOpen: With O_CREAT the EA directory"
+// Promise: "MAVOEAOpenNoADFS: MAVOEAOpen()"
 TEST_P(EaOpenInEaDirTest, CreatingMakesTheEaDirectoryAndAnEmptyFile) {
     TakeCalls();
     const Fd fd(OpenStream(O_RDWR | O_CREAT));
@@ -166,6 +169,7 @@ TEST_P(EaOpenInEaDirTest, CreatingMakesTheEaDirectoryAndAnEmptyFile) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAOpen: Opens the metadata file"
 TEST_P(EaOpenInEaDirTest, TheUmaskNarrowsTheFileButNotTheDirectory) {
     const Umask umask(027);
     const Fd fd(OpenStream(O_RDWR | O_CREAT));
@@ -174,6 +178,7 @@ TEST_P(EaOpenInEaDirTest, TheUmaskNarrowsTheFileButNotTheDirectory) {
     EXPECT_EQ(0777, ModeOf(ea_dir_));
 }
 
+// Promise: "MAVOEAOpen: Opens the metadata file"
 TEST_P(EaOpenInEaDirTest, AFileThatExistsIsOpenedWithoutCreating) {
     MakeEaDir();
     WriteFile(stream_, Ascii("stream"));
@@ -205,6 +210,7 @@ TEST_P(EaOpenInEaDirTest, ReadOnlyIsReadOnly) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAOpen: Opens the metadata file"
 TEST_P(EaOpenInEaDirTest, TruncatingEmptiesAFileThatExists) {
     MakeEaDir();
     WriteFile(resource_, Ascii("resource"));
@@ -226,6 +232,7 @@ TEST_P(EaOpenInEaDirTest, TruncatingCreatesAFileThatIsMissing) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAOpen: Returns a descriptor"
 TEST_P(EaOpenInEaDirTest, AMissingFileFailsWithEnoentAfterASecondLookAndMakesNoEaDirectory) {
     for (const int oflag : {0, O_RDWR, O_RDWR | O_TRUNC}) {
         SCOPED_TRACE(oflag);
@@ -296,6 +303,7 @@ TEST_P(EaOpenInEaDirTest, AFileInPlaceOfTheEaDirectoryFailsWithEnotdir) {
     EXPECT_EQ(Ascii("in the way"), ReadFile(ea_dir_));
 }
 
+// Promise: "MAVOEAOpen: otherwise the codes"
 TEST_P(EaOpenInEaDirTest, AnEaDirectoryThatCannotBeMadeFailsWithItsCodeAndOpensNothing) {
     const std::string object = dir_ / "none/a.txt";
     TakeCalls();
@@ -373,6 +381,7 @@ TEST_P(EaOpenInEaDirTest, AnyOtherFormNamesTheFileAfterTheKindAloneAndLooksTwice
     EXPECT_THAT(TakeLog(), IsEmpty());
 }
 
+// Promise: "MAVOEAOpen: 0xD00 NULL argument"
 TEST_P(EaOpenInEaDirTest, NullArgumentsFailWith0xD00AndEnoent) {
     TakeCallNames();
     for (const int oflag : {0, O_RDWR | O_CREAT}) {
@@ -389,6 +398,7 @@ TEST_P(EaOpenInEaDirTest, NullArgumentsFailWith0xD00AndEnoent) {
     EXPECT_THAT(TakeLog(), IsEmpty());
 }
 
+// Promise: "MAVOEAOpen: otherwise the codes"
 TEST_P(EaOpenInEaDirTest, ErrorsOfThePathStandAsTheyWereRecorded) {
     TakeCallNames();
     EXPECT_EQ(-1, Open(1, "", kStream, O_RDWR | O_CREAT));
@@ -543,6 +553,8 @@ INSTANTIATE_TEST_SUITE_P(With, EaOpenUpgradeTest, ::testing::Bool(), [](const au
     return through.param ? "MAVOEAOpen" : "MAVOEAOpenNoADFS";
 });
 
+// Promise: "MAVOEAOpen: What is missing is converted"
+// Promise: "MAVOEAUpgrade: MAVOEAOpen() calls this"
 TEST_P(EaOpenUpgradeTest, AnObjectWithOnlyALegacyFolderGivesADescriptorOfTheUpgradedStream) {
     std::filesystem::remove(legacy_);
     TakeCalls();
@@ -590,6 +602,7 @@ TEST_P(EaOpenUpgradeTest, TheLegacyResourceFileIsFoundToo) {
     EXPECT_EQ(Ascii("resource"), ReadFile(resource_));
 }
 
+// Promise: "MAVOEAOpen: What is missing is converted"
 TEST_P(EaOpenUpgradeTest, TheFolderFormNeverUpgrades) {
     for (const int oflag : {0, O_RDWR | O_CREAT}) {
         for (const char* kind : {kStream, kResource, "MAVO:x"}) {
@@ -607,12 +620,14 @@ TEST_P(EaOpenUpgradeTest, TheFolderFormNeverUpgrades) {
 }
 
 // The kind alone names the file, but the object is what is upgraded.
+// Promise: "MAVOEAOpen: What is missing is converted"
 TEST_P(EaOpenUpgradeTest, EveryOtherFormUpgrades) {
     ExpectFailed(ENOENT, Open(2, object_.c_str(), kStream, 0));
     EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("a.txt", "a.txt@MavoEAStream"));
     EXPECT_THAT(NamesIn(folder_), ElementsAre("MAVO:Resource"));
 }
 
+// Promise: "MAVOEAOpen: What is missing is converted"
 TEST_P(EaOpenUpgradeTest, AFileThatIsThereIsOpenedWithoutAnUpgrade) {
     WriteFile(stream_, Ascii("stream"));
     for (const int oflag : {0, O_RDWR | O_CREAT}) {
@@ -636,6 +651,7 @@ TEST_P(EaOpenUpgradeTest, AFailureOtherThanEnoentIsFinalWithoutAnUpgrade) {
     EXPECT_FALSE(Exists(stream_));
 }
 
+// Promise: "MAVOEAOpen: its failures leave their codes"
 TEST_P(EaOpenUpgradeTest, AFailureOfTheUpgradeThatHidesNothingIsIgnored) {
     {
         const FailCall fault("rmdir", EBUSY);
@@ -738,6 +754,7 @@ TEST_P(EaOpenInEaDirTest, TheDirectoryIsMadeByTheSuperuserAndTheFileByTheUser) {
     EXPECT_EQ(kUser, info.st_uid);
 }
 
+// Promise: "MAVOEAOpen: Returns a descriptor"
 TEST_P(EaOpenInEaDirTest, AFileThatTheUserMayNotOpenFailsWithEaccesOnce) {
     MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
@@ -756,6 +773,8 @@ TEST_P(EaOpenInEaDirTest, AFileThatTheUserMayNotOpenFailsWithEaccesOnce) {
     });
 }
 
+// Promise: "MAVOEAMKDir: 0x3C00"
+// Promise: "MAVOEAOpen: With O_CREAT the EA directory"
 TEST_P(EaOpenInEaDirTest, WhoCannotBecomeTheSuperuserCannotCreateEvenWhereTheDirectoryExists) {
     MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
@@ -935,6 +954,7 @@ TEST_F(EaOpenAppleDoubleTest, ANameThatIsTooLongForTheFileFailsWith0xC300AndKeep
 
 // ---- Any other place ------------------------------------------------------------------------
 
+// Promise: "MAVOEAOpen: 0xD00 NULL argument"
 TEST_F(EaOpenTest, AnyOtherPlaceFailsWith0xD00) {
     TakeCallNames();
     for (const int place : {-1, 2, 3, 7, 256}) {

@@ -197,12 +197,14 @@ class EaPathPropertyTest : public EaPathsTest {};
 
 // ---- The EA directory ---------------------------------------------------------------------------
 
+// Promise: "MAVOEADirPath: The EA directory"
 TEST_F(EaDirPathTest, FileFormGivesTheDirectoryThatHoldsTheMetadata) {
     EXPECT_THAT(DirPath(1, "/v/share/a.txt"), Gives("/v/share/@eaDir"));
     EXPECT_THAT(DirPath(1, "/a"), Gives("/@eaDir"));
     EXPECT_THAT(DirPath(1, "/v/@eaDir/a"), Gives("/v/@eaDir/@eaDir"));
 }
 
+// Promise: "MAVOEADirPath: in EA_FORM_FOLDER"
 TEST_F(EaDirPathTest, FolderFormGivesTheLegacyFolderOfTheObject) {
     EXPECT_THAT(DirPath(0, "/v/share/dir/"), Gives("/v/share/@eaDir/dir"));
     EXPECT_THAT(DirPath(0, "/v/share/a.txt"), Gives("/v/share/@eaDir/a.txt"));
@@ -224,6 +226,7 @@ TEST_F(EaDirPathTest, PathOfOneNameIsRelativeToTheCurrentDirectory) {
     EXPECT_THAT(DirPath(1, "share/a.txt"), Gives("share/@eaDir"));
 }
 
+// Promise: "Paths: One trailing '/'"
 TEST_F(EaDirPathTest, OneTrailingSlashIsIgnoredAndNoMore) {
     EXPECT_THAT(DirPath(1, "/v/share/dir"), Gives("/v/share/@eaDir"));
     EXPECT_THAT(DirPath(1, "/v/share/dir/"), Gives("/v/share/@eaDir"));
@@ -241,6 +244,8 @@ TEST_F(EaDirPathTest, TheRootIsAnEmptyNameInTheCurrentDirectory) {
     EXPECT_THAT(DirPath(0, "//"), Gives("/@eaDir/"));
 }
 
+// Promise: "Paths: Codes: 0xD00 NULL"
+// Promise: "MAVOEADirPath: errno"
 TEST_F(EaDirPathTest, MissingArgumentsAreRefusedWithEnoent) {
     for (const int form : {0, 1}) {
         SCOPED_TRACE(form);
@@ -266,6 +271,7 @@ TEST_F(EaDirPathTest, ArgumentsAreCheckedBeforeTheSizeOfTheBuffer) {
                 FailsWith(0xD00, "ea_dir_path", ENOENT));
 }
 
+// Promise: "Paths: Buffers."
 TEST_F(EaDirPathTest, ResultOfExactlyTheSizeOfTheBufferPasses) {
     // 4 + 7 bytes are the longest result, whatever the form.
     EXPECT_THAT(DirPath(0, "/v/a", 11), Gives("/v/@eaDir/a"));
@@ -281,6 +287,9 @@ TEST_F(EaDirPathTest, LengthCheckCountsTheTrailingSlash) {
     EXPECT_THAT(DirPath(0, "/v/d/", 11), FailsWith(0xC300, "ea_dir_path", ENAMETOOLONG));
 }
 
+// Promise: "Paths: 0xC300"
+// Promise: "MAVOEADirPath: errno"
+// Promise: "Paths: All return 0 or -1"
 TEST_F(EaDirPathTest, BufferWithoutRoomIsTooSmallForEverything) {
     for (const int size : {7, 1, 0, -1, INT_MIN}) {
         SCOPED_TRACE(size);
@@ -307,6 +316,7 @@ TEST_F(EaDirPathTest, NoResultPasses4095BytesHoweverLargeTheBuffer) {
     }
 }
 
+// Promise: "Paths: 0x200 out of memory"
 TEST_F(EaDirPathTest, PathsUpTo4094BytesAllocateNothing) {
     EXPECT_FALSE(DirPath(0, "/v/share/a.txt").allocated);
     EXPECT_FALSE(DirPath(1, PathOfLength(4088)).allocated);
@@ -317,6 +327,7 @@ TEST_F(EaDirPathTest, PathsUpTo4094BytesAllocateNothing) {
     EXPECT_FALSE(fault.fired());
 }
 
+// Promise: "Paths: 0x200 out of memory"
 TEST_F(EaDirPathTest, PathOver4094BytesNeedsMemoryBeforeItIsRefused) {
     for (const std::size_t length : {std::size_t{4095}, std::size_t{4096}, std::size_t{9000}}) {
         SCOPED_TRACE(length);
@@ -337,6 +348,8 @@ TEST_F(EaDirPathTest, LongNamesAreNeverShortened) {
 
 // ---- Metadata files in the EA directory ---------------------------------------------------------
 
+// Promise: "EA_FORM_FILE"
+// Promise: "MAVOEAPathNoADFS: The metadata file"
 TEST_F(EaPathTest, FileFormGivesNameAtKind) {
     EXPECT_THAT(PathNoADFS(1, "/v/share/a.txt", "MavoEAStream"),
                 Gives("/v/share/@eaDir/a.txt@MavoEAStream"));
@@ -345,12 +358,15 @@ TEST_F(EaPathTest, FileFormGivesNameAtKind) {
     EXPECT_THAT(PathNoADFS(1, "/a", "MavoResourceTmp"), Gives("/@eaDir/a@MavoResourceTmp"));
 }
 
+// Promise: "EA_FORM_FOLDER"
+// Promise: "MAVOEAPathNoADFS: The metadata file"
 TEST_F(EaPathTest, FolderFormGivesAFileInTheFolderOfTheObject) {
     EXPECT_THAT(PathNoADFS(0, "/v/share/a.txt", "MAVO:Resource"),
                 Gives("/v/share/@eaDir/a.txt/MAVO:Resource"));
     EXPECT_THAT(PathNoADFS(0, "/v/share/a.txt", "user.x"), Gives("/v/share/@eaDir/a.txt/user.x"));
 }
 
+// Promise: "MAVOEAPathNoADFS: The metadata file"
 TEST_F(EaPathTest, AnyOtherFormGivesTheKindAlone) {
     for (const int form : {2, 3, -1, INT_MAX, INT_MIN}) {
         SCOPED_TRACE(form);
@@ -367,6 +383,7 @@ TEST_F(EaPathTest, PathOfOneNameIsRelativeToTheCurrentDirectory) {
     EXPECT_THAT(PathNoADFS(1, As(243), "k"), Gives("@eaDir/" + As(241) + CheckOf("aa") + "@k"));
 }
 
+// Promise: "Paths: One trailing '/'"
 TEST_F(EaPathTest, OneTrailingSlashIsIgnored) {
     EXPECT_THAT(PathNoADFS(1, "/v/share/dir", "k"), Gives("/v/share/@eaDir/dir@k"));
     EXPECT_THAT(PathNoADFS(1, "/v/share/dir/", "k"), Gives("/v/share/@eaDir/dir@k"));
@@ -399,6 +416,7 @@ TEST_F(EaPathTest, EmptyKindIsAKindLikeAnyOther) {
     EXPECT_THAT(PathNoADFS(2, "/v/a", ""), Gives("/v/@eaDir/"));
 }
 
+// Promise: "Paths: Codes: 0xD00 NULL"
 TEST_F(EaPathTest, MissingArgumentsAreRefusedAndErrnoIsLeftAlone) {
     for (const int form : {0, 1, 2}) {
         SCOPED_TRACE(form);
@@ -433,12 +451,14 @@ TEST_F(EaPathTest, MissingBufferIsFoundByTheDirectoryDerivation) {
     }
 }
 
+// Promise: "Paths: Buffers."
 TEST_F(EaPathTest, FileFormNeedsRoomForItsTerminatingNul) {
     // "/v/@eaDir/a@kind" has 16 bytes.
     EXPECT_THAT(PathNoADFS(1, "/v/a", "kind", 17), Gives("/v/@eaDir/a@kind"));
     EXPECT_THAT(PathNoADFS(1, "/v/a", "kind", 16), FailsWith(0xC300, "ea_path", ENAMETOOLONG));
 }
 
+// Promise: "Paths: Buffers."
 TEST_F(EaPathTest, OtherFormsPassWithoutRoomForTheirTerminatingNul) {
     EXPECT_THAT(PathNoADFS(0, "/v/a", "kind", 16), Gives("/v/@eaDir/a/kind"));
     EXPECT_THAT(PathNoADFS(0, "/v/a", "kind", 15), FailsWith(0xC300, "ea_path", ENAMETOOLONG));
@@ -473,6 +493,8 @@ TEST_F(EaPathTest, LengthCheckCountsTheNameBeforeItIsShortened) {
                 FailsWith(0xC300, "ea_path", ENAMETOOLONG));
 }
 
+// Promise: "Paths: 0xC300"
+// Promise: "MAVOEAPathNoADFS: errno"
 TEST_F(EaPathTest, BufferWithoutRoomIsTooSmallForEverything) {
     for (const int form : {0, 1, 2}) {
         for (const int size : {8, 1, 0, -1, INT_MIN}) {
@@ -519,6 +541,7 @@ TEST_F(EaPathTest, VeryLongKindIsRefused) {
     }
 }
 
+// Promise: "Paths: 0x200 out of memory"
 TEST_F(EaPathTest, PathsUpTo4094BytesAllocateNothing) {
     const FailCall fault("malloc", ENOMEM, 0);
     EXPECT_THAT(PathNoADFS(1, "/v/share/a.txt", "k"), Gives("/v/share/@eaDir/a.txt@k"));
@@ -529,6 +552,7 @@ TEST_F(EaPathTest, PathsUpTo4094BytesAllocateNothing) {
     EXPECT_FALSE(fault.fired());
 }
 
+// Promise: "Paths: 0x200 out of memory"
 TEST_F(EaPathTest, PathOver4094BytesNeedsMemoryBeforeItIsRefused) {
     for (const int form : {0, 1, 2}) {
         for (const std::size_t length : {std::size_t{4095}, std::size_t{4096}, std::size_t{9000}}) {
@@ -557,6 +581,7 @@ TEST_F(EaShortenedNameTest, NameOf242BytesIsUsedUnchanged) {
     EXPECT_EQ(std::string(242, '.'), StoredName(std::string(242, '.')));
 }
 
+// Promise: "Paths: In EA_FORM_FILE a name of more than 242"
 TEST_F(EaShortenedNameTest, NameOf243BytesEndsInItsCheckCharacter) {
     // 'a' + 'a' is 194, index 14: 'e'.
     EXPECT_EQ(As(241) + "e", StoredName(As(243)));
@@ -682,6 +707,7 @@ TEST_F(EaShortenedNameTest, SumOfALongNameDoesNotWrapAt16Bits) {
     EXPECT_EQ(As(241) + "f", StoredName(As(241) + std::string(3001, '\xFF')));
 }
 
+// Promise: "Paths: In EA_FORM_FILE a name of more than 242"
 TEST_F(EaShortenedNameTest, StoredFileNameFitsInTheLimitOfAFilesystem) {
     for (const std::size_t length : {242U, 243U, 244U, 248U, 255U, 256U, 1000U, 4000U}) {
         SCOPED_TRACE(length);
@@ -713,6 +739,7 @@ TEST_F(EaShortenedNameTest, OnlyTheFileFormShortens) {
 
 // ---- The AppleDouble file -----------------------------------------------------------------------
 
+// Promise: "MAVOEAADPath: The AppleDouble file"
 TEST_F(EaAdPathTest, StandsBesideTheObject) {
     EXPECT_THAT(ADPath("/a.txt"), Gives("/._a.txt"));
     EXPECT_THAT(ADPath("/v/share/a.txt"), Gives("/v/share/._a.txt"));
@@ -721,6 +748,7 @@ TEST_F(EaAdPathTest, StandsBesideTheObject) {
     EXPECT_THAT(ADPath("share/a.txt"), Gives("share/._a.txt"));
 }
 
+// Promise: "Paths: One trailing '/'"
 TEST_F(EaAdPathTest, OneTrailingSlashIsIgnoredAndNoMore) {
     EXPECT_THAT(ADPath("/v/share/dir"), Gives("/v/share/._dir"));
     EXPECT_THAT(ADPath("/v/share/dir/"), Gives("/v/share/._dir"));
@@ -729,6 +757,7 @@ TEST_F(EaAdPathTest, OneTrailingSlashIsIgnoredAndNoMore) {
     EXPECT_THAT(ADPath("/v//dir"), Gives("/v//._dir"));
 }
 
+// Promise: "Paths: Codes: 0xD00 NULL"
 TEST_F(EaAdPathTest, EmptyPathAndRootGiveTheBarePrefix) {
     EXPECT_THAT(ADPath(""), Gives("._"));
     EXPECT_THAT(ADPath("/"), Gives("._"));
@@ -747,6 +776,9 @@ TEST_F(EaAdPathTest, MissingArgumentsAreRefusedAndErrnoIsLeftAlone) {
     }
 }
 
+// Promise: "MAVOEAADPath: a name of more than 253"
+// Promise: "MAVOEAADPath: errno is left alone"
+// Promise: "Paths: All return 0 or -1"
 TEST_F(EaAdPathTest, NameOf253BytesIsTheLongest) {
     EXPECT_THAT(ADPath("/v/" + As(253)), Gives("/v/._" + As(253)));
     EXPECT_THAT(ADPath(As(253)), Gives("._" + As(253)));
@@ -763,6 +795,7 @@ TEST_F(EaAdPathTest, TrailingSlashHidesALongNameFromTheLengthCheck) {
     EXPECT_THAT(ADPath(As(400) + "/"), Gives("._" + As(400)));
 }
 
+// Promise: "MAVOEAADPath: A result longer"
 TEST_F(EaAdPathTest, ResultThatDoesNotFitIsCutShort) {
     const std::string whole = "/v/._a.txt";
     for (int size = 1; size <= 14; ++size) {
@@ -793,6 +826,7 @@ TEST_F(EaAdPathTest, PathsUpTo4094BytesAllocateNothing) {
     EXPECT_FALSE(fault.fired());
 }
 
+// Promise: "Paths: 0x200 out of memory"
 TEST_F(EaAdPathTest, PathOver4094BytesNeedsMemory) {
     for (const std::size_t length : {std::size_t{4095}, std::size_t{4096}, std::size_t{9000}}) {
         SCOPED_TRACE(length);
@@ -815,6 +849,8 @@ TEST_F(EaAdPathTest, LongNameIsFoundBeforeMemoryIsNeeded) {
 
 // ---- Places -------------------------------------------------------------------------------------
 
+// Promise: "EA_PLACE_EADIR"
+// Promise: "MAVOEAPath: MAVOEAPathNoADFS()"
 TEST_F(EaPathPlaceTest, EaDirectoryPlaceLiesInTheEaDirectory) {
     EXPECT_THAT(Path(1, "/v/share/a.txt", "MavoEAStream", 0),
                 Gives("/v/share/@eaDir/a.txt@MavoEAStream"));
@@ -825,6 +861,8 @@ TEST_F(EaPathPlaceTest, EaDirectoryPlaceLiesInTheEaDirectory) {
     EXPECT_THAT(Path(1, "/v/" + As(243), "k", 0), Gives("/v/@eaDir/" + As(241) + "e@k"));
 }
 
+// Promise: "EA_PLACE_APPLEDOUBLE"
+// Promise: "MAVOEAPath: MAVOEAPathNoADFS()"
 TEST_F(EaPathPlaceTest, AppleDoublePlaceIgnoresFormAndKind) {
     for (const int form : {0, 1, 2, -1}) {
         for (const std::string kind : {"MavoEAStream", "MavoResource", ""}) {
@@ -835,6 +873,7 @@ TEST_F(EaPathPlaceTest, AppleDoublePlaceIgnoresFormAndKind) {
     EXPECT_THAT(Path(1, "/v/a", "k", 1, 5), Gives("/v/."));
 }
 
+// Promise: "MAVOEAPath: any other place"
 TEST_F(EaPathPlaceTest, AnyOtherPlaceIsRefused) {
     for (const int place : {2, 3, -1, INT_MAX, INT_MIN}) {
         SCOPED_TRACE(place);
@@ -842,6 +881,7 @@ TEST_F(EaPathPlaceTest, AnyOtherPlaceIsRefused) {
     }
 }
 
+// Promise: "MAVOEAPath: MAVOEAPathNoADFS()"
 TEST_F(EaPathPlaceTest, MissingPathOrKindIsRefusedInEveryPlace) {
     for (const int place : {0, 1, 2}) {
         SCOPED_TRACE(place);
@@ -1108,6 +1148,7 @@ void ExpectAllInPlace(Generator& generate, std::size_t lead) {
                   });
 }
 
+// Promise: "Paths: szBuf may be szPath"
 TEST_F(EaPathPropertyTest, PathMayBeReplacedByTheDerivedOne) {
     Generator generate;
     for (int round = 0; round < 3000 / kSeriesStep && !HasFatalFailure(); ++round) {
@@ -1116,6 +1157,7 @@ TEST_F(EaPathPropertyTest, PathMayBeReplacedByTheDerivedOne) {
     }
 }
 
+// Promise: "Paths: szBuf may be szPath"
 TEST_F(EaPathPropertyTest, PathMayLieAnywhereInTheBuffer) {
     Generator generate;
     for (int round = 0; round < 1000 && !HasFatalFailure(); ++round) {
@@ -1124,6 +1166,7 @@ TEST_F(EaPathPropertyTest, PathMayLieAnywhereInTheBuffer) {
     }
 }
 
+// Promise: "Paths: Pure string operations"
 TEST_F(EaPathPropertyTest, PathAndKindOfTheCallerAreNeverModified) {
     const std::string before = "/v/" + As(300) + ".txt/";
     std::string path = before;
@@ -1137,6 +1180,7 @@ TEST_F(EaPathPropertyTest, PathAndKindOfTheCallerAreNeverModified) {
     EXPECT_EQ("kind", kind);
 }
 
+// Promise: "mavoea.h: Threads."
 TEST_F(EaPathPropertyTest, SeveralThreadsDeriveAtOnce) {
     const std::string path = "/v/" + As(241) + "bc.txt";
     const std::string expected = "/v/@eaDir/" + As(237) + "&.txt@MavoEAStream";

@@ -129,6 +129,8 @@ INSTANTIATE_TEST_SUITE_P(Of, EaRemoveByTypeTest,
                                     (std::get<1>(about.param) ? "Found" : "Given");
                          });
 
+// Promise: "MAVOEARemove: Removes"
+// Promise: "MAVOEARemove: On types 0 and 5"
 TEST_P(EaRemoveByTypeTest, WhatIsRemovedIsWhatTheVolumeKeeps) {
     file_.MakeAll();
     const std::vector<std::string> before = Left();
@@ -161,6 +163,7 @@ TEST_P(EaRemoveByTypeTest, AnObjectThatIsGoneAlreadyIsRemovedAllTheSame) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARemove: On types 0 and 5"
 TEST_P(EaRemoveByTypeTest, TheIndexesAreToldWhereTheTypeIsKnownAndTheArchiveBitIsOfEaDirectories) {
     file_.MakeAll();
     TakeCallNames();
@@ -176,6 +179,10 @@ TEST_P(EaRemoveByTypeTest, TheIndexesAreToldWhereTheTypeIsKnownAndTheArchiveBitI
     if (IsEaDir(type())) ExpectArchived();
 }
 
+// Promise: "EAIndexFlags: a NULL pointer means both"
+// Promise: "fileIndex"
+// Promise: "index"
+// Promise: "Remove, rename and copy: the platform's indexes"
 TEST_P(EaRemoveByTypeTest, EachSettingOfTheOptionsTellsTheIndexesThatItSays) {
     const bool reports = IsAppleDouble(type()) || IsEaDir(type()) || type() == 7;
     for (const int file_index : {-1, 0, 1, 2}) {
@@ -204,6 +211,7 @@ TEST_P(EaRemoveByTypeTest, WhatTheIndexesAnswerIsIgnored) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARemoveWithoutEAStream"
 TEST_P(EaRemoveByTypeTest, WithoutTheStreamMeansThatItStays) {
     file_.MakeAll();
     const std::vector<std::string> before = Left();
@@ -228,6 +236,7 @@ TEST_P(EaRemoveByTypeTest, WithoutTheStreamMeansThatItStays) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARemove: other types"
 TEST_F(EaRemoveTest, ATypeThatNobodyHasHeardOfDoesNothing) {
     file_.MakeAll();
     const std::vector<std::string> before = Left();
@@ -242,6 +251,7 @@ TEST_F(EaRemoveTest, ATypeThatNobodyHasHeardOfDoesNothing) {
     ExpectNothingReported();
 }
 
+// Promise: "fileIndex"
 TEST_F(EaRemoveTest, TheFileIndexIsTheFirstOption) {
     static_assert(offsetof(EAIndexFlags, fileIndex) == 0);
     static_assert(offsetof(EAIndexFlags, index) == sizeof(int));
@@ -291,6 +301,7 @@ TEST_F(EaRemoveTest, ADirectorysOwnMetadataGoesAndThatOfItsChildrenStays) {
                                                  FileIndexCall(directory.object() + "/")));
 }
 
+// Promise: "MAVOEARemove: Removes"
 TEST_F(EaRemoveTest, AnEaDirectoryWithFilesOfAnotherObjectIsKeptWithThem) {
     file_.MakeAll();
     other_.MakeAll();
@@ -311,6 +322,7 @@ TEST_F(EaRemoveTest, OtherFilesOfTheObjectInItsEaDirectoryAreNotTouched) {
 
 // ---- The type that is found ---------------------------------------------------------------------
 
+// Promise: "MAVOEARemove: 0, or -1"
 TEST_F(EaRemoveTest, NullFailsWith0xD00AndDoesNothing) {
     TakeCallNames();
     for (const int type : {-1, 0, 1, 4, 7}) {
@@ -323,11 +335,13 @@ TEST_F(EaRemoveTest, NullFailsWith0xD00AndDoesNothing) {
     EXPECT_THAT(TakeCallNames(), IsEmpty());
 }
 
+// Promise: "Remove, rename and copy: `fsType` is"
 TEST_F(EaRemoveTest, ATypeThatIsGivenIsNotAskedFor) {
     EXPECT_EQ(0, Remove(1));
     EXPECT_THAT(TakePlatformCalls(), Each(Not(StartsWith("MAVOGetFSType("))));
 }
 
+// Promise: "MAVOEARemove: 0x2A00"
 TEST_F(EaRemoveTest, ATypeThatCannotBeFoundFailsWith0x2A00AndTellsNobody) {
     file_.MakeAll();
     const std::vector<std::string> before = Left();
@@ -371,6 +385,7 @@ class EaRemoveHereTest : public EaRemoveTest {
     std::filesystem::path former_;
 };
 
+// Promise: "MAVOEARemove: 0x2A00"
 TEST_F(EaRemoveHereTest, TheTypeIsThatOfTheParentDirectory) {
     EXPECT_EQ("/v/share", AskedOf("/v/share/a"));
     EXPECT_EQ("/v/share/a", AskedOf("/v/share/a/"));
@@ -401,6 +416,7 @@ TEST_F(EaRemoveHereTest, TheTypeIsAskedOfNoMoreThanTheFirst4095Bytes) {
     EXPECT_EQ("", AskedOf("/" + most + "a/b"));
 }
 
+// Promise: "MAVOEARemove: What is in the way"
 TEST_F(EaRemoveHereTest, ACurrentDirectoryThatCannotBeToldIsLoggedAndFails) {
     TakeCalls();
     for (const int error : {ENOENT, ERANGE, EACCES}) {
@@ -441,6 +457,8 @@ TEST_F(EaRemoveTest, WithoutASidecarTheLegacyFolderOfAnAppleDoubleVolumeStillGoe
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARemove: 0x3900"
+// Promise: "MAVOEARemove: On types 0 and 5"
 TEST_F(EaRemoveTest, ASidecarThatCannotBeRemovedFailsWith0x3900AndKeepsTheLegacyFolder) {
     for (const int error : {EACCES, EPERM, EROFS, ENOTDIR, EIO}) {
         SCOPED_TRACE(strerror(error));
@@ -463,6 +481,7 @@ TEST_F(EaRemoveTest, ADirectoryInPlaceOfTheSidecarFailsWith0x3900) {
     ExpectBothIndexesTold();
 }
 
+// Promise: "MAVOEARemove: On types 0 and 5"
 TEST_F(EaRemoveTest, ALegacyFolderThatCannotBeRemovedIsNoFailureOfAnAppleDoubleVolume) {
     file_.MakeAll();
     MakeDir(file_.folder() + "/sub");
@@ -501,6 +520,7 @@ TEST_F(EaRemoveTest, TheLongestNameThatHasASidecarLosesIt) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARemove: the path functions' codes"
 TEST_F(EaRemoveTest, ASidecarPathThatCannotBeDerivedFailsAndTellsTheIndexes) {
     const std::string path = dir_.path() + std::string(5000, '/') + "a.txt";
     const FailCall fault("malloc", ENOMEM);
@@ -531,6 +551,7 @@ TEST_F(EaRemoveTest, WithoutAnyMetadataTheIndexesAreToldAndTheArchiveBitIsSet) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARemove: 0, or -1"
 TEST_F(EaRemoveTest, ALegacyFolderThatFailsDoesNotKeepTheFilesFromBeingRemoved) {
     file_.MakeAll();
     const FailCall fault("remove", EACCES);  // the folder
@@ -551,6 +572,8 @@ TEST_F(EaRemoveTest, FilesThatFailAfterTheLegacyFolderWentLeaveItGone) {
     ExpectArchived();
 }
 
+// Promise: "MAVOEARemove: What is in the way"
+// Promise: "MAVOEARemove: 0x3900"
 TEST_F(EaRemoveTest, BothFormsFailingFailOnce) {
     file_.MakeAll();
     MakeDir(file_.folder() + "/sub");
@@ -572,6 +595,8 @@ TEST_F(EaRemoveTest, ALegacyFolderThatCannotBeOpenedStaysAndIsNoFailure) {
                                     "@eaDir/a.txt/MAVO:Resource", "@eaDir/a.txt/color", "a.txt"));
 }
 
+// Promise: "MAVOEARemove: the path functions' codes"
+// Promise: "MAVOEARemove: each of the two forms"
 TEST_F(EaRemoveTest, APathThatIsTooLongFailsInBothFormsAndIsReported) {
     const std::string path = dir_.path() + "/" + std::string(5000, 'n');
     EXPECT_EQ(-1, MAVOEARemove(path.c_str(), 1, nullptr));
@@ -619,6 +644,7 @@ TEST_F(EaRemoveTest, EveryFailingCallStillTellsTheIndexesAndLeavesNothingOpen) {
 
 // ---- The folder form ----------------------------------------------------------------------------
 
+// Promise: "EARemove: Removes"
 TEST_F(EaRemoveTest, TheFolderFormTakesTheLegacyFolderAndNothingElse) {
     file_.MakeAll();
     EXPECT_EQ(0, RemoveForm(0));
@@ -629,6 +655,7 @@ TEST_F(EaRemoveTest, TheFolderFormTakesTheLegacyFolderAndNothingElse) {
     EXPECT_THAT(archived_, IsEmpty());
 }
 
+// Promise: "EARemove: then the EA directory"
 TEST_F(EaRemoveTest, TheFolderFormTakesTheEaDirectoryToo) {
     file_.MakeLegacy("color");
     WriteFile(cover_, {});
@@ -666,6 +693,8 @@ TEST_F(EaRemoveTest, AnEmptyLegacyFolderGoesAndTheEaDirectoryStays) {
     ExpectNothingReported();
 }
 
+// Promise: "EARemove: -1: 0x3900"
+// Promise: "MAVOEARemove: What is in the way"
 TEST_F(EaRemoveTest, ASubfolderOfTheLegacyFolderIsLoggedAndFails) {
     MakeDir(file_.ea_dir());
     MakeDir(file_.folder());
@@ -719,6 +748,7 @@ TEST_F(EaRemoveTest, ALegacyFolderWhoseReadingBreaksOffFailsWith0x3900) {
     EXPECT_TRUE(Exists(file_.folder() + "/color"));
 }
 
+// Promise: "EARemove: A folder that cannot be opened"
 TEST_F(EaRemoveTest, AFileInPlaceOfTheLegacyFolderIsAFolderThatCannotBeOpened) {
     MakeDir(file_.ea_dir());
     WriteFile(file_.folder(), Ascii("in the way"));
@@ -772,6 +802,7 @@ TEST_F(EaRemoveTest, APathMayFillTheBuffersOf4095Bytes) {
 
 // ---- The file form ------------------------------------------------------------------------------
 
+// Promise: "EARemove: Removes"
 TEST_F(EaRemoveTest, TheFileFormTakesTheTwoFilesAndNothingElse) {
     file_.MakeAll();
     other_.MakeStream();
@@ -804,6 +835,7 @@ TEST_F(EaRemoveTest, OneOfTheTwoFilesIsEnough) {
     ExpectNothingReported();
 }
 
+// Promise: "EARemove: 0, also when"
 TEST_F(EaRemoveTest, AnEmptyEaDirectoryGoesWithAnObjectThatHasNoFilesInIt) {
     MakeDir(file_.ea_dir());
     EXPECT_EQ(0, RemoveForm(1));
@@ -844,6 +876,7 @@ TEST_F(EaRemoveTest, AResourceFileThatFailsDoesNotKeepTheStreamFromBeingRemoved)
     }
 }
 
+// Promise: "EARemove: -1: 0x3900"
 TEST_F(EaRemoveTest, AStreamThatFailsIsRecordedOnceAndKeepsTheEaDirectory) {
     for (const int error : {EACCES, EPERM, EISDIR, EIO}) {
         SCOPED_TRACE(strerror(error));
@@ -897,6 +930,7 @@ TEST_F(EaRemoveTest, AnyOtherFormDoesNothing) {
     ExpectNothingReported();
 }
 
+// Promise: "EARemove: the path functions' codes"
 TEST_F(EaRemoveTest, APathThatIsNullOrEmptyFailsWithItsCode) {
     for (const int form : {0, 1}) {
         EXPECT_EQ(-1, EARemove(form, nullptr));
@@ -996,6 +1030,7 @@ TEST_F(EaRemoveTest, NamesOfEveryLengthAreRemovedUnderTheirShortenedName) {
 
 // ---- The EA directory ---------------------------------------------------------------------------
 
+// Promise: "EARemoveEADir: Removes"
 TEST_F(EaRemoveTest, AnEmptyEaDirectoryIsRemovedWhateverPathInItIsGiven) {
     for (const char* const below : {"", "/", "/x", "/a.txt/color", "/x/@eaDir/y"}) {
         SCOPED_TRACE(below);
@@ -1006,6 +1041,7 @@ TEST_F(EaRemoveTest, AnEmptyEaDirectoryIsRemovedWhateverPathInItIsGiven) {
     ExpectNothingReported();
 }
 
+// Promise: "EARemoveEADir: 0 when"
 TEST_F(EaRemoveTest, AnEaDirectoryThatIsMissingIsAsGoodAsRemoved) {
     EXPECT_EQ(0, RemoveEaDir());
     EXPECT_EQ(0, EARemoveEADir((dir_ / "none/@eaDir/x").c_str()));
@@ -1026,6 +1062,7 @@ TEST_F(EaRemoveTest, APathWithoutAnEaDirectoryFailsAndTouchesNothing) {
     ExpectNothingReported();
 }
 
+// Promise: "EARemoveEADir: Removes"
 TEST_F(EaRemoveTest, TheFirstEaDirInThePathCounts) {
     MakeDir(file_.ea_dir());
     MakeDir(file_.ea_dir() + "/sub");
@@ -1064,6 +1101,7 @@ TEST_F(EaRemoveTest, APathIsLookedAtUpTo4096Bytes) {
     ExpectNothingReported();
 }
 
+// Promise: "EARemoveEADir: Removes"
 TEST_F(EaRemoveTest, ACoverDoesNotKeepTheEaDirectory) {
     MakeDir(file_.ea_dir());
     WriteFile(cover_, Ascii("cover"));
@@ -1093,6 +1131,7 @@ TEST_F(EaRemoveTest, ACoverThatLeadsToAFileIsACoverAndTheFileStays) {
     EXPECT_THAT(Left(), ElementsAre("a.txt"));
 }
 
+// Promise: "EARemoveEADir: Removes"
 TEST_F(EaRemoveTest, ACoverThatIsNoFileKeepsTheEaDirectory) {
     const std::vector<std::function<int()>> kinds = {
         [&] { return ::mkdir(cover_.c_str(), 0777); },
@@ -1142,6 +1181,8 @@ TEST_F(EaRemoveTest, ACoverThatIsGoneBeforeItsRemovalIsAsGoodAsRemoved) {
     ExpectNothingReported();
 }
 
+// Promise: "EARemoveEADir: -1 when"
+// Promise: "EARemoveEADir: No codes"
 TEST_F(EaRemoveTest, AnEaDirectoryThatCannotBeRemovedStaysInSilenceWithoutItsCover) {
     MakeDir(file_.ea_dir());
     WriteFile(cover_, {});
@@ -1152,6 +1193,7 @@ TEST_F(EaRemoveTest, AnEaDirectoryThatCannotBeRemovedStaysInSilenceWithoutItsCov
     ExpectNothingReported();
 }
 
+// Promise: "EARemoveEADir: No codes"
 TEST_F(EaRemoveTest, AnEaDirectoryThatCannotBeOpenedIsLoggedAndStays) {
     MakeDir(file_.ea_dir());
     WriteFile(cover_, {});
@@ -1309,6 +1351,7 @@ class DanglingEaDirTest : public EaRemoveTest {
     const std::string holder_ = dir_ / "holder";
 };
 
+// Promise: "MAVOEARemoveDanglingEADir"
 TEST_F(DanglingEaDirTest, AnEaDirectoryThatIsAloneIsRemovedWithEverythingInIt) {
     Fill();
     RemoveDangling();
@@ -1324,6 +1367,7 @@ TEST_F(DanglingEaDirTest, AnEmptyDirectoryIsLeftAlone) {
     EXPECT_TRUE(Exists(holder_));
 }
 
+// Promise: "MAVOEARemoveDanglingEADir"
 TEST_F(DanglingEaDirTest, AnyOtherEntryKeepsTheEaDirectory) {
     for (const char* const name :
          {"file", ".hidden", "...", "@eaDir2", "@EADIR", "._x", ".cover"}) {

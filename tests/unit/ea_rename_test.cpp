@@ -172,6 +172,7 @@ INSTANTIATE_TEST_SUITE_P(Of, EaRenameByTypeTest,
                                     (std::get<1>(about.param) ? "Found" : "Given");
                          });
 
+// Promise: "MAVOEARename: Moves"
 TEST_P(EaRenameByTypeTest, WhatFollowsTheObjectIsWhatTheVolumeKeeps) {
     for (const ObjectFiles& to : {beside_, new_}) {
         SCOPED_TRACE(to.object());
@@ -214,6 +215,7 @@ TEST_P(EaRenameByTypeTest, AnObjectWithoutMetadataIsASuccessAndMakesNothing) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARename: the archive bit"
 TEST_P(EaRenameByTypeTest, TheArchiveBitIsSetOnTheNewPathOfEaDirectoryVolumes) {
     old_.MakeAll();
     old_.MakeObject();
@@ -229,6 +231,8 @@ TEST_P(EaRenameByTypeTest, TheArchiveBitIsSetOnTheNewPathOfEaDirectoryVolumes) {
     }
 }
 
+// Promise: "EAIndexFlags: a NULL pointer means both"
+// Promise: "Remove, rename and copy: the platform's indexes"
 TEST_P(EaRenameByTypeTest, EachSettingOfTheOptionsTellsTheIndexesThatItSays) {
     for (const int file_index : {-1, 0, 1, 2}) {
         for (const int index : {-1, 0, 1, 2}) {
@@ -255,6 +259,7 @@ TEST_P(EaRenameByTypeTest, WhatTheIndexesAnswerIsIgnored) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARename: Other types"
 TEST_F(EaRenameTest, ATypeThatNobodyHasHeardOfDoesNothing) {
     old_.MakeAll();
     const std::vector<std::string> before = All();
@@ -269,6 +274,7 @@ TEST_F(EaRenameTest, ATypeThatNobodyHasHeardOfDoesNothing) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARename: Negative: 0xD00"
 TEST_F(EaRenameTest, NullFailsWith0xD00AndDoesNothing) {
     TakeCallNames();
     for (const int type : {-1, 0, 1, 4, 7}) {
@@ -284,6 +290,8 @@ TEST_F(EaRenameTest, NullFailsWith0xD00AndDoesNothing) {
     EXPECT_THAT(TakePlatformCalls(), IsEmpty());
 }
 
+// Promise: "Remove, rename and copy: `fsType` is"
+// Promise: "MAVOEARename: The type is"
 TEST_F(EaRenameTest, TheTypeIsAskedOfTheNewPathAndOnlyWhenItIsNotGiven) {
     Platform().fs_type = [](const std::string&, int) { return 4; };
     EXPECT_EQ(0, Rename(old_, new_, -1));
@@ -292,6 +300,7 @@ TEST_F(EaRenameTest, TheTypeIsAskedOfTheNewPathAndOnlyWhenItIsNotGiven) {
     EXPECT_THAT(TakePlatformCalls(), IsEmpty());
 }
 
+// Promise: "MAVOEARename: The type is"
 TEST_F(EaRenameTest, ARelativeNewPathWhoseTypeIsToBeFoundIsLoggedAndNothingMoves) {
     old_.MakeAll();
     const std::vector<std::string> before = All();
@@ -445,6 +454,7 @@ TEST_F(EaRenameTest, OtherFilesOfTheObjectInItsEaDirectoryAreNotMoved) {
 
 // ---- Onto existing metadata ---------------------------------------------------------------------
 
+// Promise: "MAVOEARename: Moves"
 TEST_F(EaRenameTest, FilesThatStandAtTheNewPathAreReplaced) {
     for (const ObjectFiles& to : {beside_, new_}) {
         SCOPED_TRACE(to.object());
@@ -479,6 +489,7 @@ TEST_F(EaRenameTest, ALegacyFolderAtTheNewPathStaysWhenTheOldOneHasNone) {
     EXPECT_EQ(Ascii("color of b"), ReadFile(new_.folder() + "/color"));
 }
 
+// Promise: "MAVOEARename: Each move that fails"
 TEST_F(EaRenameTest, ALegacyFolderAtTheNewPathThatCannotBeRemovedFailsAndTheOldOneStays) {
     old_.MakeAll();
     new_.MakeFolder();
@@ -597,6 +608,7 @@ TEST_F(EaRenameTest, FoldersThatShareOnlyHalfOfTheirIdentityAreDifferent) {
 
 // ---- Moves that fail ----------------------------------------------------------------------------
 
+// Promise: "MAVOEARename: 0x2800"
 TEST_F(EaRenameTest, EachMoveThatFailsCountsOneAndTheOthersAreMade) {
     new_.MakeObject();
     for (int nth = 1; nth <= 3; ++nth) {
@@ -621,6 +633,9 @@ TEST_F(EaRenameTest, EachMoveThatFailsCountsOneAndTheOthersAreMade) {
     }
 }
 
+// Promise: "MAVOEARename: Types 1, 2,"
+// Promise: "MAVOEARename: the archive bit"
+// Promise: "MAVOEARename: Each move that fails"
 TEST_F(EaRenameTest, AllMovesFailingCountThree) {
     old_.MakeAll();
     new_.MakeObject();
@@ -663,6 +678,7 @@ TEST_F(EaRenameTest, TheOldEaDirectoryGoesAfterAFileThatWasGoneWhenItWasMoved) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARename: the codes of paths"
 TEST_F(EaRenameTest, AnEaDirectoryThatCannotBeMadeFailsEveryMove) {
     old_.MakeAll();
     const std::vector<std::string> before = All();
@@ -713,6 +729,7 @@ TEST_F(EaRenameTest, WhatCannotBeLookedAtIsNotThere) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARename: the codes of paths"
 TEST_F(EaRenameTest, PathsThatAreTooLongFailEveryMove) {
     const std::string endless = dir_.path() + "/" + std::string(5000, 'n');
     EXPECT_EQ(-3, MAVOEARename(endless.c_str(), new_.object().c_str(), 1, nullptr));
@@ -828,6 +845,7 @@ TEST_F(EaRenameAcrossTest, MvMovesEachOfTheThree) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARename: Types 1, 2,"
 TEST_F(EaRenameAcrossTest, MvRunsOnlyForWhatIsOnAnotherVolume) {
     old_.MakeAll();
     const FailCall fault("rename", EXDEV, 2);
@@ -837,6 +855,7 @@ TEST_F(EaRenameAcrossTest, MvRunsOnlyForWhatIsOnAnotherVolume) {
     ExpectFolderOf(old_, new_);
 }
 
+// Promise: "MAVOEARename: Each move that fails"
 TEST_F(EaRenameAcrossTest, MvsExitStatusIsTheResultAndIsRecordedOnTwoLines) {
     for (const int status : {1, 2, 127, 255, -1}) {
         SCOPED_TRACE(status);
@@ -853,6 +872,7 @@ TEST_F(EaRenameAcrossTest, MvsExitStatusIsTheResultAndIsRecordedOnTwoLines) {
     }
 }
 
+// Promise: "MAVOEARename: Types 1, 2,"
 TEST_F(EaRenameAcrossTest, TheResultIsTheSumOfTheStatusesAsItStands) {
     const std::vector<std::pair<std::vector<int>, int>> kSums = {
         {{1, 2, 4}, 7},     {{0, 0, 3}, 3},   {{5, 0, 0}, 5},
@@ -1013,6 +1033,7 @@ std::map<std::string, Bytes> AttributesIn(const std::string& path) {
     return attributes;
 }
 
+// Promise: "MAVOEARename: legacy layouts"
 TEST_F(EaRenameTest, AttributeFilesBecomeTheStreamAtTheNewPath) {
     old_.MakeLegacy("color");
     old_.MakeLegacy("tags");
@@ -1024,6 +1045,7 @@ TEST_F(EaRenameTest, AttributeFilesBecomeTheStreamAtTheNewPath) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARename: legacy layouts"
 TEST_F(EaRenameTest, ALegacyResourceFileBecomesTheResourceFileAtTheNewPath) {
     MakeDir(old_.ea_dir());
     MakeDir(old_.folder());
@@ -1059,6 +1081,7 @@ TEST_F(EaRenameTest, ASidecarBecomesTheStreamWhileTheOldObjectStands) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARename: the codes of paths"
 TEST_F(EaRenameTest, AnUpgradeThatFailsFailsItsMoveAndNoOther) {
     MakeDir(old_.ea_dir());
     old_.MakeStream();
@@ -1219,6 +1242,7 @@ TEST_F(EaRenameTest, AnEmptyDirectoryInPlaceOfTheNewSidecarIsRemovedAndAFullOneI
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARename: Types 0 and 5"
 TEST_F(EaRenameTest, ASidecarAtTheNewPathThatCannotBeRemovedKeepsTheOldOneInSilence) {
     old_.MakeSidecar();
     old_.MakeLegacy("color");
@@ -1236,6 +1260,7 @@ TEST_F(EaRenameTest, ASidecarAtTheNewPathThatCannotBeRemovedKeepsTheOldOneInSile
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEARename: Types 0 and 5"
 TEST_F(EaRenameTest, ASidecarThatCannotBeMovedStaysInSilenceAndItsFolderToo) {
     for (const int error : {EACCES, EIO, ENOENT, EXDEV}) {
         SCOPED_TRACE(strerror(error));
@@ -1254,6 +1279,7 @@ TEST_F(EaRenameTest, ASidecarThatCannotBeMovedStaysInSilenceAndItsFolderToo) {
     }
 }
 
+// Promise: "MAVOEARename: Types 0 and 5"
 TEST_F(EaRenameTest, ALegacyFolderThatCannotFollowItsSidecarIsNoFailure) {
     old_.MakeSidecar();
     old_.MakeLegacy("color");

@@ -170,6 +170,7 @@ TEST_P(ResourceForkOperationTest, NeverUsesTheAttributeCalls) {
                                        Not(Contains("removexattr")), Not(Contains("listxattr"))));
 }
 
+// Promise: "Named attributes: "com.apple.ResourceFork" is"
 TEST_P(ResourceForkOperationTest, LooksAtTheObjectThenAtItsFork) {
     TakeCalls();
     Run();
@@ -177,6 +178,9 @@ TEST_P(ResourceForkOperationTest, LooksAtTheObjectThenAtItsFork) {
                 ElementsAre("stat(" + object_ + ")", "stat(" + view_ + ")"));
 }
 
+// Promise: "MAVOEAXattrSet: for the fork"
+// Promise: "MAVOEAXattrRemove: for the fork"
+// Promise: "MAVOEAXattrGet: for the fork also 0x700"
 TEST_P(ResourceForkOperationTest, ADirectoryFailsWith0x700AndIsLeftAlone) {
     const std::string directory = dir_ / "directory";
     ASSERT_EQ(0, mkdir(directory.c_str(), 0600));
@@ -202,6 +206,7 @@ TEST_P(ResourceForkOperationTest, AFileThatItsOwnerCanExecuteKeepsItsModeAndTheP
     ExpectNothingReported();
 }
 
+// Promise: "Named attributes: While a fork is used"
 TEST_P(ResourceForkOperationTest, AFileWithoutTheBitHasItAsTheSuperuserWhileTheForkIsUsed) {
     SetMode(0644);
     BeUser(kUser);
@@ -334,6 +339,7 @@ TEST_P(ResourceForkOperationTest, TheCauseOfAFailureOutlivesARestoreThatFailsToo
     EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
+// Promise: "Named attributes: so do those of a fork"
 TEST_P(ResourceForkOperationTest, AForkThatCannotBeLookedAtIsLogged) {
     SetMode(0644);
     BeUser(kUser);
@@ -348,6 +354,7 @@ TEST_P(ResourceForkOperationTest, AForkThatCannotBeLookedAtIsLogged) {
     EXPECT_THAT(TakeCallNames(), Not(Contains("fopen")));
 }
 
+// Promise: "Named attributes: "com.apple.ResourceFork" is"
 TEST_P(ResourceForkOperationTest, AFilesystemWithoutTheViewFailsAsAFailedStat) {
     Hooks().stat = nullptr;
     Hooks().fopen = nullptr;
@@ -360,6 +367,7 @@ TEST_P(ResourceForkOperationTest, AFilesystemWithoutTheViewFailsAsAFailedStat) {
     EXPECT_EQ(Ascii("data fork"), ReadFile(object_));
 }
 
+// Promise: "Named attributes: so do those of a fork"
 TEST_P(ResourceForkOperationTest, AForkThatCannotBeOpenedIsLogged) {
     SetMode(0644);
     BeUser(kUser);
@@ -598,6 +606,7 @@ TEST_F(ResourceForkGetTest, ALargeForkIsReadWhole) {
     EXPECT_EQ(content, value);
 }
 
+// Promise: "MAVOEAXattrGet: with cbValue 0"
 TEST_F(ResourceForkGetTest, WithoutABufferTheSizeIsReturnedAndNothingOpened) {
     SetMode(0644);
     TakeCallNames();
@@ -617,6 +626,7 @@ TEST_F(ResourceForkGetTest, ABufferOfExactlyTheForksSizeIsEnough) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAXattrGet: 0xBF00"
 TEST_F(ResourceForkGetTest, ABufferOneByteTooSmallFailsWith0xBF00AndErange) {
     SetMode(0644);
     BeUser(kUser);
@@ -632,6 +642,8 @@ TEST_F(ResourceForkGetTest, ABufferOneByteTooSmallFailsWith0xBF00AndErange) {
     EXPECT_THAT(TakeCallNames(), Not(Contains("fopen")));
 }
 
+// Promise: "Named attributes: an empty fork"
+// Promise: "MAVOEAXattrGet: for the fork also 0x700"
 TEST_F(ResourceForkGetTest, AnEmptyForkIsAbsentWith0x700AndEnodata) {
     SetFork("");
     SetMode(0644);
@@ -649,6 +661,7 @@ TEST_F(ResourceForkGetTest, AnEmptyForkIsAbsentWith0x700AndEnodata) {
     }
 }
 
+// Promise: "MAVOEAXattrGet: A missing fork"
 TEST_F(ResourceForkGetTest, AMissingForkFailsSilentlyWithEnoent) {
     ASSERT_EQ(0, unlink(fork_.c_str()));
     SetMode(0644);
@@ -676,6 +689,7 @@ TEST_F(ResourceForkGetTest, EnoentOfAMissingForkOutlivesARestoreThatFails) {
     EXPECT_EQ(ENOENT, errno);
 }
 
+// Promise: "MAVOEAXattrGet: for the fork also 0x700"
 TEST_F(ResourceForkGetTest, AMissingObjectFailsWith0x700) {
     const std::string missing = dir_ / "missing";
     TakeCallNames();
@@ -687,6 +701,7 @@ TEST_F(ResourceForkGetTest, AMissingObjectFailsWith0x700) {
     EXPECT_THAT(TakeCallNames(), AllOf(Not(Contains("chmod")), Not(Contains("seteuid"))));
 }
 
+// Promise: "MAVOEAXattrGet: 0x2700"
 TEST_F(ResourceForkGetTest, AnObjectThatCannotBeLookedAtFailsWith0x2700) {
     for (const int error : {EACCES, ENOTDIR, ELOOP, EIO, ENAMETOOLONG}) {
         SCOPED_TRACE(strerror(error));
@@ -775,6 +790,7 @@ TEST_F(ResourceForkSetTest, NoBytesEmptyTheFork) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAXattrSet: A fork is written"
 TEST_F(ResourceForkSetTest, TheFilesystemsAreSyncedOnceTheBytesAreInTheKernel) {
     std::string at_sync = "(no sync)";
     Hooks().sync = [&] { at_sync = Fork(); };
@@ -798,6 +814,7 @@ TEST_F(ResourceForkSetTest, AnEmptyForkCanBeCreated) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAXattrSet: for the fork"
 TEST_F(ResourceForkSetTest, AnEmptyForkCannotBeReplaced) {
     for (const int flags : {2, 3}) {
         SCOPED_TRACE(flags);
@@ -816,6 +833,7 @@ TEST_F(ResourceForkSetTest, AnEmptyForkCannotBeReplaced) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAXattrSet: for the fork"
 TEST_F(ResourceForkSetTest, AForkThatHoldsBytesCannotBeCreated) {
     for (const int flags : {1, 3}) {
         SCOPED_TRACE(flags);
@@ -920,6 +938,7 @@ class ResourceForkRemoveTest : public ResourceForkTestBase, public ::testing::Te
     int Remove() const { return MAVOEAXattrRemove(object_.c_str(), kFork); }
 };
 
+// Promise: "MAVOEAXattrRemove: a fork is emptied"
 TEST_F(ResourceForkRemoveTest, AnEmptyForkIsLeftAndNotAMissingOne) {
     TakeCalls();
     std::string at_sync = "(no sync)";

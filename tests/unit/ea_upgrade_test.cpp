@@ -286,6 +286,7 @@ void EaUpgradeTest::FailEachCall(
 
 // ---- Kinds and paths --------------------------------------------------------------------------
 
+// Promise: "MAVOEAUpgrade: -1: 0xD00"
 TEST_F(EaUpgradeTest, AKindThatIsNotReservedFailsWith0xD00AndTouchesNothing) {
     MakeFolder({{"other", Ascii("value")}, {"mavo:x", Ascii("x")}});
     TakeCallNames();
@@ -305,6 +306,7 @@ TEST_F(EaUpgradeTest, AKindThatIsNotReservedFailsWith0xD00AndTouchesNothing) {
     EXPECT_THAT(NamesIn(folder_), ElementsAre("mavo:x", "other"));
 }
 
+// Promise: "MAVOEAUpgrade: what the path"
 TEST_F(EaUpgradeTest, ErrorsOfThePathStandAsTheyWereRecorded) {
     const std::string endless = "/" + std::string(5000, 'a');
     TakeCallNames();
@@ -334,6 +336,7 @@ TEST_F(EaUpgradeTest, ThePathOfTheStreamMayTake4095Bytes) {
 
 // ---- Streams: what there is and what comes of it ----------------------------------------------
 
+// Promise: "MAVOEAUpgrade: 1 the current"
 TEST_F(EaUpgradeTest, AnObjectWithAStreamIsLeftAsItIs) {
     MakeFolder(two_);
     MakeStream(Ascii("whatever"));
@@ -347,6 +350,7 @@ TEST_F(EaUpgradeTest, AnObjectWithAStreamIsLeftAsItIs) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAUpgrade: 2 there is nothing"
 TEST_F(EaUpgradeTest, AnObjectWithoutLegacyMetadataGives2AndNothingIsMadeOrRemoved) {
     TakeCallNames();
     EXPECT_EQ(2, UpgradeStream());
@@ -356,6 +360,9 @@ TEST_F(EaUpgradeTest, AnObjectWithoutLegacyMetadataGives2AndNothingIsMadeOrRemov
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAUpgrade: MAVOEA_KIND_STREAM"
+// Promise: "MAVOEAUpgrade: A legacy folder that is empty"
+// Promise: "MAVOEAUpgrade: 0 converted"
 TEST_F(EaUpgradeTest, AttributeFilesMoveIntoANewStreamAndTheFolderGoes) {
     MakeFolder(two_);
     EXPECT_EQ(0, UpgradeStream());
@@ -419,6 +426,7 @@ TEST_F(EaUpgradeTest, ReservedNamesAreNoAttributeFilesAndKeepTheFolder) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAUpgrade: A legacy folder that is empty"
 TEST_F(EaUpgradeTest, AnEmptyFolderGives2AndIsRemoved) {
     MakeFolder({});
     EXPECT_EQ(2, UpgradeStream());
@@ -536,6 +544,7 @@ INSTANTIATE_TEST_SUITE_P(
         Times{"OnlyASidecarThatWasNeverRead", {}, 0, 2, Times::kNone}),
     [](const auto& times) { return times.param.name; });
 
+// Promise: "MAVOEAUpgrade: or a "._" file"
 TEST_P(EaUpgradeTimesTest, TheOneThatWasReadLastBecomesTheStream) {
     const Times& times = GetParam();
     Values values;
@@ -620,6 +629,7 @@ TEST_F(EaUpgradeTest, TheUpgradesOwnLookIntoTheSidecarDoesNotMakeItNewer) {
 
 // ---- Streams: the "._" file -------------------------------------------------------------------
 
+// Promise: "MAVOEAUpgrade: or a "._" file"
 TEST_F(EaUpgradeTest, ANewerSidecarBecomesTheStreamAsItIsAndTheFolderIsKept) {
     MakeFolder(two_, 100);
     MakeSidecar(SmallSidecar(), 200);
@@ -680,6 +690,7 @@ TEST_F(EaUpgradeTest, ASidecarThatIsNotAcceptedDoesNotCountHoweverNew) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAUpgrade: 0x2800"
 TEST_F(EaUpgradeTest, ASidecarThatCannotBeRenamedFailsWith0x2800AndStays) {
     MakeFolder(two_, 100);
     MakeSidecar(SmallSidecar(), 200);
@@ -806,6 +817,8 @@ class EaUpgradeBadFileTest : public EaUpgradeTest {
     const std::string bad_ = folder_ + "/bad";
 };
 
+// Promise: "MAVOEAUpgrade: Files that cannot be converted"
+// Promise: "MAVOEAUpgrade: Codes are recorded"
 TEST_F(EaUpgradeBadFileTest, OneThatCannotBeStated) {
     MakeFolder(two_);
     ASSERT_EQ(0, symlink("nowhere", bad_.c_str()));
@@ -836,6 +849,7 @@ TEST_F(EaUpgradeBadFileTest, OneThatCannotBeStatedWhicheverItIs) {
     }
 }
 
+// Promise: "MAVOEAUpgrade: Codes are recorded"
 TEST_F(EaUpgradeBadFileTest, OneThatCannotBeOpenedWhicheverItIs) {
     Values three = two_;
     three["third"] = Ascii("3");
@@ -864,6 +878,7 @@ TEST_F(EaUpgradeBadFileTest, ASocket) {
     ExpectOnlyThisOneSkipped("bad", 0x900);
 }
 
+// Promise: "MAVOEAUpgrade: Files that cannot be converted"
 TEST_F(EaUpgradeBadFileTest, OneThatTheUserMayNotRead) {
     MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     MakeFolder(two_);
@@ -908,6 +923,7 @@ TEST_F(EaUpgradeBadFileTest, OneThatIsShorterThanItsSize) {
     EXPECT_EQ(Ascii("short"), ContentsOf(bad_));
 }
 
+// Promise: "MAVOEAUpgrade: Codes are recorded"
 TEST_F(EaUpgradeBadFileTest, OneThatCannotBeRead) {
     MakeFolder(two_);
     MakeFolder({{"bad", Pattern(777)}});
@@ -932,6 +948,7 @@ TEST_F(EaUpgradeBadFileTest, OneThatIsReadInPiecesIsReadWhole) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAUpgrade: Codes are recorded"
 TEST_F(EaUpgradeBadFileTest, OneForWhichThereIsNoMemory) {
     constexpr std::size_t kSize = 1000000;
     const Values values = {{"large", Pattern(kSize)}, {"small", Ascii("s")}};
@@ -1183,6 +1200,7 @@ TEST_F(EaUpgradeNewStreamTest, WhateverFailsThereIsNoStreamThatLacksWhatCouldBeR
     }
 }
 
+// Promise: "MAVOEAUpgrade: 0x900 the stream"
 TEST_F(EaUpgradeNewStreamTest, ThatCannotBeMadeFailsWith0x900) {
     for (const char* const call : {"open(", "link("}) {
         SCOPED_TRACE(call);
@@ -1204,6 +1222,7 @@ TEST_F(EaUpgradeNewStreamTest, ThatCannotBeMadeFailsWith0x900) {
     }
 }
 
+// Promise: "MAVOEAUpgrade: what the path"
 TEST_F(EaUpgradeNewStreamTest, ThatCannotBeLockedFailsWithItsCode) {
     MakeFolder(values_);
     const FailCall fault("setlock", EAGAIN);
@@ -1274,6 +1293,7 @@ TEST_F(EaUpgradeNewStreamTest, IsMadeBesideWhatAnEarlierProcessOfItsNumberLeft) 
 
 // ---- Streams: the folder ----------------------------------------------------------------------
 
+// Promise: "MAVOEAUpgrade: 0x3900"
 TEST_F(EaUpgradeTest, AFolderThatCannotBeRemovedFailsWith0x3900) {
     MakeFolder(two_);
     {
@@ -1474,6 +1494,7 @@ TEST_F(EaUpgradeUnseenTest, ASidecarThatCannotBeLookedAtMayBeThere) {
 
 // ---- Streams: the current directory -----------------------------------------------------------
 
+// Promise: "MAVOEAUpgrade: The process's working directory"
 TEST_F(EaUpgradeTest, ObjectPathsMayBeRelative) {
     for (const bool sidecar : {false, true}) {
         SCOPED_TRACE(sidecar);
@@ -1684,6 +1705,7 @@ class EaUpgradeResourceTest : public EaUpgradeTest {
     const std::string clear_hidden_ = "command(" + object_ + ", 518)";
 };
 
+// Promise: "MAVOEAUpgrade: MAVOEA_KIND_RESOURCE"
 TEST_F(EaUpgradeResourceTest, TheFileMovesAsItIsAndTheFolderGoes) {
     const Bytes bytes = ResourceFile(0, 0);
     MakeLegacy(bytes);
@@ -1704,6 +1726,7 @@ TEST_F(EaUpgradeResourceTest, AFolderWithMoreInItIsKept) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAUpgrade: 1 the current"
 TEST_F(EaUpgradeResourceTest, AFileOfTheCurrentLayoutIsLeftAsItIs) {
     MakeLegacy(ResourceFile(0x21, 0x4000));
     WriteFile(resource_, Ascii("current"));
@@ -1715,6 +1738,7 @@ TEST_F(EaUpgradeResourceTest, AFileOfTheCurrentLayoutIsLeftAsItIs) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAUpgrade: 2 there is nothing"
 TEST_F(EaUpgradeResourceTest, NoFileInEitherLayoutGives2AndRemovesNothing) {
     EXPECT_EQ(2, Upgrade());
     EXPECT_THAT(NamesIn(dir_.path()), ElementsAre("a.txt"));
@@ -1730,6 +1754,7 @@ TEST_F(EaUpgradeResourceTest, NoFileInEitherLayoutGives2AndRemovesNothing) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAUpgrade: 0x2800"
 TEST_F(EaUpgradeResourceTest, AFileThatCannotBeRenamedFailsWith0x2800AndStays) {
     MakeLegacy(ResourceFile(0x21, 0));
     TakeCalls();
@@ -1742,6 +1767,7 @@ TEST_F(EaUpgradeResourceTest, AFileThatCannotBeRenamedFailsWith0x2800AndStays) {
     EXPECT_THAT(TakeLog(), IsEmpty());
 }
 
+// Promise: "MAVOEAUpgrade: 0x3900"
 TEST_F(EaUpgradeResourceTest, AFolderThatCannotBeRemovedFailsWith0x3900) {
     for (const int error : {EBUSY, EACCES, ENOTDIR}) {
         SCOPED_TRACE(strerror(error));
@@ -1791,6 +1817,7 @@ TEST_F(EaUpgradeResourceTest, ObjectPathsMayBeRelativeAndEndInASlash) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAUpgrade: the object gets its marks"
 TEST_F(EaUpgradeResourceTest, EveryCombinationOfMarksIsCarriedOntoTheObject) {
     using Bits = std::optional<std::uint32_t>;
     for (const Bits afp :
@@ -1848,6 +1875,7 @@ TEST_F(EaUpgradeResourceTest, OnlyTheVersionIsCheckedAndNotTheMagic) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAUpgrade: and for marks"
 TEST_F(EaUpgradeResourceTest, AFileOfAnotherVersionGivesNoMarks) {
     for (const std::uint32_t version : {0x00010000u, 0x00020001u, 0x00000200u, 0u}) {
         SCOPED_TRACE(version);
@@ -1859,6 +1887,7 @@ TEST_F(EaUpgradeResourceTest, AFileOfAnotherVersionGivesNoMarks) {
     }
 }
 
+// Promise: "MAVOEAUpgrade: and for marks"
 TEST_F(EaUpgradeResourceTest, AFileWithNeitherEntryGivesNoMarks) {
     MakeLegacy(ResourceFile({}, {}));
     ExpectMovedWithoutMarks(ResourceFile({}, {}), 0x4000);
@@ -1906,6 +1935,7 @@ TEST_F(EaUpgradeResourceTest, MoreDescriptorsThanTheFileHoldsGiveNoMarks) {
     ExpectMovedWithoutMarks(bytes, 0xA00);
 }
 
+// Promise: "MAVOEAUpgrade: and for marks"
 TEST_F(EaUpgradeResourceTest, AFileThatCannotBeOpenedOrReadGivesNoMarks) {
     const Bytes bytes = ResourceFile(0x0021, 0x4000);
     MakeLegacy(bytes);
@@ -2012,6 +2042,7 @@ class EaUpgradeReservedTest : public EaUpgradeTest {
     int Upgrade(const char* kind) const { return MAVOEAUpgrade(object_.c_str(), kind); }
 };
 
+// Promise: "MAVOEAUpgrade: other "MAVO...""
 TEST_F(EaUpgradeReservedTest, TheFileMovesWithinTheFolder) {
     MakeFolder({{"MAVO:x", Ascii("x")}, {"color", Ascii("blue")}});
     EXPECT_EQ(0, Upgrade("MAVO:x"));
@@ -2024,6 +2055,7 @@ TEST_F(EaUpgradeReservedTest, TheFileMovesWithinTheFolder) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAUpgrade: other "MAVO...""
 TEST_F(EaUpgradeReservedTest, OnlyTheLastColonIsReplaced) {
     MakeFolder({{"MAVO:a:b", Ascii("ab")}, {"MAVOc:", Ascii("c")}});
     EXPECT_EQ(0, Upgrade("MAVO:a:b"));

@@ -120,6 +120,7 @@ class XattrEnumTest : public XattrTest {
 };
 using RealXattrEnumTest = RealXattrTest;
 
+// Promise: "MAVOEAXattrEnum: 0, or -1: 0xD00"
 TEST_F(XattrEnumTest, ANullPathIsLoggedAndRecorded) {
     List list({"before"});
     EXPECT_EQ(-1, MAVOEAXattrEnum(nullptr, list.out()));
@@ -127,6 +128,7 @@ TEST_F(XattrEnumTest, ANullPathIsLoggedAndRecorded) {
     EXPECT_THAT(list.strings(), ElementsAre("before"));
 }
 
+// Promise: "MAVOEAXattrEnum: 0, or -1: 0xD00"
 TEST_F(XattrEnumTest, ANullListPointerIsLoggedAndRecorded) {
     EXPECT_EQ(-1, MAVOEAXattrEnum(object_.c_str(), nullptr));
     ExpectCheckFailed("ea_xattr_enum", "((void *)0) != ppList");
@@ -144,6 +146,7 @@ TEST_F(XattrEnumTest, ThePathIsCheckedFirst) {
     ExpectCheckFailed("ea_xattr_enum", "((void *)0) != szPath");
 }
 
+// Promise: "MAVOEAXattrEnum: Appends"
 TEST_F(RealXattrEnumTest, NamesAreAppendedToWhatTheListHolds) {
     Put("user.first", "1");
     Put("user.second", "2");
@@ -165,6 +168,7 @@ TEST_F(RealXattrEnumTest, NamesThatSetfattrWroteAreFound) {
     EXPECT_THAT(list.strings(), Contains("user.by.setfattr"));
 }
 
+// Promise: "Named attributes: symbolic links"
 TEST_F(RealXattrEnumTest, SymbolicLinksAreFollowed) {
     Put("user.of.target", "x");
     const std::string link = dir_ / "link";
@@ -207,6 +211,7 @@ TEST_F(XattrEnumTest, TheSizeIsAskedForFirstAndABufferOfThatSizeFilled) {
     EXPECT_EQ(15u, allocations.total);
 }
 
+// Promise: "MAVOEAXattrEnum: empties it"
 TEST_F(XattrEnumTest, AFileWithoutAttributesEmptiesTheList) {
     OfferNames("");
     List list({"one", "two"});
@@ -231,6 +236,7 @@ TEST_F(XattrEnumTest, MissingAttributesEmptyTheListAndAreNoFailure) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAXattrEnum: 0x2A00"
 TEST_F(XattrEnumTest, AnyOtherFailureToAskForTheSizeIsRecordedAndLeavesTheList) {
     for (const int error : {ENOTSUP, EACCES, EIO, ENOTDIR, ELOOP, ENAMETOOLONG, ERANGE}) {
         SCOPED_TRACE(strerror(error));
@@ -245,6 +251,7 @@ TEST_F(XattrEnumTest, AnyOtherFailureToAskForTheSizeIsRecordedAndLeavesTheList) 
     }
 }
 
+// Promise: "MAVOEAXattrEnum: 0x2A00"
 TEST_F(XattrEnumTest, AnyFailureToReadTheNamesIsRecordedAndLeavesTheList) {
     using namespace std::string_literals;
     OfferNames("user.a\0"s);
@@ -263,6 +270,7 @@ TEST_F(XattrEnumTest, AnyFailureToReadTheNamesIsRecordedAndLeavesTheList) {
     }
 }
 
+// Promise: "MAVOEAXattrEnum: 0x100"
 TEST_F(XattrEnumTest, LackOfMemoryForTheNamesIsRecordedAndLeavesTheList) {
     using namespace std::string_literals;
     OfferNames("user.a\0"s);
@@ -275,6 +283,7 @@ TEST_F(XattrEnumTest, LackOfMemoryForTheNamesIsRecordedAndLeavesTheList) {
     EXPECT_THAT(TakeCallNames(), ElementsAre("listxattr"));
 }
 
+// Promise: "mavoea.h: Results."
 TEST_F(XattrEnumTest, EveryFailingCallIsRecordedOnceAndLeavesNothingBehind) {
     using namespace std::string_literals;
     OfferNames("user.a\0user.b\0"s);
@@ -298,6 +307,7 @@ TEST_F(XattrEnumTest, EveryFailingCallIsRecordedOnceAndLeavesNothingBehind) {
     }
 }
 
+// Promise: "MAVOEAXattrEnum: or the list"
 TEST_F(XattrEnumTest, AListThatTakesNoMoreEndsTheWalk) {
     using namespace std::string_literals;
     OfferNames("user.a\0user.b\0user.c\0"s);
@@ -348,18 +358,22 @@ TEST_F(XattrEnumTest, TheResourceForkIsNotListed) {
 using XattrGetTest = XattrTest;
 using RealXattrGetTest = RealXattrTest;
 
+// Promise: "Named attributes: NULL and negative"
+// Promise: "MAVOEAXattrGet: -1: 0xD00"
 TEST_F(XattrGetTest, ANullPathIsLoggedAndRecorded) {
     char value[4];
     EXPECT_EQ(-1, MAVOEAXattrGet(nullptr, "user.a", value, 4));
     ExpectCheckFailed("ea_xattr_get", "((void *)0) != szPath");
 }
 
+// Promise: "MAVOEAXattrGet: -1: 0xD00"
 TEST_F(XattrGetTest, ANullNameIsLoggedAndRecorded) {
     char value[4];
     EXPECT_EQ(-1, MAVOEAXattrGet(object_.c_str(), nullptr, value, 4));
     ExpectCheckFailed("ea_xattr_get", "((void *)0) != szName");
 }
 
+// Promise: "Named attributes: NULL and negative"
 TEST_F(XattrGetTest, ABufferThatDoesNotFitItsSizeIsLoggedAndRecorded) {
     char value[4];
     const std::string check = "((0 < cbValue && NULL != szValue) || 0 == cbValue)";
@@ -380,6 +394,7 @@ TEST_F(XattrGetTest, ArgumentsAreCheckedFromLeftToRight) {
     ExpectCheckFailed("ea_xattr_get", "((void *)0) != szName");
 }
 
+// Promise: "MAVOEAXattrGet: Reads"
 TEST_F(RealXattrGetTest, AValueIsReadIntoTheBuffer) {
     using namespace std::string_literals;
     const std::string stored = "a\0b\xFF"s;
@@ -407,6 +422,7 @@ TEST_F(RealXattrGetTest, ABufferThatIsTooSmallFailsWithErangeAndRecordsNothing) 
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAXattrGet: with cbValue 0"
 TEST_F(RealXattrGetTest, WithoutABufferTheLengthIsReturned) {
     Put("user.a", "abcde");
     EXPECT_EQ(5, MAVOEAXattrGet(object_.c_str(), "user.a", nullptr, 0));
@@ -440,6 +456,7 @@ TEST_F(XattrGetTest, AMissingFileFailsWithEnoentAndRecordsNothing) {
     ExpectNothingReported();
 }
 
+// Promise: "Named attributes: Failures of the attribute calls"
 TEST_F(XattrGetTest, AnyFailureKeepsItsErrnoAndRecordsNothing) {
     const FailCall fault("getxattr", EIO);
     char value[4];
@@ -464,6 +481,7 @@ TEST_F(RealXattrGetTest, AValueThatSetfattrWroteIsRead) {
     EXPECT_EQ(Hex("00 FF 4D"), Bytes(value, value + 3));
 }
 
+// Promise: "Named attributes: symbolic links"
 TEST_F(RealXattrGetTest, SymbolicLinksAreFollowed) {
     Put("user.a", "of target");
     const std::string link = dir_ / "link";
@@ -478,16 +496,19 @@ TEST_F(RealXattrGetTest, SymbolicLinksAreFollowed) {
 using XattrSetTest = XattrTest;
 using RealXattrSetTest = RealXattrTest;
 
+// Promise: "MAVOEAXattrSet: -1: 0xD00"
 TEST_F(XattrSetTest, ANullPathIsLoggedAndRecorded) {
     EXPECT_EQ(-1, MAVOEAXattrSet(nullptr, "user.a", "v", 1, 0));
     ExpectCheckFailed("ea_xattr_set", "((void *)0) != szPath");
 }
 
+// Promise: "MAVOEAXattrSet: -1: 0xD00"
 TEST_F(XattrSetTest, ANullNameIsLoggedAndRecorded) {
     EXPECT_EQ(-1, MAVOEAXattrSet(object_.c_str(), nullptr, "v", 1, 0));
     ExpectCheckFailed("ea_xattr_set", "((void *)0) != szName");
 }
 
+// Promise: "MAVOEAXattrSet: szValue"
 TEST_F(XattrSetTest, ANullValueIsLoggedAndRecordedEvenForNoBytes) {
     EXPECT_EQ(-1, MAVOEAXattrSet(object_.c_str(), "user.a", nullptr, 1, 0));
     ExpectCheckFailed("ea_xattr_set", "((void *)0) != szValue");
@@ -497,6 +518,7 @@ TEST_F(XattrSetTest, ANullValueIsLoggedAndRecordedEvenForNoBytes) {
     ExpectCheckFailed("ea_xattr_set", "((void *)0) != szValue");
 }
 
+// Promise: "Named attributes: NULL and negative"
 TEST_F(XattrSetTest, ANegativeSizeIsLoggedAndRecorded) {
     EXPECT_EQ(-1, MAVOEAXattrSet(object_.c_str(), "user.a", "v", -1, 0));
     ExpectCheckFailed("ea_xattr_set", "0 <= cbValue");
@@ -520,6 +542,8 @@ TEST_F(RealXattrSetTest, AValueIsStoredWithItsZeroBytes) {
     ExpectNothingReported();
 }
 
+// Promise: "Named attributes: The object's own"
+// Promise: "MAVOEAXattrSet: Sets"
 TEST_F(RealXattrSetTest, GetfattrSeesTheValue) {
     if (!HasProgram("getfattr")) GTEST_SKIP() << "getfattr is not installed (package attr)";
     ASSERT_EQ(0, MAVOEAXattrSet(object_.c_str(), "user.seen", "by others", 9, 0));
@@ -540,6 +564,7 @@ TEST_F(RealXattrSetTest, WithoutFlagsAValueIsCreatedAndReplaced) {
     EXPECT_EQ("short", ValueOf("user.a"));
 }
 
+// Promise: "MAVOEAXattrSet: flags as"
 TEST_F(RealXattrSetTest, Flag1OnlyCreates) {
     EXPECT_EQ(0, MAVOEAXattrSet(object_.c_str(), "user.a", "one", 3, 1));
     errno = 0;
@@ -549,6 +574,7 @@ TEST_F(RealXattrSetTest, Flag1OnlyCreates) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAXattrSet: flags as"
 TEST_F(RealXattrSetTest, Flag2OnlyReplaces) {
     errno = 0;
     EXPECT_EQ(-1, MAVOEAXattrSet(object_.c_str(), "user.a", "one", 3, 2));
@@ -559,6 +585,7 @@ TEST_F(RealXattrSetTest, Flag2OnlyReplaces) {
     ExpectNothingReported();
 }
 
+// Promise: "Named attributes: symbolic links"
 TEST_F(RealXattrSetTest, SymbolicLinksAreFollowed) {
     const std::string link = dir_ / "link";
     ASSERT_EQ(0, symlink(object_.c_str(), link.c_str()));
@@ -566,6 +593,7 @@ TEST_F(RealXattrSetTest, SymbolicLinksAreFollowed) {
     EXPECT_EQ("x", ValueOf("user.a"));
 }
 
+// Promise: "Named attributes: Failures of the attribute calls"
 TEST_F(XattrSetTest, AFailureKeepsItsErrnoAndRecordsNothing) {
     for (const int error : {ENOSPC, EPERM, ENOTSUP}) {
         const FailCall fault("setxattr", error);
@@ -589,6 +617,7 @@ TEST_F(XattrSetTest, TheKernelsResultIsReturnedAsItStands) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAXattrSet: flags as"
 TEST_F(XattrSetTest, FlagsAreHandedThroughUnchanged) {
     Hooks().setxattr = [](const char*, const char*, const void*, size_t, int) { return 0; };
     for (const int flags : {0, 1, 2, 3, 0x40, -1}) {
@@ -604,6 +633,7 @@ TEST_F(XattrSetTest, FlagsAreHandedThroughUnchanged) {
 using XattrRemoveTest = XattrTest;
 using RealXattrRemoveTest = RealXattrTest;
 
+// Promise: "MAVOEAXattrRemove: -1: 0xD00"
 TEST_F(XattrRemoveTest, ANullPathIsLoggedAndRecorded) {
     EXPECT_EQ(-1, MAVOEAXattrRemove(nullptr, "user.a"));
     ExpectCheckFailed("ea_xattr_remove", "((void *)0) != szPath");
@@ -611,11 +641,13 @@ TEST_F(XattrRemoveTest, ANullPathIsLoggedAndRecorded) {
     ExpectCheckFailed("ea_xattr_remove", "((void *)0) != szPath");
 }
 
+// Promise: "MAVOEAXattrRemove: -1: 0xD00"
 TEST_F(XattrRemoveTest, ANullNameIsLoggedAndRecorded) {
     EXPECT_EQ(-1, MAVOEAXattrRemove(object_.c_str(), nullptr));
     ExpectCheckFailed("ea_xattr_remove", "NULL != szName");
 }
 
+// Promise: "MAVOEAXattrRemove: Removes"
 TEST_F(RealXattrRemoveTest, OnlyTheNamedAttributeGoes) {
     Put("user.a", "1");
     Put("user.b", "2");
@@ -634,6 +666,7 @@ TEST_F(RealXattrRemoveTest, GetfattrNoLongerSeesIt) {
     EXPECT_EQ("# file: " + object_ + "\nuser.stays\n\n", seen.output);
 }
 
+// Promise: "Named attributes: symbolic links"
 TEST_F(RealXattrRemoveTest, SymbolicLinksAreFollowed) {
     Put("user.a", "1");
     const std::string link = dir_ / "link";
@@ -649,6 +682,7 @@ TEST_F(RealXattrRemoveTest, AMissingAttributeFailsWithEnodataAndRecordsNothing) 
     ExpectNothingReported();
 }
 
+// Promise: "Named attributes: Failures of the attribute calls"
 TEST_F(XattrRemoveTest, AFailureKeepsItsErrnoAndRecordsNothing) {
     {
         const FailCall fault("removexattr", EPERM);
@@ -701,6 +735,7 @@ class XattrNameTest : public XattrTest {
     std::map<std::string, std::string> attributes_;
 };
 
+// Promise: "Named attributes: The object's own"
 TEST_F(XattrNameTest, NamesOtherThanTheResourceForkArePassedThroughUnchanged) {
     for (const std::string name :
          {"com.apple.FinderInfo", "com.apple.resourcefork", "COM.APPLE.RESOURCEFORK",

@@ -342,6 +342,7 @@ TEST_F(EasDamageTest, ADeclaredDataLengthTakesNoMemoryThatTheFileDoesNotFill) {
     }
 }
 
+// Promise: "EA streams: attributes: A stream whose offsets"
 TEST_F(EasDamageTest, ValuesThatDoNotFollowEachOtherAreNotRewritten) {
     const StreamImage image{.attributes = {{"a", Ascii("xyz")}, {"b", Ascii("12")}}};
     struct Case {
@@ -376,6 +377,7 @@ TEST_F(EasDamageTest, ValuesThatDoNotFollowEachOtherAreNotRewritten) {
     }
 }
 
+// Promise: "EA streams: attributes: A stream whose offsets"
 TEST_F(EasDamageTest, ADataAreaBeforeTheEndOfTheTableIsNotRewritten) {
     StreamImage image{.attributes = {{"a", Ascii("xyz")}, {"b", Ascii("12")}}};
     Bytes bytes = image.Build();

@@ -56,6 +56,8 @@ class EasEntriesTest : public StreamTest {
 
 // ---- Search -------------------------------------------------------------------------------------
 
+// Promise: "EA streams: attributes: Names are compared"
+// Promise: "MAVOEASSearch: The index"
 TEST_F(EasEntriesTest, SearchComparesByteByByte) {
     image_.attributes = {{"name", {}}, {"Name", {}}, {"names", {}}, {"nam", {}}, {"", {}}};
     Reopen();
@@ -96,12 +98,14 @@ TEST_F(EasEntriesTest, SearchTellsApartNamesThatBeginOrEndAlike) {
     TakeRecords();
 }
 
+// Promise: "MAVOEASSearch: 0x2000"
 TEST_F(EasEntriesTest, SearchInAStreamWithoutAttributesFindsNone) {
     handle_ = Open();
     EXPECT_EQ(-1, MAVOEASSearch(h(), "a"));
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2000, "eas_search")));
 }
 
+// Promise: "MAVOEASSearch: The index"
 TEST_F(EasEntriesTest, SearchRefusesMissingArguments) {
     OpenThree();
     EXPECT_EQ(-1, MAVOEASSearch(nullptr, "a"));
@@ -114,6 +118,7 @@ TEST_F(EasEntriesTest, SearchRefusesMissingArguments) {
     EXPECT_THAT(records, Each(RecordOf(0xD00, "eas_search")));
 }
 
+// Promise: "MAVOEASSearch: The index"
 TEST_F(EasEntriesTest, OfTwoRecordsWithTheSameNameTheLastIsMeant) {
     image_.attributes = {
         {"a", Ascii("first")}, {"b", Ascii("2")}, {"a", Ascii("last")}, {"c", Ascii("3")}};
@@ -135,6 +140,7 @@ TEST_F(EasEntriesTest, OfTwoRecordsWithTheSameNameTheLastIsMeant) {
 
 // ---- Enum ---------------------------------------------------------------------------------------
 
+// Promise: "MAVOEASEnum: Appends"
 TEST_F(EasEntriesTest, EnumAppendsNamesInTableOrder) {
     OpenThree();
     MLIBCSzList* list = NewList({"before"});
@@ -153,6 +159,7 @@ TEST_F(EasEntriesTest, EnumOfNoAttributesLeavesTheListAlone) {
     MLIBCSzListFree(list);
 }
 
+// Promise: "MAVOEASEnum: -1"
 TEST_F(EasEntriesTest, EnumThatCannotAppendEmptiesTheWholeList) {
     OpenThree();
     for (const int pushes : {0, 1, 2}) {
@@ -167,6 +174,7 @@ TEST_F(EasEntriesTest, EnumThatCannotAppendEmptiesTheWholeList) {
     }
 }
 
+// Promise: "MAVOEASEnum: -1"
 TEST_F(EasEntriesTest, EnumNeedsAList) {
     OpenThree();
     EXPECT_EQ(-1, MAVOEASEnum(h(), nullptr));
@@ -177,6 +185,8 @@ TEST_F(EasEntriesTest, EnumNeedsAList) {
 
 // ---- Read ---------------------------------------------------------------------------------------
 
+// Promise: "MAVOEASRead: Copies up to"
+// Promise: "MAVOEASRead: With size 0"
 TEST_F(EasEntriesTest, ReadCopiesWhatLiesInTheRange) {
     OpenThree();
     struct Case {
@@ -211,6 +221,7 @@ TEST_F(EasEntriesTest, ReadIsOneRead) {
     EXPECT_THAT(TakeCalls(), IsEmpty());
 }
 
+// Promise: "MAVOEASRead: -1: 0xD00"
 TEST_F(EasEntriesTest, ReadRefusesMissingArguments) {
     OpenThree();
     char buffer[8];
@@ -226,6 +237,7 @@ TEST_F(EasEntriesTest, ReadRefusesMissingArguments) {
     EXPECT_THAT(records, Each(RecordOf(0xD00, "eas_read")));
 }
 
+// Promise: "MAVOEASRead: 0x2000"
 TEST_F(EasEntriesTest, ReadOfAnAbsentNameLeavesTheSearchsRecord) {
     OpenThree();
     char buffer[8];
@@ -233,6 +245,7 @@ TEST_F(EasEntriesTest, ReadOfAnAbsentNameLeavesTheSearchsRecord) {
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2000, "eas_search")));
 }
 
+// Promise: "MAVOEASRead: 0x300"
 TEST_F(EasEntriesTest, ReadUnderEitherLockButNotWithout) {
     OpenThree();
     char buffer[8];
@@ -246,6 +259,7 @@ TEST_F(EasEntriesTest, ReadUnderEitherLockButNotWithout) {
     h()->lockType = F_WRLCK;
 }
 
+// Promise: "MAVOEASRead: 0xA00"
 TEST_F(EasEntriesTest, AShortOrFailedReadIsRecorded) {
     OpenThree();
     char buffer[8];
@@ -267,6 +281,8 @@ TEST_F(EasEntriesTest, AShortOrFailedReadIsRecorded) {
     EXPECT_EQ(4, MAVOEASRead(h(), "b", buffer, 4, 0));  // these bytes are there
 }
 
+// Promise: "MAVOEASRead: Of values of 2 GiB"
+// Promise: "MAVOEASRead: 0xA00"
 TEST_F(EasEntriesTest, OfAValueTooLongForAResultPiecesAreRead) {
     image_.attributes = {{"a", {}}};
     for (const std::uint32_t length : {0x80000000u, 0xFFFFF000u}) {
@@ -298,6 +314,8 @@ TEST_F(EasEntriesTest, OfAValueTooLongForAResultPiecesAreRead) {
     }
 }
 
+// Promise: "EA streams: attributes: Names are compared"
+// Promise: "EA streams: attributes: What would pass"
 TEST_F(EasEntriesTest, AValueTooLongForAResultIsNotMade) {
     OpenThree();
     const HandleState before = StateOf(*h());
@@ -350,6 +368,7 @@ TEST_F(EasEntriesTest, WritingOneByteOverThreeChangesTheFirstOnly) {
     EXPECT_EQ(139u, FileSize());
 }
 
+// Promise: "MAVOEASWrite: A value never shrinks"
 TEST_F(EasEntriesTest, ANewValueIsZeroBeforeItsOffset) {
     handle_ = Open();
     ASSERT_EQ(2, Write(handle_, "a", "ef", 4, 0));
@@ -361,6 +380,9 @@ TEST_F(EasEntriesTest, ANewValueIsZeroBeforeItsOffset) {
     EXPECT_EQ(image_.Build(), Contents());
 }
 
+// Promise: "MAVOEASWrite: Writes `size`"
+// Promise: "MAVOEASWrite: A value never shrinks"
+// Promise: "MAVOEASWrite: Returns size"
 TEST_F(EasEntriesTest, WritingInsideAtTheEndAndBeyondAValue) {
     struct Case {
         unsigned offset;
@@ -387,6 +409,7 @@ TEST_F(EasEntriesTest, WritingInsideAtTheEndAndBeyondAValue) {
     }
 }
 
+// Promise: "MAVOEASWrite: The attribute becomes"
 TEST_F(EasEntriesTest, ARewrittenAttributeBecomesTheLast) {
     handle_ = Open();
     ASSERT_EQ(3, Write(handle_, "A", "aaa"));
@@ -398,6 +421,8 @@ TEST_F(EasEntriesTest, ARewrittenAttributeBecomesTheLast) {
     EXPECT_THAT(Names(handle_), ElementsAre("B", "C", "A"));
 }
 
+// Promise: "EAS_WRITE_OVERWRITE"
+// Promise: "MAVOEASWrite: EEXIST"
 TEST_F(EasEntriesTest, AnExistingNameIsNotWrittenWithoutTheFlag) {
     OpenThree();
     for (const int flags : {0, EAS_WRITE_MUST_EXIST + 0}) {
@@ -418,6 +443,9 @@ TEST_F(EasEntriesTest, AnExistingNameIsNotWrittenWithoutTheFlag) {
     EXPECT_EQ(image_.Build(), Contents());
 }
 
+// Promise: "EAS_WRITE_MUST_EXIST"
+// Promise: "MAVOEASWrite: Writes `size`"
+// Promise: "MAVOEASWrite: errno alone"
 TEST_F(EasEntriesTest, AMissingNameIsNotCreatedWhenItMustExist) {
     OpenThree();
     for (const int flags : {EAS_WRITE_MUST_EXIST + 0, EAS_WRITE_MUST_EXIST | EAS_WRITE_OVERWRITE}) {
@@ -442,6 +470,7 @@ TEST_F(EasEntriesTest, AnAttributeThatIsCreatedLeavesNoRecord) {
     EXPECT_EQ(0, MLIBCErrGet());
 }
 
+// Promise: "MAVOEASWrite: -1 with a code: 0xD00"
 TEST_F(EasEntriesTest, WriteRefusesMissingArguments) {
     OpenThree();
     EXPECT_EQ(-1, MAVOEASWrite(nullptr, "a", "x", 1, 0, 1));
@@ -467,6 +496,7 @@ TEST_F(EasEntriesTest, TheLongestSizeThatAResultCanTellIsNoWrongArgument) {
 }
 
 // What errno was before is no reason to read on behind the end of the file.
+// Promise: "MAVOEASWrite: 0xA00"
 TEST_F(EasEntriesTest, ValuesThatTheFileEndsBeforeCannotBeMoved) {
     OpenThree();
     const Bytes before = Contents();
@@ -479,6 +509,10 @@ TEST_F(EasEntriesTest, ValuesThatTheFileEndsBeforeCannotBeMoved) {
     EXPECT_EQ(before, Contents());
 }
 
+// Promise: "MAVOEASWrite: 0x300"
+// Promise: "MAVOEASRemove: 0x300"
+// Promise: "MAVOEASTruncate: 0x300"
+// Promise: "MAVOEASWriteHeader: 0x300"
 TEST_F(EasEntriesTest, ChangesNeedTheWriteLock) {
     OpenThree();
     for (const int lock_type : {F_RDLCK, F_UNLCK}) {
@@ -529,6 +563,9 @@ TEST_F(EasEntriesTest, AnOverwriteIsOneReadOneWriteAndOneSync) {
     EXPECT_EQ("fsync()", calls[3]);
 }
 
+// Promise: "MAVOEASWrite: Writes `size`"
+// Promise: "MAVOEASRemove: Removes"
+// Promise: "MAVOEASTruncate: Sets"
 TEST_F(EasEntriesTest, EveryChangeIsSyncedOnce) {
     OpenThree();
     ASSERT_EQ(1, Write(handle_, "new", "x"));
@@ -795,6 +832,7 @@ TEST_F(EasEntriesTest, RemovingTheOnlyAttributeCutsTheFileTo120BytesAndTheFork) 
     }
 }
 
+// Promise: "MAVOEASRemove: Removes"
 TEST_F(EasEntriesTest, EachAttributeCanBeRemoved) {
     for (const std::size_t index : {0u, 1u, 2u}) {
         SCOPED_TRACE(index);
@@ -809,6 +847,7 @@ TEST_F(EasEntriesTest, EachAttributeCanBeRemoved) {
     EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
+// Promise: "MAVOEASRemove: Removes"
 TEST_F(EasEntriesTest, RemoveCutsWhatLaysBehindTheFork) {
     OpenThree();
     ASSERT_EQ(0, ftruncate(fd_, 10000));
@@ -827,6 +866,8 @@ TEST_F(EasEntriesTest, AFileThatCannotBeCutIsARemovalAllTheSame) {
     EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
+// Promise: "MAVOEASRemove: -1: 0xD00"
+// Promise: "MAVOEASRemove: 0x2000"
 TEST_F(EasEntriesTest, RemoveRefusesWhatIsNotThere) {
     OpenThree();
     EXPECT_EQ(-1, MAVOEASRemove(nullptr, "a"));
@@ -913,6 +954,8 @@ TEST_F(EasEntriesTest, RemovingOnlyALongNameLeavesDataStartAt376) {
 
 // ---- Truncate -----------------------------------------------------------------------------------
 
+// Promise: "MAVOEASTruncate: Sets"
+// Promise: "MAVOEASTruncate: The attribute becomes"
 TEST_F(EasEntriesTest, TruncateShortensAValueButNotTheFile) {
     OpenThree();
     image_.fork.clear();
@@ -930,6 +973,7 @@ TEST_F(EasEntriesTest, TruncateShortensAValueButNotTheFile) {
     EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
+// Promise: "MAVOEASTruncate: Sets"
 TEST_F(EasEntriesTest, TruncateLengthensAValueWithZeros) {
     OpenThree();
     image_.fork.clear();
@@ -956,6 +1000,7 @@ TEST_F(EasEntriesTest, TruncateLeavesNoOldBytesInAValueThatGrowsAgain) {
     EXPECT_EQ(value, Read(handle_, "a"));
 }
 
+// Promise: "MAVOEASTruncate: The resource fork's"
 TEST_F(EasEntriesTest, TruncateMovesTheForksOffsetButNotItsBytes) {
     for (const unsigned length : {0u, 7u, 50u}) {
         SCOPED_TRACE(length);
@@ -979,6 +1024,7 @@ TEST_F(EasEntriesTest, TruncateMovesTheForksOffsetButNotItsBytes) {
     }
 }
 
+// Promise: "MAVOEASTruncate: 0x2A00"
 TEST_F(EasEntriesTest, TruncateRecordsAFailedFlushTwice) {
     OpenThree();
     const FailCall fault("fsync", EIO);
@@ -988,6 +1034,8 @@ TEST_F(EasEntriesTest, TruncateRecordsAFailedFlushTwice) {
                 ElementsAre(RecordOf(0x2A00, "eas_flush"), RecordOf(0x2A00, "eas_truncate")));
 }
 
+// Promise: "MAVOEASWrite: 0x2A00"
+// Promise: "MAVOEASRemove: 0x2A00"
 TEST_F(EasEntriesTest, OtherChangesRecordAFailedFlushOnce) {
     OpenThree();
     const FailCall fault("fsync", EIO, 0);
@@ -999,6 +1047,8 @@ TEST_F(EasEntriesTest, OtherChangesRecordAFailedFlushOnce) {
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x2A00, "eas_flush")));
 }
 
+// Promise: "MAVOEASTruncate: -1: 0xD00"
+// Promise: "MAVOEASTruncate: 0x2000"
 TEST_F(EasEntriesTest, TruncateRefusesWhatIsNotThere) {
     OpenThree();
     EXPECT_EQ(-1, MAVOEASTruncate(nullptr, "a", 1));
@@ -1016,6 +1066,11 @@ TEST_F(EasEntriesTest, TruncateRefusesWhatIsNotThere) {
 
 // ---- The table ----------------------------------------------------------------------------------
 
+// Promise: "name: NULL in unused records"
+// Promise: "capacity"
+// Promise: "MAVOEASAllocEntry: Enlarges"
+// Promise: "MAVOEASAllocEntry: -1: 0xD00"
+// Promise: "MAVOEASAllocEntry: 0x200"
 TEST_F(EasEntriesTest, AllocEntryAddsFiveRecordsOrAsManyAsAreAskedFor) {
     OpenThree();
     const HandleState before = StateOf(*h());
@@ -1039,6 +1094,8 @@ TEST_F(EasEntriesTest, AllocEntryAddsFiveRecordsOrAsManyAsAreAskedFor) {
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_alloc_entry")));
 }
 
+// Promise: "MAVOEASWriteHeader: Writes header"
+// Promise: "MAVOEASWriteHeader: Total size"
 TEST_F(EasEntriesTest, WriteHeaderWritesHeaderAndTableAndStandsAtDataStart) {
     OpenThree();
     image_.finder_info = Pattern(32, 77);
@@ -1062,6 +1119,7 @@ TEST_F(EasEntriesTest, WriteHeaderOfANewStreamWrites120Bytes) {
 }
 
 // Nobody could open, or rewrite, what it would leave.
+// Promise: "MAVOEASWriteHeader: 0xA00"
 TEST_F(EasEntriesTest, WriteHeaderRefusesATableThatDoesNotFitTheDataArea) {
     const auto refused = [&](const char* what) {
         SCOPED_TRACE(what);
@@ -1129,6 +1187,11 @@ TEST_F(EasEntriesTest, WriteHeaderNeedsNoValuesInTheFile) {
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xA00, "eas_write_header")));
 }
 
+// Promise: "mavoea.h: elsewhere a failure leaves the `errno`"
+// Promise: "MAVOEASWriteHeader: -1: 0xD00"
+// Promise: "MAVOEASWriteHeader: 0x200"
+// Promise: "MAVOEASWriteHeader: 0xA00"
+// Promise: "MAVOEASWriteHeader: 0xB00"
 TEST_F(EasEntriesTest, WriteHeaderReportsWhatFails) {
     EXPECT_EQ(-1, MAVOEASWriteHeader(nullptr));
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_write_header")));
@@ -1158,6 +1221,9 @@ TEST_F(EasEntriesTest, WriteHeaderReportsWhatFails) {
     EXPECT_EQ(image_.Build(), Contents());
 }
 
+// Promise: "MAVOEASWrite: 0xB00"
+// Promise: "MAVOEASRemove: 0xB00"
+// Promise: "MAVOEASTruncate: 0xB00"
 TEST_F(EasEntriesTest, AShortWriteIsRecordedByTheUnitWhosePartItCuts) {
     struct Change {
         const char* unit;
@@ -1253,6 +1319,9 @@ class EasNamesTest : public EasEntriesTest {
 
 constexpr int kFewAndMany[] = {3, 32, 33, 200, 600};
 
+// Promise: "EASEntry: A caller may put another name"
+// Promise: "EASEntry: it is the handle's then"
+// Promise: "EASEntry: In a table of up to 32"
 TEST_F(EasNamesTest, OfAFewAttributesCanBeFreedAndReplaced) {
     for (const int count : {3, 32}) {
         SCOPED_TRACE(count);
@@ -1272,6 +1341,8 @@ TEST_F(EasNamesTest, OfAFewAttributesCanBeFreedAndReplaced) {
     }
 }
 
+// Promise: "EASEntry: A caller may put another name"
+// Promise: "EASEntry: it is the handle's then"
 TEST_F(EasNamesTest, OfManyAttributesCanBeReplaced) {
     for (const int count : {33, 200, 600}) {
         SCOPED_TRACE(count);
@@ -1289,6 +1360,9 @@ TEST_F(EasNamesTest, OfManyAttributesCanBeReplaced) {
     }
 }
 
+// Promise: "EASEntry: In a larger one the names share a block"
+// Promise: "name: NUL-terminated"
+// Promise: "entries: attribute table"
 TEST_F(EasNamesTest, AreFreedWithTheTableWhicheverOfThemAreStillThere) {
     for (const int count : kFewAndMany) {
         SCOPED_TRACE(count);
@@ -1310,6 +1384,7 @@ TEST_F(EasNamesTest, AreFreedWithTheTableWhicheverOfThemAreStillThere) {
     }
 }
 
+// Promise: "EASHandle: A copy may be used"
 TEST_F(EasNamesTest, ACopyOfAHandleIsAsGood) {
     for (const int count : kFewAndMany) {
         SCOPED_TRACE(count);
@@ -1321,6 +1396,7 @@ TEST_F(EasNamesTest, ACopyOfAHandleIsAsGood) {
     }
 }
 
+// Promise: "EASHandle: A copy may be used"
 TEST_F(EasNamesTest, ACopyOfAHandleCanBeClosedInItsPlace) {
     for (const int count : kFewAndMany) {
         SCOPED_TRACE(count);
@@ -1336,6 +1412,8 @@ TEST_F(EasNamesTest, ACopyOfAHandleCanBeClosedInItsPlace) {
 
 // ---- Update entry -------------------------------------------------------------------------------
 
+// Promise: "MAVOEASUpdateEntry: Makes record"
+// Promise: "MAVOEASUpdateEntry: The file is only read"
 TEST_F(EasEntriesTest, UpdateEntryPutsARecordLastAndItsValueBehindTheOthers) {
     OpenThree();
     const Bytes before = Contents();
@@ -1361,6 +1439,7 @@ TEST_F(EasEntriesTest, UpdateEntryOfTheLastGathersOnly) {
     EXPECT_TRUE(before == StateOf(*h()));
 }
 
+// Promise: "MAVOEASUpdateEntry: Makes record"
 TEST_F(EasEntriesTest, UpdateEntryDropsARecord) {
     OpenThree();
     const Bytes before = Contents();
@@ -1380,6 +1459,9 @@ TEST_F(EasEntriesTest, UpdateEntryDropsARecord) {
     EXPECT_EQ(live - kBlocksOfThree, TakeAllocations().live);
 }
 
+// Promise: "MAVOEASUpdateEntry: bufSize"
+// Promise: "MAVOEASUpdateEntry: -1: 0xD00"
+// Promise: "MAVOEASUpdateEntry: 0x100"
 TEST_F(EasEntriesTest, UpdateEntryRefusesBadArgumentsAndSmallBuffers) {
     OpenThree();
     const HandleState before = StateOf(*h());
@@ -1404,6 +1486,7 @@ TEST_F(EasEntriesTest, UpdateEntryRefusesBadArgumentsAndSmallBuffers) {
     EXPECT_EQ(Repeat(0, 100), buffer);
 }
 
+// Promise: "MAVOEASUpdateEntry: 0xA00"
 TEST_F(EasEntriesTest, UpdateEntryThatCannotReadChangesNothing) {
     OpenThree();
     const HandleState before = StateOf(*h());

@@ -174,6 +174,7 @@ TEST_F(EasForkTest, AReadThatComesBackShortLosesNothing) {
     EXPECT_THAT(TakeLog(), IsEmpty());
 }
 
+// Promise: "MAVOEASWrite: the log has its cause"
 TEST_F(EasForkTest, AFailedReadIsLoggedAndItsCauseReturned) {
     struct Case {
         int error, result;
@@ -203,6 +204,7 @@ TEST_F(EasForkTest, AFailedReadIsLoggedAndItsCauseReturned) {
     }
 }
 
+// Promise: "MAVOEASWrite: the log has its cause"
 TEST_F(EasForkTest, AFailedWriteIsLoggedAndItsCauseReturned) {
     struct Case {
         int error, result;
@@ -333,6 +335,7 @@ TEST_F(EasForkTest, AnOverwriteOfEqualSizeDoesNotTouchTheFork) {
     EXPECT_EQ(image_.Build(), Contents());
 }
 
+// Promise: "MAVOEASWrite: A failure to move"
 TEST_F(EasForkTest, AWriteWhoseForkCannotMoveRecordsNothingAndLeavesTheHeader) {
     for (const std::string call : {"ftruncate", "pread", "pwrite"}) {
         SCOPED_TRACE(call);
@@ -426,6 +429,7 @@ TEST_F(EasForkTest, AForkThatDoesNotLieWhereTheLayoutPutsItIsNotMoved) {
     }
 }
 
+// Promise: "EA streams: attributes: A stream whose offsets"
 TEST_F(EasForkTest, AForkInsideTheDataAreaIsNotMoved) {
     const StreamImage image{.attributes = {{"a", Ascii("xyz")}}, .fork = Pattern(200)};
     for (const std::uint32_t fork_at : {83u, 120u, 135u, 138u}) {

@@ -52,6 +52,8 @@ TEST_F(EasFormatTest, ANewStreamHasItsWholeHeaderInMemory) {
               StateOf(*handle).header);
 }
 
+// Promise: "mavoea.h: On disk every multi-byte field is big-endian"
+// Promise: "EA streams: handle: A stream is"
 TEST_F(EasFormatTest, OneThreeByteValueUnderAOneLetterNameIsThese139Bytes) {
     const Handle handle = Open();
     ASSERT_NE(nullptr, handle);
@@ -141,6 +143,7 @@ TEST_F(EasFormatTest, EveryNameLengthIsReadBack) {
     EXPECT_EQ(image.Build(), Contents());
 }
 
+// Promise: "mavoea.h: no character set is assumed"
 TEST_F(EasFormatTest, NamesAreBytesOfNoCharacterSet) {
     const std::vector<std::string> names = {"\xFF\xFE\x80", "a/b", "\xC3\xA4", "a\x01\n", "A", "a"};
     const Handle handle = Open();
@@ -201,6 +204,7 @@ TEST_F(EasFormatTest, PaddingOfRecordsIsSkippedWhateverItHoldsAndWrittenAsZeros)
 
 // ---- What is kept and what is not looked at -----------------------------------------------------
 
+// Promise: "flags: carried through unchanged"
 TEST_F(EasFormatTest, FieldsThatMeanNothingHereAreKept) {
     StreamImage image{.attributes = {{"a", Ascii("1"), 0xABCD}, {"b", Ascii("22"), 0x8001}},
                       .fork = Pattern(50),
@@ -243,6 +247,7 @@ TEST_F(EasFormatTest, TheTotalSizeFieldIsNotBelievedButRewritten) {
 
 // ---- Descriptors --------------------------------------------------------------------------------
 
+// Promise: "MAVOEASOpen: Returns a handle"
 TEST_F(EasFormatTest, FourteenDescriptorsAreRefusedAndThirteenAreRead) {
     Fill(PlainAppleDouble(Pattern(32), Pattern(20), 14));
     EXPECT_EQ(nullptr, Open());
@@ -609,6 +614,8 @@ TEST_F(EasEmptyValueTest, LeadsTheTable) {
 
 // ---- Limits -------------------------------------------------------------------------------------
 
+// Promise: "EA streams: attributes: Names are compared"
+// Promise: "EA streams: attributes: What would pass"
 TEST_F(EasFormatTest, ANameHas254BytesAtMost) {
     StreamImage image{.attributes = {{"a", Ascii("1")}}, .fork = Pattern(20)};
     Fill(image);
@@ -638,6 +645,8 @@ class EasManyAttributesTest : public EasFormatTest {
     }
 };
 
+// Promise: "EA streams: attributes: a stream holds"
+// Promise: "EA streams: attributes: What would pass"
 TEST_F(EasManyAttributesTest, AStreamHolds65535AndTheNextIsRefused) {
     StreamImage image;
     image.fork = Pattern(100);
@@ -685,6 +694,7 @@ class EasFourGigabytesTest : public EasFormatTest {
     Bytes head_;
 };
 
+// Promise: "EA streams: attributes: a stream holds"
 TEST_F(EasFourGigabytesTest, AreReachedButNotPassed) {
     FillUpTo(kLimit);
     const Handle handle = Open();
@@ -708,6 +718,7 @@ TEST_F(EasFourGigabytesTest, AreReachedButNotPassed) {
     EXPECT_EQ(before, StateOf(*handle));
 }
 
+// Promise: "EA streams: attributes: What would pass"
 TEST_F(EasFourGigabytesTest, AreNotPassedByOffsetsAndSizesThatWrapIn32Bits) {
     image_.fork = Pattern(10);
     Fill(image_);

@@ -40,6 +40,8 @@ class EasHandleTest : public StreamTest {
 
 // ---- Open and close -----------------------------------------------------------------------------
 
+// Promise: "MAVOEASOpen: Reads the stream"
+// Promise: "MAVOEASClose: Frees h"
 TEST_F(EasHandleTest, OpeningAnEmptyFileToWriteAndClosingItLeavesItEmpty) {
     EASHandle* const handle = MAVOEASOpen(fd_, F_WRLCK);
     ASSERT_NE(nullptr, handle);
@@ -51,6 +53,10 @@ TEST_F(EasHandleTest, OpeningAnEmptyFileToWriteAndClosingItLeavesItEmpty) {
     EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
+// Promise: "offset: of the value's first byte"
+// Promise: "length: of the value"
+// Promise: "nameLength"
+// Promise: "header: the file's first 120 bytes"
 TEST_F(EasHandleTest, AnOpenHandleHoldsHeaderAndTableAsTheyAreOnDisk) {
     const StreamImage image = Image();
     const Bytes bytes = image.Build();
@@ -67,6 +73,7 @@ TEST_F(EasHandleTest, AnOpenHandleHoldsHeaderAndTableAsTheyAreOnDisk) {
     EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
+// Promise: "MAVOEASOpen: Returns a handle"
 TEST_F(EasHandleTest, ANegativeDescriptorIsRefused) {
     TakeCallNames();
     EXPECT_EQ(nullptr, MAVOEASOpen(-1, F_RDLCK));
@@ -101,6 +108,11 @@ TEST_F(EasHandleTest, Descriptor0IsAsGoodAsAnyOther) {
     EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
+// Promise: "mavoea.h: Ownership."
+// Promise: "mavoea.h: The library closes only descriptors that it opened"
+// Promise: "fd: owned by the caller"
+// Promise: "MAVOEASOpen: it stays the caller's"
+// Promise: "MAVOEASClose: the descriptor stays open"
 TEST_F(EasHandleTest, ClosingLeavesTheDescriptorOpen) {
     Fill(Image());
     ASSERT_EQ(0, MAVOEASClose(MAVOEASOpen(fd_, F_WRLCK)));
@@ -110,11 +122,13 @@ TEST_F(EasHandleTest, ClosingLeavesTheDescriptorOpen) {
     EXPECT_NE(nullptr, again);
 }
 
+// Promise: "MAVOEASClose: -1 when"
 TEST_F(EasHandleTest, ClosingNothingIsRefused) {
     EXPECT_EQ(-1, MAVOEASClose(nullptr));
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_close")));
 }
 
+// Promise: "MAVOEASClose: -1 when"
 TEST_F(EasHandleTest, ACloseThatCannotReleaseTheLockFreesTheHandleAllTheSame) {
     Fill(Image());
     const int live = TakeAllocations().live;
@@ -130,6 +144,7 @@ TEST_F(EasHandleTest, ACloseThatCannotReleaseTheLockFreesTheHandleAllTheSame) {
     EXPECT_EQ(live, TakeAllocations().live);
 }
 
+// Promise: "MAVOEASOpen: Reads the stream"
 TEST_F(EasHandleTest, AHandleWithoutALockSearchesAndEnumeratesOnly) {
     Fill(Image());
     const Handle handle = Open(F_UNLCK);
@@ -160,6 +175,7 @@ TEST_F(EasHandleTest, AHandleWithoutALockReleasesNoneWhenItIsClosed) {
     EXPECT_THAT(TakeCallNames(), Not(Contains("setlock")));
 }
 
+// Promise: "MAVOEASOpen: 0xA00"
 TEST_F(EasHandleTest, AShortFileIsRefusedAtEveryLengthWithoutALockLeft) {
     const StreamImage image = Image();
     const Bytes bytes = image.Build();
@@ -240,6 +256,9 @@ int CodeOfOpenFailure(const std::string& call) {
     return 0xA00;
 }
 
+// Promise: "mavoea.h: elsewhere a failure leaves the `errno`"
+// Promise: "MAVOEASOpen: 0x200"
+// Promise: "mavoea.h: Results."
 TEST_F(EasHandleTest, EveryFailingCallOfAnOpenIsRecordedOnceAndLeavesNothingBehind) {
     StreamImage long_table;
     for (int i = 0; i < 600; ++i) long_table.attributes.push_back({"name" + std::to_string(i), {}});
@@ -355,6 +374,8 @@ TEST_F(EasHandleTest, ValuesThatCannotBeReadAreNoReasonToRefuseAStream) {
     EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
 }
 
+// Promise: "MAVOEASOpen: fd must be open"
+// Promise: "MAVOEASOpen: 0xA00"
 TEST_F(EasHandleTest, ADescriptorThatCannotBeReadIsAReadFailure) {
     Fill(Image());
     const int fd = ::open(path_.c_str(), O_WRONLY);
@@ -365,6 +386,7 @@ TEST_F(EasHandleTest, ADescriptorThatCannotBeReadIsAReadFailure) {
     ::close(fd);
 }
 
+// Promise: "MAVOEASOpen: fd must be open"
 TEST_F(EasHandleTest, AWriteLockNeedsADescriptorToWriteTo) {
     Fill(Image());
     const int fd = ::open(path_.c_str(), O_RDONLY);
@@ -376,6 +398,7 @@ TEST_F(EasHandleTest, AWriteLockNeedsADescriptorToWriteTo) {
 
 // ---- Locks --------------------------------------------------------------------------------------
 
+// Promise: "MAVOEASOpen: Reads the stream"
 TEST_F(EasHandleTest, ReadersShareAStreamBetweenProcesses) {
     Fill(Image());
     OtherProcess first(path_, F_RDLCK);
@@ -387,6 +410,8 @@ TEST_F(EasHandleTest, ReadersShareAStreamBetweenProcesses) {
     EXPECT_EQ(Ascii("two"), Read(handle, "b"));
 }
 
+// Promise: "MAVOEASOpen: Reads the stream"
+// Promise: "MAVOEASOpen: 0x400"
 TEST_F(EasHandleTest, AWriterInAnotherProcessKeepsReadersAndWritersOutAtOnce) {
     Fill(Image());
     OtherProcess writer(path_, F_WRLCK);
@@ -419,6 +444,7 @@ TEST_F(EasHandleTest, AReaderInAnotherProcessKeepsWritersOutAtOnce) {
     EXPECT_NE(nullptr, Open(F_WRLCK));
 }
 
+// Promise: "MAVOEASClose: Frees h"
 TEST_F(EasHandleTest, ThisProcessKeepsOthersOutUntilItCloses) {
     Fill(Image());
     Handle handle = Open(F_WRLCK);
@@ -444,6 +470,7 @@ TEST_F(EasHandleTest, TheLockIsDroppedWhenAStreamIsRefused) {
     EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
 }
 
+// Promise: "MAVOEASOpen: Reads the stream"
 TEST_F(EasHandleTest, TheLockCoversTheFileHoweverItGrows) {
     const Handle handle = Open(F_WRLCK);
     ASSERT_NE(nullptr, handle);
@@ -464,6 +491,8 @@ TEST_F(EasHandleTest, TheLockCoversTheFileHoweverItGrows) {
     EXPECT_EQ(0, status);
 }
 
+// Promise: "lockType"
+// Promise: "MAVOEASLockSet: Changes"
 TEST_F(EasHandleTest, TheLockIsChangedAndTheHandleKnows) {
     Fill(Image());
     const Handle handle = Open(F_UNLCK);
@@ -483,6 +512,7 @@ TEST_F(EasHandleTest, TheLockIsChangedAndTheHandleKnows) {
     EXPECT_THAT(TakeCodes(), ElementsAre(0x300));
 }
 
+// Promise: "MAVOEASLockSet: 0x400"
 TEST_F(EasHandleTest, ALockThatIsNotGrantedLeavesTheOldOne) {
     Fill(Image());
     const Handle handle = Open(F_RDLCK);
@@ -496,6 +526,36 @@ TEST_F(EasHandleTest, ALockThatIsNotGrantedLeavesTheOldOne) {
     EXPECT_EQ(F_RDLCK, LockInTheWay(path_, F_WRLCK));
 }
 
+// Promise: "MAVOEASLockSet: The file is not read again"
+TEST_F(EasHandleTest, AWriteUnderALateLockLosesWhatAnotherHasWrittenBefore) {
+    StreamImage image = Image();
+    Fill(image.Build());
+    const Handle late = Open(F_UNLCK);
+    ASSERT_NE(nullptr, late);
+    {
+        const Handle other = Open();
+        ASSERT_NE(nullptr, other);
+        EXPECT_EQ(6, Write(other, "theirs", "theirs"));
+    }
+    EXPECT_EQ(0, MAVOEASLockSet(late.get(), F_WRLCK));
+    EXPECT_THAT(Names(late), ElementsAre("a", "b", "c"));
+    EXPECT_EQ(4, Write(late, "mine", "mine"));
+    EXPECT_THAT(Names(Open()), ElementsAre("a", "b", "c", "mine"));
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
+// Promise: "MAVOEASOpen: Beware"
+TEST_F(EasHandleTest, ClosingAnotherDescriptorOfTheFileDropsTheLock) {
+    const Handle handle = Open(F_WRLCK);
+    ASSERT_NE(nullptr, handle);
+    EXPECT_EQ(F_WRLCK, LockInTheWay(path_, F_WRLCK));
+    ::close(::open(path_.c_str(), O_RDONLY));
+    EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
+    EXPECT_EQ(F_WRLCK, handle->lockType);
+}
+
+// Promise: "MAVOEASLockGet: 0xD00"
+// Promise: "MAVOEASLockSet: 0xD00"
 TEST_F(EasHandleTest, LocksWithoutAHandleOrDescriptorAreRefused) {
     EXPECT_EQ(-1, MAVOEASLockSet(nullptr, F_RDLCK));
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "eas_lock_set")));
@@ -524,6 +584,7 @@ TEST_F(EasHandleTest, AnUnknownLockTypeIsALockFailure) {
     EXPECT_EQ(F_RDLCK, handle->lockType);
 }
 
+// Promise: "MAVOEASLockGet: Asks"
 TEST_F(EasHandleTest, TheKernelIsAskedAboutALock) {
     Fill(Image());
     const Handle handle = Open(F_UNLCK);
@@ -546,6 +607,7 @@ TEST_F(EasHandleTest, TheKernelIsAskedAboutALock) {
     EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
+// Promise: "MAVOEASLockGet: 0xD00"
 TEST_F(EasHandleTest, AQuestionThatTheKernelRefusesIsASystemCallFailure) {
     const Handle handle = Open(F_RDLCK);
     ASSERT_NE(nullptr, handle);
@@ -559,6 +621,8 @@ TEST_F(EasHandleTest, AQuestionThatTheKernelRefusesIsASystemCallFailure) {
 
 // ---- Flush --------------------------------------------------------------------------------------
 
+// Promise: "MAVOEASFlush: fsync(2)"
+// Promise: "MAVOEASFlush: 0xD00"
 TEST_F(EasHandleTest, FlushingSyncsTheDescriptor) {
     const Handle handle = Open(F_RDLCK);
     ASSERT_NE(nullptr, handle);

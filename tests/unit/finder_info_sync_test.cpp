@@ -209,6 +209,7 @@ class FinderInfoTest : public ::testing::Test, protected Identity {
 
 // ---- A fresh record ----------------------------------------------------------------------------
 
+// Promise: "Netatalk record: The AFP service's"
 TEST_F(FinderInfoTest, AFreshRecordIsThese402Bytes) {
     const Bytes finder_info = Pattern(32, 0x40);
     ASSERT_EQ(402u, FreshRecord(finder_info).size());
@@ -218,11 +219,13 @@ TEST_F(FinderInfoTest, AFreshRecordIsThese402Bytes) {
                 ElementsAre("setxattr(" + object_ + ", user.netatalk.Metadata, 402, 0)"));
 }
 
+// Promise: "Finder info and flush time: All zeros"
 TEST_F(FinderInfoTest, AFreshRecordWithoutFinderInfoIsThese402Bytes) {
     EXPECT_EQ(0, EAFileEAFSFinfoFlush(object_.c_str(), kNone.data()));
     EXPECT_EQ(FreshRecord(kNone), Record());
 }
 
+// Promise: "Finder info and flush time: All zeros"
 TEST_F(FinderInfoTest, FinderInfoIsStoredThatDiffersFromNoneInOneByteOnly) {
     for (std::size_t i = 0; i < 32; ++i) {
         Bytes finder_info = kNone;
@@ -289,6 +292,8 @@ TEST_F(FinderInfoTest, AFreshRecordThatCannotBeStoredFailsWithTheCodeOfTheFlush)
 
 // ---- From the resource file to the attribute ---------------------------------------------------
 
+// Promise: "Finder info and flush time: Whoever changes"
+// Promise: "MAVOEAFileEAFSFinfoEASync: Finder info from"
 TEST_F(FinderInfoTest, WithoutAResourceFileTheRecordIsFreshWithoutFinderInfoAndTheTimeIsStamped) {
     EXPECT_EQ(0, EASync());
     EXPECT_EQ(FreshRecord(kNone), Record());
@@ -296,6 +301,7 @@ TEST_F(FinderInfoTest, WithoutAResourceFileTheRecordIsFreshWithoutFinderInfoAndT
     EXPECT_FALSE(Exists(ea_dir_));
 }
 
+// Promise: "MAVOEAFileEAFSFinfoEASync: Finder info from"
 TEST_F(FinderInfoTest, FinderInfoOfEveryLayoutOfResourceFileGoesIntoTheRecord) {
     const Bytes finder_info = Pattern(32, 0x90);
     for (const Layout& layout : Layouts(finder_info)) {
@@ -316,6 +322,7 @@ TEST_F(FinderInfoTest, AnEmptyResourceFileHasNoFinderInfoAndStaysEmpty) {
     EXPECT_EQ(Bytes(), ReadFile(resource_));
 }
 
+// Promise: "MAVOEAFileEAFSFinfoEASync: The attribute's record"
 TEST_F(FinderInfoTest, WhateverElseTheRecordHeldIsReset) {
     SetRecord(AttributeRecord());
     FillResourceFile(FreshResourceFile(Pattern(32, 3)));
@@ -330,6 +337,7 @@ TEST_F(FinderInfoTest, TheFormerRecordIsNeitherReadNorMissed) {
     EXPECT_THAT(TakeCallNames(), ::testing::Not(::testing::Contains("getxattr")));
 }
 
+// Promise: "MAVOEAFileEAFSFinfoEASync: Finder info from"
 TEST_F(FinderInfoTest, TheRecordIsStoredBeforeTheTime) {
     EXPECT_EQ(0, EASync());
     std::vector<std::string> calls = TakeCalls();
@@ -349,6 +357,7 @@ TEST_F(FinderInfoTest, TheResourceFileIsReadUnderAReadLock) {
     EXPECT_FALSE(locks.empty());
 }
 
+// Promise: "MAVOEAFileEAFSFinfoEASync: what opening"
 TEST_F(FinderInfoTest, AResourceFileThatCannotBeOpenedStopsTheSync) {
     FillResourceFile(FreshResourceFile(Pattern(32)));
     for (const int error : {EACCES, EMFILE, EIO, ENOTDIR, ELOOP}) {
@@ -416,6 +425,7 @@ TEST_F(FinderInfoTest, AResourceFileWithTooManyDescriptorsStopsTheSync) {
     ExpectNoAttributes();
 }
 
+// Promise: "MAVOEAFileEAFSFinfoEASync: what opening"
 TEST_F(FinderInfoTest, ARecordThatCannotBeStoredFailsTheSyncAndTheTimeIsStampedAllTheSame) {
     for (const auto& [error, code] : {std::pair{EPERM, 0x300}, {EDQUOT, 0xB00}, {ENOTSUP, 0xB00}}) {
         SCOPED_TRACE(strerror(error));
@@ -428,6 +438,7 @@ TEST_F(FinderInfoTest, ARecordThatCannotBeStoredFailsTheSyncAndTheTimeIsStampedA
     }
 }
 
+// Promise: "MAVOEAFileEAFSFinfoEASync: what opening"
 TEST_F(FinderInfoTest, ATimeThatCannotBeStampedFailsTheSync) {
     const FailCall fault("setxattr", EPERM, 2);
     EXPECT_EQ(-1, EASync());
@@ -455,6 +466,7 @@ TEST_F(FinderInfoTest, APathThatCannotBeDerivedStopsTheSync) {
     EXPECT_THAT(TakeCallNames(), ::testing::Not(::testing::Contains("setxattr")));
 }
 
+// Promise: "MAVOEAFileEAFSFinfoEASync: 0, or -1: 0xD00"
 TEST_F(FinderInfoTest, NullIsABadArgumentToTheSyncOfTheAttribute) {
     EXPECT_EQ(-1, MAVOEAFileEAFSFinfoEASync(nullptr, 0));
     ExpectOnly(0xD00, kEaSync);
@@ -467,6 +479,7 @@ TEST_F(FinderInfoTest, NullIsABadArgumentToTheSyncOfTheAttribute) {
     EXPECT_THAT(TakeCallNames(), IsEmpty());
 }
 
+// Promise: "Finder info and flush time: With checkFSType 1"
 TEST_F(FinderInfoTest, WithTheCheckOnlyVolumesOfType2AreSynced) {
     FillResourceFile(FreshResourceFile(Pattern(32)));
     for (int type = -1; type <= 13; ++type) {
@@ -486,6 +499,7 @@ TEST_F(FinderInfoTest, WithTheCheckOnlyVolumesOfType2AreSynced) {
     }
 }
 
+// Promise: "Finder info and flush time: with any other value"
 TEST_F(FinderInfoTest, WithoutTheCheckNobodyIsAskedForTheType) {
     Platform().fs_type = [](const std::string&, int) { return 0; };
     for (const int check : {0, 2, -1, 256}) {
@@ -629,6 +643,7 @@ TEST_F(FinderInfoTest, WithoutARecordNoResourceFileIsMade) {
     EXPECT_EQ(FreshResourceFile(Pattern(32)), ReadFile(resource_));
 }
 
+// Promise: "Finder info and flush time: File-EA volumes"
 TEST_F(FinderInfoTest, FinderInfoOfTheRecordGoesIntoANewResourceFile) {
     SetRecord(AttributeRecord());
     EXPECT_EQ(0, FileSync());
@@ -699,6 +714,7 @@ TEST_F(FinderInfoTest, AFailedWriteFailsTheSyncOfTheResourceFile) {
     ExpectOnly(0xB00, kWrite);
 }
 
+// Promise: "Finder info and flush time: File-EA volumes"
 TEST_F(FinderInfoTest, FinderInfoComesBackFromEitherPlace) {
     const Bytes finder_info = Hex("'TEXTttxt' 40 00  FF*22");
     ASSERT_EQ(0, EAFileEAFSFinfoFlush(object_.c_str(), finder_info.data()));
@@ -713,6 +729,7 @@ TEST_F(FinderInfoTest, FinderInfoComesBackFromEitherPlace) {
 
 // ---- Writing into the resource file ------------------------------------------------------------
 
+// Promise: "MAVOEAEADirFSFInfoWrite: one that is missing"
 TEST_F(FinderInfoTest, AMissingResourceFileIsMadeOf82Bytes) {
     const Bytes finder_info = Pattern(32, 0xC0);
     ASSERT_EQ(82u, FreshResourceFile(finder_info).size());
@@ -740,6 +757,7 @@ TEST_F(FinderInfoTest, AResourceFileNeedsNoObject) {
     EXPECT_EQ(FreshResourceFile(Pattern(32)), ReadFile(ea_dir_ + "/missing@MavoResource"));
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: Writes"
 TEST_F(FinderInfoTest, OfAnExistingFileOnlyTheFinderInfoChanges) {
     for (const Layout& layout : Layouts(Pattern(32, 0xB0))) {
         SCOPED_TRACE(layout.name);
@@ -760,6 +778,7 @@ TEST_F(FinderInfoTest, OnlyThe32BytesOfFinderInfoAreWritten) {
     EXPECT_THAT(calls, ElementsAre("pwrite(32, 50)"));
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: Writes"
 TEST_F(FinderInfoTest, TheResourceFileIsWrittenUnderTheWriteLock) {
     for (const bool existed : {false, true}) {
         SCOPED_TRACE(existed);
@@ -772,6 +791,7 @@ TEST_F(FinderInfoTest, TheResourceFileIsWrittenUnderTheWriteLock) {
     }
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: 0, or -1: 0xD00"
 TEST_F(FinderInfoTest, NullIsABadArgumentToTheWriteOfFinderInfo) {
     EXPECT_EQ(-1, MAVOEAEADirFSFInfoWrite(nullptr, kNone.data()));
     ExpectOnly(0xD00, kWrite);
@@ -781,6 +801,7 @@ TEST_F(FinderInfoTest, NullIsABadArgumentToTheWriteOfFinderInfo) {
     EXPECT_FALSE(Exists(ea_dir_));
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: 0, or -1: 0xD00"
 TEST_F(FinderInfoTest, AFileWithoutAFinderInfoEntryIsRefusedAndStaysAsItIs) {
     Bytes fork_only = OneEntry(2, 741, 100) + Pattern(100);
     Bytes no_entry = Hex("00 05 16 07  00 02 00 00  00*16  00 00") + Repeat(0, 200);
@@ -805,6 +826,7 @@ TEST_F(FinderInfoTest, FinderInfoIsNotWrittenOverTheHeader) {
     }
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: When nothing"
 TEST_F(FinderInfoTest, AFailedWriteLeavesNoEmptyResourceFileBehind) {
     for (const int error : {ENOSPC, EIO, EDQUOT}) {
         const FailCall fault("pwrite", error);
@@ -823,6 +845,7 @@ TEST_F(FinderInfoTest, AFailedWriteNeverRemovesAFileWithContent) {
     EXPECT_EQ(file, ReadFile(resource_));
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: 0xB00"
 TEST_F(FinderInfoTest, AShortWriteIsAFailedOne) {
     const Bytes file = FreshResourceFile(Pattern(32));
     FillResourceFile(file);
@@ -875,6 +898,7 @@ TEST_F(FinderInfoTest, AFailedCallLeavesAnEmptyResourceFileThatWasThereBefore) {
     EXPECT_EQ(Bytes(), ReadFile(resource_));
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: When nothing"
 TEST_F(FinderInfoTest, AFileThatAnotherProcessHasMadeMeanwhileIsNotRemoved) {
     bool made = false;
     Hooks().fails = [&](const std::string& call) {
@@ -890,6 +914,7 @@ TEST_F(FinderInfoTest, AFileThatAnotherProcessHasMadeMeanwhileIsNotRemoved) {
     EXPECT_EQ(Bytes(), ReadFile(resource_));
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: When nothing"
 TEST_F(FinderInfoTest, AFileThatAnotherProcessHasLockedIsNotRemovedEvenByWhoMadeIt) {
     std::unique_ptr<OtherProcess> other;
     bool started = false;  // In the other process, too.
@@ -904,6 +929,7 @@ TEST_F(FinderInfoTest, AFileThatAnotherProcessHasLockedIsNotRemovedEvenByWhoMade
     EXPECT_EQ(0, other->code());
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: One that is removed"
 TEST_F(FinderInfoTest, AFileThatIsRemovedBeforeItIsLockedIsMadeAnew) {
     int locks = 0;
     Hooks().before = [&](const std::string& name) {
@@ -913,6 +939,7 @@ TEST_F(FinderInfoTest, AFileThatIsRemovedBeforeItIsLockedIsMadeAnew) {
     EXPECT_EQ(FreshResourceFile(Pattern(32)), ReadFile(resource_));
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: One that is removed"
 TEST_F(FinderInfoTest, AFileThatIsReplacedBeforeItIsLockedIsLeftForTheOneInItsPlace) {
     const Bytes theirs = StreamImage{.attributes = {{"user.a", Pattern(9)}}}.Build();
     for (const bool existed : {false, true}) {
@@ -931,6 +958,7 @@ TEST_F(FinderInfoTest, AFileThatIsReplacedBeforeItIsLockedIsLeftForTheOneInItsPl
     }
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: 0x400"
 TEST_F(FinderInfoTest, AFileThatIsRemovedTimeAndAgainIsGivenUp) {
     int locks = 0;
     Hooks().before = [&](const std::string& name) {
@@ -940,6 +968,7 @@ TEST_F(FinderInfoTest, AFileThatIsRemovedTimeAndAgainIsGivenUp) {
         }
     };
     EXPECT_EQ(-1, Write(Pattern(32)));
+    EXPECT_EQ(EAGAIN, errno);
     ExpectOnly(0x400, kWrite);
     EXPECT_LT(1, locks);
     EXPECT_GT(100, locks);
@@ -970,6 +999,7 @@ TEST_F(FinderInfoTest, AFileIsRemovedUnderItsLock) {
     EXPECT_EQ(F_WRLCK, locked);
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: what MAVOEAOpen()"
 TEST_F(FinderInfoTest, ADamagedResourceFileIsNeitherWrittenNorRemoved) {
     const Bytes whole = FreshResourceFile(Pattern(32));
     for (std::size_t size = 1; size < whole.size(); ++size) {
@@ -987,6 +1017,7 @@ TEST_F(FinderInfoTest, ADamagedResourceFileIsNeitherWrittenNorRemoved) {
     EXPECT_EQ(file, ReadFile(resource_));
 }
 
+// Promise: "MAVOEAEADirFSFInfoWrite: what MAVOEAOpen()"
 TEST_F(FinderInfoTest, AResourceFileThatCannotBeOpenedOrMadeIsNotWritten) {
     FillResourceFile(FreshResourceFile(kNone));
     {
@@ -1063,6 +1094,7 @@ class WriteFinderInfoTest : public StreamTest {
     }
 };
 
+// Promise: "EASWriteFinderInfo: Writes"
 TEST_F(WriteFinderInfoTest, TheHandlesFinderInfoIsWrittenWhereTheFilesIs) {
     for (const Layout& layout : Layouts(Pattern(32, 0xB0))) {
         SCOPED_TRACE(layout.name);
@@ -1075,6 +1107,7 @@ TEST_F(WriteFinderInfoTest, TheHandlesFinderInfoIsWrittenWhereTheFilesIs) {
     }
 }
 
+// Promise: "EASWriteFinderInfo: 0, or -1: 0xD00"
 TEST_F(WriteFinderInfoTest, NullAndAHandleWithoutADescriptorAreBadArguments) {
     EXPECT_EQ(-1, EASWriteFinderInfo(nullptr));
     ExpectOnly(0xD00);
@@ -1087,6 +1120,7 @@ TEST_F(WriteFinderInfoTest, NullAndAHandleWithoutADescriptorAreBadArguments) {
     }
 }
 
+// Promise: "EASWriteFinderInfo: 0x300"
 TEST_F(WriteFinderInfoTest, AHandleWithoutAWriteLockMayNotWrite) {
     const Bytes file = FreshResourceFile(Pattern(32));
     Fill(file);
@@ -1100,6 +1134,7 @@ TEST_F(WriteFinderInfoTest, AHandleWithoutAWriteLockMayNotWrite) {
     EXPECT_EQ(file, Contents());
 }
 
+// Promise: "EASWriteFinderInfo: 0, or -1: 0xD00"
 TEST_F(WriteFinderInfoTest, AnOffsetThatCannotBeSoughtIsLogged) {
     const Bytes file = FreshResourceFile(Pattern(32));
     Fill(file);
@@ -1115,6 +1150,7 @@ TEST_F(WriteFinderInfoTest, AnOffsetThatCannotBeSoughtIsLogged) {
     EXPECT_EQ(file, Contents());
 }
 
+// Promise: "EASWriteFinderInfo: 0xB00"
 TEST_F(WriteFinderInfoTest, FewerThan32BytesWrittenAreAFailure) {
     Fill(FreshResourceFile(Pattern(32)));
     const Handle handle = Open();
@@ -1130,6 +1166,7 @@ TEST_F(WriteFinderInfoTest, FewerThan32BytesWrittenAreAFailure) {
     }
 }
 
+// Promise: "EASWriteFinderInfo: 0, or -1: 0xD00"
 TEST_F(WriteFinderInfoTest, AHandleWhoseFileHasNoFinderInfoEntryIsRefused) {
     const Bytes file = OneEntry(2, 741, 100) + Pattern(100);
     Fill(file);
@@ -1158,6 +1195,8 @@ TEST_F(WriteFinderInfoTest, OffsetsAreUnsigned) {
 
 // ---- Flush time --------------------------------------------------------------------------------
 
+// Promise: "mavoea.h: On disk every multi-byte field is big-endian"
+// Promise: "Finder info and flush time: Whoever changes"
 TEST_F(FinderInfoTest, TheFlushTimeIsTheSecondsIn4BytesTheHighestFirst) {
     struct Case {
         std::int64_t time;
@@ -1182,6 +1221,7 @@ TEST_F(FinderInfoTest, TheFlushTimeIsTheSecondsIn4BytesTheHighestFirst) {
     }
 }
 
+// Promise: "MAVOEAFileEAWriteFlushTime: Stamps"
 TEST_F(FinderInfoTest, TheFlushTimeIsThePresent) {
     Hooks().time = nullptr;
     const auto before = static_cast<std::uint32_t>(time(nullptr));
@@ -1202,6 +1242,7 @@ TEST_F(FinderInfoTest, TheFlushTimeReplacesTheOneBeforeAndTouchesNothingElse) {
     EXPECT_FALSE(Exists(ea_dir_));
 }
 
+// Promise: "MAVOEAFileEAWriteFlushTime: 0x2A00"
 TEST_F(FinderInfoTest, AFlushTimeThatCannotBeSetIsAFailure) {
     for (const int error : {EPERM, ENOSPC, ENOTSUP}) {
         const FailCall fault("setxattr", error);
@@ -1214,6 +1255,7 @@ TEST_F(FinderInfoTest, AFlushTimeThatCannotBeSetIsAFailure) {
     ExpectNoAttributes();
 }
 
+// Promise: "MAVOEAFileEAWriteFlushTime: 0, or -1: 0xD00"
 TEST_F(FinderInfoTest, NullIsABadArgumentToTheFlushTimeBeforeTheTypeIsAsked) {
     for (const int check : {0, 1, 2}) {
         EXPECT_EQ(-1, MAVOEAFileEAWriteFlushTime(nullptr, check));
@@ -1223,6 +1265,7 @@ TEST_F(FinderInfoTest, NullIsABadArgumentToTheFlushTimeBeforeTheTypeIsAsked) {
     EXPECT_THAT(TakeCallNames(), IsEmpty());
 }
 
+// Promise: "Finder info and flush time: With checkFSType 1"
 TEST_F(FinderInfoTest, WithTheCheckTheFlushTimeIsForVolumesOfType2Only) {
     for (int type = -1; type <= 13; ++type) {
         SCOPED_TRACE(type);

@@ -11,6 +11,7 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <thread>
 #include <vector>
 
 #include "include/mavoea.h"
@@ -61,6 +62,10 @@ class SmbArchiveTest : public NamesTest {};
 
 // ---- The classes --------------------------------------------------------------------------------
 
+// Promise: "Names and marks: The tests return"
+// Promise: "MAVOEAIsHiddenDir: 1 for"
+// Promise: "MAVOEAIsVetoFile"
+// Promise: "MAVOEAIsHiddenFile"
 TEST_F(NamesTest, EveryNameIsInItsClassAndTheWiderOnes) {
     enum Class { kNone, kHiddenFile, kVetoFile, kHiddenDir };
     const struct {
@@ -147,6 +152,9 @@ TEST_F(NamesTest, HiddenDirectoriesAreFoundBehindAnAbsolutePathByTheFileTestsToo
     }
 }
 
+// Promise: "Names and marks: The tests return"
+// Promise: "MAVOEAIsHiddenDir: -1 on NULL"
+// Promise: "MAVOEAIsHiddenDirName: -1 on NULL"
 TEST_F(NamesTest, NoNameIsInNoClass) {
     EXPECT_EQ(0, MAVOEAIsVetoFile(nullptr));
     EXPECT_EQ(0, MAVOEAIsHiddenFile(nullptr));
@@ -155,6 +163,25 @@ TEST_F(NamesTest, NoNameIsInNoClass) {
     EXPECT_EQ(-1, MAVOEAIsHiddenDirName(nullptr));
 }
 
+// Promise: "mavoea.h: Threads."
+TEST_F(NamesTest, SeveralThreadsTestAtOnce) {
+    std::vector<int> wrong(4, 0);
+    std::vector<std::thread> threads;
+    for (int& count : wrong) {
+        threads.emplace_back([&] {
+            for (int i = 0; i < 2000; ++i) {
+                const int right = MAVOEAIsHiddenDir("@eaDir") + MAVOEAIsHiddenDirName("@tmp") +
+                                  MAVOEAIsVetoFile("..") + MAVOEAIsHiddenFile("._x") +
+                                  MAVOEAIsHiddenName("a:b");
+                if (right != 5) ++count;
+            }
+        });
+    }
+    for (std::thread& thread : threads) thread.join();
+    EXPECT_THAT(wrong, ElementsAre(0, 0, 0, 0));
+}
+
+// Promise: "MAVOEAIsHiddenName"
 TEST_F(NamesTest, HiddenNameIsOneWithAColonAnywhere) {
     for (const char* const name : {":", "MAVO:Resource", ":x", "x:", "::", "/v/a:b", "/v:/a"}) {
         SCOPED_TRACE(name);
@@ -184,6 +211,7 @@ TEST_F(NamesTest, BareNamesAllocateNothing) {
 
 // ---- Hidden directories -------------------------------------------------------------------------
 
+// Promise: "MAVOEAIsHiddenDir: a path that begins"
 TEST_F(HiddenDirTest, AbsolutePathIsReducedToItsLastComponent) {
     for (const char* const path :
          {"/volume/share/@sharebin/", "/volume/share/@sharebin", "/@tmp", "/@tmp/", "/@tmp///",
@@ -220,6 +248,7 @@ TEST_F(HiddenDirTest, PathOfTheCallerIsNotModified) {
     EXPECT_EQ(before, path);
 }
 
+// Promise: "MAVOEAIsHiddenDirName: MAVOEAIsHiddenDir()"
 TEST_F(HiddenDirTest, NameTestDecidesByTheFirstByte) {
     EXPECT_EQ(0, MAVOEAIsHiddenDirName("/v/@eaDir"));
     EXPECT_EQ(0, MAVOEAIsHiddenDirName("/@tmp"));
@@ -233,6 +262,7 @@ TEST_F(HiddenDirTest, NameTestDecidesByTheFirstByte) {
     EXPECT_EQ(0U, TakeAllocations().total);
 }
 
+// Promise: "MAVOEAIsHiddenDir: -1 on NULL"
 TEST_F(HiddenDirTest, CopyThatCannotBeMadeIsRecorded) {
     const FailCall fault("malloc", ENOMEM, 0);
     for (const char* const path : {"/v/@eaDir", "/v/a", "/"}) {
@@ -243,6 +273,7 @@ TEST_F(HiddenDirTest, CopyThatCannotBeMadeIsRecorded) {
     EXPECT_TRUE(fault.fired());
 }
 
+// Promise: "MAVOEAIsHiddenDir: -1 on NULL"
 TEST_F(HiddenDirTest, BaseNameThatCannotBeTakenIsRecordedAndTheCopyFreed) {
     base_name_fails = true;
     const int live = TakeAllocations().live;
@@ -269,6 +300,7 @@ TEST_F(HiddenDirTest, FailureIsNoHiddenDirectoryToTheFileTests) {
 
 // ---- The list of hidden directories -------------------------------------------------------------
 
+// Promise: "MAVOEAHiddenDirGet: Appends"
 TEST_F(HiddenDirGetTest, AppendsTheThreeNamesInOrder) {
     MLIBCSzList* list = NewList();
     EXPECT_EQ(0, MAVOEAHiddenDirGet(&list));
@@ -276,6 +308,7 @@ TEST_F(HiddenDirGetTest, AppendsTheThreeNamesInOrder) {
     MLIBCSzListFree(list);
 }
 
+// Promise: "MAVOEAHiddenDirGet: Appends"
 TEST_F(HiddenDirGetTest, NamesInTheListStay) {
     MLIBCSzList* list = NewList({"before"});
     EXPECT_EQ(0, MAVOEAHiddenDirGet(&list));
@@ -285,6 +318,7 @@ TEST_F(HiddenDirGetTest, NamesInTheListStay) {
     MLIBCSzListFree(list);
 }
 
+// Promise: "MAVOEAHiddenDirGet: 0, or -1"
 TEST_F(HiddenDirGetTest, MissingListIsRefused) {
     EXPECT_EQ(-1, MAVOEAHiddenDirGet(nullptr));
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0xD00, "ea_is_hidden_dir")));
@@ -294,6 +328,7 @@ TEST_F(HiddenDirGetTest, MissingListIsRefused) {
     EXPECT_EQ(nullptr, list);
 }
 
+// Promise: "MAVOEAHiddenDirGet: 0, or -1"
 TEST_F(HiddenDirGetTest, NamesAppendedBeforeAFailureStay) {
     const std::vector<std::string> names = {"before", "@eaDir", "@tmp", "@sharebin"};
     for (int pushes = 0; pushes < 3; ++pushes) {
@@ -320,6 +355,7 @@ TEST_F(HiddenDirGetTest, EveryNameOfTheListIsAHiddenDirectory) {
 
 // ---- The search index ---------------------------------------------------------------------------
 
+// Promise: "MAVOIndex: Tells"
 TEST_F(IndexTest, ChangesAreForwardedToTheSearchIndex) {
     EXPECT_EQ(0, MAVOIndex("/v/a", nullptr, 7));
     EXPECT_EQ(0, MAVOIndex("/v/new", "/v/old", 4));
@@ -329,6 +365,7 @@ TEST_F(IndexTest, ChangesAreForwardedToTheSearchIndex) {
                                                  "MLIBMavoIndexAddEx(NULL, NULL, -1, 0, 0)"));
 }
 
+// Promise: "MAVOIndex: returns"
 TEST_F(IndexTest, AnswerOfTheSearchIndexIsReturnedAsItIs) {
     for (const int answer : {0, 1, -1, 42, -2000000000}) {
         Platform().index = [=](const std::string&) { return answer; };
@@ -357,6 +394,7 @@ bool KeepsUserAttributes(const std::string& directory) {
     return setxattr(directory.c_str(), "user.test", "", 0, 0) == 0;
 }
 
+// Promise: "EASetSmbArchive: Sets"
 TEST_F(SmbArchiveTest, OpensReadOnlySetsTheBitAndCloses) {
     const TempDir temp;
     const std::string path = temp / "a";
@@ -395,6 +433,7 @@ TEST_F(SmbArchiveTest, ResultOfTheKernelIsReturnedAsItIs) {
     }
 }
 
+// Promise: "EASetSmbArchive: 0, or -1"
 TEST_F(SmbArchiveTest, FailureOfTheKernelLeavesItsErrnoAndNoRecord) {
     const TempDir temp;
     WriteFile(temp / "a", {});
@@ -406,6 +445,7 @@ TEST_F(SmbArchiveTest, FailureOfTheKernelLeavesItsErrnoAndNoRecord) {
     EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
+// Promise: "EASetSmbArchive: 0, or -1"
 TEST_F(SmbArchiveTest, FileThatCannotBeOpenedIsAFailureWithoutARecord) {
     const TempDir temp;
     errno = 0;
@@ -454,6 +494,7 @@ class SmbArchiveOnHostTest : public SmbArchiveTest {
     const std::string file_ = temp_ / "a";
 };
 
+// Promise: "EASetSmbArchive: Sets"
 TEST_F(SmbArchiveOnHostTest, BitIsKeptBigEndianInFourBytes) {
     ASSERT_THAT(AttributeOf(file_), IsEmpty());
     EXPECT_EQ(0, EASetSmbArchive(file_.c_str()));
