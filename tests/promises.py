@@ -27,6 +27,7 @@ SUBJECT = re.compile(r"(\w+)\(|struct (\w+) \{|#define (\w+) \S|(enum) \{")
 FIELD = re.compile(r"\s*(?:\w+\*? )*(\w+)(?:\[\w+\])?(?: = \w+)?[,;]?\s*$")
 SECTION = re.compile(r"---- (.*?) -*$")
 END = re.compile(r"(?<=[.;]) (?=[\"'`*(<A-Za-z0-9_-])|(?<=[^.][.;][)*]) ")
+TABLE_HEAD = re.compile(r"^\|.*\n\|[-|]+$\n", re.M)
 LABEL = re.compile(r"[A-Z][a-z]+\.")
 TAG = re.compile(r'^// Promise: "(.*)"$', re.M)
 TAGGED = re.compile(r"((?:^// Promise: .*\n)+)TEST\w*\(\s*(\w+),\s*(\w+)\)", re.M)
@@ -35,7 +36,7 @@ TAGGED = re.compile(r"((?:^// Promise: .*\n)+)TEST\w*\(\s*(\w+),\s*(\w+)\)", re.
 def sentences(text):
     """The sentences of a paragraph, a word in front of one included; none ends in parentheses."""
     begun = ""
-    for part in END.split(" ".join(text.split())):
+    for part in filter(None, END.split(" ".join(text.split()))):
         begun = f"{begun} {part}" if begun else part
         if LABEL.fullmatch(begun) or begun.count("(") > begun.count(")"):
             continue
@@ -65,13 +66,11 @@ def header_sentences(text):
 def document_sentences(text):
     """(title, sentence) of each paragraph, list item, row of a table and block of code."""
     title = ""
-    for block in re.split(r"\n\s*\n|\n(?=[|#-])", text):
+    for block in re.split(r"\n\s*\n|\n(?=[|#-])", TABLE_HEAD.sub("", text)):
         if block.startswith("#"):
             title, _, block = block.lstrip("# ").partition("\n")
         if block.startswith("|"):
-            cells = [" ".join(cell.split()) for cell in block.strip("|\n ").split("|")]
-            if not re.fullmatch(r"[-| ]*", block):
-                yield title, " | ".join(cells)
+            yield title, " | ".join(cell.strip() for cell in block.strip("|\n ").split("|"))
         elif block.startswith("    "):
             yield title, block.split("\n")[0].strip()
         else:
@@ -88,7 +87,8 @@ def quoted(words, sentences):
     """The sentences that begin with `words`; the one that consists of them before all others."""
     if words in sentences:
         return [words]
-    return [sentence for sentence in sentences if re.match(re.escape(words) + r"(?!\w)", sentence)]
+    end = len(words)
+    return [s for s in sentences if s.startswith(words) and not s[end : end + 1].isalnum()]
 
 
 def tests():
@@ -117,8 +117,8 @@ def excused():
 
 
 def main(files):
-    facts = [fact for file in files for fact in promises(Path(file))]
-    holders = {fact: [] for fact in facts}
+    holders = {fact: [] for file in files for fact in promises(Path(file))}
+    facts = list(holders)
     reasons = {}
     faults = []
     for test, words in tests():

@@ -94,6 +94,7 @@ TEST_F(FileMarksTest, HidingSetsTheHiddenBitAndShowingClearsIt) {
     EXPECT_EQ(0u, Word());
 }
 
+// Promise: "Attribute word: A host whose"
 TEST_F(FileMarksTest, BothBitsLiveSideBySide) {
     EXPECT_EQ(0, Command(kHide));
     EXPECT_EQ(0, Command(kLock));
@@ -168,6 +169,7 @@ TEST_F(FileMarksTest, TheContentAndTheModeStay) {
     EXPECT_EQ(Ascii("content"), ReadFile(path_));
 }
 
+// Promise: "Attribute word: A host whose"
 TEST_F(FileMarksTest, TheArchiveBitIsKeptInTheSameWord) {
     EXPECT_EQ(0, Command(kLock));
     const int fd = open(path_.c_str(), O_RDONLY);

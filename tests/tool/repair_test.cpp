@@ -119,6 +119,17 @@ TEST_P(RepairTest, AFileThatWouldLoseAnEntryIsNotChanged) {
     EXPECT_EQ("xyz", volume_.Get("a").out);
 }
 
+// Promise: "AppleDouble: A resource file, or a "._" file"
+// Promise: "AppleDouble: real name"
+// Promise: "AppleDouble: comment"
+// Promise: "AppleDouble: file dates"
+// Promise: "AppleDouble: Finder info"
+// Promise: "AppleDouble: AFP directory id"
+// Promise: "AppleDouble: AFP file info"
+// Promise: "AppleDouble: AFP short name"
+// Promise: "AppleDouble: ProDOS file info"
+// Promise: "AppleDouble: private device"
+// Promise: "AppleDouble: resource fork"
 TEST_P(RepairTest, ACommentIsKeptInAHeadOfThirteenEntries) {
     WriteFile(volume_.resource(), WithThirdEntry(4));
     const ToolResult result = Repair();
@@ -128,6 +139,13 @@ TEST_P(RepairTest, ACommentIsKeptInAHeadOfThirteenEntries) {
     const Bytes file = ReadFile(volume_.resource());
     EXPECT_EQ(kNetatalkHead + 4, file.size());
     EXPECT_EQ(13, U16At(file, 24));
+    std::map<std::uint32_t, std::uint32_t> places;
+    for (std::size_t at = 26; at < 182; at += 12) places[U32At(file, at)] = U32At(file, at + 4);
+    const std::map<std::uint32_t, std::uint32_t> classic = {
+        {3, 182},          {4, 437},          {8, 637},         {9, 653}, {15, 685},
+        {14, 689},         {13, 693},         {11, 705},        {2, 741}, {0x80444556, 713},
+        {0x80494E4F, 721}, {0x8053594E, 729}, {0x8053567E, 737}};
+    EXPECT_EQ(classic, places);
     EXPECT_EQ((MacContents{{}, Pattern(32), Ascii("fork")}), ReadMacFile(file));
     auto entries = EntriesOf(file);
     EXPECT_EQ(Ascii("comment"), entries[4]);

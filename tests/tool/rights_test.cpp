@@ -671,12 +671,16 @@ class LockedModeTest : public RightsTest {
 INSTANTIATE_TEST_SUITE_P(VolumeTypes, LockedModeTest, ::testing::ValuesIn(Types({0, 7})),
                          [](const auto& tested) { return "Type" + std::to_string(tested.param); });
 
+// Promise: "Attribute word: Where the permissions"
 TEST_P(LockedModeTest, UnlockingGivesBackWhatLockingTook) {
     for (const mode_t mode : {0600U, 0640U, 0644U, 0664U, 0755U, 0666U, 0620U, 0602U}) {
         SCOPED_TRACE(Octal(mode));
         GiveRights(volume_.object(), {mode, false});
         EXPECT_EQ(Octal(mode & ~0222U), ModeAfter("lock"));
         EXPECT_EQ(Octal(mode & ~0222U), ModeAfter("lock"));
+        char taken[8] = {};
+        EXPECT_EQ(4, getxattr(volume_.object().c_str(), "user.mavoea.writable", taken, 8));
+        EXPECT_EQ(Octal(mode & 0222U), taken);
         EXPECT_EQ(Octal(mode), ModeAfter("unlock"));
         EXPECT_EQ(Octal(mode), ModeAfter("unlock"));
     }

@@ -120,6 +120,7 @@ TEST_F(StorageTest, AnAttributeThatDoesNotParseIsRefused) {
 }
 
 // Promise: "MAVOEAFileEAAdoubleRead: 0xA00"
+// Promise: "Netatalk record: The attribute has all"
 TEST_F(StorageTest, AnAttributeHasItsEightEntries) {
     const Bytes whole = AttributeRecord();
     Bytes record = whole;
@@ -154,6 +155,7 @@ TEST_F(StorageTest, AFailedReadOfTheAttributeIsLogged) {
 
 // Promise: "Netatalk record: The AFP service's"
 // Promise: "MAVOEAFileEAAdoubleFlush: Stores"
+// Promise: "Netatalk record: An AppleDouble header"
 TEST_F(StorageTest, ARecordIsStoredAsTheAttributeAndReplacesTheOneBefore) {
     SetAttribute(Repeat(9, 1000));
     const Bytes record = AttributeRecord();
@@ -202,6 +204,8 @@ TEST_F(StorageTest, WhyTheAttributeCouldNotBeSetIsToldByTheCode) {
 // Promise: "Netatalk record: The AFP service's"
 // Promise: "MAVOEAFileEAAdoubleRead: The record"
 // Promise: "MAVOEAFileEAAdoubleRead: 0"
+// Promise: "Netatalk record: An AppleDouble header"
+// Promise: "Netatalk record: the head of a resource file"
 TEST_F(StorageTest, TheHeadOfAResourceFileIsRead) {
     const long before = OpenDescriptors();
     FillResourceFile(OneEntry(9, 100, 32) + Pattern(5000));
@@ -271,6 +275,7 @@ TEST_F(StorageTest, OnlyTheHeadOfAResourceFileIsReplaced) {
 }
 
 // Promise: "MAVOEAFileEAAdoubleFlush: The resource file"
+// Promise: "Where metadata lies: `D/@eaDir/N@MavoResource`"
 TEST_F(StorageTest, AMissingResourceFileIsCreated) {
     mkdir((dir_ / "@eaDir").c_str(), 0777);
     const Umask umask(022);

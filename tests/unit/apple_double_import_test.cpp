@@ -66,6 +66,7 @@ TEST(MacFiles, HoldWhatTheyAreSaidToHold) {
     }
 }
 
+// Promise: "EA stream: An AppleDouble file"
 TEST(MacFiles, LieAsMacsAndNetatalkWriteThem) {
     ASSERT_EQ(286u, BlankFork().size());
     const MacFile blank = MacSidecarWithBlankFork({{{"a", Ascii("value")}}, Pattern(32), {}});
@@ -1323,16 +1324,26 @@ TEST_F(FixErrorTest, ATemporaryPathThatDoesNotFitIsRefused) {
     TakeRecords();
 }
 
+// Promise: "How long names can be: of an object that `MAVOEAFixErrorAD` repairs"
 TEST_F(FixErrorTest, ANameThatLeavesNoRoomForTheTemporaryOnesIsAFailure) {
-    const std::string name(242, 'n');
-    WriteFile(dir_ / name, {});
-    const std::string resource = ea_dir_ + "/" + name + "@MavoResource";
-    WriteFile(resource, Three().bytes);
-    EXPECT_EQ(-1, MAVOEAFixErrorAD((dir_ / name).c_str()));
-    EXPECT_THAT(TakeLog(), ElementsAre("ea_copy.c:LINE(EACopyAdoubleV2) failed to open " +
-                                       resource + "Tmp, reason=File name too long."));
-    EXPECT_EQ(Three().bytes, ReadFile(resource));
-    EXPECT_EQ(1u, NamesIn(ea_dir_).size());
+    for (const std::size_t length : {239u, 240u, 242u}) {
+        SCOPED_TRACE(length);
+        const std::string name(length, 'n');
+        WriteFile(dir_ / name, {});
+        const std::string resource = ea_dir_ + "/" + name + "@MavoResource";
+        WriteFile(resource, Three().bytes);
+        if (length == 239) {
+            EXPECT_EQ(0, MAVOEAFixErrorAD((dir_ / name).c_str()));
+            EXPECT_EQ(Rewritten(Three()), ReadFile(resource));
+            continue;
+        }
+        const std::vector<std::string> before = NamesIn(ea_dir_);
+        EXPECT_EQ(-1, MAVOEAFixErrorAD((dir_ / name).c_str()));
+        EXPECT_THAT(TakeLog(), ElementsAre("ea_copy.c:LINE(EACopyAdoubleV2) failed to open " +
+                                           resource + "Tmp, reason=File name too long."));
+        EXPECT_EQ(Three().bytes, ReadFile(resource));
+        EXPECT_EQ(before, NamesIn(ea_dir_));
+    }
 }
 
 TEST_F(FixErrorTest, NamedPipesDoNotKeepTheCallerWaiting) {

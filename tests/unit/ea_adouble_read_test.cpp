@@ -45,6 +45,15 @@ class AdoubleReadTest : public ::testing::Test {
 // Promise: "data: the block as on disk"
 // Promise: "MAVOEAAdoubleRead: Parses"
 // Promise: "entries: ids 1 to 15"
+// Promise: "Netatalk record: netatalk has four"
+// Promise: "Netatalk record: comment |"
+// Promise: "Netatalk record: file dates |"
+// Promise: "Netatalk record: Finder info |"
+// Promise: "Netatalk record: AFP file info |"
+// Promise: "Netatalk record: private device |"
+// Promise: "Netatalk record: private inode |"
+// Promise: "Netatalk record: private sync |"
+// Promise: "Netatalk record: private id |"
 TEST_F(AdoubleReadTest, EveryEntryOfAnAttributeRecordIsInItsSlot) {
     const Bytes block = AttributeRecord();
     ASSERT_EQ(402u, block.size());
@@ -124,6 +133,7 @@ TEST_F(AdoubleReadTest, ARecordWithoutEntriesSetsNoSlot) {
 }
 
 // Promise: "entries: ids 1 to 15"
+// Promise: "Netatalk record: Ids up to 15"
 TEST_F(AdoubleReadTest, StandardIdsAreTheirOwnSlots) {
     for (std::uint32_t id = 1; id <= 15; ++id) {
         SCOPED_TRACE(id);
@@ -133,6 +143,7 @@ TEST_F(AdoubleReadTest, StandardIdsAreTheirOwnSlots) {
     }
 }
 
+// Promise: "Netatalk record: netatalk has four"
 TEST_F(AdoubleReadTest, OtherIdsAreRejected) {
     for (const std::uint32_t id : {0u, 16u, 19u, 20u, 0x80000000u, 0x80444557u, 0xFFFFFFFFu}) {
         ExpectRejected(OneEntry(id, 100, 5), "eid: 0, off: 100, len: 5");
@@ -141,6 +152,7 @@ TEST_F(AdoubleReadTest, OtherIdsAreRejected) {
 }
 
 // Promise: "MAVOEAAdoubleRead: Entries lie"
+// Promise: "Netatalk record: Entries lie within"
 TEST_F(AdoubleReadTest, EntriesEndWithinTheData) {
     EXPECT_EQ(0, Read(OneEntry(9, 1023, 1)));
     EXPECT_EQ(0, Read(OneEntry(9, 800, 224)));  // behind the block, inside the data
@@ -153,6 +165,7 @@ TEST_F(AdoubleReadTest, EntriesEndWithinTheData) {
 }
 
 // Promise: "MAVOEAAdoubleRead: Entries lie"
+// Promise: "Netatalk record: only the resource fork"
 TEST_F(AdoubleReadTest, OnlyTheResourceForkMayRunPastTheData) {
     EXPECT_EQ(0, Read(OneEntry(2, 741, 1000000)));
     EXPECT_EQ(741, ad_.entries[2].offset);

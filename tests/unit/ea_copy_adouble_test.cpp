@@ -113,6 +113,12 @@ class CopyAdoubleTest : public ::testing::Test {
 
 // ---- Layouts ------------------------------------------------------------------------------------
 
+// Promise: "AppleDouble: 0 |"
+// Promise: "AppleDouble: 4 |"
+// Promise: "AppleDouble: 8 |"
+// Promise: "AppleDouble: 24 |"
+// Promise: "AppleDouble: 26 |"
+// Promise: "AppleDouble: A **resource file** that the library"
 TEST_F(CopyAdoubleTest, ARewrittenFileHasFinderInfoAt50AndForkAt82) {
     EXPECT_EQ(0, Rewrite(Hex("00 05 16 07  00 02 00 00 'Mac OS X        ' 00 02"
                              "00 00 00 09  00 00 00 32  00 00 00 4E"
@@ -144,11 +150,13 @@ TEST_F(CopyAdoubleTest, EveryLayoutOfMacsAndNetatalkIsRewrittenWhole) {
     }
 }
 
+// Promise: "AppleDouble: Of the ids"
 TEST_F(CopyAdoubleTest, WhatIsAtOtherPlacesIsFoundByItsDescriptors) {
     EXPECT_EQ(0, Rewrite(Spread(Pattern(32, 1), Pattern(5000, 2))));
     EXPECT_EQ(Rewritten(ReadFile(src_), Pattern(32, 1), Pattern(5000, 2)), ReadFile(dst_));
 }
 
+// Promise: "AppleDouble: A rewrite keeps"
 TEST_F(CopyAdoubleTest, AForkListedFirstStaysFirst) {
     const StreamImage image = {
         .attributes = {{"a", Ascii("value")}},
@@ -164,6 +172,7 @@ TEST_F(CopyAdoubleTest, AForkListedFirstStaysFirst) {
               ReadFile(dst_));
 }
 
+// Promise: "AppleDouble: A rewrite keeps"
 TEST_F(CopyAdoubleTest, MagicAndFillerAreKeptAsTheyAre) {
     Bytes file = Spread(Pattern(32), Ascii("fork"));
     PutU32(file, 0, 0x01020304);
@@ -209,6 +218,7 @@ TEST_F(CopyAdoubleTest, AForkIsCopiedInStepsOf16384Bytes) {
 
 // ---- A fork that is left blank ------------------------------------------------------------------
 
+// Promise: "AppleDouble: A fork that only says"
 TEST_F(CopyAdoubleTest, ABlankForkBecomesNone) {
     EXPECT_EQ(0, Rewrite(MacSidecarWithBlankFork({{}, Pattern(32), {}}).bytes));
     EXPECT_EQ(Hex("00 05 16 07  00 02 00 00 'Mac OS X        ' 00 02"
@@ -218,6 +228,7 @@ TEST_F(CopyAdoubleTest, ABlankForkBecomesNone) {
               ReadFile(dst_));
 }
 
+// Promise: "AppleDouble: A fork that only says"
 TEST_F(CopyAdoubleTest, TheTextOfABlankForkCountsFrom63BytesOn) {
     const Bytes text = Ascii("This resource fork intentionally left blank   ");
     const Bytes shortest = Pattern(16) + text + Hex("00");
@@ -236,6 +247,7 @@ TEST_F(CopyAdoubleTest, TheTextOfABlankForkCountsFrom63BytesOn) {
     EXPECT_EQ(Rewritten(ReadFile(src_), Pattern(32), too_short), ReadFile(dst_));
 }
 
+// Promise: "AppleDouble: A fork that only says"
 TEST_F(CopyAdoubleTest, AForkThatDiffersFromTheBlankTextIsAFork) {
     for (const std::size_t at : {16u, 40u, 58u, 59u, 61u}) {
         SCOPED_TRACE(at);

@@ -613,6 +613,7 @@ class ToDoubleTest : public AppleDoubleTest {
     }
 };
 
+// Promise: "Where metadata lies: `D/._N`"
 TEST_F(ToDoubleTest, ResourceFileAndStreamBecomeOneDouble) {
     const Umask mask(077);
     for (const int move : {0, 1, 2}) {

@@ -266,6 +266,7 @@ class RecordLockTest : public CopyLockTest {
     int Get() const { return EAAdoubleLockGet(source_.path.c_str(), GivenRecord); }
 };
 
+// Promise: "AppleDouble: Of the ids"
 TEST_F(RecordLockTest, AnyOfThreeAfpAttributesLocks) {
     given.entries[14] = {.offset = 370, .length = 4};
     for (int bit = 0; bit < 16; ++bit) {
@@ -297,6 +298,7 @@ TEST_F(RecordLockTest, WithoutARecordNothingIsLockedAndAFailureStaysOne) {
     EXPECT_EQ(-1, Get());
 }
 
+// Promise: "Netatalk record: Finder info or AFP"
 TEST_F(RecordLockTest, AFileInfoEntryThatIsAbsentOrLiesDoesNotLock) {
     memset(given.data, 0xFF, sizeof given.data);
     given.data[24] = 0;

@@ -87,6 +87,7 @@ class EaMkdirTest : public ::testing::Test, protected Identity {
 // ---- What it makes --------------------------------------------------------------------------
 
 // Promise: "MAVOEAMKDir: Creates the EA directory"
+// Promise: "Where metadata lies: `D/@eaDir` has mode 0777"
 TEST_F(EaMkdirTest, MakesADirectoryForEveryone) {
     EXPECT_EQ(0, MAVOEAMKDir(0, ea_dir_.c_str()));
     struct stat info;

@@ -154,6 +154,7 @@ INSTANTIATE_TEST_SUITE_P(With, EaOpenInEaDirTest, ::testing::Bool(), [](const au
 // Promise: "MAVOEAOpen: Opens the metadata file"
 // Promise: "MAVOEAOpen: With O_CREAT the EA directory"
 // Promise: "MAVOEAOpenNoADFS: MAVOEAOpen()"
+// Promise: "Where metadata lies: `D/@eaDir/N@MavoEAStream`"
 TEST_P(EaOpenInEaDirTest, CreatingMakesTheEaDirectoryAndAnEmptyFile) {
     TakeCalls();
     const Fd fd(OpenStream(O_RDWR | O_CREAT));

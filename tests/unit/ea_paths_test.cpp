@@ -350,6 +350,7 @@ TEST_F(EaDirPathTest, LongNamesAreNeverShortened) {
 
 // Promise: "EA_FORM_FILE"
 // Promise: "MAVOEAPathNoADFS: The metadata file"
+// Promise: "Where metadata lies: `D/@eaDir/N@MavoEAStream`"
 TEST_F(EaPathTest, FileFormGivesNameAtKind) {
     EXPECT_THAT(PathNoADFS(1, "/v/share/a.txt", "MavoEAStream"),
                 Gives("/v/share/@eaDir/a.txt@MavoEAStream"));
@@ -575,6 +576,8 @@ TEST_F(EaPathTest, TheSlashOfAPathOf4095BytesCountsForItsMemory) {
 
 // ---- Names that are shortened -------------------------------------------------------------------
 
+// Promise: "Where metadata lies: In the file names"
+// Promise: "How long names can be: of an object as part"
 TEST_F(EaShortenedNameTest, NameOf242BytesIsUsedUnchanged) {
     EXPECT_EQ(As(242), StoredName(As(242)));
     EXPECT_EQ(As(238) + ".txt", StoredName(As(238) + ".txt"));
@@ -582,6 +585,8 @@ TEST_F(EaShortenedNameTest, NameOf242BytesIsUsedUnchanged) {
 }
 
 // Promise: "Paths: In EA_FORM_FILE a name of more than 242"
+// Promise: "Where metadata lies: In the file names"
+// Promise: "How long names can be: of an object as part"
 TEST_F(EaShortenedNameTest, NameOf243BytesEndsInItsCheckCharacter) {
     // 'a' + 'a' is 194, index 14: 'e'.
     EXPECT_EQ(As(241) + "e", StoredName(As(243)));
@@ -589,6 +594,7 @@ TEST_F(EaShortenedNameTest, NameOf243BytesEndsInItsCheckCharacter) {
     EXPECT_EQ(As(237) + "*.txt", StoredName(As(239) + ".txt"));
 }
 
+// Promise: "Where metadata lies: In the file names"
 TEST_F(EaShortenedNameTest, SumRunsFromThe242ndByteToTheEndOfTheExtension) {
     // "bc.txt" is 98 + 99 + 46 + 116 + 120 + 116 = 595, index 55: '&'.
     EXPECT_EQ(As(237) + "&.txt", StoredName(As(241) + "bc.txt"));
@@ -604,6 +610,7 @@ TEST_F(EaShortenedNameTest, DotMoreThanSixBytesFromTheEndMakesNoExtension) {
     EXPECT_EQ("." + As(240) + "e", StoredName("." + As(242)));
 }
 
+// Promise: "Where metadata lies: In the file names"
 TEST_F(EaShortenedNameTest, ExtensionsOfOneToSixBytesAreKept) {
     for (std::size_t length = 1; length <= 6; ++length) {
         SCOPED_TRACE(length);
@@ -617,6 +624,7 @@ TEST_F(EaShortenedNameTest, ExtensionsOfOneToSixBytesAreKept) {
     }
 }
 
+// Promise: "Where metadata lies: In the file names"
 TEST_F(EaShortenedNameTest, ExtensionOfSevenBytesIsNotKept) {
     for (const std::size_t stem : {std::size_t{236}, std::size_t{243}, std::size_t{900}}) {
         const std::string name = As(stem) + ".uvwxyz";
@@ -708,6 +716,7 @@ TEST_F(EaShortenedNameTest, SumOfALongNameDoesNotWrapAt16Bits) {
 }
 
 // Promise: "Paths: In EA_FORM_FILE a name of more than 242"
+// Promise: "How long names can be: of a file"
 TEST_F(EaShortenedNameTest, StoredFileNameFitsInTheLimitOfAFilesystem) {
     for (const std::size_t length : {242U, 243U, 244U, 248U, 255U, 256U, 1000U, 4000U}) {
         SCOPED_TRACE(length);
@@ -740,6 +749,7 @@ TEST_F(EaShortenedNameTest, OnlyTheFileFormShortens) {
 // ---- The AppleDouble file -----------------------------------------------------------------------
 
 // Promise: "MAVOEAADPath: The AppleDouble file"
+// Promise: "Where metadata lies: `D/._N`"
 TEST_F(EaAdPathTest, StandsBesideTheObject) {
     EXPECT_THAT(ADPath("/a.txt"), Gives("/._a.txt"));
     EXPECT_THAT(ADPath("/v/share/a.txt"), Gives("/v/share/._a.txt"));
@@ -779,6 +789,7 @@ TEST_F(EaAdPathTest, MissingArgumentsAreRefusedAndErrnoIsLeftAlone) {
 // Promise: "MAVOEAADPath: a name of more than 253"
 // Promise: "MAVOEAADPath: errno is left alone"
 // Promise: "Paths: All return 0 or -1"
+// Promise: "How long names can be: of an object with"
 TEST_F(EaAdPathTest, NameOf253BytesIsTheLongest) {
     EXPECT_THAT(ADPath("/v/" + As(253)), Gives("/v/._" + As(253)));
     EXPECT_THAT(ADPath(As(253)), Gives("._" + As(253)));

@@ -363,6 +363,7 @@ TEST_F(EaUpgradeTest, AnObjectWithoutLegacyMetadataGives2AndNothingIsMadeOrRemov
 // Promise: "MAVOEAUpgrade: MAVOEA_KIND_STREAM"
 // Promise: "MAVOEAUpgrade: A legacy folder that is empty"
 // Promise: "MAVOEAUpgrade: 0 converted"
+// Promise: "Where metadata lies: `D/@eaDir/N/`"
 TEST_F(EaUpgradeTest, AttributeFilesMoveIntoANewStreamAndTheFolderGoes) {
     MakeFolder(two_);
     EXPECT_EQ(0, UpgradeStream());
@@ -1706,6 +1707,7 @@ class EaUpgradeResourceTest : public EaUpgradeTest {
 };
 
 // Promise: "MAVOEAUpgrade: MAVOEA_KIND_RESOURCE"
+// Promise: "Where metadata lies: `D/@eaDir/N/`"
 TEST_F(EaUpgradeResourceTest, TheFileMovesAsItIsAndTheFolderGoes) {
     const Bytes bytes = ResourceFile(0, 0);
     MakeLegacy(bytes);
@@ -1818,6 +1820,7 @@ TEST_F(EaUpgradeResourceTest, ObjectPathsMayBeRelativeAndEndInASlash) {
 }
 
 // Promise: "MAVOEAUpgrade: the object gets its marks"
+// Promise: "AppleDouble: Of the ids"
 TEST_F(EaUpgradeResourceTest, EveryCombinationOfMarksIsCarriedOntoTheObject) {
     using Bits = std::optional<std::uint32_t>;
     for (const Bits afp :

@@ -343,6 +343,7 @@ TEST_F(EasDamageTest, ADeclaredDataLengthTakesNoMemoryThatTheFileDoesNotFill) {
 }
 
 // Promise: "EA streams: attributes: A stream whose offsets"
+// Promise: "EA stream: what does not fit"
 TEST_F(EasDamageTest, ValuesThatDoNotFollowEachOtherAreNotRewritten) {
     const StreamImage image{.attributes = {{"a", Ascii("xyz")}, {"b", Ascii("12")}}};
     struct Case {
@@ -378,6 +379,7 @@ TEST_F(EasDamageTest, ValuesThatDoNotFollowEachOtherAreNotRewritten) {
 }
 
 // Promise: "EA streams: attributes: A stream whose offsets"
+// Promise: "EA stream: what does not fit"
 TEST_F(EasDamageTest, ADataAreaBeforeTheEndOfTheTableIsNotRewritten) {
     StreamImage image{.attributes = {{"a", Ascii("xyz")}, {"b", Ascii("12")}}};
     Bytes bytes = image.Build();

@@ -410,6 +410,7 @@ TEST_F(EasEntriesTest, WritingInsideAtTheEndAndBeyondAValue) {
 }
 
 // Promise: "MAVOEASWrite: The attribute becomes"
+// Promise: "EA stream: The values follow"
 TEST_F(EasEntriesTest, ARewrittenAttributeBecomesTheLast) {
     handle_ = Open();
     ASSERT_EQ(3, Write(handle_, "A", "aaa"));
@@ -885,6 +886,8 @@ TEST_F(EasEntriesTest, RemoveRefusesWhatIsNotThere) {
 
 // The size of a dropped record is counted in eight bits: with names of 242 bytes or more, their NUL
 // included, 256 bytes too few are taken out.
+// Promise: "How long names can be: of an attribute that is removed"
+// Promise: "EA stream: **A gap between"
 TEST_F(EasEntriesTest, RemovingALongNameLeavesAGapOf256Bytes) {
     for (const std::size_t letters : {240u, 241u, 250u, 254u}) {
         SCOPED_TRACE(letters);

@@ -302,6 +302,7 @@ TEST_F(EasForkTest, ShiftThatFailsRecordsNothing) {
 
 // ---- Beneath attributes -------------------------------------------------------------------------
 
+// Promise: "EA stream: Four regions"
 TEST_F(EasForkTest, AWriteMovesTheForkThenWritesThenSyncs) {
     OpenWith({.attributes = {{"a", Ascii("xyz")}}, .fork = Pattern(40000)});
     ASSERT_EQ(9, Write(handle_, "b", "123456789"));
@@ -369,6 +370,7 @@ TEST_F(EasForkTest, ACrashAfterTheMoveLeavesTheOldHeaderBeforeAForkInItsNewPlace
     EXPECT_EQ(Pattern(5000), Contents(5000, 142));
 }
 
+// Promise: "EA stream: A fork that is longer"
 TEST_F(EasForkTest, AForkThatPassesTheEndOfTheFileMovesTheBytesThatAreThere) {
     for (const std::size_t there : {0u, 1u, 300u, 20000u}) {
         for (const std::uint32_t declared : {20001u, 0x7FFFFFFFu}) {
@@ -397,6 +399,7 @@ TEST_F(EasForkTest, AForkThatPassesTheEndOfTheFileMovesTheBytesThatAreThere) {
     }
 }
 
+// Promise: "EA stream: A fork whose descriptor"
 TEST_F(EasForkTest, AForkThatDoesNotLieWhereTheLayoutPutsItIsNotMoved) {
     const StreamImage image{.attributes = {{"a", Ascii("xyz")}, {"b", Ascii("2")}},
                             .fork = Pattern(200)};

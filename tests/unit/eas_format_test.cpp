@@ -40,6 +40,13 @@ TEST_F(EasFormatTest, AnEmptyFileOpensWithoutAttributesAndStaysEmptyUntilItIsWri
     EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
+// Promise: "EA stream: 0 | 4 | magic"
+// Promise: "EA stream: 4 | 4 | version"
+// Promise: "EA stream: 8 | 16 | filler"
+// Promise: "EA stream: 24 |"
+// Promise: "EA stream: 50 |"
+// Promise: "EA stream: 82 |"
+// Promise: "EA stream: 84 |"
 TEST_F(EasFormatTest, ANewStreamHasItsWholeHeaderInMemory) {
     const Handle handle = Open(F_RDLCK);
     ASSERT_NE(nullptr, handle);
@@ -54,6 +61,22 @@ TEST_F(EasFormatTest, ANewStreamHasItsWholeHeaderInMemory) {
 
 // Promise: "mavoea.h: On disk every multi-byte field is big-endian"
 // Promise: "EA streams: handle: A stream is"
+// Promise: "What is on disk: All multi-byte fields are big-endian"
+// Promise: "EA stream: An AppleDouble file"
+// Promise: "EA stream: Four regions"
+// Promise: "EA stream: 92 |"
+// Promise: "EA stream: 96 |"
+// Promise: "EA stream: 100 |"
+// Promise: "EA stream: 118 |"
+// Promise: "EA stream: 120 |"
+// Promise: "EA stream: 0 | 4 | offset"
+// Promise: "EA stream: 4 | 4 | length"
+// Promise: "EA stream: 10 |"
+// Promise: "EA stream: The Finder info entry reaches"
+// Promise: "EA stream: A stream with the attribute"
+// Promise: "EA stream: 00 05 16 07"
+// Promise: "EA stream: 26 |"
+// Promise: "EA stream: 38 |"
 TEST_F(EasFormatTest, OneThreeByteValueUnderAOneLetterNameIsThese139Bytes) {
     const Handle handle = Open();
     ASSERT_NE(nullptr, handle);
@@ -107,6 +130,7 @@ TEST_F(EasFormatTest, AnEmptyValueAddsNoDataButItsRecordCountsInDataStart) {
 
 // ---- Records ------------------------------------------------------------------------------------
 
+// Promise: "EA stream: A record of the table"
 TEST_F(EasFormatTest, RecordsAreRoundedUpToFourBytes) {
     struct Case {
         std::size_t letters;
@@ -144,6 +168,7 @@ TEST_F(EasFormatTest, EveryNameLengthIsReadBack) {
 }
 
 // Promise: "mavoea.h: no character set is assumed"
+// Promise: "EA stream: 11 |"
 TEST_F(EasFormatTest, NamesAreBytesOfNoCharacterSet) {
     const std::vector<std::string> names = {"\xFF\xFE\x80", "a/b", "\xC3\xA4", "a\x01\n", "A", "a"};
     const Handle handle = Open();
@@ -188,6 +213,7 @@ TEST_F(EasFormatTest, ANameOfNoBytesAtAllTakesTwelve) {
     EXPECT_EQ(bytes, Contents());
 }
 
+// Promise: "EA stream: A record of the table"
 TEST_F(EasFormatTest, PaddingOfRecordsIsSkippedWhateverItHoldsAndWrittenAsZeros) {
     const StreamImage image{.attributes = {{"a", Ascii("1")}, {"b", Ascii("2")}}};
     Bytes bytes = image.Build();
@@ -205,6 +231,10 @@ TEST_F(EasFormatTest, PaddingOfRecordsIsSkippedWhateverItHoldsAndWrittenAsZeros)
 // ---- What is kept and what is not looked at -----------------------------------------------------
 
 // Promise: "flags: carried through unchanged"
+// Promise: "EA stream: 88 |"
+// Promise: "EA stream: 104 |"
+// Promise: "EA stream: 116 |"
+// Promise: "EA stream: 8 | 2 | flags"
 TEST_F(EasFormatTest, FieldsThatMeanNothingHereAreKept) {
     StreamImage image{.attributes = {{"a", Ascii("1"), 0xABCD}, {"b", Ascii("22"), 0x8001}},
                       .fork = Pattern(50),
@@ -248,6 +278,8 @@ TEST_F(EasFormatTest, TheTotalSizeFieldIsNotBelievedButRewritten) {
 // ---- Descriptors --------------------------------------------------------------------------------
 
 // Promise: "MAVOEASOpen: Returns a handle"
+// Promise: "EA stream: Limits"
+// Promise: "EA stream: **Damage**"
 TEST_F(EasFormatTest, FourteenDescriptorsAreRefusedAndThirteenAreRead) {
     Fill(PlainAppleDouble(Pattern(32), Pattern(20), 14));
     EXPECT_EQ(nullptr, Open());
@@ -353,6 +385,7 @@ TEST_F(EasFormatTest, WritingTheFinderInfoNeedsItsDescriptor) {
     EXPECT_EQ(before, StateOf(*handle));
 }
 
+// Promise: "EA stream: **More than two descriptors**"
 TEST_F(EasFormatTest, TheCountOfDescriptorsIsWrittenBackAsItWasRead) {
     const Bytes fork = Pattern(30);
     Fill(PlainAppleDouble(Pattern(32, 4), fork, 3));
@@ -374,6 +407,7 @@ TEST_F(EasFormatTest, TheCountOfDescriptorsIsWrittenBackAsItWasRead) {
     EXPECT_EQ(Ascii("xyz"), Read(handle, "a"));
 }
 
+// Promise: "EA stream: **More than two descriptors**"
 TEST_F(EasFormatTest, ThirteenDescriptorsStayReadableThroughEveryRewrite) {
     const Bytes fork = Pattern(60);
     Fill(PlainAppleDouble(Pattern(32, 4), fork, 13));
@@ -402,6 +436,7 @@ TEST_F(EasFormatTest, ThirteenDescriptorsStayReadableThroughEveryRewrite) {
     EXPECT_THAT(TakeRecords(), IsEmpty());
 }
 
+// Promise: "EA stream: **Finder info elsewhere"
 TEST_F(EasFormatTest, TheAttributeHeaderIsReadAt82WhereverTheFinderInfoLies) {
     StreamImage image{.attributes = {{"a", Ascii("1")}}, .finder_info = Repeat(0xAA, 32)};
     Bytes bytes = image.Build();
@@ -434,6 +469,7 @@ TEST_F(EasFormatTest, AFinderInfoFarBehindTheTableIsRead) {
 
 // ---- AppleDouble files of others ----------------------------------------------------------------
 
+// Promise: "EA stream: **A Finder info entry of 32 bytes**"
 TEST_F(EasFormatTest, APlainAppleDoubleFileOpensWithAnEmptyAttributeHeader) {
     const Bytes bytes = PlainAppleDouble(Pattern(32), Pattern(1000));
     Fill(bytes);
@@ -448,6 +484,8 @@ TEST_F(EasFormatTest, APlainAppleDoubleFileOpensWithAnEmptyAttributeHeader) {
     EXPECT_EQ(bytes, Contents());
 }
 
+// Promise: "EA stream: The first write turns"
+// Promise: "EA stream: its fork moves"
 TEST_F(EasFormatTest, TheFirstWriteMakesAPlainAppleDoubleFileAWholeStreamAndMovesItsForkFrom82) {
     const Bytes fork = Pattern(1000);
     Fill(PlainAppleDouble(Pattern(32, 6), fork));
@@ -477,6 +515,7 @@ TEST_F(EasFormatTest, APlainAppleDoubleFileOf82BytesIsEnough) {
 }
 
 // Mac OS X reserves 3,760 bytes for Finder info and attributes; the fork lies behind them.
+// Promise: "EA stream: **Mac OS X leaves"
 TEST_F(EasFormatTest, TheSlackThatMacsLeaveIsTakenOutByTheFirstWrite) {
     StreamImage image{.attributes = {{"com.apple.quarantine", Ascii("0001;")}, {"b", Pattern(500)}},
                       .fork = Pattern(286),
@@ -538,6 +577,7 @@ class EasEmptyValueTest : public EasFormatTest {
     Handle handle_;
 };
 
+// Promise: "EA stream: **A record of an empty value**"
 TEST_F(EasEmptyValueTest, ReadsAsEmpty) {
     ASSERT_NE(nullptr, handle_);
     EXPECT_EQ(Bytes{}, Read(handle_, "three"));
@@ -616,6 +656,7 @@ TEST_F(EasEmptyValueTest, LeadsTheTable) {
 
 // Promise: "EA streams: attributes: Names are compared"
 // Promise: "EA streams: attributes: What would pass"
+// Promise: "How long names can be: of an attribute in a stream"
 TEST_F(EasFormatTest, ANameHas254BytesAtMost) {
     StreamImage image{.attributes = {{"a", Ascii("1")}}, .fork = Pattern(20)};
     Fill(image);
@@ -647,6 +688,7 @@ class EasManyAttributesTest : public EasFormatTest {
 
 // Promise: "EA streams: attributes: a stream holds"
 // Promise: "EA streams: attributes: What would pass"
+// Promise: "EA stream: Limits"
 TEST_F(EasManyAttributesTest, AStreamHolds65535AndTheNextIsRefused) {
     StreamImage image;
     image.fork = Pattern(100);
@@ -695,6 +737,7 @@ class EasFourGigabytesTest : public EasFormatTest {
 };
 
 // Promise: "EA streams: attributes: a stream holds"
+// Promise: "EA stream: Limits"
 TEST_F(EasFourGigabytesTest, AreReachedButNotPassed) {
     FillUpTo(kLimit);
     const Handle handle = Open();

@@ -176,6 +176,7 @@ TEST_F(EasHandleTest, AHandleWithoutALockReleasesNoneWhenItIsClosed) {
 }
 
 // Promise: "MAVOEASOpen: 0xA00"
+// Promise: "EA stream: **Damage**"
 TEST_F(EasHandleTest, AShortFileIsRefusedAtEveryLengthWithoutALockLeft) {
     const StreamImage image = Image();
     const Bytes bytes = image.Build();
@@ -322,6 +323,7 @@ class UnreadableFrom {
     UnreadableFrom& operator=(const UnreadableFrom&) = delete;
 };
 
+// Promise: "EA stream: Any other stream opens"
 TEST_F(EasHandleTest, ValuesThatCannotBeReadAreNoReasonToRefuseAStream) {
     StreamImage large;
     for (int i = 0; i < 600; ++i) large.attributes.push_back({"name" + std::to_string(i), {}});

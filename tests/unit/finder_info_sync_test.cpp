@@ -210,6 +210,16 @@ class FinderInfoTest : public ::testing::Test, protected Identity {
 // ---- A fresh record ----------------------------------------------------------------------------
 
 // Promise: "Netatalk record: The AFP service's"
+// Promise: "Netatalk record: An AppleDouble header"
+// Promise: "Netatalk record: comment |"
+// Promise: "Netatalk record: file dates |"
+// Promise: "Netatalk record: Finder info |"
+// Promise: "Netatalk record: AFP file info |"
+// Promise: "Netatalk record: private device |"
+// Promise: "Netatalk record: private inode |"
+// Promise: "Netatalk record: private sync |"
+// Promise: "Netatalk record: private id |"
+// Promise: "Netatalk record: A fresh record"
 TEST_F(FinderInfoTest, AFreshRecordIsThese402Bytes) {
     const Bytes finder_info = Pattern(32, 0x40);
     ASSERT_EQ(402u, FreshRecord(finder_info).size());
@@ -663,6 +673,7 @@ TEST_F(FinderInfoTest, FinderInfoOfTheRecordReplacesTheOneOfEveryLayoutOfResourc
     }
 }
 
+// Promise: "Netatalk record: Finder info or AFP"
 TEST_F(FinderInfoTest, ARecordWithoutFinderInfoLeavesTheResourceFileAsItIs) {
     struct Case {
         std::uint32_t offset;
@@ -730,6 +741,8 @@ TEST_F(FinderInfoTest, FinderInfoComesBackFromEitherPlace) {
 // ---- Writing into the resource file ------------------------------------------------------------
 
 // Promise: "MAVOEAEADirFSFInfoWrite: one that is missing"
+// Promise: "Where metadata lies: `D/@eaDir/N@MavoResource`"
+// Promise: "AppleDouble: A **resource file** that the library"
 TEST_F(FinderInfoTest, AMissingResourceFileIsMadeOf82Bytes) {
     const Bytes finder_info = Pattern(32, 0xC0);
     ASSERT_EQ(82u, FreshResourceFile(finder_info).size());
@@ -1197,6 +1210,7 @@ TEST_F(WriteFinderInfoTest, OffsetsAreUnsigned) {
 
 // Promise: "mavoea.h: On disk every multi-byte field is big-endian"
 // Promise: "Finder info and flush time: Whoever changes"
+// Promise: "Netatalk record: The **flush time**"
 TEST_F(FinderInfoTest, TheFlushTimeIsTheSecondsIn4BytesTheHighestFirst) {
     struct Case {
         std::int64_t time;
@@ -1222,6 +1236,7 @@ TEST_F(FinderInfoTest, TheFlushTimeIsTheSecondsIn4BytesTheHighestFirst) {
 }
 
 // Promise: "MAVOEAFileEAWriteFlushTime: Stamps"
+// Promise: "Netatalk record: The **flush time**"
 TEST_F(FinderInfoTest, TheFlushTimeIsThePresent) {
     Hooks().time = nullptr;
     const auto before = static_cast<std::uint32_t>(time(nullptr));

@@ -495,6 +495,7 @@ class SmbArchiveOnHostTest : public SmbArchiveTest {
 };
 
 // Promise: "EASetSmbArchive: Sets"
+// Promise: "Attribute word: A host whose"
 TEST_F(SmbArchiveOnHostTest, BitIsKeptBigEndianInFourBytes) {
     ASSERT_THAT(AttributeOf(file_), IsEmpty());
     EXPECT_EQ(0, EASetSmbArchive(file_.c_str()));
