@@ -376,6 +376,15 @@ void CopyOver(const std::vector<Pair>& pairs) {
     for (const Pair& pair : pairs) KillEverywhere(CopyOf(pair));
 }
 
+// Promise: "What a crash costs: `tests/crash/crash_points_test.cpp` kills"
+// Promise: "Copying: What has arrived"
+// Promise: "Copying: Copying again"
+// Promise: "Copying: AppleDouble to AppleDouble"
+// Promise: "Copying: EA directory or file EA"
+// Promise: "Copying: AppleDouble or attributes"
+// Promise: "Copying: EA directory, file EA or attributes"
+// Promise: "Copying: anything"
+// Promise: "What may be left over: metadata at both ends of a copy"
 TEST(CrashPointsTest, ACopyLeavesItsSourceWholeAndIsCompletedByAnother) {
     CopyOver({
         {0, 0, false, {{"", "src all; dst none"}, {"/bin/cp", "src all; dst all"}}},
@@ -505,6 +514,18 @@ TEST(CrashPointsTest, ACopyLeavesItsSourceWholeAndIsCompletedByAnother) {
     });
 }
 
+// Promise: "Moving: A move removes"
+// Promise: "Moving: Every item"
+// Promise: "Moving: A crash in one"
+// Promise: "Moving: AppleDouble to any"
+// Promise: "Moving: attributes to EA"
+// Promise: "Moving: EA directory to attributes"
+// Promise: "Moving: EA directory to AppleDouble"
+// Promise: "Moving: EA directory to file EA"
+// Promise: "Moving: file EA to file EA"
+// Promise: "Moving: file EA to AppleDouble"
+// Promise: "Moving: *Other files*"
+// Promise: "Moving: A second move"
 TEST(CrashPointsTest, AMoveHasEveryItemAtOneEndAtLeast) {
     CopyOver({
         {0,
@@ -752,6 +773,9 @@ Operation RenameOf(const std::string& name, int type, bool to_dst, std::vector<S
     };
 }
 
+// Promise: "Renaming: Resource file, stream"
+// Promise: "Renaming: Renaming again"
+// Promise: "What may be left over: `<old>@MavoEAStream`"
 TEST(CrashPointsTest, ARenameHasEveryItemUnderOneOfTheNamesAndIsCompletedByAnother) {
     KillEverywhere(RenameOf("rename in a directory, type 1", 1, false,
                             {{"", "old all; new none"},
@@ -767,6 +791,7 @@ TEST(CrashPointsTest, ARenameHasEveryItemUnderOneOfTheNamesAndIsCompletedByAnoth
                             {{"", "old all; new none"}, {"rename", "old none; new all"}}));
 }
 
+// Promise: "Renaming: Across volumes"
 TEST(CrashPointsTest, ARenameToAnotherVolumeHasEveryItemUnderOneOfTheNames) {
     const SecondVolume volume("", true);
     if (!volume.ok()) GTEST_SKIP() << "there is no second volume";
@@ -778,6 +803,7 @@ TEST(CrashPointsTest, ARenameToAnotherVolumeHasEveryItemUnderOneOfTheNames) {
 }
 
 // Where a "._" file of an object stood that has been replaced.
+// Promise: "Renaming: On AppleDouble volumes"
 TEST(CrashPointsTest, ARenameOverAnObjectCostsThatOnesAppleDoubleFileFirst) {
     Operation operation = RenameOf("rename over another object, type 0", 0, true,
                                    {{"", "old all; new none; the other's there"},
@@ -795,6 +821,8 @@ TEST(CrashPointsTest, ARenameOverAnObjectCostsThatOnesAppleDoubleFileFirst) {
     KillEverywhere(operation);
 }
 
+// Promise: "Renaming: Attribute files"
+// Promise: "Renaming: If that was"
 TEST(CrashPointsTest, ARenameOfLegacyMetadataHasEveryItemInOneOfThreePlaces) {
     Operation operation = RenameOf(
         "rename of legacy metadata, type 1", 1, true,
@@ -889,6 +917,8 @@ Operation UpgradeOfAttributes() {
                       {"unlink", "0 files and the stream"}});
 }
 
+// Promise: "What a crash costs: Nothing is repaired by itself"
+// Promise: "Upgrading: attribute files"
 TEST(CrashPointsTest, AnUpgradeLosesNothingAndPutsNothingOutOfSight) {
     KillEverywhere(UpgradeOfAttributes());
 }
@@ -918,6 +948,9 @@ TEST(CrashPointsTest, AnUpgradeThatIsCutShortWithinAWriteHasDoneNothing) {
     printf("crash points: within the writes of: %s: %d\n", operation.name.c_str(), points);
 }
 
+// Promise: "Upgrading: a legacy"
+// Promise: "Upgrading: a "._" file"
+// Promise: "Upgrading: another"
 TEST(CrashPointsTest, AnUpgradeOfOneFileIsDoneOrNot) {
     KillEverywhere(
         UpgradeOf("upgrade of a legacy resource file", MAVOEA_KIND_RESOURCE, FillLegacy,
@@ -957,6 +990,10 @@ TEST(CrashPointsTest, AnUpgradeOfOneFileIsDoneOrNot) {
 
 // ---- Repairs ------------------------------------------------------------------------------------
 
+// Promise: "Repairing: The attributes"
+// Promise: "Repairing: Until then"
+// Promise: "Repairing: repairing again"
+// Promise: "What may be left over: `@eaDir/<name>@MavoResourceTmp`"
 TEST(CrashPointsTest, ARepairLosesNothingAndIsCompletedByAnother) {
     const auto unfinished = [](const World& world) { return world.src().resource() + "Tmp"; };
     KillEverywhere({
@@ -1018,6 +1055,10 @@ Operation ObjectRemovalOf(const std::string& name, int type, std::vector<Stage> 
     };
 }
 
+// Promise: "Removing: Each file is unlinked"
+// Promise: "Removing: What a crash leaves"
+// Promise: "Removing: Removing again"
+// Promise: "What may be left over: `@eaDir` or"
 TEST(CrashPointsTest, ARemovalLeavesFilesOfAnObjectThatIsGoneAndIsCompletedByAnother) {
     KillEverywhere(
         ObjectRemovalOf("remove an object, type 1", 1,
@@ -1040,6 +1081,7 @@ TEST(CrashPointsTest, ARemovalLeavesFilesOfAnObjectThatIsGoneAndIsCompletedByAno
                          {"rmdir", "nothing left"}}));
 }
 
+// Promise: "Removing: `MAVOEARemoveDanglingEADir`"
 TEST(CrashPointsTest, ADanglingEADirectoryIsThereOrNot) {
     KillEverywhere({
         .name = "remove a dangling EA directory",
@@ -1063,6 +1105,8 @@ TEST(CrashPointsTest, ADanglingEADirectoryIsThereOrNot) {
 // ---- EA directories -----------------------------------------------------------------------------
 
 // A directory that is there is left as it is, so that what one lacks it lacks for good.
+// Promise: "Last steps: An EA directory"
+// Promise: "Last steps: Later calls"
 TEST(CrashPointsTest, AnEADirectoryThatWasJustMadeMayNotBeOpenToEverybody) {
     constexpr char kAclName[] = "user.test.acl";
     const Umask mask(022);
@@ -1101,6 +1145,9 @@ std::string CostOfFork(const World& world) {
     return text + (widened ? "; object executable" : "");
 }
 
+// Promise: "The fork on an attribute volume: Opening"
+// Promise: "The fork on an attribute volume: A crash"
+// Promise: "The fork on an attribute volume: until"
 TEST(CrashPointsTest, AForkOnAnAttributeVolumeIsEmptiedBeforeItIsWritten) {
     KillEverywhere({
         .name = "set the fork of an object, type 7",
@@ -1160,6 +1207,7 @@ void KillOnStream(const StreamOperation& operation, std::vector<Stage> stages) {
 constexpr std::size_t kSize = 300;
 constexpr std::size_t kFork = 40000;
 
+// Promise: "Streams: Without a fork"
 TEST(CrashPointsTest, AWriteToAStreamWithoutAForkIsDoneOrNot) {
     KillOnStream(WriteToAnEmptyFile(), {{"", "old"}, {"pwrite", "new"}});
     KillOnStream(WriteOf("write a new attribute", kSize, 0, std::nullopt, 500),
@@ -1173,6 +1221,13 @@ TEST(CrashPointsTest, AWriteToAStreamWithoutAForkIsDoneOrNot) {
     KillOnStream(RemovalOf("remove an attribute", kSize, 0), {{"", "old"}, {"pwrite", "new"}});
 }
 
+// Promise: "What a crash costs: In every state that they reach"
+// Promise: "Streams: A stream is rewritten in place"
+// Promise: "Streams: a write that makes"
+// Promise: "Streams: an overwrite"
+// Promise: "Streams: a removal"
+// Promise: "Streams: `MAVOEASTruncate`"
+// Promise: "Repairing: But each"
 TEST(CrashPointsTest, AForkThatMovesMayBeLostAndSoMayTheLastValues) {
     KillOnStream(
         WriteOf("write a new attribute before a fork", kSize, kFork, std::nullopt, 500),
@@ -1207,6 +1262,7 @@ TEST(CrashPointsTest, AReplacementHasOneOfTheTwoValues) {
         {{"", "old"}, {"pwrite", "new; LOST fork", "0: new; LOST fork"}, {"pwrite", "new"}});
 }
 
+// Promise: "Streams: Finder info, a netatalk record"
 TEST(CrashPointsTest, FinderInfoIsWrittenInOneCall) {
     KillEverywhere({
         .name = "write Finder info",
@@ -1254,6 +1310,13 @@ void KillWithinWrites(const StreamOperation& operation, const std::set<std::stri
     printf("crash points: within the writes of: %s: %d\n", operation.name.c_str(), points);
 }
 
+// Promise: "What a crash costs: In every state that they reach"
+// Promise: "Streams: A larger one"
+// Promise: "Streams: Then the pages"
+// Promise: "Streams: The value that was written"
+// Promise: "Streams: where table and values"
+// Promise: "Upgrading: each further one"
+// Promise: "Repairing: But each"
 TEST(CrashPointsTest, AWriteOfSeveralPagesThatIsCutShortMayCostEveryValue) {
     constexpr std::size_t kLarge = 6000;
     KillWithinWrites(WriteOf("write a new attribute", kLarge, 0, std::nullopt, 500),

@@ -403,6 +403,9 @@ Operation OnStream(const StreamOperation& operation, const std::string& during) 
 constexpr std::size_t kSize = 1500;
 constexpr std::size_t kFork = 20000;
 
+// Promise: "What a crash costs: `tests/crash/power_loss_test.cpp` puts"
+// Promise: "A loss of power: a new stream"
+// Promise: "A loss of power: write, overwrite"
 TEST(PowerLossTest, AChangeOfAStreamMayCostAnyOfItsValues) {
     LosePower(OnStream(WriteToAnEmptyFile(), "new, old"));
     LosePower(OnStream(WriteOf("write a new attribute", kSize, 0, std::nullopt, 1000),
@@ -421,6 +424,8 @@ TEST(PowerLossTest, AChangeOfAStreamMayCostAnyOfItsValues) {
                        "LOST the value, new, old; LOST a, c"));
 }
 
+// Promise: "What a crash costs: In every state that they reach"
+// Promise: "A loss of power: the same before"
 TEST(PowerLossTest, AChangeOfAStreamBeforeAForkMayCostTheForkToo) {
     LosePower(
         OnStream(WriteOf("write a new attribute before a fork", kSize, kFork, std::nullopt, 1000),
@@ -477,6 +482,7 @@ StreamOperation ForkWriteOf(const std::string& name, std::size_t old_size, std::
     return operation;
 }
 
+// Promise: "A loss of power: a fork, written"
 TEST(PowerLossTest, AWriteOfTheForkCostsNothingElse) {
     LosePower(OnStream(ForkWriteOf("write a fork", 0, 5000), "LOST the value, new, old"));
     LosePower(OnStream(ForkWriteOf("make a fork longer", 3000, 5000), "LOST the value, new, old"));
@@ -515,6 +521,7 @@ int WriteFinderInfo(const ObjectFiles& object) {
 }
 
 // Nothing syncs it: that is left to the caller.
+// Promise: "A loss of power: Finder info"
 TEST(PowerLossTest, FinderInfoThatHasBeenWrittenMayNotBeThere) {
     LosePower({
         .name = "write Finder info",
@@ -538,6 +545,7 @@ TEST(PowerLossTest, FinderInfoThatHasBeenWrittenMayNotBeThere) {
 }
 
 // The record replaces the head of the file, in two blocks; nothing syncs it.
+// Promise: "A loss of power: Finder info"
 TEST(PowerLossTest, ARecordThatHasBeenWrittenMayNotBeThere) {
     const Bytes former = OneEntry(9, 122, 32);
     const Bytes record = Pattern(741, 0x77);
@@ -606,6 +614,7 @@ int OpenStream(const ObjectFiles& object) {
     return fd < 0 ? -1 : 0;
 }
 
+// Promise: "A loss of power: import"
 TEST(PowerLossTest, AnImportOnOpenLosesNothing) {
     LosePower({
         .name = "import an AppleDouble file on open",
@@ -629,6 +638,7 @@ TEST(PowerLossTest, AnImportOnOpenLosesNothing) {
     });
 }
 
+// Promise: "A loss of power: upgrade"
 TEST(PowerLossTest, AnUpgradeOfAttributeFilesIsDoneOrNot) {
     LosePower({
         .name = "upgrade of attribute files",
@@ -685,6 +695,7 @@ Cost CostOfRepair(const ObjectFiles& object) {
             LostFrom(wanted, {resource, moved})};
 }
 
+// Promise: "A loss of power: repair"
 TEST(PowerLossTest, ARepairCostsNothing) {
     LosePower({
         .name = "repair of a resource file",
@@ -758,6 +769,7 @@ Operation CopyOf(int from, int to, bool move, const std::string& during, const s
 }
 
 // Once it has succeeded a copy may be incomplete: its source is still there.
+// Promise: "A loss of power: copy"
 TEST(PowerLossTest, ACopyMayBeIncompleteBehindItsSuccessButItsSourceIsNot) {
     LosePower(CopyOf(0, 0, false, "new, old", "new, old"));
     LosePower(CopyOf(0, 1, false, "new, old", "new, old"));
@@ -766,6 +778,7 @@ TEST(PowerLossTest, ACopyMayBeIncompleteBehindItsSuccessButItsSourceIsNot) {
     LosePower(CopyOf(1, 2, false, "new, old", "new, old"));
 }
 
+// Promise: "A loss of power: move"
 TEST(PowerLossTest, AMoveRemovesItsSourceBeforeItsCopyHasBeenSynced) {
     LosePower(CopyOf(0, 0, true, "half, new, old; LOST Finder info, fork, user.one, user.two",
                      "half, new, old; LOST Finder info, fork, user.one, user.two"));

@@ -133,6 +133,7 @@ TEST_F(CleanLiveTest, MetadataWhoseObjectComesIsGivenBack) {
         });
 }
 
+// Promise: "The tool: `clean`"
 TEST_F(CleanLiveTest, ARunThatIsKilledTakesNothingThatItWouldNotHaveTaken) {
     Make();
     ASSERT_THAT(RunTool(Clean()), Succeeded());
@@ -158,6 +159,8 @@ TEST_F(CleanLiveTest, ARunThatIsKilledTakesNothingThatItWouldNotHaveTaken) {
     }
 }
 
+// Promise: "The tool: Where something is replaced"
+// Promise: "The tool: all |"
 TEST_F(CleanLiveTest, TemporaryFilesGoThatNobodyWorksWith) {
     Make();
     for (const std::string& name :

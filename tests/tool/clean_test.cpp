@@ -87,6 +87,8 @@ class CleanTest : public ::testing::Test {
 
 // ---- What dangles -------------------------------------------------------------------------------
 
+// Promise: "What may be left over: `@eaDir` or"
+// Promise: "The tool: `rm`"
 TEST_F(CleanTest, EveryKindOfMetadataIsListedWithItsPathAndReasonAndThenRemoved) {
     MakeObject("here");
     Files("gone").MakeStream();

@@ -133,6 +133,10 @@ class CopyKillTest : public ::testing::TestWithParam<Way> {
     Arguments arguments_;
 };
 
+// Promise: "The tool: So a metadata file"
+// Promise: "The tool: `tests/tool/rename_kill_test.cpp`"
+// Promise: "The tool: `cp`, `convert`, `carry` |"
+// Promise: "The tool: `mv` between volumes |"
 TEST_P(CopyKillTest, TheSameCommandAgainBringsItToItsEnd) {
     MakeAll();
     ASSERT_THAT(RunTool(arguments_).status, Eq(0));
@@ -156,6 +160,8 @@ TEST_P(CopyKillTest, TheSameCommandAgainBringsItToItsEnd) {
 }
 
 // A tree that takes long enough to be killed anywhere, by several runs one after the other.
+// Promise: "The tool: `cp`, `convert`, `carry` |"
+// Promise: "The tool: `mv` between volumes |"
 TEST_P(CopyKillTest, RunsThatAreKilledAtAnyTimeAreBroughtToTheirEnd) {
     constexpr int kRounds = 6;
     constexpr int kRuns = 3;

@@ -518,6 +518,7 @@ TEST_F(CpTest, AnotherUsersProgramLosesItsRights) {
     EXPECT_EQ(0755, ModeOf(travel_.To("b")));
 }
 
+// Promise: "The tool: `cp`, `convert`, `carry` |"
 TEST_F(CpTest, OnAFullDiskTheTargetOfAnAtomicCopyIsAsItWas) {
     const SecondVolume small("size=64k", true);
     MAVOEA_SKIP_WITHOUT_SECOND(small);
@@ -537,6 +538,7 @@ TEST_F(CpTest, OnAFullDiskTheTargetOfAnAtomicCopyIsAsItWas) {
     }
 }
 
+// Promise: "The tool: only data that"
 TEST_F(CpTest, OnAFullDiskWhatIsWrittenOverHasTheBeginning) {
     const SecondVolume small("size=64k", true);
     MAVOEA_SKIP_WITHOUT_SECOND(small);

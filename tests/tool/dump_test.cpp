@@ -184,6 +184,8 @@ TEST_F(DumpTest, TheOffsetOfAnEmptyValueMeansNothing) {
 
 // ---- Damaged files ------------------------------------------------------------------------------
 
+// Promise: "Streams: `mavoea dump FILE`"
+// Promise: "What may be left over: a stream that is refused"
 TEST_F(DumpTest, EachViolationIsToldInItsOwnWords) {
     const std::size_t first = 120;   // record of "a"
     const std::size_t second = 136;  // record of "two words"

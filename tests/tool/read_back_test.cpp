@@ -136,6 +136,7 @@ class WrittenTest : public ::testing::TestWithParam<Way> {
 
 INSTANTIATE_TEST_SUITE_P(Ways, WrittenTest, ::testing::ValuesIn(AllWays()));
 
+// Promise: "The tool: They make each file"
 TEST_P(WrittenTest, IsReadBackBeforeTheSourceGoes) {
     const std::string& item = GetParam().item;
     const Bytes value = ValueOf(item);

@@ -140,6 +140,9 @@ class RenameKillTest : public ::testing::TestWithParam<Case> {
 INSTANTIATE_TEST_SUITE_P(Everything, RenameKillTest, ::testing::ValuesIn(AllCases()),
                          [](const auto& tested) { return NameOf(tested.param); });
 
+// Promise: "The tool: So a metadata file"
+// Promise: "The tool: `tests/tool/rename_kill_test.cpp`"
+// Promise: "The tool: `mv` on one volume"
 TEST_P(RenameKillTest, TheSameCommandAgainBringsItToItsEnd) {
     const auto done = Done();
     KillAtEachCall([&] {
@@ -159,6 +162,7 @@ bool HasAllOf(const Holdings& found, const Holdings& wanted) {
            });
 }
 
+// Promise: "The tool: `mv` on one volume"
 TEST_P(RenameKillTest, CleanTakesNothingOfItAndTheSameCommandFinishesItAfterThat) {
     const int type = GetParam().type;
     const auto done = Done();

@@ -69,6 +69,15 @@ TEST_P(RepairTest, AValueThatWasLongerInTheStreamDoesNotKeepItsEnd) {
     EXPECT_EQ("stays", volume_.Get("other").out);
 }
 
+// Promise: "What may be left over: `@eaDir/<name>@MavoResourceTmp`"
+TEST_P(RepairTest, TheUnfinishedFileOfTheLibrarysRepairIsLeftToBeRemoved) {
+    WriteFile(volume_.resource(), StreamImage{.attributes = {{"a", Ascii("new")}}}.Build());
+    WriteFile(volume_.resource() + "Tmp", Ascii("half of"));
+    EXPECT_EQ(Counts(1, 0, 0), Repair().out);
+    EXPECT_EQ("new", volume_.Get("a").out);
+    EXPECT_EQ(Ascii("half of"), ReadFile(volume_.resource() + "Tmp"));
+}
+
 TEST_P(RepairTest, ObjectsWithoutAResourceFileHaveNothingToRepair) {
     EXPECT_THAT(Repair(), Succeeded());
     EXPECT_EQ(Counts(0, 1, 0), Repair().out);

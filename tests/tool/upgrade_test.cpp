@@ -70,6 +70,27 @@ TEST_P(UpgradeTest, AttributeFilesBecomeAStream) {
     EXPECT_EQ(Counts(0, 1, 0, 0), Upgrade().out);
 }
 
+// Promise: "What may be left over: a stream of 0 bytes"
+TEST_P(UpgradeTest, WithoutTheEmptyStreamOfOneThatWasCutShortTheFolderIsConverted) {
+    AddLegacy(Folder(), "color", Ascii("blue"));
+    WriteFile(volume_.stream(), {});
+    ASSERT_EQ(0, unlink(volume_.stream().c_str()));
+    EXPECT_THAT(Upgrade(), Succeeded());
+    EXPECT_EQ("blue", volume_.Get("color").out);
+    EXPECT_FALSE(Exists(Folder()));
+}
+
+// Promise: "What may be left over: a stream with attributes"
+TEST_P(UpgradeTest, WhatOneThatWasCutShortLeftInTheFolderIsSetByHand) {
+    ASSERT_THAT(volume_.Set("color", Ascii("blue")), Succeeded());
+    AddLegacy(Folder(), "tags", Pattern(3000));
+    EXPECT_EQ("color\n", volume_.Run({"list", volume_.object()}).out);
+    EXPECT_THAT(volume_.Run({"set", volume_.object(), "tags", "--file", Folder() + "/tags"}),
+                Succeeded());
+    EXPECT_EQ(Pattern(3000), volume_.Get("tags").bytes());
+    EXPECT_EQ("blue", volume_.Get("color").out);
+}
+
 // What a metadata file holds, if there is one.
 MacContents ContentsOf(const std::string& path) {
     if (!Exists(path)) return {};

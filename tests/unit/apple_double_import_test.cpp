@@ -1150,6 +1150,7 @@ TEST_F(FixErrorTest, ATemporaryFileOfAnEarlierAttemptIsNoPartOfTheResult) {
 }
 
 // Promise: "MAVOEAFixErrorAD: Repairs"
+// Promise: "Repairing: repairing again"
 TEST_F(FixErrorTest, ATemporaryFileThatAnotherRepairWritesIsLeftAlone) {
     for (const Bytes& written : {Bytes(), PlainAppleDouble(Pattern(32), Ascii("fork"))}) {
         SCOPED_TRACE(written.size());
@@ -1171,6 +1172,7 @@ TEST_F(FixErrorTest, ATemporaryFileThatAnotherRepairWritesIsLeftAlone) {
 }
 
 // Promise: "MAVOEAFixErrorAD: Repairs"
+// Promise: "Repairing: Until then"
 TEST_F(FixErrorTest, TheTemporaryFileIsLockedUntilItHasItsPlace) {
     std::map<std::string, int> locks;
     Hooks().before = [&](const std::string& name) {

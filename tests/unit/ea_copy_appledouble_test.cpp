@@ -930,6 +930,7 @@ class FileEAToDoubleTest : public ToDoubleTest {
     static Bytes RecordsInfo() { return Pattern(32, 0x40); }
 };
 
+// Promise: "Copying: The source is changed"
 TEST_F(FileEAToDoubleTest, TheRecordsFinderInfoIsTheOneThatIsCopied) {
     for (const int move : {0, 1, 2}) {
         Restart();

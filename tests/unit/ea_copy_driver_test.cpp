@@ -866,6 +866,7 @@ TEST_F(CopyDriverTest, LegacyLayoutsThatCannotBeUpgradedAreLoggedAndTheCopyGoesO
     }
 }
 
+// Promise: "Copying: The source is changed"
 TEST_F(CopyDriverTest, OnlySourcesWithEADirectoriesAloneAreUpgraded) {
     for (const int src : {2, 7, 0}) {
         CopyWorld world;

@@ -377,6 +377,7 @@ TEST_F(EaMkdirTest, AModeThatCannotBeSetFailsAndLeavesTheDirectory) {
 }
 
 // Promise: "MAVOEAMKDir: 0x2A00"
+// Promise: "Last steps: (One that"
 TEST_F(EaMkdirTest, ADirectoryThatCannotBeOpenedIsRemovedAgainAndMadeWholeTheNextTime) {
     const Umask umask(077);
     for (const int error : {EMFILE, ENFILE, ENOMEM}) {

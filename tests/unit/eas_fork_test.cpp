@@ -303,6 +303,7 @@ TEST_F(EasForkTest, ShiftThatFailsRecordsNothing) {
 // ---- Beneath attributes -------------------------------------------------------------------------
 
 // Promise: "EA stream: Four regions"
+// Promise: "Streams: A stream is rewritten in place"
 TEST_F(EasForkTest, AWriteMovesTheForkThenWritesThenSyncs) {
     OpenWith({.attributes = {{"a", Ascii("xyz")}}, .fork = Pattern(40000)});
     ASSERT_EQ(9, Write(handle_, "b", "123456789"));

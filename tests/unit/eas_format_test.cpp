@@ -280,6 +280,8 @@ TEST_F(EasFormatTest, TheTotalSizeFieldIsNotBelievedButRewritten) {
 // Promise: "MAVOEASOpen: Returns a handle"
 // Promise: "EA stream: Limits"
 // Promise: "EA stream: **Damage**"
+// Promise: "Streams: A stream whose header"
+// Promise: "What may be left over: a stream that is refused"
 TEST_F(EasFormatTest, FourteenDescriptorsAreRefusedAndThirteenAreRead) {
     Fill(PlainAppleDouble(Pattern(32), Pattern(20), 14));
     EXPECT_EQ(nullptr, Open());

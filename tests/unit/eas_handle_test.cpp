@@ -177,6 +177,7 @@ TEST_F(EasHandleTest, AHandleWithoutALockReleasesNoneWhenItIsClosed) {
 
 // Promise: "MAVOEASOpen: 0xA00"
 // Promise: "EA stream: **Damage**"
+// Promise: "Streams: A stream whose header"
 TEST_F(EasHandleTest, AShortFileIsRefusedAtEveryLengthWithoutALockLeft) {
     const StreamImage image = Image();
     const Bytes bytes = image.Build();
@@ -324,6 +325,7 @@ class UnreadableFrom {
 };
 
 // Promise: "EA stream: Any other stream opens"
+// Promise: "Streams: Others open"
 TEST_F(EasHandleTest, ValuesThatCannotBeReadAreNoReasonToRefuseAStream) {
     StreamImage large;
     for (int i = 0; i < 600; ++i) large.attributes.push_back({"name" + std::to_string(i), {}});
