@@ -1247,6 +1247,8 @@ TEST(CrashPointsTest, AForkThatMovesMayBeLostAndSoMayTheLastValues) {
 }
 
 // Which is what imports and repairs do.
+// Promise: "Streams: a replacement by an import"
+// Promise: "Streams: a replacement by a shorter"
 TEST(CrashPointsTest, AReplacementHasOneOfTheTwoValues) {
     for (const std::size_t size : {100u, 300u, 500u}) {
         KillOnStream(ReplacementOf("replace an attribute", kSize, 0, size),
@@ -1315,7 +1317,6 @@ void KillWithinWrites(const StreamOperation& operation, const std::set<std::stri
 // Promise: "Streams: Then the pages"
 // Promise: "Streams: The value that was written"
 // Promise: "Streams: where table and values"
-// Promise: "Upgrading: each further one"
 // Promise: "Repairing: But each"
 TEST(CrashPointsTest, AWriteOfSeveralPagesThatIsCutShortMayCostEveryValue) {
     constexpr std::size_t kLarge = 6000;
@@ -1339,6 +1340,8 @@ TEST(CrashPointsTest, AWriteOfSeveralPagesThatIsCutShortMayCostEveryValue) {
 // Beyond 64 KiB header and table go out first, then what changes of the values.
 constexpr std::size_t kVeryLarge = 30000;
 
+// Promise: "Streams: Of one that is larger"
+// Promise: "Streams: Values that an overwrite"
 TEST(CrashPointsTest, AnOverwriteInALargeStreamCostsNothingBeforeWhatIsWritten) {
     KillOnStream(
         WriteOf("overwrite an attribute of a large stream", kVeryLarge, 0, kVeryLarge, kVeryLarge),
@@ -1352,6 +1355,7 @@ TEST(CrashPointsTest, AnOverwriteInALargeStreamCostsNothingBeforeWhatIsWritten) 
                  {{"", "old"}, {"pwrite", "new"}});
 }
 
+// Promise: "Streams: if it was the last"
 TEST(CrashPointsTest, AnOverwriteInALargeStreamThatIsCutShortCostsWhatIsWrittenAndWhatMoves) {
     KillWithinWrites(
         WriteOf("overwrite an attribute of a large stream", kVeryLarge, 0, kVeryLarge, kVeryLarge),

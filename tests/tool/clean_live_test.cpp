@@ -161,6 +161,7 @@ TEST_F(CleanLiveTest, ARunThatIsKilledTakesNothingThatItWouldNotHaveTaken) {
 
 // Promise: "The tool: Where something is replaced"
 // Promise: "The tool: all |"
+// Promise: "What may be left over: `@eaDir/.mavoea-`"
 TEST_F(CleanLiveTest, TemporaryFilesGoThatNobodyWorksWith) {
     Make();
     for (const std::string& name :

@@ -554,7 +554,7 @@ INSTANTIATE_TEST_SUITE_P(With, EaOpenUpgradeTest, ::testing::Bool(), [](const au
     return through.param ? "MAVOEAOpen" : "MAVOEAOpenNoADFS";
 });
 
-// Promise: "MAVOEAOpen: What is missing is converted"
+// Promise: "MAVOEAOpen: What is missing is first looked"
 // Promise: "MAVOEAUpgrade: MAVOEAOpen() calls this"
 TEST_P(EaOpenUpgradeTest, AnObjectWithOnlyALegacyFolderGivesADescriptorOfTheUpgradedStream) {
     std::filesystem::remove(legacy_);
@@ -603,7 +603,7 @@ TEST_P(EaOpenUpgradeTest, TheLegacyResourceFileIsFoundToo) {
     EXPECT_EQ(Ascii("resource"), ReadFile(resource_));
 }
 
-// Promise: "MAVOEAOpen: What is missing is converted"
+// Promise: "MAVOEAOpen: What is missing is first looked"
 TEST_P(EaOpenUpgradeTest, TheFolderFormNeverUpgrades) {
     for (const int oflag : {0, O_RDWR | O_CREAT}) {
         for (const char* kind : {kStream, kResource, "MAVO:x"}) {
@@ -621,14 +621,14 @@ TEST_P(EaOpenUpgradeTest, TheFolderFormNeverUpgrades) {
 }
 
 // The kind alone names the file, but the object is what is upgraded.
-// Promise: "MAVOEAOpen: What is missing is converted"
+// Promise: "MAVOEAOpen: What is missing is first looked"
 TEST_P(EaOpenUpgradeTest, EveryOtherFormUpgrades) {
     ExpectFailed(ENOENT, Open(2, object_.c_str(), kStream, 0));
     EXPECT_THAT(NamesIn(ea_dir_), ElementsAre("a.txt", "a.txt@MavoEAStream"));
     EXPECT_THAT(NamesIn(folder_), ElementsAre("MAVO:Resource"));
 }
 
-// Promise: "MAVOEAOpen: What is missing is converted"
+// Promise: "MAVOEAOpen: What is missing is first looked"
 TEST_P(EaOpenUpgradeTest, AFileThatIsThereIsOpenedWithoutAnUpgrade) {
     WriteFile(stream_, Ascii("stream"));
     for (const int oflag : {0, O_RDWR | O_CREAT}) {
@@ -678,6 +678,7 @@ TEST_P(EaOpenUpgradeTest, AFailureOfTheUpgradeThatHidesNothingIsIgnored) {
     EXPECT_THAT(TakeRecords(), ::testing::Each(RecordOf(0x3900, "ea_upgrade")));
 }
 
+// Promise: "MAVOEAOpen: Where it fails"
 TEST_P(EaOpenUpgradeTest, NothingIsMadeOverWhatAFailedUpgradeLeaves) {
     {
         const FailCall fault("rename", EIO);
@@ -703,6 +704,7 @@ TEST_P(EaOpenUpgradeTest, NothingIsMadeOverWhatAFailedUpgradeLeaves) {
 }
 
 // Whatever fails, a descriptor is one of a stream that has what could be read.
+// Promise: "MAVOEAOpen: Where it fails"
 TEST_P(EaOpenUpgradeTest, WhateverFailsNoFileIsMadeOverAttributes) {
     std::filesystem::remove(legacy_);
     const auto make = [this] {
@@ -1026,6 +1028,7 @@ bool OpensOnceTheLeaseIsGone(const std::string& path, const std::function<int()>
     return status == 0;
 }
 
+// Promise: "MAVOEAOpen: Waits"
 TEST_F(EaOpenTest, ALeaseIsWaitedForAsByAPlainOpen) {
     MakeEaDir();
     WriteFile(stream_, Ascii("stream"));

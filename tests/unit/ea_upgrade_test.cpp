@@ -473,6 +473,7 @@ TEST_F(EaUpgradeTest, TheStreamOfALongNameHasTheShortenedName) {
 }
 
 // A "._" file's name would take 256 or 257 bytes: there is none, but a folder there may be.
+// Promise: "MAVOEAUpgrade: for the "._" file"
 TEST_F(EaUpgradeTest, ANameThatIsTooLongForASidecarHasItsFolderConverted) {
     for (const auto& [size, shortened] : {std::pair{254, '2'}, std::pair{255, '='}}) {
         SCOPED_TRACE(size);
@@ -818,7 +819,7 @@ class EaUpgradeBadFileTest : public EaUpgradeTest {
     const std::string bad_ = folder_ + "/bad";
 };
 
-// Promise: "MAVOEAUpgrade: Files that cannot be converted"
+// Promise: "MAVOEAUpgrade: Attribute files that cannot be read"
 // Promise: "MAVOEAUpgrade: Codes are recorded"
 TEST_F(EaUpgradeBadFileTest, OneThatCannotBeStated) {
     MakeFolder(two_);
@@ -879,7 +880,8 @@ TEST_F(EaUpgradeBadFileTest, ASocket) {
     ExpectOnlyThisOneSkipped("bad", 0x900);
 }
 
-// Promise: "MAVOEAUpgrade: Files that cannot be converted"
+// Promise: "MAVOEAUpgrade: Attribute files that cannot be read"
+// Promise: "MAVOEAUpgrade: the others are converted"
 TEST_F(EaUpgradeBadFileTest, OneThatTheUserMayNotRead) {
     MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     MakeFolder(two_);
@@ -998,6 +1000,7 @@ TEST_F(EaUpgradeBadFileTest, OfTheSizeOnlyTheLow32BitsCount) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAUpgrade: Attribute files that cannot be read"
 TEST_F(EaUpgradeBadFileTest, OneWhoseNameIsTooLongForAnAttribute) {
     const std::string longest(254, 'n');
     const std::string too_long(255, 'n');
@@ -1124,6 +1127,7 @@ class EaUpgradeNewStreamTest : public EaUpgradeTest {
     Values values_ = two_;
 };
 
+// Promise: "MAVOEAUpgrade: The stream gets its name"
 TEST_F(EaUpgradeNewStreamTest, FromTheMomentItHasANameItHasAllValuesAndTheyAreOnDisk) {
     for (const Lack lack : kLacks) {
         SCOPED_TRACE(static_cast<int>(lack));
@@ -1176,6 +1180,7 @@ TEST_F(EaUpgradeNewStreamTest, TheUmaskNarrowsItHoweverItComes) {
     }
 }
 
+// Promise: "MAVOEAUpgrade: The stream gets its name"
 TEST_F(EaUpgradeNewStreamTest, WhateverFailsThereIsNoStreamThatLacksWhatCouldBeRead) {
     for (const Lack lack : kLacks) {
         SCOPED_TRACE(static_cast<int>(lack));
@@ -1202,6 +1207,7 @@ TEST_F(EaUpgradeNewStreamTest, WhateverFailsThereIsNoStreamThatLacksWhatCouldBeR
 }
 
 // Promise: "MAVOEAUpgrade: 0x900 the stream"
+// Promise: "MAVOEAUpgrade: errno is that"
 TEST_F(EaUpgradeNewStreamTest, ThatCannotBeMadeFailsWith0x900) {
     for (const char* const call : {"open(", "link("}) {
         SCOPED_TRACE(call);
@@ -1429,6 +1435,7 @@ TEST_F(EaUpgradeUnseenTest, AFolderThatTheUserMayNotReadMayHoldAnything) {
 }
 
 // Neither walk decides anything by what it saw of a folder that cannot be read to its end.
+// Promise: "MAVOEAUpgrade: 0xA00 the folder"
 TEST_F(EaUpgradeUnseenTest, AFolderThatCannotBeReadToItsEndMayHoldMore) {
     int reads = 0;
     for (int nth = 1;; ++nth) {
@@ -1471,6 +1478,7 @@ TEST_F(EaUpgradeUnseenTest, AFileThatCannotBeLookedAtMayBeThere) {
     }
 }
 
+// Promise: "MAVOEAUpgrade: 0x2A00 none"
 TEST_F(EaUpgradeUnseenTest, AttributeFilesOfWhichNoneCanBeLookedAtMayBeThere) {
     for (const int error : {EACCES, EIO, ENOMEM, ELOOP}) {
         SCOPED_TRACE(strerror(error));
