@@ -2,8 +2,8 @@
 // and the "._" file.
 
 #include <errno.h>
-#include <string.h>
 
+#include <algorithm>
 #include <cstdint>
 #include <optional>
 
@@ -44,9 +44,7 @@ class ShortName {
         // It stands for all from the last byte that has room on.
         const char check = CheckCharacter(name.substr(kNameMax - 1));
         const std::string_view end = name.substr(name.size() - kExtensionMax);
-        const std::size_t dot = end.rfind('.');
-        const std::string_view extension =
-            dot == std::string_view::npos ? std::string_view() : end.substr(dot);
+        const std::string_view extension = end.substr(std::min(end.rfind('.'), end.size()));
         PathWriter(bytes_)
             .Add(name.substr(0, kNameMax - 1 - extension.size()))
             .Add({&check, 1})

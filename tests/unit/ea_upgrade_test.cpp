@@ -1261,8 +1261,9 @@ TEST_F(EaUpgradeTest, WhatAnotherProcessConvertsMeanwhileIsCurrent) {
     const auto at_the_first = [](const std::string& call, const std::function<void()>& convert) {
         Hooks().before = [=](const std::string& name) {
             if (name != call) return;
+            const auto once = convert;  // this goes with the hook
             Hooks().before = nullptr;
-            convert();
+            once();
         };
     };
     MakeFolder(two_);
