@@ -47,9 +47,8 @@ int WriteFinderInfo(EASHandle* h, const unsigned char finfo[kFinderInfoSize]) {
 // to write, and one that waits for it looks afterwards whether the file is still there.
 void RemoveIfEmpty(int fd, const char* file) {
     const ErrnoKeeper keep;
-    struct flock64 lock = {};
-    lock.l_type = F_WRLCK;
-    lock.l_whence = SEEK_SET;
+    const struct flock64 lock = {
+        .l_type = F_WRLCK, .l_whence = SEEK_SET, .l_start = 0, .l_len = 0, .l_pid = 0};
     if (kernel::SetLock(fd, &lock) == 0 && kernel::Lseek(fd, 0, SEEK_END) == 0 && Names(file, fd)) {
         (void)kernel::Unlink(file);
     }

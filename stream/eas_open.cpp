@@ -131,21 +131,16 @@ class TableReader {
 
     bool Read(std::uint64_t size) {
         if (size > most_) return false;
-        std::uint64_t want = size;
-        if (!only_needed_) {
-            want = likely_ >= size ? std::min(likely_, here_.size() + 16 * kStep) : size + kStep;
-        }
+        const std::uint64_t want =
+            likely_ >= size ? std::min(likely_, here_.size() + 16 * kStep) : size + kStep;
         NameBlock* const block = ResizeNameBlock(block_, std::min(want, most_));
         out_of_memory_ = block == nullptr;
         if (out_of_memory_) return false;
         if (block_ == nullptr) memcpy(block->bytes(), here_.data(), here_.size());
         block_ = block;
         here_ = {block->bytes(), here_.size()};
-        if (!ReadTo(block->size)) {
-            only_needed_ = true;
-            if (!ReadTo(size)) return false;
-        }
-        return size <= here_.size();
+        // More than what is needed may have been what could not be read.
+        return (ReadTo(block->size) || ReadTo(size)) && size <= here_.size();
     }
 
     // Reads the table on up to `end`, or as far as the file goes.
@@ -164,7 +159,6 @@ class TableReader {
     std::uint64_t likely_;
     ByteView here_;
     NameBlock* block_ = nullptr;  // where they are once more than the first bytes are needed
-    bool only_needed_ = false;    // More than that could not be read.
     bool out_of_memory_ = false;
 };
 

@@ -297,7 +297,7 @@ def known_survivors():
 def main():
     parser = argparse.ArgumentParser(description=__doc__.split("\n")[0])
     parser.add_argument("build", type=pathlib.Path)
-    parser.add_argument("--count", type=int, default=200)
+    parser.add_argument("--count", type=int, default=300)
     parser.add_argument("--jobs", type=int, default=2)
     parser.add_argument("--only", default="", help="mutants whose name has this text")
     parser.add_argument("--again", action="store_true", help="known survivors too")

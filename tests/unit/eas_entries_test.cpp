@@ -771,6 +771,19 @@ TEST_F(EasRoomTest, ItIsGivenBackWhenNothingIsWritten) {
     }
 }
 
+TEST_F(EasRoomTest, AnEmptyFileGivesAllOfItBack) {
+    handle_ = Open();
+    const blkcnt_t before = Blocks();
+    {
+        const FailCall fault("pwrite", EIO);
+        EXPECT_EQ(-1, Write(handle_, "new", Pattern(100'000)));
+    }
+    TakeRecords();
+    EXPECT_THAT(TakeCallNames(), Contains("fallocate"));
+    EXPECT_EQ(Bytes(), Contents());
+    EXPECT_EQ(before, Blocks());
+}
+
 TEST_F(EasRoomTest, WhatAVolumeHadOfItIsGivenBackToo) {
     for (const auto& grow : Growths()) {
         OpenThree();
