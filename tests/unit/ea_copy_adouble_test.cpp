@@ -861,6 +861,27 @@ TEST_F(CopyAdoubleTest, EveryFailedWriteHasItsLineAndResult) {
     }
 }
 
+// Of head, what there is of Finder info, what is missing of it, and fork.
+TEST_F(CopyAdoubleTest, AFailedWriteOfWhatAFinderInfoLacksIsAFailureToo) {
+    const Bytes file =
+        Hex("00 05 16 07  00 02 00 00  00*16  00 02"
+            "00 00 00 09  00 00 00 36  00 00 00 20"
+            "00 00 00 02  00 00 00 32  00 00 00 04"
+            "'fork' 'TEXTttxt' 01 02");
+    int failed = 0;
+    for (int nth = 1;; ++nth) {
+        WriteFile(src_, file);
+        const FailCall fault("pwrite", ENOSPC, nth);
+        const int got = Rewrite();
+        if (!fault.fired()) break;
+        ++failed;
+        EXPECT_EQ(-9, got);
+        EXPECT_FALSE(Exists(dst_));
+        EXPECT_THAT(TakeLog(), ElementsAre(HasSubstr("(EACopyAdoubleV2) failed to write ")));
+    }
+    EXPECT_LE(4, failed);
+}
+
 TEST_F(CopyAdoubleTest, AWriteThatStopsShortIsAFailure) {
     for (int nth = 1;; ++nth) {
         unlink(dst_.c_str());

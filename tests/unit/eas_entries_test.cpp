@@ -595,7 +595,7 @@ class EasLargeTest : public EasEntriesTest {
                   .fork = Pattern(fork, 4)};
         Reopen();
     }
-    std::string Range(std::size_t size, std::uint64_t at) {
+    std::string Range(std::uint64_t size, std::uint64_t at) {
         return "(" + std::to_string(size) + ", " + std::to_string(at) + ")";
     }
     // Where the values begin, and the one of that index.
@@ -651,7 +651,8 @@ TEST_F(EasLargeTest, RandomOverwritesComeToWhatTheyShould) {
             ASSERT_EQ(static_cast<int>(bytes.size()),
                       Write(handle_, attribute.name, bytes, offset));
             if (length < offset + bytes.size()) attribute.value.resize(offset + bytes.size());
-            std::copy(bytes.begin(), bytes.end(), attribute.value.begin() + offset);
+            std::copy(bytes.begin(), bytes.end(),
+                      attribute.value.begin() + static_cast<std::ptrdiff_t>(offset));
             image_.attributes.erase(image_.attributes.begin() + static_cast<std::ptrdiff_t>(index));
             image_.attributes.push_back(attribute);
             ASSERT_TRUE(image_.Build() == Contents());

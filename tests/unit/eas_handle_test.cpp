@@ -220,6 +220,18 @@ TEST_F(EasHandleTest, TheFileIsReadInOneOrTwoReads) {
     EXPECT_EQ(1000, U16At(handle->header, kAttributeCountAt));
 }
 
+TEST_F(EasHandleTest, ALargeTableMayEndWithTheFile) {
+    // Records without padding, of values without bytes.
+    StreamImage image;
+    for (int i = 1000; i < 2000; ++i) image.attributes.push_back({"name" + std::to_string(i), {}});
+    ASSERT_EQ(120u + 1000 * 20, image.Build().size());
+    Fill(image);
+    const Handle handle = Open(F_RDLCK);
+    ASSERT_NE(nullptr, handle);
+    EXPECT_EQ(999, MAVOEASSearch(handle.get(), "name1999"));
+    EXPECT_THAT(TakeRecords(), IsEmpty());
+}
+
 TEST_F(EasHandleTest, ReadsThatComeBackShortButNotEmptyAreGoneOnWith) {
     Fill(Image());
     const ShortCall fault("pread", 1, 70, true);
