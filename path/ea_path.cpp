@@ -5,7 +5,6 @@
 
 #include <algorithm>
 #include <cstdint>
-#include <optional>
 
 #include "include/mavoea.h"
 #include "path/ea_dir_path.h"
@@ -37,24 +36,18 @@ char CheckCharacter(std::string_view dropped) {
     return kCheckCharacters[sum % kCheckCharacters.size()];
 }
 
-// What a name of more than kNameMax bytes is shortened to, in exactly kNameMax.
-class ShortName {
- public:
-    explicit ShortName(std::string_view name) {
-        // It stands for all from the last byte that has room on.
-        const char check = CheckCharacter(name.substr(kNameMax - 1));
-        const std::string_view end = name.substr(name.size() - kExtensionMax);
-        const std::string_view extension = end.substr(std::min(end.rfind('.'), end.size()));
-        PathWriter(bytes_)
-            .Add(name.substr(0, kNameMax - 1 - extension.size()))
-            .Add({&check, 1})
-            .Add(extension);
-    }
-    std::string_view text() const { return {bytes_, kNameMax}; }
-
- private:
-    char bytes_[kNameMax];
-};
+// Shortens a name of more than kNameMax bytes to exactly kNameMax, in `to`.
+std::string_view Shorten(std::string_view name, char* to) {
+    // It stands for all from the last byte that has room on.
+    const char check = CheckCharacter(name.substr(kNameMax - 1));
+    const std::string_view end = name.substr(name.size() - kExtensionMax);
+    const std::string_view extension = end.substr(std::min(end.rfind('.'), end.size()));
+    PathWriter(to)
+        .Add(name.substr(0, kNameMax - 1 - extension.size()))
+        .Add({&check, 1})
+        .Add(extension);
+    return {to, kNameMax};
+}
 
 }  // namespace
 }  // namespace mavoea
@@ -79,13 +72,12 @@ int MAVOEAPathNoADFS(int form, const char* szPath, const char* szName, char* szB
     }
 
     std::string_view name;
-    std::optional<ShortName> shortened;
+    char shortened[kNameMax];
     if (form == EA_FORM_FILE) {
         name = SplitObject(path).name;
         if (name.size() > kNameMax) {
-            shortened.emplace(name);
             path.remove_suffix(name.size() - kNameMax);
-            name = shortened->text();
+            name = Shorten(name, shortened);
         }
     }
     char* const dir_end = DeriveDirPath(form, path, szBuf, cbBuf);

@@ -23,9 +23,15 @@ struct Range {
     friend constexpr bool operator==(const Range&, const Range&) = default;
 };
 
-// memcpy() for sizes that fit in a byte, most of them names': those of 8 to 32 bytes are two copies
-// that meet or overlap. For the others compilers must not know that the size fits in a byte: they
-// would copy with string instructions, which take longer to start than a name takes to copy.
+// memcpy() of a size that compilers are to know nothing of. Where they know the most that it can be
+// they copy with string instructions, which take longer to start than a path takes to copy.
+inline void CopyBytes(void* to, const void* from, std::size_t size) {
+    asm("" : "+r"(size));  // makes the size anybody's guess
+    std::memcpy(to, from, size);
+}
+
+// The same for sizes that fit in a byte, most of them names': those of 8 to 32 bytes are two copies
+// that meet or overlap.
 inline void CopyShort(void* to, const void* from, std::size_t size) {
     auto* const end = static_cast<std::uint8_t*>(to) + size;
     const auto* const from_end = static_cast<const std::uint8_t*>(from) + size;
@@ -36,8 +42,7 @@ inline void CopyShort(void* to, const void* from, std::size_t size) {
         std::memcpy(to, from, 8);
         std::memcpy(end - 8, from_end - 8, 8);
     } else {
-        asm("" : "+r"(size));  // makes the size anybody's guess
-        std::memcpy(to, from, size);
+        CopyBytes(to, from, size);
     }
 }
 

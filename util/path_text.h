@@ -11,6 +11,7 @@
 #include <string_view>
 #include <type_traits>
 
+#include "util/bytes.h"
 #include "util/owned.h"
 
 namespace mavoea {
@@ -59,7 +60,7 @@ class WorkingPath {
     // cppcheck-suppress uninitMemberVar; clearing it would cost more than the rest of a derivation
     explicit WorkingPath(const char* path) : size_(strlen(path)) {
         if (size_ > kShortPathMax) heap_ = Owned<char>::Allocate(size_ + 1);
-        if (ok()) memcpy(data(), path, size_ + 1);
+        if (ok()) CopyBytes(data(), path, size_ + 1);
     }
 
     bool ok() const { return size_ <= kShortPathMax || heap_; }  // false: out of memory
@@ -110,7 +111,7 @@ class CutShort {
 
     CutShort& Add(std::string_view text) {
         const std::size_t count = std::min(text.size(), left_);
-        memcpy(at_, text.data(), count);
+        CopyBytes(at_, text.data(), count);
         at_ += count;
         left_ -= count;
         *at_ = '\0';
@@ -128,7 +129,7 @@ class PathWriter {
     explicit PathWriter(char* at) : at_(at) {}
 
     PathWriter& Add(std::string_view text) {
-        memcpy(at_, text.data(), text.size());
+        CopyBytes(at_, text.data(), text.size());
         at_ += text.size();
         return *this;
     }
