@@ -343,11 +343,13 @@ void SyncToFile(View block, const Parsed& parsed) {
     const Codes codes = call.End(MemoryFor(block.size()));
     if ((result == 0) != codes.empty()) Fail("EAFileEAFSFinfoFileSync: result and codes");
     const auto made = Get(At().resource);
-    if ((result == 0) != made.has_value()) Fail("EAFileEAFSFinfoFileSync: result and file");
-    if (!made) return;
     const auto finder_info = FinderInfoOf(parsed);
+    if ((result == 0 && finder_info) != made.has_value()) {
+        Fail("EAFileEAFSFinfoFileSync: result and file");
+    }
+    if (!made) return;
     if (made->size() != 82) Fail("EAFileEAFSFinfoFileSync: %zu bytes", made->size());
-    if (finder_info && !std::equal(finder_info->begin(), finder_info->end(), made->begin() + 50)) {
+    if (!std::equal(finder_info->begin(), finder_info->end(), made->begin() + 50)) {
         Fail("EAFileEAFSFinfoFileSync: Finder info");
     }
 }
