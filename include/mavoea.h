@@ -194,8 +194,8 @@ MAVOEA_API int MAVOEAMKDir(int blParentFirst, const char* szEADirPath);
  * fails, with O_CREAT, nothing is made over what it may have left: -1, with its errno and codes.
  * Returns a descriptor, which the caller closes, or -1: a failed open(2) records no code and leaves
  * its errno, ELOOP for a link, EISDIR for a directory and ENXIO for anything else that is no
- * regular file; 0xD00 NULL argument (errno ENOENT) or unknown place; otherwise the codes of the path
- * functions and of MAVOEAMKDir(). */
+ * regular file; 0xD00 NULL argument (errno ENOENT) or unknown place; otherwise the codes of the
+ * path functions and of MAVOEAMKDir(). */
 MAVOEA_API int MAVOEAOpen(int form, const char* szPath, const char* szName, int oflag, int place);
 
 /* MAVOEAOpen() for EA_PLACE_EADIR. */
