@@ -41,9 +41,7 @@ constexpr mode_t kPermissions = 07777;
 
 // Whether a call that failed with `error` has said that there is no such file. After any other
 // failure there may be one, and nothing is decided.
-bool SaysMissing(int error) {
-    return error == ENOENT || error == ENOTDIR || error == ENAMETOOLONG;
-}
+bool SaysMissing(int error) { return error == ENOENT || error == ENOTDIR || error == ENAMETOOLONG; }
 
 // Whether something is at `path`: 1 or 0, or -1 after recording that it cannot be told.
 int IsThere(const char* path, int line = __builtin_LINE()) {
