@@ -20,10 +20,6 @@ constexpr Unit unit("ea_rename.c");
 // The operation of both indexes.
 constexpr int kRenamed = 4;
 
-bool SameFile(const struct stat& one, const struct stat& other) {
-    return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
-}
-
 // Makes the directory in which `path` is to lie.
 int MakeParent(const char* path) {
     char dir[kPathBufferSize];

@@ -209,7 +209,7 @@ int ImportAttributeFiles(const char* szPath, const char* stream_path, Folder* fo
 // that it cannot be told.
 std::int64_t AppleDoubleAccess(const char* path) {
     struct stat info;
-    if (kernel::FstatAt(AT_FDCWD, path, &info, AT_SYMLINK_NOFOLLOW) != 0) {
+    if (kernel::Lstat(path, &info) != 0) {
         return SaysMissing(errno) ? 0 : unit.Fail(Err::kOpen);
     }
     // Looking into it, which is an access, comes after its time.

@@ -24,7 +24,7 @@ bool Names(const char* path, int fd) {
     struct stat opened;
     struct stat named;
     if (kernel::Fstat(fd, &opened) != 0 || kernel::Lstat(path, &named) != 0) return false;
-    if (opened.st_dev == named.st_dev && opened.st_ino == named.st_ino) return true;
+    if (SameFile(opened, named)) return true;
     errno = ESTALE;
     return false;
 }

@@ -14,6 +14,11 @@ inline constexpr int kOpenTries = 16;
 // whether this call did: nobody else may remove it. A descriptor, or -1 with errno.
 int OpenOrMake(const char* path, bool* made);
 
+// Whether two of them are one file.
+inline bool SameFile(const struct stat& one, const struct stat& other) {
+    return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
+}
+
 // Whether `path` still names the file on `fd`, which may have been removed, or replaced by another,
 // since it was opened: before a lock on it was had, or by who may put a link there. Otherwise false
 // with errno, ESTALE when it names another.

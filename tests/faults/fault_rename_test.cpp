@@ -59,6 +59,16 @@ Outcome Stays(long long result, std::vector<ExpectedRecord> records, Names from,
             .free = std::move(free)};
 }
 
+// The upgrade before a file is moved, which then stays where it is.
+template <class Staying>
+Rules LookedFor(const char* file, const Staying& stays) {
+    return {
+        {.call = "access", .with = file, .errors = {ENOENT}, .outcome = stays(0, {})},
+        // What may be in an earlier layout stays.
+        {.call = "access", .with = file, .outcome = stays(-1, {{0x900, "ea_upgrade"}})},
+    };
+}
+
 // ---- Within a directory -------------------------------------------------------------------------
 
 TEST(FaultRenameTest, WithinADirectory) {
@@ -113,23 +123,9 @@ TEST(FaultRenameTest, WithinADirectory) {
                                   ReadFile(Exists(from) ? from : to));
                     }
                 },
-            .rules = rules + PassedOver() +
+            .rules = rules + PassedOver() + LookedFor(kOldResource, resource_stays) +
+                     LookedFor(kOldStream, stream_stays) +
                      Rules{
-                         {.call = "access",
-                          .with = kOldResource,
-                          .errors = {ENOENT},
-                          .outcome = resource_stays(0, {})},
-                         {.call = "access",
-                          .with = kOldStream,
-                          .errors = {ENOENT},
-                          .outcome = stream_stays(0, {})},
-                         // What may be in an earlier layout stays.
-                         {.call = "access",
-                          .with = kOldResource,
-                          .outcome = resource_stays(-1, {{0x900, "ea_upgrade"}})},
-                         {.call = "access",
-                          .with = kOldStream,
-                          .outcome = stream_stays(-1, {{0x900, "ea_upgrade"}})},
                          // What cannot be looked at is not there.
                          {.call = "stat", .with = kOldResource, .outcome = resource_stays(0, {})},
                          {.call = "stat", .with = kOldStream, .outcome = stream_stays(0, {})},
@@ -198,23 +194,9 @@ TEST(FaultRenameTest, IntoADirectoryThatHasNoEADirectory) {
                 }
             },
         .state = UserOf,
-        .rules = PassedOver() +
+        .rules = PassedOver() + LookedFor(kOldResource, resource_stays) +
+                 LookedFor(kOldStream, stream_stays) +
                  Rules{
-                     {.call = "access",
-                      .with = kOldResource,
-                      .errors = {ENOENT},
-                      .outcome = resource_stays(0, {})},
-                     {.call = "access",
-                      .with = kOldStream,
-                      .errors = {ENOENT},
-                      .outcome = stream_stays(0, {})},
-                     // What may be in an earlier layout stays.
-                     {.call = "access",
-                      .with = kOldResource,
-                      .outcome = resource_stays(-1, {{0x900, "ea_upgrade"}})},
-                     {.call = "access",
-                      .with = kOldStream,
-                      .outcome = stream_stays(-1, {{0x900, "ea_upgrade"}})},
                      {.call = "access", .outcome = {.files = Files::kDone}},
                      {.call = "stat", .with = kOldResource, .outcome = resource_stays(0, {})},
                      {.call = "stat", .with = kOldStream, .outcome = stream_stays(0, {})},
@@ -331,23 +313,9 @@ TEST(FaultRenameTest, ToAnotherVolume) {
                 for (const std::string& name : Tree(former.path())) all += name + "\n";
                 return all;
             },
-        .rules = PassedOver() +
+        .rules = PassedOver() + LookedFor("a@MavoResource", resource_stays) +
+                 LookedFor("a@MavoEAStream", stream_stays) +
                  Rules{
-                     {.call = "access",
-                      .with = "a@MavoResource",
-                      .errors = {ENOENT},
-                      .outcome = resource_stays(0, {})},
-                     {.call = "access",
-                      .with = "a@MavoEAStream",
-                      .errors = {ENOENT},
-                      .outcome = stream_stays(0, {})},
-                     // What may be in an earlier layout stays.
-                     {.call = "access",
-                      .with = "a@MavoResource",
-                      .outcome = resource_stays(-1, {{0x900, "ea_upgrade"}})},
-                     {.call = "access",
-                      .with = "a@MavoEAStream",
-                      .outcome = stream_stays(-1, {{0x900, "ea_upgrade"}})},
                      {.call = "access", .outcome = {.files = Files::kDone}},
                      {.call = "stat", .with = "a@MavoResource", .outcome = resource_stays(0, {})},
                      {.call = "stat", .with = "a@MavoEAStream", .outcome = stream_stays(0, {})},

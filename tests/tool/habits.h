@@ -9,24 +9,11 @@
 #include <string>
 #include <vector>
 
+#include "tests/support/working_directory.h"
 #include "tests/tool/holdings.h"
 #include "tests/tool/travel.h"
 
 namespace mavoea::test {
-
-// The working directory until the end of its scope.
-class WorkingDirectory {
- public:
-    explicit WorkingDirectory(const std::string& path) : former_(std::filesystem::current_path()) {
-        std::filesystem::current_path(path);
-    }
-    ~WorkingDirectory() { std::filesystem::current_path(former_); }
-    WorkingDirectory(const WorkingDirectory&) = delete;
-    WorkingDirectory& operator=(const WorkingDirectory&) = delete;
-
- private:
-    std::filesystem::path former_;
-};
 
 // The directories "from" and "to" are two volumes of the type, and the working directory is the one
 // that holds both.

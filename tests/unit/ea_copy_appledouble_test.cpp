@@ -11,6 +11,7 @@
 #include "tests/support/copy_fixture.h"
 #include "tests/support/record_builder.h"
 #include "tests/support/stream_fixture.h"
+#include "tests/support/working_directory.h"
 
 namespace mavoea::test {
 namespace {
@@ -106,20 +107,6 @@ class AppleDoubleTest : public CopyTest {
         EXPECT_EQ(finder_info, Bytes(found[kRecord].begin() + 122, found[kRecord].begin() + 154));
         EXPECT_EQ(Hex("12 34 56 78"), found[kFlushTime]);
     }
-};
-
-// In a directory until the end of its scope.
-class WorkingDirectory {
- public:
-    explicit WorkingDirectory(const std::string& path) : former_(std::filesystem::current_path()) {
-        std::filesystem::current_path(path);
-    }
-    ~WorkingDirectory() { std::filesystem::current_path(former_); }
-    WorkingDirectory(const WorkingDirectory&) = delete;
-    WorkingDirectory& operator=(const WorkingDirectory&) = delete;
-
- private:
-    std::filesystem::path former_;
 };
 
 // ---- "._" file to "._" file -----------------------------------------------------------------

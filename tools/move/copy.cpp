@@ -485,10 +485,11 @@ class Placement final : private TreeCopy {
                               (ReadsContents() && !S_ISLNK(source->info.st_mode));
         if (!S_ISREG(source->info.st_mode) && contents && !source->stream) OpenStream(source);
         if (target.dangling) return WriteThrough(*source, target);
-        const bool may_write = target.info && !Replaces(*source, target) && contents;
+        const bool stays = target.info && !Replaces(*source, target);
+        const bool may_write = stays && contents;
         if (!may_write || !S_ISREG(target.info->st_mode)) {
             if (may_write && !S_ISDIR(target.info->st_mode)) return Feed(source, target);
-            if (target.info && !Replaces(*source, target)) {
+            if (stays) {
                 throw Refusal("cannot create " + std::string(NameOfType(source->info)) + ' ' +
                                   Quoted(to.path()),
                               EEXIST);

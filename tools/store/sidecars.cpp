@@ -28,6 +28,16 @@ bool MayBeAppleDouble(const struct stat& info) {
 
 bool HasColon(const std::string& name) { return name.find(':') != std::string::npos; }
 
+// Whether the directory, when it was listed, had an object to which something of that name in the
+// EA directory may belong: one whose name ends before an '@' that is at `from` or behind it.
+bool HadOwnerAtFirst(const Directory& directory, const std::string& name, std::size_t from) {
+    for (std::size_t at = name.find('@', from); at != std::string::npos;
+         at = name.find('@', at + 1)) {
+        if (directory.HadAtFirst(name.substr(0, at))) return true;
+    }
+    return false;
+}
+
 class Finder {
  public:
     explicit Finder(const Object& object)
@@ -139,10 +149,7 @@ class Finder {
     }
 
     bool BelongsToALongerName(const std::string& name) const {
-        for (std::size_t at = name.find('@', derived_.size() + 1); at != std::string::npos;
-             at = name.find('@', at + 1)) {
-            if (directory_.HadAtFirst(name.substr(0, at))) return true;
-        }
+        if (HadOwnerAtFirst(directory_, name, derived_.size() + 1)) return true;
         // A folder of an object with an '@' in its name.
         return S_ISDIR(sidecars_.ea_dir->StatusOf(name).value_or(kNoStatus).st_mode) &&
                directory_.Has(name);
@@ -272,29 +279,19 @@ bool BelongsToAnObject(const Directory& directory, const std::string& name) {
     return !MayBelongTo(directory, name).empty();
 }
 
-namespace {
-
-// Whether one of the objects was there when the directory was listed. They are told by the list
-// where it can tell, and most metadata is of one.
-bool BelongedToAnObject(const Directory& directory, const std::string& name) {
-    if (!directory.listed()) return false;
-    for (std::size_t at = name.find('@', 1); at != std::string::npos; at = name.find('@', at + 1)) {
-        if (directory.HadAtFirst(name.substr(0, at))) return true;
-    }
-    return false;
-}
-
-}  // namespace
-
 std::vector<LeftOver> FindLeftOver(const Directory& directory, const Directory& ea_dir) {
+    // By the list, where there is one: most of what is there is of objects that it has.
+    const auto has_object = [&](const std::string& name) {
+        return (directory.listed() && HadOwnerAtFirst(directory, name, 1)) ||
+               BelongsToAnObject(directory, name);
+    };
     std::vector<LeftOver> all;
     const auto add = [&](const auto& self, const Directory& in, const std::string& prefix) -> void {
         for (const Directory::Entry& entry : in.Entries()) {
             const bool top = prefix.empty();
             if (top && entry.name == kCoverName && S_ISREG(entry.type)) continue;
             if (entry.name.starts_with(kOwnPrefix)) continue;
-            if (top && BelongedToAnObject(directory, entry.name)) continue;
-            if (top && BelongsToAnObject(directory, entry.name)) continue;
+            if (top && has_object(entry.name)) continue;
             const auto info = in.StatusOf(entry.name);
             if (!info) continue;
             if (S_ISDIR(info->st_mode)) {
