@@ -40,13 +40,15 @@ struct Missing {
 struct Metadata {
     struct Item {
         Content value;
-        std::string holder;  // path of the file that has it
+        std::string holder;         // path of the file that has it
+        std::string spelling = {};  // the attribute of that file, where it is not its name there
     };
     struct Attribute {
         std::string name;
         Content value;
         std::uint16_t flags = 0;
         std::string holder;
+        std::string spelling = {};
     };
     // A file that another service keeps for the object in the EA directory, or what an earlier
     // version left there.

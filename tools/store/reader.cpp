@@ -5,209 +5,17 @@
 #include <algorithm>
 #include <cerrno>
 
-#include "format/ea_stream.h"
 #include "format/netatalk_record.h"
+#include "tools/store/apple_double_reader.h"
 #include "tools/store/by_kind.h"
+#include "tools/store/gathering.h"
 #include "tools/store/layout.h"
-#include "tools/store/locking.h"
 #include "tools/store/marks.h"
 
 namespace mavoea::tool {
 namespace {
 
 using Found = Sidecars::Found;
-
-constexpr const char* kLook = "look at it with: mavoea dump FILE";
-constexpr const char* kLookAtRecord = "look at it with: mavoea dump --record PATH";
-
-// netatalk's own entries name the file that they are in, and mean nothing in another.
-bool IsPrivate(EntryId id) {
-    return SlotOf(static_cast<std::uint32_t>(id)) >= Slot::kPrivateDevice;
-}
-
-// ---- One AppleDouble file -----------------------------------------------------------------------
-
-// Adds what a file holds to what is known: what is known already stays, and another value of it is
-// a stray.
-class FileReader {
- public:
-    FileReader(std::shared_ptr<const File> file, Metadata* metadata)
-        : file_(std::move(file)), layout_(ReadLayout(*file_)), metadata_(*metadata) {}
-
-    void Read() {
-        if (layout_.file_size == 0) return;  // made, and not written yet
-        if (!layout_.IsAppleDouble()) {
-            return Problem("no AppleDouble file",
-                           "move it away, or look at it with: mavoea dump FILE");
-        }
-        const AppleDoubleHeader& header = *layout_.header;
-        if (header.version != kAppleDoubleVersion2) {
-            return Problem("its AppleDouble version is " + HexNumber(header.version) + ", not " +
-                               HexNumber(kAppleDoubleVersion2),
-                           kLook);
-        }
-        if (layout_.entries.size() < header.entry_count) Damaged("its descriptors pass");
-        if (header.entry_count > kStreamDescriptorMax) {
-            Problem("damaged: it declares " + std::to_string(header.entry_count) + " entries",
-                    kLook);
-        }
-        ReadFinderInfo();
-        ReadAttributes();
-        ReadFork();
-        ReadEntries();
-    }
-
- private:
-    void Problem(const std::string& cause, const char* advice) {
-        metadata_.problems.emplace_back(kFailed, file_->path(), cause, advice);
-    }
-    void Damaged(const std::string& what) {
-        Problem("damaged: " + what + " the end of the file", kLook);
-    }
-    void Stray(const std::string& item, const std::string& reason) {
-        metadata_.strays.push_back(
-            {item + " in " + Printable(file_->path()), reason, file_->path()});
-    }
-
-    Content Stretch(Range range) const { return {file_, range.offset, range.length}; }
-
-    // What passes the file's end is there all the same, so that nobody takes it for missing.
-    void Take(std::optional<Metadata::Item>* item, const std::string& name, Content value,
-              const char* passes) {
-        if (value.damaged()) Damaged(passes);
-        if (!*item) {
-            *item = Metadata::Item{std::move(value), file_->path()};
-        } else if (Differs((*item)->value, value)) {
-            Stray("a second " + name, "it is another one than in " + Printable((*item)->holder));
-        }
-    }
-    static bool Differs(const Content& one, const Content& other) {
-        if (one.damaged() || other.damaged()) return true;
-        return one.size() != other.size() || FirstDifference(one, other).has_value();
-    }
-
-    void ReadFinderInfo() {
-        const auto index = layout_.FindEntry(EntryId::kFinderInfo);
-        if (!index || layout_.entries[*index].data.length == 0) return;
-        Range range = layout_.entries[*index].data;
-        if (range.length < kFinderInfoSize) {
-            return Stray("Finder info", "it has fewer bytes than it should");
-        }
-        range.length = kFinderInfoSize;
-        Content value = Stretch(range);
-        if (!value.damaged() && IsAllZero(value.All())) return;
-        Take(&metadata_.finder_info, "Finder info", std::move(value), "its Finder info passes");
-    }
-
-    void ReadAttributes() {
-        if (!layout_.HasAttributeArea()) return;
-        if (!layout_.attributes || layout_.attributes->magic != kAttributeMagic) {
-            return Stray("what is behind the Finder info", "it is of no known kind");
-        }
-        if (layout_.records.size() < layout_.attributes->count) {
-            Damaged("its attribute table passes");
-        }
-        std::uint64_t total = 0;
-        for (const Layout::Record& record : layout_.records) {
-            const std::string name = record.name();
-            if (name.empty() || name.size() >= kNameSizeMax) {
-                Problem("damaged: an attribute has no name", kLook);
-                continue;
-            }
-            // Values that share bytes could make much of little.
-            total += record.fixed.value.length;
-            Content value =
-                total > layout_.file_size && record.fixed.value.length > 0
-                    ? Content::Damaged(record.fixed.value.length,
-                                       "it passes the end of " + Printable(file_->path()))
-                    : Stretch(record.fixed.value);
-            if (value.damaged()) Damaged("attribute " + NameOfAttribute(name) + " passes");
-            AddAttribute({name, std::move(value), record.fixed.flags, file_->path()});
-        }
-    }
-
-    // Of two of one name in one file the last is meant.
-    void AddAttribute(Metadata::Attribute attribute) {
-        auto& all = metadata_.attributes;
-        const auto other = std::find_if(
-            all.begin(), all.end(),
-            [&](const Metadata::Attribute& one) { return one.name == attribute.name; });
-        if (other == all.end()) {
-            all.push_back(std::move(attribute));
-        } else if (other->holder == attribute.holder) {
-            *other = std::move(attribute);
-        } else if (Differs(other->value, attribute.value)) {
-            Stray("a second " + NameOfAttribute(attribute.name),
-                  "it is another one than in " + Printable(other->holder));
-            metadata_.strays.back().attribute = true;
-        }
-    }
-
-    void ReadFork() {
-        const auto index = layout_.FindEntry(EntryId::kResourceFork);
-        if (!index || layout_.entries[*index].data.length == 0) return;
-        Content value = Stretch(layout_.entries[*index].data);
-        auto& known = metadata_.fork;
-        if (known && IsBlankFork(value)) return;
-        if (known && IsBlankFork(known->value)) known.reset();
-        Take(&metadata_.fork, "resource fork", std::move(value), "its resource fork passes");
-    }
-
-    void ReadEntries() {
-        for (std::size_t i = 0; i < layout_.entries.size(); ++i) {
-            const EntryDescriptor& entry = layout_.entries[i];
-            const bool known = entry.id == EntryId::kFinderInfo ||
-                               entry.id == EntryId::kResourceFork || entry.id == EntryId::kNone;
-            if (known || entry.data.length == 0 || IsPrivate(entry.id)) continue;
-            if (layout_.FindEntry(entry.id) != i) continue;
-            Content value = Stretch(entry.data);
-            if (!value.damaged() && !Speaks(entry.id, value)) continue;
-            std::optional<Metadata::Item> item;
-            if (const auto other = metadata_.entries.find(entry.id);
-                other != metadata_.entries.end()) {
-                item = other->second;
-            }
-            Take(&item, NameOfEntry(entry.id), std::move(value), "an entry passes");
-            metadata_.entries.insert_or_assign(entry.id, *std::move(item));
-        }
-    }
-
-    // The lock is kept as it is; what else says nothing is left out.
-    static bool Speaks(EntryId id, const Content& value) {
-        const Bytes bytes = value.All();
-        return id == EntryId::kAfpFileInfo ? !IsAllZero(bytes) : SaysSomething(id, bytes);
-    }
-
-    std::shared_ptr<const File> file_;
-    Layout layout_;
-    Metadata& metadata_;
-};
-
-// Runs `work`, which throws what is wrong with one file.
-template <class Work>
-void Noting(Metadata* metadata, Work work) {
-    try {
-        work();
-    } catch (const Failure& failure) {
-        metadata->problems.push_back(failure);
-    }
-}
-
-// Reads the file that was found, if it is still there; null when not, or when it is none.
-// One that is small is read at once.
-WholeFile ReadFound(const Found& found, Metadata* metadata) {
-    WholeFile file;
-    Noting(metadata, [&] {
-        file = found.file ? found.file : found.directory->FindFile(found.name, O_RDONLY);
-        if (!file) return;
-        if (!file->keeps_contents()) {
-            LockFile(*file, Access::kRead);
-            (void)file->KeepContents(kSmallFile);
-        }
-        FileReader(file, metadata).Read();
-    });
-    return file;
-}
 
 void AddService(const Found& found, const std::string& name, Metadata* metadata) {
     Noting(metadata, [&] {
@@ -346,34 +154,10 @@ class FileEaReader final : public EaDirectoryReader {
         Noting(metadata, [&] {
             if (!inode.HoldsContents()) return;
             metadata->whole_record = inode.Attribute(kNetatalkAttribute);
-            if (metadata->whole_record) ReadRecord(inode.path(), metadata);
-        });
-    }
-
- private:
-    static void ReadRecord(const std::string& path, Metadata* metadata) {
-        const Bytes& block = *metadata->whole_record;
-        const Layout layout = ReadLayout(ByteView(block));
-        if (!CheckRecord(layout, RecordPlace::kAttribute).violations.empty()) {
-            throw Failure(kFailed, path, "its netatalk record is damaged", kLookAtRecord);
-        }
-        const auto bytes = [&](Range range) {
-            const ByteView part = ByteView(block).subspan(range.offset, range.length);
-            return Bytes(part.begin(), part.end());
-        };
-        for (std::size_t i = 0; i < layout.entries.size(); ++i) {
-            const EntryDescriptor& entry = layout.entries[i];
-            const Range range = entry.data;
-            if (range.length == 0 || range.end() > block.size() || IsPrivate(entry.id)) continue;
-            if (entry.id == EntryId::kFinderInfo) {
-                const Bytes info = bytes({range.offset, std::uint32_t{kFinderInfoSize}});
-                if (!IsAllZero(info)) metadata->finder_info = Metadata::Item{Content(info), path};
-            } else if (const Bytes value = bytes(range);
-                       !IsAllZero(value) &&
-                       (entry.id == EntryId::kAfpFileInfo || SaysSomething(entry.id, value))) {
-                metadata->entries[entry.id] = {Content(value), path};
+            if (metadata->whole_record) {
+                ReadRecord(*metadata->whole_record, {inode.path(), {}}, metadata);
             }
-        }
+        });
     }
 };
 
@@ -458,9 +242,10 @@ Metadata ReadMetadata(const Object& object, Sidecars::Services services) {
 Metadata ReadAppleDoubleFile(std::shared_ptr<const File> file) {
     Metadata metadata;
     if (!ReadLayout(*file).IsAppleDouble()) {
-        throw Failure(kFailed, file->path(), "no AppleDouble file", kLook);
+        throw Failure(kFailed, file->path(), "no AppleDouble file",
+                      "look at it with: mavoea dump FILE");
     }
-    FileReader(std::move(file), &metadata).Read();
+    ReadFile(std::move(file), &metadata);
     if (!metadata.problems.empty()) throw Failure(metadata.problems.front());
     return metadata;
 }
