@@ -16,9 +16,14 @@ struct Target {
 };
 
 constexpr Target kTargets[] = {
-    {"stream_fuzz", WriteStreamSeeds},   {"record_fuzz", WriteRecordSeeds},
-    {"import_fuzz", WriteImportSeeds},   {"resource_copy_fuzz", WriteResourceCopySeeds},
+    {"stream_fuzz", WriteStreamSeeds},
+    {"record_fuzz", WriteRecordSeeds},
+    {"import_fuzz", WriteImportSeeds},
+    {"resource_copy_fuzz", WriteResourceCopySeeds},
     {"upgrade_fuzz", WriteUpgradeSeeds},
+    {"afp_info_fuzz", WriteAfpInfoSeeds},
+    {"dos_attributes_fuzz", WriteDosAttributesSeeds},
+    {"samba_stream_fuzz", WriteSambaStreamSeeds},
 };
 
 }  // namespace

@@ -23,6 +23,9 @@ upgrade_fuzz 20000 4096
 record_fuzz 100000 1200
 import_fuzz 100000 4096
 resource_copy_fuzz 100000 4096
+afp_info_fuzz 100000 128
+dos_attributes_fuzz 100000 128
+samba_stream_fuzz 100000 512
 '
 
 # run NAME INPUTS LONGEST

@@ -12,6 +12,9 @@ void WriteRecordSeeds(const std::string& directory);
 void WriteImportSeeds(const std::string& directory);
 void WriteResourceCopySeeds(const std::string& directory);
 void WriteUpgradeSeeds(const std::string& directory);
+void WriteAfpInfoSeeds(const std::string& directory);
+void WriteDosAttributesSeeds(const std::string& directory);
+void WriteSambaStreamSeeds(const std::string& directory);
 
 }  // namespace mavoea::fuzz
 

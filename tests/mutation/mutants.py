@@ -176,6 +176,7 @@ class Workshop:
         self.commands = {os.path.relpath(c["file"], ROOT): shlex.split(c["command"])
                          for c in commands
                          if "mavoea_objects.dir" in c["command"]
+                         or "mavoea_foreign_format.dir" in c["command"]
                          or "mavoea_format.dir" in c["command"]}
 
     def object_of(self, file):
