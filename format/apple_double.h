@@ -21,6 +21,8 @@ inline constexpr std::uint32_t kAppleDoubleVersion2 = 0x00020000;
 enum class EntryId : std::uint32_t {
     kNone = 0,
     kResourceFork = 2,
+    kComment = 4,
+    kFileDates = 8,
     kFinderInfo = 9,
     kAfpFileInfo = 14
 };
@@ -61,14 +63,27 @@ inline constexpr std::string_view kBlankForkText = "This resource fork intention
 inline constexpr std::size_t kBlankForkTextOffset = 16;
 static_assert(kBlankForkText.size() == 46);
 
+// File dates: of creation, modification, backup and access, in seconds from 2000-01-01 UTC, signed.
+inline constexpr std::size_t kFileDatesSize = 16;
+inline constexpr std::size_t kBackupDateOffset = 8;
+inline constexpr std::uint32_t kUnknownDate = 0x80000000;
+
 // AFP file info: 4 bytes, of which the last two are the AFP attributes. From the Apple Filing
 // Protocol; the attributes forbid writing, renaming and deleting one by one.
 inline constexpr std::size_t kAfpFileInfoSize = 4;
 inline constexpr std::size_t kAfpAttributesOffset = 2;
 inline constexpr std::uint16_t kAfpInvisible = 0x0001;
+inline constexpr std::uint16_t kAfpSystem = 0x0004;
 inline constexpr std::uint16_t kAfpNoWrite = 0x0020;
+inline constexpr std::uint16_t kAfpBackup = 0x0040;  // it has changed since it was backed up
 inline constexpr std::uint16_t kAfpNoRename = 0x0080;
 inline constexpr std::uint16_t kAfpNoDelete = 0x0100;
+
+// Who has written a file, in its filler: a Mac, or netatalk and Samba.
+inline constexpr std::string_view kMacFiller = "Mac OS X        ";
+inline constexpr std::string_view kNetatalkFiller = "Netatalk        ";
+static_assert(kMacFiller.size() == sizeof AppleDoubleHeader::filler);
+static_assert(kNetatalkFiller.size() == sizeof AppleDoubleHeader::filler);
 
 // Where a header with that many entries and its descriptors end.
 constexpr std::size_t DescriptorsEnd(std::uint16_t entry_count) {

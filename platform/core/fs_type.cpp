@@ -109,6 +109,10 @@ int FsTypeOfPath(VolumeTable* table, const char* path) {
     if (!lexical.ok()) return kUnknown;
 
     int type = table->Find(lexical.text());
+    if (type >= MAVO_VOLUME_SAMBA) {  // another program's
+        errno = ENOTSUP;
+        return kUnknown;
+    }
     if (type >= 0) return type;
 
     // As given first: a ".." behind a symbolic link is the kernel's to resolve.

@@ -20,7 +20,7 @@
 namespace mavoea::core {
 namespace {
 
-constexpr int kTypeMax = 12;
+constexpr int kPlatformTypeMax = 12;
 
 struct NamedType {
     std::string_view name;
@@ -32,9 +32,17 @@ constexpr NamedType kNamedTypes[] = {
     {"eadir", 1},
     {"fileea", 2},
     {"xattr", 7},
+    {"samba", MAVO_VOLUME_SAMBA},
+    {"samba-stream", MAVO_VOLUME_SAMBA_STREAM},
+    {"netatalk", MAVO_VOLUME_NETATALK},
+    {"netatalk-samba", MAVO_VOLUME_NETATALK_SAMBA},
+    {"linux", MAVO_VOLUME_LINUX},
 };
 
-constexpr bool IsType(int type) { return type >= 0 && type <= kTypeMax; }
+constexpr bool IsPlatformType(int type) { return type >= 0 && type <= kPlatformTypeMax; }
+constexpr bool IsType(int type) {
+    return IsPlatformType(type) || (type >= MAVO_VOLUME_SAMBA && type <= MAVO_VOLUME_LINUX);
+}
 
 // The type that TYPE means, -1 for none.
 constexpr int ParseType(std::string_view text) {
@@ -47,10 +55,11 @@ constexpr int ParseType(std::string_view text) {
         if (c < '0' || c > '9') return -1;
         number = 10 * number + (c - '0');
     }
-    return IsType(number) ? number : -1;
+    return IsPlatformType(number) ? number : -1;
 }
 
 static_assert(ParseType("0") == 0 && ParseType("12") == 12 && ParseType("eadir") == 1);
+static_assert(ParseType("linux") == MAVO_VOLUME_LINUX && ParseType("104") == -1);
 static_assert(ParseType("13") == -1 && ParseType("-1") == -1 && ParseType("") == -1);
 
 constexpr std::string_view kBlanks = " \t\r\n\v\f";

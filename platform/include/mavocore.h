@@ -108,20 +108,32 @@ MAVOCORE_API int MLIBMavoIndexAddEx(const char* szPath, const char* szOldPath, i
  * when it has changed. */
 #define MAVO_VOLUME_TABLE "/etc/mavoea/volumes"
 
-/* Declares, for this process, that the directory szPath (absolute) is a volume of `type`, 0 to 12.
- * A second declaration of the same path replaces the first. 0, or -1 with errno EINVAL or ENOMEM.
- */
+/* Types of volumes beside the platform's: directories where other programs keep metadata in ways of
+ * their own. A volume table may say so; to MAVOGetFSType(), and to whoever asks it, such a path is
+ * of no known type (-1, ENOTSUP), and nothing is written there that those programs do not know. */
+enum {
+    MAVO_VOLUME_SAMBA = 100,          /* vfs_fruit with netatalk's records, vfs_streams_xattr */
+    MAVO_VOLUME_SAMBA_STREAM = 101,   /* the same with "fruit:metadata = stream" */
+    MAVO_VOLUME_NETATALK = 102,       /* netatalk, "ea = sys" */
+    MAVO_VOLUME_NETATALK_SAMBA = 103, /* netatalk, "ea = samba" */
+    MAVO_VOLUME_LINUX = 104           /* one extended attribute of the user namespace for each */
+};
+
+/* Declares, for this process, that the directory szPath (absolute) is a volume of `type`, 0 to 12
+ * or one of those above. A second declaration of the same path replaces the first. 0, or -1 with
+ * errno EINVAL or ENOMEM. */
 MAVOCORE_API int MAVOVolumeDeclare(const char* szPath, int type);
 
 /* The type that a volume table's TYPE means: a number from 0 to 12, or "appledouble" (0), "eadir"
- * (1), "fileea" (2), "xattr" (7). -1 when it means none. */
+ * (1), "fileea" (2), "xattr" (7), "samba" (100), "samba-stream" (101), "netatalk" (102),
+ * "netatalk-samba" (103), "linux" (104). -1 when it means none. */
 MAVOCORE_API int MAVOVolumeTypeFromName(const char* szName);
 
 /* Where an entry of the volume table comes from. */
 enum { MAVO_VOLUME_DECLARED = 1, MAVO_VOLUME_LISTED = 2 };
 
 typedef struct MAVOVolumeEntry {
-    int type;   /* 0 to 12 */
+    int type;   /* 0 to 12, or one of those above */
     int source; /* MAVO_VOLUME_... */
     int line;   /* of MAVO_VOLUME_TABLE, from 1, when listed; else 0 */
 } MAVOVolumeEntry;

@@ -215,6 +215,20 @@ TEST_F(FsTypeTest, TheTableDecidesBeforeTheFilesystem) {
     EXPECT_EQ(-1, TypeOf("/proc/self/../none"));
 }
 
+TEST_F(FsTypeTest, WhatOtherProgramsKeepIsOfNoKnownType) {
+    const std::string volume = dir_ / "volume";
+    for (int type : {MAVO_VOLUME_SAMBA, MAVO_VOLUME_SAMBA_STREAM, MAVO_VOLUME_NETATALK,
+                     MAVO_VOLUME_NETATALK_SAMBA, MAVO_VOLUME_LINUX}) {
+        EXPECT_EQ(0, MAVOVolumeDeclare(volume.c_str(), type));
+        errno = 0;
+        EXPECT_EQ(-1, MAVOGetFSType((volume + "/a").c_str(), 1));
+        EXPECT_EQ(ENOTSUP, errno);
+        MAVOVolumeEntry entry;
+        EXPECT_EQ(1, MAVOVolumeFind((volume + "/a").c_str(), &entry));
+        EXPECT_EQ(type, entry.type);
+    }
+}
+
 TEST_F(FsTypeTest, AProcessDeclaresVolumesOfItsOwn) {
     const std::string volume = dir_ / "volume";
     EXPECT_EQ(0, MAVOVolumeDeclare(volume.c_str(), 7));
@@ -222,7 +236,7 @@ TEST_F(FsTypeTest, AProcessDeclaresVolumesOfItsOwn) {
     EXPECT_EQ(0, MAVOVolumeDeclare((volume + "/").c_str(), 0));
     EXPECT_EQ(0, MAVOGetFSType((volume + "/a").c_str(), 1));
 
-    for (int type : {-1, 13, INT_MIN, INT_MAX}) {
+    for (int type : {-1, 13, 99, 105, INT_MIN, INT_MAX}) {
         errno = 0;
         EXPECT_EQ(-1, MAVOVolumeDeclare(volume.c_str(), type));
         EXPECT_EQ(EINVAL, errno);

@@ -542,7 +542,7 @@ TEST(VolumeTableCheckTest, ArgumentsThatAreMissingAreRefused) {
     EXPECT_EQ(EINVAL, errno);
 }
 
-TEST(VolumeTypeFromNameTest, NumbersFrom0To12AndFourNamesAreTypes) {
+TEST(VolumeTypeFromNameTest, NumbersFrom0To12AndNineNamesAreTypes) {
     for (int type = 0; type <= 12; ++type) {
         EXPECT_EQ(type, MAVOVolumeTypeFromName(std::to_string(type).c_str()));
     }
@@ -550,8 +550,13 @@ TEST(VolumeTypeFromNameTest, NumbersFrom0To12AndFourNamesAreTypes) {
     EXPECT_EQ(1, MAVOVolumeTypeFromName("eadir"));
     EXPECT_EQ(2, MAVOVolumeTypeFromName("fileea"));
     EXPECT_EQ(7, MAVOVolumeTypeFromName("xattr"));
-    for (const char* none :
-         {"", "13", "99", "100", "-1", "+1", " 1", "1 ", "1x", "eadir2", "EADir"}) {
+    EXPECT_EQ(100, MAVOVolumeTypeFromName("samba"));
+    EXPECT_EQ(101, MAVOVolumeTypeFromName("samba-stream"));
+    EXPECT_EQ(102, MAVOVolumeTypeFromName("netatalk"));
+    EXPECT_EQ(103, MAVOVolumeTypeFromName("netatalk-samba"));
+    EXPECT_EQ(104, MAVOVolumeTypeFromName("linux"));
+    for (const char* none : {"", "13", "99", "100", "104", "-1", "+1", " 1", "1 ", "1x", "eadir2",
+                             "EADir", "Samba", "samba-"}) {
         EXPECT_EQ(-1, MAVOVolumeTypeFromName(none)) << none;
     }
     EXPECT_EQ(-1, MAVOVolumeTypeFromName(nullptr));

@@ -7,6 +7,7 @@
 #include "include/mavoea.h"
 #include "tools/care/upgrade.h"
 #include "tools/say/messages.h"
+#include "tools/store/foreign/detection.h"
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
@@ -58,6 +59,7 @@ Outcome RepairObject(const Object& volume_object) {
                stray.attribute;
     });
     RefuseToLose(metadata);
+    RequireDeclared(object);
     RequireOwnNames(object);
     metadata.whole_resource.reset();
     metadata.whole_stream.reset();

@@ -10,7 +10,7 @@ void RequireEaDirectory(const Object& object) {
     if (object.keeping() == Keeping::kNone) throw NoStore(object);
     if (object.keeping() != Keeping::kEaDirectory) {
         throw Failure(kFailed, object.path(),
-                      "volumes of type " + std::to_string(object.type) + ", " +
+                      "volumes of type " + TypeId(object.type) + ", " +
                           std::string(TypeName(object.type)) + ", keep no EA directory",
                       "there is nothing to do there");
     }

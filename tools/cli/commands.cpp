@@ -153,14 +153,15 @@ ExitStatus DumpRecord(const Options& options) {
         if (!stored) continue;
         const Layout layout = ReadLayout(stored->block);
         const Findings findings = CheckRecord(layout, place);
-        const char* const kind = place == RecordPlace::kAttribute
-                                     ? "netatalk record, attribute user.netatalk.Metadata"
-                                     : "netatalk record, head of a resource file";
+        const std::string kind =
+            "netatalk record, " + (stored->attribute.empty() ? "head of a resource file"
+                                                             : "attribute " + stored->attribute);
         violations += findings.violations.size();
         if (options.json) {
-            json.Add(DumpJson(stored->file, layout, findings, kind));
+            json.Add(DumpJson(stored->file, layout, findings, kind.c_str()));
         } else {
-            std::cout << (found ? "\n" : "") << DumpText(stored->file, layout, findings, kind);
+            std::cout << (found ? "\n" : "")
+                      << DumpText(stored->file, layout, findings, kind.c_str());
         }
         found = true;
     }

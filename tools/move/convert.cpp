@@ -229,7 +229,7 @@ ExitStatus Convert(const ConvertOptions& options) {
     }
     const Object target = ObjectAt(destination, nullptr);
     if (source.keeping() == Keeping::kNone) throw NoStore(source);
-    if (target.kind() == VolumeKind::kNone) throw NoStore(target);
+    if (AsReadable(target).keeping() == Keeping::kNone) throw NoStore(target);
     if (options.compare_only && !destination.Status()) {
         throw SystemFailure(destination.path(), ENOENT);
     }

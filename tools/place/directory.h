@@ -98,7 +98,11 @@ class Directory : public std::enable_shared_from_this<Directory> {
 
     // The type of the volume that what is in it is on, unless that is a directory; kept for who
     // asks again.
-    std::optional<int>& volume_type() const { return volume_type_; }
+    struct VolumeType {
+        int type;
+        bool declared;
+    };
+    std::optional<VolumeType>& volume_type() const { return volume_type_; }
 
     // None when nothing of that name is there.
     std::optional<struct stat> StatusOf(const std::string& name) const;
@@ -161,7 +165,7 @@ class Directory : public std::enable_shared_from_this<Directory> {
     mutable std::set<std::string> later_;  // has come by this process since
     mutable std::optional<bool> tells_cases_apart_;
     mutable DirectoryRef kept_;
-    mutable std::optional<int> volume_type_;
+    mutable std::optional<VolumeType> volume_type_;
 };
 
 // An object, or where one is to be: an open directory and a name there.

@@ -71,7 +71,8 @@ int RequireTypeName(const std::string& type_name, const std::string& option) {
     const int type = MAVOVolumeTypeFromName(type_name.c_str());
     if (type >= 0) return type;
     throw Failure(kFailed, option, "unknown volume type \"" + type_name + "\"",
-                  "take a number from 0 to 12, appledouble, eadir, fileea or xattr");
+                  "take a number from 0 to 12, appledouble, eadir, fileea, xattr, samba, "
+                  "samba-stream, netatalk, netatalk-samba or linux");
 }
 
 constexpr const char* kDeclareVolume =
@@ -83,6 +84,10 @@ constexpr const char* kDeclareVolume = "move the object to another volume";
 }  // namespace
 
 Keeping KeepingOf(int type) {
+    if (const Dialect* const dialect = DialectOf(type)) {
+        return dialect->fork == Dialect::Fork::kAppleDouble ? Keeping::kAppleDouble
+                                                            : Keeping::kXattr;
+    }
     switch (VolumeKindOf(type)) {
         case VolumeKind::kAppleDouble:
             return Keeping::kAppleDouble;
@@ -146,9 +151,12 @@ Object FindObject(const std::string& path) {
 Object ObjectAt(const Place& place, const struct stat* info) {
 #if MAVOEA_HOST_PLATFORM
     MAVOVolumeEntry entry;
-    if (MAVOVolumeFind(place.location().c_str(), &entry) == 1) return {place, entry.type};
+    if (MAVOVolumeFind(place.location().c_str(), &entry) == 1) return {place, entry.type, true};
+    constexpr bool kDeclared = false;
+#else
+    constexpr bool kDeclared = true;  // the platform knows its volumes
 #endif
-    return {place, TypeOfFileSystem(place, info != nullptr && S_ISDIR(info->st_mode))};
+    return {place, TypeOfFileSystem(place, info != nullptr && S_ISDIR(info->st_mode)), kDeclared};
 }
 
 Object ObjectAt(const Place& place, mode_t type) {
@@ -160,9 +168,12 @@ Object ObjectAt(const Place& place, mode_t type) {
         info.st_mode = type;
         return ObjectAt(place, &info);
     }
-    std::optional<int>& kept = place.directory->volume_type();
-    if (!kept) kept = ObjectAt(place, nullptr).type;
-    return {place, *kept};
+    std::optional<Directory::VolumeType>& kept = place.directory->volume_type();
+    if (!kept) {
+        const Object object = ObjectAt(place, nullptr);
+        kept = {object.type, object.declared};
+    }
+    return {place, kept->type, kept->declared};
 }
 
 int ReadableType(int type) {
@@ -175,7 +186,15 @@ Object AsReadable(Object object) {
     return object;
 }
 
+std::string TypeId(int type) {
+    const Dialect* const dialect = DialectOf(type);
+    return dialect != nullptr ? std::string(dialect->name) : std::to_string(type);
+}
+
+Json TypeJson(int type) { return DialectOf(type) != nullptr ? Json(TypeId(type)) : Json(type); }
+
 std::string_view TypeName(int type) {
+    if (const Dialect* const dialect = DialectOf(type)) return dialect->title;
     switch (VolumeKindOf(type)) {
         case VolumeKind::kAppleDouble:
             return "AppleDouble";
@@ -275,8 +294,8 @@ Failure NoStore(const Object& object) {
     if (object.type < 0) {
         return {kFailed, object.path(), "the type of its volume is unknown", kDeclareVolume};
     }
-    return {kFailed, object.path(),
-            "volumes of type " + std::to_string(object.type) + " keep no metadata", kDeclareVolume};
+    return {kFailed, object.path(), "volumes of type " + TypeId(object.type) + " keep no metadata",
+            kDeclareVolume};
 }
 
 void RequireParent(const Object& object) {

@@ -6,23 +6,27 @@
 #include <string_view>
 #include <vector>
 
+#include "tools/place/dialect.h"
 #include "tools/place/directory.h"
+#include "tools/say/json.h"
 #include "tools/say/messages.h"
 #include "util/volume_kind.h"
 
 namespace mavoea::tool {
 
-// How volumes of a type keep metadata.
+// How volumes of a type keep metadata. Those of other programs count by what lies beside an object.
 enum class Keeping { kAppleDouble, kEaDirectory, kXattr, kNone };
 Keeping KeepingOf(int type);
 
 struct Object {
     Place place;
-    int type = -1;  // of its volume, -1 unknown
+    int type = -1;          // of its volume, -1 unknown
+    bool declared = false;  // by somebody, and not found by the filesystem
 
     std::string path() const { return place.path(); }  // absolute, for people
     Keeping keeping() const { return KeepingOf(type); }
     VolumeKind kind() const { return VolumeKindOf(type); }
+    const Dialect* dialect() const { return DialectOf(type); }
     bool is_root() const { return place.name == "."; }
 };
 
@@ -49,6 +53,9 @@ int ReadableType(int type);
 Object AsReadable(Object object);
 
 std::string_view TypeName(int type);
+// "1"; "samba" for those that have no number.
+std::string TypeId(int type);
+Json TypeJson(int type);
 
 // A directory's volume type for this run, from "PATH=TYPE". Only the host's platform library can be
 // told. Throws Failure, also when there is no such directory.

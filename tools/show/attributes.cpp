@@ -10,6 +10,7 @@
 #include "tools/place/volume.h"
 #include "tools/say/output.h"
 #include "tools/say/text.h"
+#include "tools/store/gathering.h"
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
 #include "tools/walk/tree.h"
@@ -21,21 +22,23 @@ struct Line {
     std::string name;
     std::uint64_t size;
     const char* kind;
-    std::string file;  // that holds it
+    std::string file;           // that holds it
+    std::string spelling = {};  // the attribute of that file, where it is not its name there
 };
 
 std::vector<Line> LinesOf(const Object& object, const Metadata& metadata) {
     std::vector<Line> lines;
     for (const Metadata::Attribute& attribute : metadata.attributes) {
-        lines.push_back({attribute.name, attribute.value.size(), "attribute", attribute.holder});
+        lines.push_back({attribute.name, attribute.value.size(), "attribute", attribute.holder,
+                         attribute.spelling});
     }
     if (const auto& info = metadata.finder_info) {
-        lines.push_back(
-            {std::string(kFinderInfoName), info->value.size(), "Finder info", info->holder});
+        lines.push_back({std::string(kFinderInfoName), info->value.size(), "Finder info",
+                         info->holder, info->spelling});
     }
     if (const auto& fork = metadata.fork) {
-        lines.push_back(
-            {std::string(kResourceForkName), fork->value.size(), "resource fork", fork->holder});
+        lines.push_back({std::string(kResourceForkName), fork->value.size(), "resource fork",
+                         fork->holder, fork->spelling});
     }
     if (metadata.locked) {
         lines.push_back({std::string(kLockedName), 1, "locked state", object.path()});
@@ -92,15 +95,24 @@ class Listing {
             const Metadata metadata = ReadAll(object);
             const std::vector<Line> lines = LinesOf(object, metadata);
             if (options_.json) {
-                AddJson(object, lines);
+                AddJson(object, metadata, lines);
             } else if (!lines.empty() || !options_.recursive) {
                 AddText(shown, lines);
             }
+            TellStrays(object, metadata);
             for (const Failure& problem : metadata.problems) Add(problem);
         } catch (const Failure& failure) {
             if (!options_.recursive || !HasGone(object.place, failure)) Add(failure);
         }
         return true;
+    }
+
+    // Other programs keep one thing in several places.
+    void TellStrays(const Object& object, const Metadata& metadata) const {
+        if (options_.json || (object.dialect() == nullptr && object.declared)) return;
+        for (const Metadata::Stray& stray : metadata.strays) {
+            Note(stray.item + ": " + stray.reason);
+        }
     }
 
     void AddText(const std::string& path, const std::vector<Line>& lines) {
@@ -118,11 +130,20 @@ class Listing {
             }
             std::cout << std::setw(10) << line.size << "  " << std::left << std::setw(13)
                       << line.kind << "  " << std::setw(static_cast<int>(width)) << name
-                      << std::right << "  " << Printable(line.file) << '\n';
+                      << std::right << "  " << WhereText(line.file, line.spelling) << '\n';
         }
     }
 
-    void AddJson(const Object& object, const std::vector<Line>& lines) {
+    static void SetStrays(const Metadata& metadata, Json* entry) {
+        if (metadata.strays.empty()) return;
+        Json strays = Json::Array();
+        for (const Metadata::Stray& stray : metadata.strays) {
+            strays.Add(Json::Object({{"item", stray.item}, {"reason", stray.reason}}));
+        }
+        entry->Set("strays", std::move(strays));
+    }
+
+    void AddJson(const Object& object, const Metadata& metadata, const std::vector<Line>& lines) {
         Json attributes = Json::Array();
         for (const Line& line : lines) {
             Json entry;
@@ -130,12 +151,14 @@ class Listing {
             entry.Set("size", line.size);
             entry.Set("kind", line.kind);
             entry.SetText("file", line.file);
+            if (!line.spelling.empty()) entry.SetText("attribute", line.spelling);
             attributes.Add(std::move(entry));
         }
         Json entry;
         entry.SetText("path", object.path());
-        entry.Set("type", object.type);
+        entry.Set("type", TypeJson(object.type));
         entry.Set("attributes", std::move(attributes));
+        if (object.dialect() != nullptr || !object.declared) SetStrays(metadata, &entry);
         json_.Add(std::move(entry));
     }
 

@@ -9,6 +9,7 @@
 #include "tools/place/volume.h"
 #include "tools/say/output.h"
 #include "tools/say/text.h"
+#include "tools/store/foreign/detection.h"
 #include "tools/store/sidecars.h"
 
 namespace mavoea::tool {
@@ -88,20 +89,28 @@ ExitStatus Where(const std::string& path, bool json) {
     const Object object = FindObject(path);
     const std::string source = TypeSource(object);
     const std::vector<MetadataPlace> places = PlacesOf(object);
+    const std::optional<Sign> sign = FindSign(object.place);
     if (json) {
         Json result;
         result.SetText("path", object.path());
-        result.Set("type", object.type);
+        result.Set("type", TypeJson(object.type));
         result.Set("typeName", TypeName(object.type));
         result.Set("typeSource", source);
         Json files = Json::Array();
         for (const MetadataPlace& place : places) files.Add(PlaceJson(place));
         result.Set("files", std::move(files));
+        if (sign) {
+            result.Set("found", Json::Object({{"type", sign->dialect->name}, {"by", sign->text}}));
+        }
         Print(result);
     } else {
-        std::cout << Printable(object.path()) << "\n  volume type: " << object.type << ", "
+        std::cout << Printable(object.path()) << "\n  volume type: " << TypeId(object.type) << ", "
                   << TypeName(object.type) << " (" << source << ")\n";
         for (const MetadataPlace& place : places) std::cout << PlaceText(place);
+        if (sign) {
+            std::cout << "  other programs: " << sign->dialect->title << ", by " << sign->text
+                      << "; --volume PATH=" << sign->dialect->name << " declares it\n";
+        }
     }
     if (object.keeping() == Keeping::kNone) throw NoStore(object);
     return kSuccess;

@@ -5,6 +5,7 @@
 
 #include "include/mavoea.h"
 #include "tools/say/text.h"
+#include "tools/store/foreign/detection.h"
 #include "tools/store/marks.h"
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
@@ -63,6 +64,7 @@ class ObjectAdoption {
 
  private:
     void Convert() {
+        RequireDeclared(object_);
         RequireOwnNames(object_);
         // What is in the folder stays there, or goes into the stream.
         Metadata metadata = wanted_;

@@ -9,6 +9,9 @@
 #include "include/mavoea.h"
 #include "tools/say/messages.h"
 #include "tools/store/apple_double_file.h"
+#include "tools/store/foreign/changer.h"
+#include "tools/store/foreign/detection.h"
+#include "tools/store/foreign/marks.h"
 #include "tools/store/marks.h"
 #include "tools/store/reader.h"
 #include "tools/store/record.h"
@@ -18,15 +21,6 @@
 
 namespace mavoea::tool {
 namespace {
-
-// Finder info of another size than its own is a Failure.
-void CheckFinderInfoSize(const std::string& path, const Bytes& value) {
-    if (value.size() == kFinderInfoSize) return;
-    throw Failure(kFailed, path,
-                  "Finder info has " + std::to_string(kFinderInfoSize) + " bytes, the value has " +
-                      std::to_string(value.size()),
-                  "give all of them, as with --hex and 64 digits");
-}
 
 // ---- Volumes that keep metadata in files beside the object --------------------------------------
 
@@ -274,6 +268,10 @@ class LockChanger final : public Changer {
 
 std::unique_ptr<Changer> MakeChanger(const Object& object) {
     RequireParent(object);
+    RequireDeclared(object);
+    if (const Dialect* const dialect = object.dialect()) {
+        return OpenForeignChanger(object, *dialect);
+    }
     switch (object.keeping()) {
         case Keeping::kAppleDouble:
         case Keeping::kEaDirectory:
@@ -288,21 +286,34 @@ std::unique_ptr<Changer> MakeChanger(const Object& object) {
 
 }  // namespace
 
+void CheckFinderInfoSize(const std::string& path, const Bytes& value) {
+    if (value.size() == kFinderInfoSize) return;
+    throw Failure(kFailed, path,
+                  "Finder info has " + std::to_string(kFinderInfoSize) + " bytes, the value has " +
+                      std::to_string(value.size()),
+                  "give all of them, as with --hex and 64 digits");
+}
+
 std::unique_ptr<Changer> OpenChanger(const Object& object) {
     return std::make_unique<LockChanger>(object, MakeChanger(object));
 }
 
 void SetLocked(const Object& object, bool locked) {
     if (object.keeping() == Keeping::kNone) throw NoStore(object);
+    RequireDeclared(object);
     const Metadata metadata = ReadMetadata(object, Sidecars::Services::kLeaveOut);
     if (!metadata.problems.empty()) throw Failure(metadata.problems.front());
     const auto inode = Inode::Open(object.place);
     if (inode->HoldsContents()) {
-        if (LocksByMode(object)) {
+        const Dialect* const dialect = object.dialect();
+        if (dialect != nullptr && dialect->marks != Dialect::Marks::kHost) {
+            SetForeignLock(*dialect, *inode, locked);
+        } else if (LocksByMode(object)) {
             const mode_t before = inode->info().st_mode;
             if (locked && (before & kWriteBits) != 0) LockMode(*inode, before & kPermissionBits);
             if (!locked) UnlockMode(*inode);
             if (!locked) LetSidecarFollow(object, *inode, before);
+            if (!locked && dialect != nullptr) SetForeignLock(*dialect, *inode, false);
         } else {
             SetLockFlag(*inode, locked);
             SetRecordLock(object, *inode, locked);

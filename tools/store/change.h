@@ -20,6 +20,9 @@ class Changer {
     virtual bool Remove(const std::string& name) = 0;  // false: there was none
 };
 
+// Finder info of another size than its own is a Failure.
+void CheckFinderInfoSize(const std::string& path, const Bytes& value);
+
 // The one for the object's volume. Failure for a volume whose type has none, and where the metadata
 // would be another object's as well.
 std::unique_ptr<Changer> OpenChanger(const Object& object);

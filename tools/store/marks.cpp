@@ -1,8 +1,12 @@
 #include "tools/store/marks.h"
 
+#include <algorithm>
 #include <cerrno>
+#include <string>
+#include <vector>
 
 #include "adouble/ea_copy_lock.h"
+#include "format/dos_attributes.h"
 #include "format/flush_time.h"
 #include "format/netatalk_record.h"
 #include "include/mavoea.h"
@@ -11,6 +15,7 @@
 #include "platform/kernel.h"
 #include "platform/marks.h"
 #include "tools/say/messages.h"
+#include "tools/store/foreign/marks.h"
 
 namespace mavoea::tool {
 namespace {
@@ -35,12 +40,15 @@ std::optional<mode_t> FormerBits(const Inode& inode) {
     return bits & kWriteBits;
 }
 
-std::uint32_t AttributeWordOf(const Inode& inode) {
+// `listed`: whether the object has the attribute in which hosts keep it.
+std::uint32_t AttributeWordOf(const Inode& inode, bool listed) {
 #if MAVOEA_HOST_PLATFORM
+    if (!listed) return 0;
     // As the host's own function finds it, which takes a path.
     const auto word = inode.Attribute(attribute_word::kName);
     return word ? attribute_word::Decode(word->data(), static_cast<ssize_t>(word->size())) : 0;
 #else
+    (void)listed;
     FileStatus status;
     if (!ReadFileStatus(inode.ProcPath().c_str(), &status)) {
         throw SystemFailure(inode.path(), errno);
@@ -53,12 +61,25 @@ std::uint32_t AttributeWordOf(const Inode& inode) {
 
 void ReadMarks(const Object& object, const Inode& inode, Metadata* metadata) {
     if (!inode.HoldsContents()) return;
-    const std::uint32_t word = AttributeWordOf(inode);
+    const Dialect* const dialect = object.dialect();
+    const bool by_dos =
+        dialect != nullptr ? dialect->marks == Dialect::Marks::kDosAttributes : !object.declared;
+    const std::vector<std::string> names = inode.AttributeNames();
+    const auto has = [&](const char* name) {
+        return std::find(names.begin(), names.end(), name) != names.end();
+    };
+    const bool has_dos =
+        has(kDosAttributesName) &&
+        ReadDosAttributes(inode, by_dos ? LockedBy::kDosAttributes : LockedBy::kOthers, metadata);
+    if (dialect != nullptr) TakeMarksFromWord(metadata);
+    if (dialect != nullptr && dialect->marks != Dialect::Marks::kHost) return;
+    const std::uint32_t word = AttributeWordOf(inode, has(attribute_word::kName));
     metadata->hidden = metadata->hidden || (word & MLIBC_ATTRIBUTE_HIDDEN) != 0;
-    metadata->archived = (word & MLIBC_ATTRIBUTE_ARCHIVE) != 0;
-    metadata->locked = LocksByMode(object)
-                           ? (inode.Status().st_mode & kWriteBits) == 0
-                           : (word & MLIBC_ATTRIBUTE_LOCKED) != 0 || LockedByRecord(*metadata);
+    if (!has_dos) metadata->archived = (word & MLIBC_ATTRIBUTE_ARCHIVE) != 0;
+    const bool locked = LocksByMode(object)
+                            ? (inode.Status().st_mode & kWriteBits) == 0
+                            : (word & MLIBC_ATTRIBUTE_LOCKED) != 0 || LockedByRecord(*metadata);
+    metadata->locked = metadata->locked || locked;
 }
 
 void SetLockFlag(const Inode& inode, bool locked) {

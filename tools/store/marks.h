@@ -10,6 +10,9 @@ namespace mavoea::tool {
 
 // Volumes that keep the lock in the permissions: an object is locked that nobody may write.
 inline bool LocksByMode(const Object& object) {
+    if (const Dialect* const dialect = object.dialect()) {
+        return dialect->marks == Dialect::Marks::kHost;
+    }
     return object.keeping() == Keeping::kAppleDouble || object.keeping() == Keeping::kXattr;
 }
 

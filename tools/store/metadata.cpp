@@ -8,7 +8,6 @@
 namespace mavoea::tool {
 namespace {
 
-constexpr EntryId kFileDates{8};
 constexpr const char* kNotThere = "it is not there";
 
 std::optional<std::string> Compare(const Content& wanted, const Content& found) {
@@ -96,6 +95,10 @@ std::vector<Missing> WhatIsMissing(const Metadata& wanted, const Metadata& found
             found.locked ? "what is there is locked" : "what is there is not locked");
     }
     if (wanted.hidden && !found.hidden) add("hidden mark", "it could not be set");
+    if (wanted.system && !found.system) add("system mark", "it could not be set");
+    if (wanted.created && wanted.created != found.created) {
+        add("creation time", "it could not be set");
+    }
     return missing;
 }
 
@@ -129,10 +132,10 @@ std::string Joined(const std::vector<Missing>& missing) {
 }
 
 bool SaysSomething(EntryId id, const Bytes& bytes) {
-    constexpr std::uint8_t kUnknownDate = 0x80;
+    constexpr std::uint8_t kUnknown = 0x80;
     const Bytes meant = WithoutLock(id, bytes);
     return std::any_of(meant.begin(), meant.end(), [&](std::uint8_t byte) {
-        return byte != 0 && (id != kFileDates || byte != kUnknownDate);
+        return byte != 0 && (id != EntryId::kFileDates || byte != kUnknown);
     });
 }
 

@@ -66,6 +66,9 @@ struct Metadata {
     bool locked = false;
     bool hidden = false;
     bool archived = false;
+    bool system = false;
+    // In 100 ns from 1601-01-01 UTC, as Samba's clients have set it.
+    std::optional<std::uint64_t> created = {};
 
     // Found beside the object, and no part of what is above: a second value of something, links
     // and pipes.

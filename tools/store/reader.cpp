@@ -8,6 +8,9 @@
 #include "format/netatalk_record.h"
 #include "tools/store/apple_double_reader.h"
 #include "tools/store/by_kind.h"
+#include "tools/store/foreign/detection.h"
+#include "tools/store/foreign/marks.h"
+#include "tools/store/foreign/reader.h"
 #include "tools/store/gathering.h"
 #include "tools/store/layout.h"
 #include "tools/store/marks.h"
@@ -218,6 +221,15 @@ class AttributeReader final : public Reader {
     }
 };
 
+// What another program keeps of an object where nobody has said that it does.
+void AddUndeclared(const Object& object, const Inode& inode, Metadata* metadata) {
+    if (object.declared || !inode.HoldsContents()) return;
+    const auto sign = SignIn(inode.AttributeNames());
+    if (!sign) return;
+    AddForeignAttributes(*sign->dialect, inode, metadata);
+    TakeMarksFromWord(metadata);
+}
+
 }  // namespace
 
 Metadata ReadMetadata(const Object& object, const Inode& inode, const Sidecars& sidecars) {
@@ -225,7 +237,14 @@ Metadata ReadMetadata(const Object& object, const Inode& inode, const Sidecars& 
     const auto* const reader =
         OneFor<Reader, AppleDoubleReader, EaDirectoryReader, FileEaReader, AttributeReader>(
             object.kind());
-    if (reader != nullptr && !object.is_root()) metadata = reader->Read(inode, sidecars);
+    if (const Dialect* const dialect = object.dialect()) {
+        metadata = ReadForeign(*dialect, inode, sidecars);
+        AddServices(sidecars, &metadata);
+        AddFolder(sidecars, &metadata);
+    } else if (reader != nullptr && !object.is_root()) {
+        metadata = reader->Read(inode, sidecars);
+        Noting(&metadata, [&] { AddUndeclared(object, inode, &metadata); });
+    }
     if (sidecars.problem) metadata.problems.push_back(*sidecars.problem);
     Noting(&metadata, [&] { ReadMarks(object, inode, &metadata); });
     return metadata;

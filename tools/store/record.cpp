@@ -8,6 +8,7 @@
 #include "adouble/internal.h"
 #include "format/flush_time.h"
 #include "tools/say/messages.h"
+#include "tools/store/foreign/spelling.h"
 #include "tools/store/metadata.h"
 #include "tools/store/sidecars.h"
 #include "util/bytes.h"
@@ -80,9 +81,15 @@ std::optional<StoredRecord> ReadStoredRecord(const Object& object, RecordPlace p
     if (place == RecordPlace::kAttribute) {
         const auto inode = Inode::Open(object.place);
         if (!inode->HoldsContents()) return std::nullopt;
-        auto block = inode->Attribute(kNetatalkAttribute);
+        const bool foreign = object.dialect() != nullptr || !object.declared;
+        std::string attribute = kNetatalkAttribute;
+        auto block = inode->Attribute(attribute);
+        if (!block && foreign) {
+            attribute = kRecordAttribute;
+            block = inode->Attribute(attribute);
+        }
         if (!block) return std::nullopt;
-        return StoredRecord{object.path(), *std::move(block)};
+        return StoredRecord{object.path(), attribute, *std::move(block)};
     }
     const DirectoryRef ea_dir = object.place.directory->FindAgain(kEaDirName);
     if (!ea_dir) return std::nullopt;
@@ -91,7 +98,7 @@ std::optional<StoredRecord> ReadStoredRecord(const Object& object, RecordPlace p
     if (!file) return std::nullopt;
     Bytes block = file->Read(0, kResourceHeadSize);
     if (block.size() < kResourceHeadSize) return std::nullopt;
-    return StoredRecord{file->path(), std::move(block)};
+    return StoredRecord{file->path(), {}, std::move(block)};
 }
 
 }  // namespace mavoea::tool

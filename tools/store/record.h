@@ -50,7 +50,8 @@ void StampFlushTime(const Inode& object);
 
 // A record as it is stored, whatever it holds.
 struct StoredRecord {
-    std::string file;  // that holds it
+    std::string file;       // that holds it
+    std::string attribute;  // of that file; empty for the head of a resource file
     Bytes block;
 };
 

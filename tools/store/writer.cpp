@@ -12,6 +12,9 @@
 #include "include/mavoea.h"
 #include "tools/store/by_kind.h"
 #include "tools/store/encoding.h"
+#include "tools/store/fitting.h"
+#include "tools/store/foreign/marks.h"
+#include "tools/store/foreign/writer.h"
 #include "tools/store/locking.h"
 #include "tools/store/marks.h"
 #include "tools/store/record.h"
@@ -139,42 +142,19 @@ bool Contains(const std::vector<std::string>& paths, const std::string& path) {
     return std::find(paths.begin(), paths.end(), path) != paths.end();
 }
 
-std::string HolderOf(const WholeFile& whole) { return whole ? whole->path() : std::string(); }
-
 void WriteMarks(const Object& to, const Inode& inode, const Metadata& metadata, bool is_new) {
     if (!inode.HoldsContents()) return;
+    const Dialect* const dialect = to.dialect();
+    try {
+        const bool by_dos = dialect != nullptr && dialect->marks == Dialect::Marks::kDosAttributes;
+        WriteDosAttributes(inode, by_dos ? Into::kAny : Into::kNeeded, metadata);
+    } catch (const Failure&) {
+        // What is not there is found, and named, by who reads it back.
+    }
+    if (dialect != nullptr && dialect->marks != Dialect::Marks::kHost) return;
     if (!LocksByMode(to) && (metadata.locked || !is_new)) SetLockFlag(inode, metadata.locked);
     if (metadata.hidden) SetHidden(inode, true);
     SetArchived(inode);
-}
-
-// What is damaged has no bytes to write, unless the whole file goes as it is. The reader has said
-// so among the problems. Nor has a fork that stands for none.
-void DropDamaged(Metadata* metadata) {
-    if (metadata->fork && IsBlankFork(metadata->fork->value)) metadata->fork.reset();
-    const auto drop = [&](const auto& item) {
-        return item.value.damaged() && item.holder != HolderOf(metadata->whole_stream) &&
-               item.holder != HolderOf(metadata->whole_resource);
-    };
-    std::erase_if(metadata->attributes, drop);
-    if (metadata->finder_info && drop(*metadata->finder_info)) metadata->finder_info.reset();
-    if (metadata->fork && drop(*metadata->fork)) metadata->fork.reset();
-    std::erase_if(metadata->entries, [&](const auto& entry) { return drop(entry.second); });
-}
-
-// Entries that have no room go; `room` says how much there is.
-void FitEntries(Metadata* metadata, std::uint32_t (*room)(EntryId), const char* where,
-                std::vector<Missing>* missing) {
-    std::erase_if(metadata->entries, [&](const auto& entry) {
-        const auto& [id, item] = entry;
-        if (item.value.size() <= room(id)) return false;
-        if (!SaysSomething(id, item.value.All())) return true;
-        missing->push_back(
-            {NameOfEntry(id), room(id) == 0 ? std::string(where) + " has no place for it"
-                                            : "it has more than the " + std::to_string(room(id)) +
-                                                  " bytes that " + where + " has room for"});
-        return true;
-    });
 }
 
 // ---- What other services keep -------------------------------------------------------------------
@@ -546,6 +526,7 @@ const Writer* FindWriter(const Object& object) {
 
 const Writer& WriterFor(const Object& object) {
     RequireParent(object);
+    if (const Dialect* const dialect = object.dialect()) return ForeignWriterFor(*dialect);
     if (const Writer* const writer = FindWriter(object)) return *writer;
     throw NoStore(object);
 }
@@ -596,7 +577,8 @@ Written Writer::Write(const Object& to, const Inode& inode, const Metadata& fitt
 }
 
 void RequirePlace(const Object& to) {
-    if (to.keeping() != Keeping::kAppleDouble || !AppleDoubleName(to.place.name).empty()) return;
+    const bool beside = to.keeping() == Keeping::kAppleDouble && to.dialect() == nullptr;
+    if (!beside || !AppleDoubleName(to.place.name).empty()) return;
     throw Failure(kFailed, to.path(), "its name or path is too long to have metadata there",
                   "use a shorter name");
 }

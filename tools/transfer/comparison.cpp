@@ -10,6 +10,8 @@
 #include <map>
 #include <set>
 
+#include "tools/store/foreign/marks.h"
+#include "tools/store/foreign/spelling.h"
 #include "tools/store/metadata.h"
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
@@ -75,6 +77,11 @@ Values ValuesOf(const Metadata& metadata) {
     }
     if (metadata.locked) values[{Aspect::kAttribute, std::string(kLockedName)}] = One();
     if (metadata.hidden) values[{Aspect::kAttribute, "mavoea.hidden"}] = One();
+    if (metadata.system) values[{Aspect::kAttribute, "mavoea.system"}] = One();
+    if (metadata.created) {
+        const std::string time = std::to_string(*metadata.created);
+        values[{Aspect::kAttribute, "mavoea.created"}] = Content(Bytes(time.begin(), time.end()));
+    }
     for (const auto& [id, item] : metadata.entries) {
         Content value = item.value;
         if (!value.damaged()) {
@@ -159,8 +166,12 @@ class Comparison {
     }
 
     void CompareMetadata() {
-        const Metadata wanted = ReadMetadata(original_, Sidecars::Services::kFind);
-        const Metadata found = ReadMetadata(copy_, Sidecars::Services::kFind);
+        Metadata wanted = ReadMetadata(original_, Sidecars::Services::kFind);
+        Metadata found = ReadMetadata(copy_, Sidecars::Services::kFind);
+        if (original_.dialect() != nullptr || copy_.dialect() != nullptr) {
+            TakeMarksFromWord(&wanted);
+            TakeMarksFromWord(&found);
+        }
         for (const Metadata* one : {&wanted, &found}) {
             for (const Failure& problem : one->problems) receiver_.fails(problem);
         }
@@ -170,8 +181,8 @@ class Comparison {
         for (const Values* values : {&original, &copy}) {
             for (const auto& [key, value] : *values) keys.insert(key);
         }
-        const bool in_inode =
-            original_.keeping() == Keeping::kXattr || copy_.keeping() == Keeping::kXattr;
+        const bool in_inode = original_.keeping() == Keeping::kXattr ||
+                              copy_.keeping() == Keeping::kXattr || copy_.dialect() != nullptr;
         // What cannot be read has been told, and may hold what seems not to be there.
         const bool original_is_known = wanted.problems.empty();
         const bool copy_is_known = found.problems.empty();
@@ -221,7 +232,11 @@ class Comparison {
     bool InodeHas(const std::string& name, const Content& value) const {
         const auto inode = Inode::Open(original_.place);
         if (!inode->HoldsContents()) return false;
-        const auto own = inode->Attribute(name);
+        std::optional<Bytes> own = inode->Attribute(name);
+        if (const Dialect* const dialect = copy_.dialect()) {
+            const auto spelling = SpellAttribute(name, *dialect);
+            own = spelling ? spelling->Value(*inode) : std::nullopt;
+        }
         return own && *own == value.All();
     }
 

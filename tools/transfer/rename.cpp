@@ -79,7 +79,7 @@ class Renaming {
         const Object source = ObjectAt(from_, &info_);
         const Object target = ObjectAt(to_, &info_);
         // Below the two a directory would be kept in other ways.
-        if (source.kind() != target.kind()) return false;
+        if (source.kind() != target.kind() || source.dialect() != target.dialect()) return false;
         keeping_ = source.keeping();
         // A file system that ignores case knows one file by both names, but lists one of them.
         same_ = there_ && SameFile(*there_, info_);

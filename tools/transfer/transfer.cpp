@@ -9,10 +9,13 @@
 #include <exception>
 #include <set>
 
+#include "format/dos_attributes.h"
 #include "format/netatalk_record.h"
 #include "tools/say/job.h"
 #include "tools/say/messages.h"
 #include "tools/say/text.h"
+#include "tools/store/foreign/detection.h"
+#include "tools/store/foreign/spelling.h"
 #include "tools/store/marks.h"
 #include "tools/store/metadata.h"
 #include "tools/store/reader.h"
@@ -123,9 +126,13 @@ bool Names(const std::vector<Missing>& missing, const std::string& item) {
                        [&](const Missing& one) { return one.item == item; });
 }
 
-// Whether attributes of the object travel as its metadata, and not with its mode and owner.
+// Whether attributes of the object travel as its metadata, and not with its mode and owner. Those
+// in which Samba keeps marks and more go as they are; the marks are set after that.
 bool TravelsAsMetadata(const std::string& attribute, const Object& from, const Object& to) {
     if (IsMark(attribute)) return true;
+    if (attribute == kDosAttributesName) return false;
+    if (from.dialect() != nullptr) return IsForeign(attribute, *from.dialect());
+    if (!from.declared && IsForeignInAny(attribute)) return true;
     if (IsOfRecord(attribute)) {
         return from.kind() == VolumeKind::kFileEA || to.kind() == VolumeKind::kFileEA;
     }
@@ -266,8 +273,8 @@ Object TargetAt(const Place& to, mode_t type) {
 // Whether the copy at `there` may have this object's metadata, too, where that is in the file
 // itself.
 bool SharesMetadata(const Place& there, const Leg& leg) {
-    const bool in_inode =
-        leg.to.keeping() == Keeping::kXattr || leg.to.kind() == VolumeKind::kFileEA;
+    const bool in_inode = leg.to.keeping() == Keeping::kXattr ||
+                          leg.to.kind() == VolumeKind::kFileEA || leg.to.dialect() != nullptr;
     if (!in_inode) return true;
     const auto info = StatusOf(there);
     const Metadata other =
@@ -277,14 +284,14 @@ bool SharesMetadata(const Place& there, const Leg& leg) {
     if (leg.to.kind() == VolumeKind::kFileEA) own.attributes.clear();
     return WhatIsMissing(own, other).empty() && own.entries.size() == other.entries.size() &&
            (own.attributes.size() == other.attributes.size() ||
-            leg.to.keeping() != Keeping::kXattr) &&
+            leg.to.kind() == VolumeKind::kFileEA) &&
            own.finder_info.has_value() == other.finder_info.has_value();
 }
 
 // What of the metadata of an object that is written over lies in its attributes. What is wanted of
 // it is written anew.
 void RemoveFormerAttributes(const Leg& leg) {
-    const bool in_attributes = leg.to.keeping() == Keeping::kXattr;
+    const bool in_attributes = leg.to.keeping() == Keeping::kXattr || leg.to.dialect() != nullptr;
     if (!in_attributes && leg.to.kind() != VolumeKind::kFileEA) return;
     for (const std::string& name : leg.target->AttributeNames()) {
         const bool goes = in_attributes ? TravelsAsMetadata(name, leg.to, Object()) && !IsMark(name)
@@ -296,6 +303,14 @@ void RemoveFormerAttributes(const Leg& leg) {
 // What a service is changing stays as it is, and so does the data that belongs to it.
 void RequireUnlockedTarget(const Leg& leg) {
     if (leg.replaces) RequireUnlocked(Sidecars::Find(leg.to, Sidecars::Services::kLeaveOut));
+}
+
+// What is written beside another program's metadata, or left there with other data, nobody sees.
+void RequireSeen(const Leg& leg) {
+    const Metadata& wanted = leg.wanted;
+    if (leg.to.declared) return;
+    const bool writes = wanted.HasAny() || wanted.locked || wanted.hidden || wanted.system;
+    if (writes || (leg.replaces && SignOf(leg.to.place))) RequireDeclared(leg.to);
 }
 
 // What was to arrive, and what a writer said of it.
@@ -472,6 +487,7 @@ void Transfer::CarryMetadata(const Place& from, const Place& to) {
     Leg leg = LegFor(from, to);
     leg.target = Inode::Open(to);
     leg.former_mode = leg.target->info().st_mode & kPermissionBits;
+    RequireSeen(leg);
     RequireUnlockedTarget(leg);
     RemoveFormerAttributes(leg);
     Finish(&leg);
@@ -581,7 +597,7 @@ void Transfer::Finish(Leg* leg) {
     const bool holds = HoldsContents(leg->source->info()) && !leg->is_link;
     const FinalMode mode = holds ? FinalModeOf(*leg, manner) : FinalMode{0};
     NoteOrphan(*leg);
-    const bool keeps = leg->to.kind() != VolumeKind::kNone;
+    const bool keeps = leg->to.keeping() != Keeping::kNone;
     std::vector<Missing> missing;
     Arrival arrival;
     std::optional<Failure> failure;
@@ -681,6 +697,7 @@ bool Transfer::HasMadeLink(const Place& to) const {
 }
 
 void Transfer::RequireMayCome(const Leg& leg) const {
+    RequireSeen(leg);
     RequireNoMetadata(leg.from.place, leg.to);
     if (leg.replaces) RequireNotMade(leg.from.place, leg.to.place);
 }

@@ -1,0 +1,198 @@
+#include "tools/store/foreign/changer.h"
+
+#include <algorithm>
+
+#include "format/afp_info.h"
+#include "tools/store/apple_double_file.h"
+#include "tools/store/foreign/apple_double.h"
+#include "tools/store/foreign/record.h"
+#include "tools/store/foreign/spelling.h"
+#include "tools/store/sidecars.h"
+#include "tools/store/stream_file.h"
+
+namespace mavoea::tool {
+namespace {
+
+using Datum = Spelling::Datum;
+
+class ForeignChanger final : public Changer {
+ public:
+    ForeignChanger(const Object& object, const Dialect& dialect)
+        : object_(object), dialect_(dialect), inode_(Inode::Open(object.place)) {
+        if (inode_->HoldsContents()) return;
+        throw Failure(kFailed, object.path(), "only files and directories have attributes",
+                      "name what it leads to, if it is a symbolic link");
+    }
+
+    void Set(const std::string& name, const Bytes& value) override {
+        switch (KindOf(name)) {
+            case Kind::kAttribute:
+            case Kind::kLocked:
+                return SetAttribute(name, value);
+            case Kind::kFinderInfo:
+                CheckFinderInfoSize(object_.path(), value);
+                if (IsAllZero(value)) {
+                    (void)Remove(name);
+                } else {
+                    SetFinderInfo(value);
+                }
+                return;
+            case Kind::kResourceFork:
+                if (value.empty()) {
+                    (void)Remove(name);
+                } else {
+                    SetFork(value);
+                }
+                return;
+        }
+    }
+
+    bool Remove(const std::string& name) override {
+        switch (KindOf(name)) {
+            case Kind::kAttribute:
+            case Kind::kLocked:
+                return RemoveSpellings(Datum::kAttribute, name) | RemoveFromFile(name);
+            case Kind::kFinderInfo:
+                return RemoveFinderInfo();
+            case Kind::kResourceFork:
+                break;
+        }
+        return RemoveSpellings(Datum::kFork, {}) | RemoveFork();
+    }
+
+ private:
+    void SetAttribute(const std::string& name, const Bytes& value) const {
+        const auto spelling = SpellAttribute(name, dialect_);
+        if (!spelling) {
+            throw Failure(kFailed, object_.path(),
+                          NameOfAttribute(name) +
+                              " is too long a name there, or means something "
+                              "else to " +
+                              std::string(dialect_.program),
+                          "give it another name");
+        }
+        Store(*inode_, *spelling, value);
+        (void)RemoveSpellings(Datum::kAttribute, name, spelling->attribute);
+        // From there it would be taken over what has just been stored.
+        (void)RemoveFromFile(name);
+    }
+
+    void SetFinderInfo(const Bytes& value) const {
+        if (dialect_.finder_info == Dialect::FinderInfo::kRecord) {
+            ForeignRecord record = ForeignRecord::Read(*inode_);
+            record.Set(EntryId::kFinderInfo, value);
+            record.Store(*inode_);
+            (void)RemoveSpellings(Datum::kAfpInfo, {});
+            (void)RemoveSpellings(Datum::kFinderInfo, {});
+        } else {
+            const Spelling spelling = SpellFinderInfo(dialect_);
+            if (spelling.datum == Datum::kAfpInfo) {
+                StoreAfpInfo(spelling, value);
+            } else {
+                Store(*inode_, spelling, value);
+                (void)RemoveSpellings(Datum::kAfpInfo, {});
+            }
+            ClearRecord();
+        }
+        // What a Mac has left beside the object comes first for Samba.
+        SetFinderInfoOfFile(value);
+    }
+
+    // The backup time that is there stays.
+    void StoreAfpInfo(const Spelling& spelling, const Bytes& finder_info) const {
+        const auto there = spelling.Value(*inode_);
+        AfpInfo info = (there ? DecodeAfpInfo(*there) : std::nullopt).value_or(AfpInfo());
+        std::copy(finder_info.begin(), finder_info.end(), info.finder_info.begin());
+        const auto bytes = EncodeAfpInfo(info);
+        Store(*inode_, spelling, Bytes(bytes.begin(), bytes.end()));
+    }
+
+    bool RemoveFinderInfo() const {
+        bool removed = RemoveSpellings(Datum::kAfpInfo, {});
+        removed |= RemoveSpellings(Datum::kFinderInfo, {});
+        removed |= ClearRecord();
+        removed |= SetFinderInfoOfFile(Bytes(kFinderInfoSize));
+        return removed;
+    }
+
+    bool ClearRecord() const {
+        ForeignRecord record = ForeignRecord::Read(*inode_);
+        if (IsAllZero(record.Entry(EntryId::kFinderInfo))) return false;
+        record.Set(EntryId::kFinderInfo, Bytes(kFinderInfoSize));
+        record.Store(*inode_);
+        return true;
+    }
+
+    void SetFork(const Bytes& value) const {
+        const bool in_attribute = dialect_.fork == Dialect::Fork::kAttribute ||
+                                  inode_->Attribute(SpellFork(dialect_).attribute).has_value();
+        if (in_attribute) {
+            Store(*inode_, SpellFork(dialect_), value);
+            (void)RemoveSpellings(Datum::kFork, {}, SpellFork(dialect_).attribute);
+            (void)RemoveFork();
+            return;
+        }
+        const auto file = OpenFile(true);
+        if (file->file().Size() == 0) file->file().Write(0, EncodeForkHead(0));
+        AppleDoubleFile(*file).SetFork(value);
+        file->Commit();
+    }
+
+    bool RemoveFork() const {
+        const auto opened = OpenFile(false);
+        if (!opened) return false;
+        AppleDoubleFile file(*opened);
+        if (file.ForkLength() == 0) return false;
+        file.SetFork({});
+        return true;
+    }
+
+    bool SetFinderInfoOfFile(const Bytes& value) const {
+        const auto opened = OpenFile(false);
+        if (!opened) return false;
+        AppleDoubleFile file(*opened);
+        if (!file.HasFinderInfo()) return false;
+        file.SetFinderInfo(value);
+        return true;
+    }
+
+    bool RemoveFromFile(const std::string& name) const {
+        const auto opened = OpenFile(false);
+        return opened && StreamFile(*opened).Remove(name);
+    }
+
+    // The "._" file, if there is one or it is to be made.
+    std::unique_ptr<ChangedFile> OpenFile(bool make) const {
+        const Place& place = object_.place;
+        const std::string name = AppleDoubleName(place.name);
+        if (object_.keeping() == Keeping::kAppleDouble && !name.empty()) {
+            return ChangedFile::Open(place, {place.directory, name}, make);
+        }
+        if (!make) return nullptr;
+        throw Failure(kFailed, object_.path(), "its name is too long for a \"._\" file",
+                      "use a shorter name");
+    }
+
+    // All but one.
+    bool RemoveSpellings(Datum datum, const std::string& name, const std::string& but = {}) const {
+        bool removed = false;
+        for (const Spelling& spelling : SpellingsOf(*inode_, dialect_)) {
+            const bool is_it =
+                spelling.datum == datum && (datum != Datum::kAttribute || spelling.name == name);
+            if (is_it && spelling.attribute != but) removed |= Drop(*inode_, spelling);
+        }
+        return removed;
+    }
+
+    const Object object_;
+    const Dialect& dialect_;
+    std::shared_ptr<const Inode> inode_;
+};
+
+}  // namespace
+
+std::unique_ptr<Changer> OpenForeignChanger(const Object& object, const Dialect& dialect) {
+    return std::make_unique<ForeignChanger>(object, dialect);
+}
+
+}  // namespace mavoea::tool

@@ -1,0 +1,111 @@
+#include "tools/store/foreign/reader.h"
+
+#include <vector>
+
+#include "format/afp_info.h"
+#include "tools/store/apple_double_reader.h"
+#include "tools/store/foreign/apple_double.h"
+#include "tools/store/foreign/spelling.h"
+#include "tools/store/gathering.h"
+
+namespace mavoea::tool {
+namespace {
+
+using Datum = Spelling::Datum;
+
+// The backup time as the dates of a record have it, which know nothing else then.
+Bytes DatesOf(const AfpInfo& info) {
+    Bytes dates(kFileDatesSize);
+    for (std::size_t at = 0; at < dates.size(); at += sizeof kUnknownDate) {
+        StoreBe32(at == kBackupDateOffset ? info.backup_time : kUnknownDate, &dates[at]);
+    }
+    return dates;
+}
+
+class ForeignReader {
+ public:
+    ForeignReader(const Inode& inode, Metadata* metadata)
+        : inode_(inode), metadata_(*metadata), gathering_(metadata) {}
+
+    void Read(const Spelling& spelling) {
+        Noting(&metadata_, [&] {
+            auto value = spelling.Value(inode_);
+            if (value) Add(spelling, *std::move(value));
+        });
+    }
+
+ private:
+    void Add(const Spelling& spelling, Bytes value) {
+        const Source source = {inode_.path(), spelling.attribute};
+        switch (spelling.datum) {
+            case Datum::kRecord:
+                return ReadRecord(value, source, &metadata_);
+            case Datum::kAfpInfo:
+                return AddAfpInfo(value, source);
+            case Datum::kFinderInfo:
+                if (value.size() == kFinderInfoSize) {
+                    return gathering_.AddFinderInfo(Content(std::move(value)), source);
+                }
+                return gathering_.AddStray(
+                    "Finder info", "it has " + std::to_string(value.size()) + " bytes, and not 32",
+                    source);
+            case Datum::kFork:
+                return gathering_.AddFork(Content(std::move(value)), source);
+            case Datum::kAttribute:
+                return gathering_.AddAttribute(
+                    {spelling.name, Content(std::move(value)), 0, source.holder, source.spelling});
+        }
+    }
+
+    void AddAfpInfo(const Bytes& value, const Source& source) {
+        const auto info = DecodeAfpInfo(value);
+        if (!info) {
+            throw Failure(kFailed, source.holder,
+                          "its " + std::string(kAfpInfoStream) + " is damaged",
+                          "look at it with: getfattr -n " + source.spelling + " -e hex PATH");
+        }
+        gathering_.AddFinderInfo(Content(Bytes(info->finder_info.begin(), info->finder_info.end())),
+                                 source);
+        if (info->backup_time != kNoBackupTime) {
+            gathering_.AddEntry(EntryId::kFileDates, Content(DatesOf(*info)), source);
+        }
+    }
+
+    const Inode& inode_;
+    Metadata& metadata_;
+    Gathering gathering_;
+};
+
+}  // namespace
+
+Metadata ReadForeign(const Dialect& dialect, const Inode& inode, const Sidecars& sidecars) {
+    Metadata metadata;
+    const auto& apple_double = sidecars.apple_double;
+    // Samba takes over what a Mac has put into the file whenever a client looks.
+    const bool macs = apple_double && dialect.marks == Dialect::Marks::kDosAttributes &&
+                      apple_double->file && IsMacs(*apple_double->file);
+    if (macs) (void)ReadFound(*apple_double, &metadata);
+    std::vector<Spelling> spellings;
+    if (inode.HoldsContents()) {
+        Noting(&metadata, [&] { spellings = SpellingsOf(inode, dialect); });
+    }
+    ForeignReader reader(inode, &metadata);
+    for (const Spelling& spelling : spellings) {
+        if (spelling.datum != Datum::kFork) reader.Read(spelling);
+    }
+    // The fork beside the object is what clients see.
+    if (apple_double && !macs) (void)ReadFound(*apple_double, &metadata);
+    for (const Spelling& spelling : spellings) {
+        if (spelling.datum == Datum::kFork) reader.Read(spelling);
+    }
+    return metadata;
+}
+
+void AddForeignAttributes(const Dialect& dialect, const Inode& inode, Metadata* metadata) {
+    ForeignReader reader(inode, metadata);
+    for (const Spelling& spelling : SpellingsOf(inode, dialect)) {
+        if (spelling.certain) reader.Read(spelling);
+    }
+}
+
+}  // namespace mavoea::tool

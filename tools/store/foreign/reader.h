@@ -1,0 +1,19 @@
+// Reading what Samba, netatalk and others have kept of an object.
+#ifndef MAVOEA_TOOLS_STORE_FOREIGN_READER_H_
+#define MAVOEA_TOOLS_STORE_FOREIGN_READER_H_
+
+#include "tools/place/volume.h"
+#include "tools/store/metadata.h"
+#include "tools/store/sidecars.h"
+
+namespace mavoea::tool {
+
+// All of it, in whatever spelling; the dialect's own counts. Marks are left to ReadMarks().
+Metadata ReadForeign(const Dialect& dialect, const Inode& inode, const Sidecars& sidecars);
+
+// Adds what the attributes of an object hold that no other program would have given such names.
+void AddForeignAttributes(const Dialect& dialect, const Inode& inode, Metadata* metadata);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_STORE_FOREIGN_READER_H_

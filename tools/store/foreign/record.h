@@ -1,0 +1,41 @@
+// netatalk's record of an object, in the attribute that netatalk and Samba keep it in.
+#ifndef MAVOEA_TOOLS_STORE_FOREIGN_RECORD_H_
+#define MAVOEA_TOOLS_STORE_FOREIGN_RECORD_H_
+
+#include <map>
+#include <optional>
+
+#include "format/apple_double.h"
+#include "tools/place/directory.h"
+
+namespace mavoea::tool {
+
+// What is changed is stored by Store() only. All members throw Failure.
+class ForeignRecord {
+ public:
+    // Of an object without a record, one that says nothing.
+    static ForeignRecord Read(const Inode& object);
+    ForeignRecord() = default;
+
+    // Empty where it has none.
+    const Bytes& Entry(EntryId id) const;
+    // It fits.
+    void Set(EntryId id, Bytes bytes);
+
+    // netatalk's own entries aside.
+    bool SaysAnything() const;
+
+    // Never one that smbd would remove. A record that says nothing is stored only where there is
+    // one already.
+    void Store(const Inode& object) const;
+
+ private:
+    Bytes Encode() const;
+
+    std::map<EntryId, Bytes> entries_;
+    bool there_ = false;
+};
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_STORE_FOREIGN_RECORD_H_

@@ -1,0 +1,58 @@
+// The extended attributes in which other programs keep what is known of an object.
+#ifndef MAVOEA_TOOLS_STORE_FOREIGN_SPELLING_H_
+#define MAVOEA_TOOLS_STORE_FOREIGN_SPELLING_H_
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "tools/place/dialect.h"
+#include "tools/place/directory.h"
+
+namespace mavoea::tool {
+
+// netatalk's record, as netatalk and Samba call it.
+inline constexpr char kRecordAttribute[] = "user.org.netatalk.Metadata";
+
+struct Spelling {
+    enum class Datum { kRecord, kAfpInfo, kFinderInfo, kFork, kAttribute };
+
+    std::string attribute;  // of the object: "user.DosStream.colour:$DATA"
+    Datum datum;
+    std::string name = {};  // of an attribute: "colour"
+    bool has_nul = false;   // behind the value
+    bool own = false;       // the dialect's; otherwise another program has left it
+    bool certain = true;    // the name alone says that it is such a program's
+
+    // The bytes that are meant; those of larger ones go on in further attributes. None when it has
+    // gone. Throws Failure.
+    std::optional<Bytes> Value(const Inode& inode) const;
+};
+
+// What an attribute of an object means in a dialect; none when it is nothing of the kind, or the
+// continuation of another.
+std::optional<Spelling> SpellingOf(const std::string& attribute, const Dialect& dialect);
+
+// All that an object has, the dialect's own first.
+std::vector<Spelling> SpellingsOf(const Inode& inode, const Dialect& dialect);
+
+// How the dialect spells an attribute of that name; none where it would mean something else, or is
+// too long.
+std::optional<Spelling> SpellAttribute(const std::string& name, const Dialect& dialect);
+// The same for the Finder info, outside of a record, and for the fork.
+Spelling SpellFinderInfo(const Dialect& dialect);
+Spelling SpellFork(const Dialect& dialect);
+
+// Whether another program keeps metadata in an attribute of that name, values that go on included:
+// in that dialect, or in any.
+bool IsForeign(const std::string& attribute, const Dialect& dialect);
+bool IsForeignInAny(const std::string& attribute);
+
+// Stores it. A Failure that names the limit where the file system has no room for it.
+void Store(const Inode& inode, const Spelling& spelling, Bytes value);
+// False: there was none.
+bool Drop(const Inode& inode, const Spelling& spelling);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_STORE_FOREIGN_SPELLING_H_
