@@ -8,24 +8,24 @@ namespace {
 constexpr std::uint32_t kAttributesValid = 0x01;
 constexpr std::uint32_t kCreationTimeValid = 0x10;
 
-constexpr std::uint16_t LoadLe16(ByteView bytes, std::size_t at) {
+std::uint16_t LoadLe16(ByteView bytes, std::size_t at) {
     return static_cast<std::uint16_t>(bytes[at] | bytes[at + 1] << 8);
 }
-constexpr std::uint32_t LoadLe32(ByteView bytes, std::size_t at) {
+std::uint32_t LoadLe32(ByteView bytes, std::size_t at) {
     return LoadLe16(bytes, at) | std::uint32_t{LoadLe16(bytes, at + 2)} << 16;
 }
-constexpr std::uint64_t LoadLe64(ByteView bytes, std::size_t at) {
+std::uint64_t LoadLe64(ByteView bytes, std::size_t at) {
     return LoadLe32(bytes, at) | std::uint64_t{LoadLe32(bytes, at + 4)} << 32;
 }
-constexpr void StoreLe16(std::uint16_t value, ByteSpan bytes, std::size_t at) {
+void StoreLe16(std::uint16_t value, ByteSpan bytes, std::size_t at) {
     bytes[at] = static_cast<std::uint8_t>(value);
     bytes[at + 1] = static_cast<std::uint8_t>(value >> 8);
 }
-constexpr void StoreLe32(std::uint32_t value, ByteSpan bytes, std::size_t at) {
+void StoreLe32(std::uint32_t value, ByteSpan bytes, std::size_t at) {
     StoreLe16(static_cast<std::uint16_t>(value), bytes, at);
     StoreLe16(static_cast<std::uint16_t>(value >> 16), bytes, at + 2);
 }
-constexpr void StoreLe64(std::uint64_t value, ByteSpan bytes, std::size_t at) {
+void StoreLe64(std::uint64_t value, ByteSpan bytes, std::size_t at) {
     StoreLe32(static_cast<std::uint32_t>(value), bytes, at);
     StoreLe32(static_cast<std::uint32_t>(value >> 32), bytes, at + 4);
 }
