@@ -273,7 +273,9 @@ def survey(programs, out, jobs):
         started = time.monotonic()
         if not run(program, {"MAVOEA_REACHED": str(reached)}, 300):
             sys.exit(f"{program.name} fails without any mutant")
-        return time.monotonic() - started, program, reached.read_text().split()
+        # A program with none of the code that has mutants tells of none.
+        numbers = reached.read_text().split() if reached.exists() else ()
+        return time.monotonic() - started, program, numbers
 
     seen = {}
     with concurrent.futures.ThreadPoolExecutor(jobs) as pool:
