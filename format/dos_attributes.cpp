@@ -55,13 +55,13 @@ std::optional<Fields> FindFields(ByteView bytes) {
     const auto text_end = std::find(bytes.begin(), bytes.end(), 0);
     const auto text_size = static_cast<std::size_t>(text_end - bytes.begin());
     const std::size_t versions = (text_size + 2) & ~std::size_t{1};  // behind the NUL
-    if (versions > bytes.size() || bytes.size() - versions < 4) return std::nullopt;
+    if (bytes.size() < versions + 4) return std::nullopt;
     const std::uint16_t version = LoadLe16(bytes, versions);
     if (version < 1 || version > std::size(kLayouts)) return std::nullopt;
     if (LoadLe16(bytes, versions + 2) != version) return std::nullopt;
     const Layout& layout = kLayouts[version - 1];
     const std::size_t offset = (versions + 4 + 3) & ~std::size_t{3};
-    if (offset > bytes.size() || bytes.size() - offset < layout.size) return std::nullopt;
+    if (bytes.size() < offset + layout.size) return std::nullopt;
     return Fields{&layout, offset};
 }
 

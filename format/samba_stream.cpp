@@ -14,14 +14,6 @@ constexpr std::string_view kPrivate = "\xEF\x80";
 constexpr std::string_view kMapped = "\"*:<>?\\|";  // U+F020 to U+F027
 constexpr unsigned kFirstMapped = 0x20;
 
-// The plain character of a private one; NUL where there is none.
-char PlainOf(char last_byte) {
-    const unsigned low = static_cast<unsigned char>(last_byte) - 0x80U;
-    if (low < kFirstMapped) return static_cast<char>(low);
-    if (low < kFirstMapped + kMapped.size()) return kMapped[low - kFirstMapped];
-    return '\0';
-}
-
 // The low bits of the private character that stands for one; 0 where a plain one stands.
 unsigned PrivateOf(char plain) {
     const auto code = static_cast<unsigned char>(plain);
@@ -29,6 +21,16 @@ unsigned PrivateOf(char plain) {
     const std::size_t mapped = kMapped.find(plain);
     if (mapped == std::string_view::npos) return 0;
     return kFirstMapped + static_cast<unsigned>(mapped);
+}
+
+// The plain character of a private one; NUL where there is none.
+char PlainOf(char last_byte) {
+    const unsigned low = static_cast<unsigned char>(last_byte) - 0x80U;
+    if (low < kFirstMapped) return static_cast<char>(low);
+    for (const char plain : kMapped) {
+        if (PrivateOf(plain) == low) return plain;
+    }
+    return '\0';
 }
 
 bool TakePrefix(std::string_view prefix, std::string_view* text) {
@@ -68,13 +70,11 @@ std::optional<StreamAttribute> DecodeStreamAttribute(std::string_view attribute)
         !(TakePrefix(kExtentPrefix, &left) && TakeExtent(&left, &stream.extent))) {
         return std::nullopt;
     }
-    if (!left.ends_with(kSuffix)) return std::nullopt;
-    left.remove_suffix(kSuffix.size());
-    if (left.empty()) return std::nullopt;
-    while (!left.empty()) {
+    if (!left.ends_with(kSuffix) || left.size() == kSuffix.size()) return std::nullopt;
+    while (left.size() > kSuffix.size()) {  // which stays, so that a byte is behind any two
         std::size_t size = 1;
         char plain = left.front();
-        if (left.size() > kPrivate.size() && left.starts_with(kPrivate)) {
+        if (left.starts_with(kPrivate)) {
             if (const char mapped = PlainOf(left[kPrivate.size()]); mapped != '\0') {
                 size = kPrivate.size() + 1;
                 plain = mapped;

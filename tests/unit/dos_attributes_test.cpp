@@ -144,7 +144,9 @@ TEST(DosAttributesTest, TextAloneTellsAttributes) {
                                            {"0x1", 1},
                                            {"0", 0},
                                            {"0x", 0},
-                                           {"0xAbCdEf01", 0xABCDEF01}}) {
+                                           {"0xAbCdEf01", 0xABCDEF01},
+                                           {"0xFFFFFFFF", 0xFFFFFFFF},
+                                           {"0xffffffff", 0xFFFFFFFF}}) {
         SCOPED_TRACE(c.text);
         ExpectDecoded(Ascii(c.text), c.attributes, std::nullopt);
         ExpectDecoded(Ascii(c.text) + Bytes{0}, c.attributes, std::nullopt);
@@ -152,7 +154,7 @@ TEST(DosAttributesTest, TextAloneTellsAttributes) {
 }
 
 TEST(DosAttributesTest, WhatIsNoValueTellsNothing) {
-    for (const std::string text : {"", "x22", "-0x22", " 22", "0x123456789", "hidden"}) {
+    for (const std::string text : {"", "x22", "-0x22", " 22", "0x100000000", "hidden"}) {
         SCOPED_TRACE(text);
         EXPECT_FALSE(DecodeDosAttributes(Ascii(text)));
         EXPECT_FALSE(DecodeDosAttributes(Ascii(text) + Bytes{0}));
