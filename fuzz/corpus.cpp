@@ -24,6 +24,9 @@ constexpr Target kTargets[] = {
     {"afp_info_fuzz", WriteAfpInfoSeeds},
     {"dos_attributes_fuzz", WriteDosAttributesSeeds},
     {"samba_stream_fuzz", WriteSambaStreamSeeds},
+    {"apple_single_fuzz", WriteAppleSingleSeeds},
+    {"mac_binary_fuzz", WriteMacBinarySeeds},
+    {"bin_hex_fuzz", WriteBinHexSeeds},
 };
 
 }  // namespace

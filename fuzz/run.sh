@@ -26,6 +26,9 @@ resource_copy_fuzz 100000 4096
 afp_info_fuzz 100000 128
 dos_attributes_fuzz 100000 128
 samba_stream_fuzz 100000 512
+apple_single_fuzz 100000 512
+mac_binary_fuzz 100000 512
+bin_hex_fuzz 20000 1024
 '
 
 # run NAME INPUTS LONGEST

@@ -15,6 +15,9 @@ void WriteUpgradeSeeds(const std::string& directory);
 void WriteAfpInfoSeeds(const std::string& directory);
 void WriteDosAttributesSeeds(const std::string& directory);
 void WriteSambaStreamSeeds(const std::string& directory);
+void WriteAppleSingleSeeds(const std::string& directory);
+void WriteMacBinarySeeds(const std::string& directory);
+void WriteBinHexSeeds(const std::string& directory);
 
 }  // namespace mavoea::fuzz
 
