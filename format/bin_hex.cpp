@@ -8,17 +8,6 @@ namespace {
 // The line as far as all versions of it are alike.
 constexpr std::string_view kLineBegins = "(This file must be converted with BinHex";
 
-constexpr std::uint8_t kNoDigit = 64;
-constexpr std::array<std::uint8_t, 256> MakeDigits() {
-    std::array<std::uint8_t, 256> table{};
-    table.fill(kNoDigit);
-    for (std::size_t i = 0; i < kBinHexDigits.size(); ++i) {
-        table[static_cast<unsigned char>(kBinHexDigits[i])] = static_cast<std::uint8_t>(i);
-    }
-    return table;
-}
-constexpr std::array<std::uint8_t, 256> kDigitOf = MakeDigits();
-
 bool IsSpace(std::uint8_t c) { return c == ' ' || c == '\t' || c == '\r' || c == '\n'; }
 
 }  // namespace
@@ -34,9 +23,9 @@ std::optional<std::uint8_t> BinHexReader::Packed() {
         if (left_.empty()) return std::nullopt;
         const std::uint8_t c = left_.front();
         if (!IsSpace(c)) {
-            const std::uint8_t digit = kDigitOf[c];
-            if (digit == kNoDigit) return std::nullopt;  // the ':' at the end is none either
-            bits_ = bits_ << 6 | digit;
+            const std::size_t digit = kBinHexDigits.find(static_cast<char>(c));
+            if (digit == std::string_view::npos) return std::nullopt;  // as the ':' at the end
+            bits_ = bits_ << 6 | static_cast<std::uint32_t>(digit);
             bit_count_ += 6;
         }
         left_ = left_.subspan(1);
@@ -70,11 +59,9 @@ bool BinHexReader::Read(ByteSpan to) {
 }
 
 bool BinHexReader::EndPart() {
-    const std::uint16_t crc = crc_;
+    // Bytes with their checksum behind them have the checksum 0, with which the next part begins.
     std::array<std::uint8_t, 2> bytes{};
-    const bool is_right = Read(bytes) && LoadBe16(bytes.data()) == crc;
-    crc_ = 0;
-    return is_right;
+    return Read(bytes) && crc_ == 0;
 }
 
 std::optional<BinHexHead> BinHexReader::ReadHead() {

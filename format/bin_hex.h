@@ -144,8 +144,7 @@ template <class Put>
 void BinHexWriter<Put>::EndPart() {
     std::array<std::uint8_t, 2> bytes{};
     StoreBe16(crc_, bytes.data());
-    Write(bytes);
-    crc_ = 0;
+    Write(bytes);  // which brings the checksum back to 0
 }
 
 template <class Put>

@@ -57,12 +57,10 @@ std::optional<MacBinary> DecodeMacBinary(ByteView head, std::uint64_t file_size)
     info.creation_time = LoadBe32(&head[91]);
     info.modification_time = LoadBe32(&head[95]);
     info.comment_length = LoadBe16(&head[99]);
-    std::uint16_t second_header = 0;
-    if (file.version > 1) {
-        if (head[123] > kVersionNeeded) return std::nullopt;
-        info.finder_info[kFinderFlagsOffset + 1] = head[101];
-        second_header = LoadBe16(&head[120]);
-    }
+    // Version 1 has zeros from here on.
+    if (head[123] > kVersionNeeded) return std::nullopt;
+    info.finder_info[kFinderFlagsOffset + 1] = head[101];
+    const std::uint16_t second_header = LoadBe16(&head[120]);
     if (file.version > 2) {
         info.finder_info[kScript] = head[106];
         info.finder_info[kExtendedFlags] = head[107];

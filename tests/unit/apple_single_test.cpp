@@ -147,6 +147,9 @@ TEST(AppleSingleTest, AHeadHasTheSizeOfItsEntries) {
     EXPECT_FALSE(EncodeAppleSingleHead(entries, small));
     Bytes large(51);
     EXPECT_FALSE(EncodeAppleSingleHead(entries, large));
+    entries.resize(65535);
+    Bytes most(26 + 12 * 65535);
+    EXPECT_TRUE(EncodeAppleSingleHead(entries, most));
     entries.resize(65536);
     Bytes wrapped(26);
     EXPECT_FALSE(EncodeAppleSingleHead(entries, wrapped));
