@@ -25,8 +25,6 @@ from impacket.smb3structs import (
 )
 from impacket.smbconnection import SMBConnection
 
-__all__ = ["Mac", "SessionError"]
-
 READ_ONLY, HIDDEN, SYSTEM, DIRECTORY, ARCHIVE, NORMAL = 0x1, 0x2, 0x4, 0x10, 0x20, 0x80
 SHARED = FILE_SHARE_READ | FILE_SHARE_WRITE | FILE_SHARE_DELETE
 STATUS_END_OF_FILE = 0xC0000011
@@ -84,19 +82,14 @@ class Mac:
                 if len(piece) < PIECE:
                     return data
 
-    def write(self, path, data, offset=0, create=True):
-        """Into what is there, which keeps what it has behind the data."""
-        with self._opened(path, FILE_WRITE_DATA, FILE_OPEN_IF if create else FILE_OPEN) as file:
-            self._write(file, data, offset)
+    def write(self, path, data):
+        """Over what is there, which keeps what it has behind the data."""
+        with self._opened(path, FILE_WRITE_DATA, FILE_OPEN_IF) as file:
+            self._write(file, data)
 
     def replace(self, path, data):
         with self._opened(path, FILE_WRITE_DATA, FILE_OVERWRITE_IF) as file:
-            self._write(file, data, 0)
-
-    def touch(self, path):
-        """Opens, and makes what is not there."""
-        with self._opened(path, FILE_WRITE_DATA, FILE_OPEN_IF):
-            pass
+            self._write(file, data)
 
     def mkdir(self, path):
         with self._opened(path, FILE_READ_ATTRIBUTES, FILE_OPEN_IF, FILE_DIRECTORY_FILE):
@@ -141,10 +134,10 @@ class Mac:
             info = self._smb.queryInfo(self._tree, file, fileInfoClass=SMB2_FILE_BASIC_INFO)
         return struct.unpack_from("<QQQQI", info)
 
-    def _write(self, file, data, offset):
+    def _write(self, file, data):
         for at in range(0, len(data), PIECE):
             piece = data[at : at + PIECE]
-            written = self._smb.write(self._tree, file, piece, offset + at, len(piece))
+            written = self._smb.write(self._tree, file, piece, at, len(piece))
             assert written == len(piece), (written, len(piece))
 
     def _open(self, path, access, disposition=FILE_OPEN, options=0, contexts=None):
