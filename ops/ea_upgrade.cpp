@@ -14,6 +14,8 @@
 #include "include/mavoea.h"
 #include "ops/folder.h"
 #include "ops/new_file.h"
+#include "path/ea_adpath.h"
+#include "path/ea_open.h"
 #include "platform/file_status.h"
 #include "platform/include/mavocore.h"
 #include "platform/marks.h"
@@ -48,6 +50,9 @@ int IsThere(const char* path, int line = __builtin_LINE()) {
     if (kernel::Access(path, F_OK) == 0) return 1;
     return SaysMissing(errno) ? 0 : unit.Fail(Err::kOpen, line);
 }
+
+// What is known of the file of the current layout beforehand.
+enum class Current { kUnknown, kMissed };
 
 // Whether something is there by now: another process may have been quicker. errno stays.
 bool IsThereNow(const char* path) {
@@ -217,7 +222,11 @@ std::int64_t AppleDoubleAccess(const char* path) {
 }
 
 // The "._" file becomes the stream as it is.
-int AdoptAppleDouble(const char* szPath, const char* apple_double, const char* stream_path) {
+int AdoptAppleDouble(const char* szPath, const char* apple_double, const char* stream_path,
+                     Current current) {
+    if (current == Current::kMissed) {
+        if (const int there = IsThere(stream_path); there != 0) return there;
+    }
     char dir[kPathBufferSize];
     if (MAVOEADirPath(EA_FORM_FILE, szPath, dir, kDerivedPathMax) != 0) return kFailure;
     if (MAVOEAMKDir(0, dir) != 0) return kFailure;
@@ -225,7 +234,26 @@ int AdoptAppleDouble(const char* szPath, const char* apple_double, const char* s
     return IsThereNow(stream_path) ? kCurrent : unit.Fail(Err::kRename);
 }
 
-int ConvertStream(const char* szPath, const char* stream_path, Folder* folder) {
+// Where the stream of an object may be kept in an earlier layout.
+enum class Legacy { kAnywhere, kInFolder, kNowhere };
+
+// Where that is for who has just missed the stream. The "._" file is looked for before the EA
+// directory: who makes a stream of it meanwhile makes that first, if need be.
+Legacy LegacyPlace(const char* szPath, const char* folder_path) {
+    char path[kPathBufferSize];
+    if (SplitObject(szPath).name.size() > kAppleDoubleNameMax ||
+        MAVOEAADPath(szPath, path, kDerivedPathMax) != 0) {
+        return Legacy::kAnywhere;
+    }
+    struct stat info;
+    if (kernel::Lstat(path, &info) == 0 || errno != ENOENT) return Legacy::kAnywhere;
+    CutShort(path, sizeof path).Add(WithoutTrailingSlash(SplitObject(folder_path).parent));
+    return kernel::Access(path, F_OK) != 0 && errno == ENOENT ? Legacy::kNowhere
+                                                              : Legacy::kInFolder;
+}
+
+int ConvertStream(const char* szPath, const char* stream_path, Folder* folder, Current current,
+                  Legacy place) {
     const std::int64_t folder_time = *folder ? LatestAccess(folder) : 0;
     if (folder_time < 0) return kFailure;
     char apple_double[kPathBufferSize];
@@ -234,17 +262,17 @@ int ConvertStream(const char* szPath, const char* stream_path, Folder* folder) {
         if (MLIBCErrGet() != MAVOEA_ERR_NAME_TOO_LONG) return kFailure;
         return folder_time == 0 ? kConverted : ImportAttributeFiles(szPath, stream_path, folder);
     }
-    const std::int64_t file_time = AppleDoubleAccess(apple_double);
+    const std::int64_t file_time = place == Legacy::kInFolder ? 0 : AppleDoubleAccess(apple_double);
     if (file_time < 0) return kFailure;
     if (folder_time == 0 && file_time == 0) {
         return *folder && IsThereNow(stream_path) ? kCurrent : kNothing;
     }
     // Deliberately the time of the last access, not that of the last change.
     return file_time < folder_time ? ImportAttributeFiles(szPath, stream_path, folder)
-                                   : AdoptAppleDouble(szPath, apple_double, stream_path);
+                                   : AdoptAppleDouble(szPath, apple_double, stream_path, current);
 }
 
-int UpgradeStream(const char* szPath) {
+int UpgradeStream(const char* szPath, Current current, bool* nowhere) {
     char stream_path[kPathBufferSize];
     char folder_path[kPathBufferSize];
     if (MAVOEAPath(EA_FORM_FILE, szPath, MAVOEA_KIND_STREAM, stream_path, kDerivedPathMax,
@@ -252,12 +280,19 @@ int UpgradeStream(const char* szPath) {
         MAVOEADirPath(EA_FORM_FOLDER, szPath, folder_path, kDerivedPathMax) != 0) {
         return kFailure;
     }
-    if (const int there = IsThere(stream_path); there != 0) return there;
-
+    if (current == Current::kUnknown) {
+        if (const int there = IsThere(stream_path); there != 0) return there;
+    }
+    Legacy place = Legacy::kAnywhere;
+    if (nowhere != nullptr) {
+        place = LegacyPlace(szPath, folder_path);
+        *nowhere = place == Legacy::kNowhere;
+        if (*nowhere) return kNothing;
+    }
     Folder folder(folder_path);
     if (!folder && !SaysMissing(errno)) return unit.Fail(Err::kOpen);
     const bool missing = !folder && errno == ENOENT;
-    const int result = ConvertStream(szPath, stream_path, &folder);
+    const int result = ConvertStream(szPath, stream_path, &folder, current, place);
     return missing ? result : RemoveFolder(folder_path, result);
 }
 
@@ -341,7 +376,7 @@ void CarryMarks(const char* resource_file, const char* szPath) {
     (void)kernel::FileCommand(szPath, marks.invisible ? marks::kSetHidden : marks::kClearHidden);
 }
 
-int UpgradeResourceFile(const char* szPath) {
+int UpgradeResourceFile(const char* szPath, Current known) {
     char legacy[kPathBufferSize];
     char current[kPathBufferSize];
     if (MAVOEAPath(EA_FORM_FOLDER, szPath, MAVOEA_KIND_LEGACY_RESOURCE, legacy, kDerivedPathMax,
@@ -350,8 +385,13 @@ int UpgradeResourceFile(const char* szPath) {
                    EA_PLACE_EADIR) != 0) {
         return kFailure;
     }
-    if (const int there = IsThere(current); there != 0) return there;
+    if (known == Current::kUnknown) {
+        if (const int there = IsThere(current); there != 0) return there;
+    }
     if (const int there = IsThere(legacy); there != 1) return there == 0 ? kNothing : kFailure;
+    if (known == Current::kMissed) {
+        if (const int there = IsThere(current); there != 0) return there;
+    }
     const UniqueFd folder = FolderOf(legacy);
     if (!folder) return unit.Fail(Err::kOpen);
     if (kernel::RenameAt(folder.get(), MAVOEA_KIND_LEGACY_RESOURCE, AT_FDCWD, current) != 0) {
@@ -378,16 +418,25 @@ int UpgradeReserved(const char* szPath, const char* szName) {
     return MLIBCExec("/bin/mv", legacy, current, nullptr) == -1 ? kFailure : kConverted;
 }
 
+int Upgrade(const char* szPath, const char* szName, Current current, bool* nowhere) {
+    const std::string_view kind = szName;
+    if (kind == MAVOEA_KIND_STREAM) return UpgradeStream(szPath, current, nowhere);
+    if (kind == MAVOEA_KIND_RESOURCE) return UpgradeResourceFile(szPath, current);
+    if (kind.starts_with(kReserved)) return UpgradeReserved(szPath, szName);
+    return unit.Fail(Err::kBadArgument);
+}
+
 }  // namespace
+
+int UpgradeMissed(const char* szPath, const char* szName, bool* nowhere) {
+    return Upgrade(szPath, szName, Current::kMissed, nowhere);
+}
+
 }  // namespace mavoea
 
 using namespace mavoea;
 
 int MAVOEAUpgrade(const char* szPath, const char* szName) {
     if (szName == nullptr) return unit.Fail(Err::kBadArgument);
-    const std::string_view kind = szName;
-    if (kind == MAVOEA_KIND_STREAM) return UpgradeStream(szPath);
-    if (kind == MAVOEA_KIND_RESOURCE) return UpgradeResourceFile(szPath);
-    if (kind.starts_with(kReserved)) return UpgradeReserved(szPath, szName);
-    return unit.Fail(Err::kBadArgument);
+    return Upgrade(szPath, szName, Current::kUnknown, nullptr);
 }

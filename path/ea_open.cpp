@@ -50,19 +50,30 @@ int OpenInEADir(int form, const char* szPath, const char* szName, int oflag, boo
     char path[kPathBufferSize];
     if (MAVOEAPath(form, szPath, szName, path, MAVOEA_PATH_SIZE, EA_PLACE_EADIR) != 0) return -1;
 
-    if ((oflag & O_CREAT) != 0) {
-        char dir[kPathBufferSize];
-        if (MAVOEADirPath(form, szPath, dir, MAVOEA_PATH_SIZE) != 0) return -1;
-        if (MAVOEAMKDir(form == EA_FORM_FOLDER, dir) != 0) return -1;
+    const bool creates = (oflag & O_CREAT) != 0;
+    char dir[kPathBufferSize];
+    if (creates && MAVOEADirPath(form, szPath, dir, MAVOEA_PATH_SIZE) != 0) return -1;
+    if (form == EA_FORM_FOLDER) {
+        if (creates && MAVOEAMKDir(1, dir) != 0) return -1;
+        return kernel::OpenRegular(path, oflag, kMode);
     }
-    if (form == EA_FORM_FOLDER) return kernel::OpenRegular(path, oflag, kMode);
 
-    const int fd = kernel::OpenRegular(path, oflag & ~O_CREAT, kMode);
+    // Where the file is, its directory need not be made, by who could make it.
+    const bool at_once = !creates || kernel::Geteuid() == 0;
+    int fd = at_once ? kernel::OpenRegular(path, oflag & ~O_CREAT, kMode) : -1;
+    if (fd < 0 && creates) {
+        const int error = errno;
+        if (MAVOEAMKDir(0, dir) != 0) return -1;
+        errno = error;
+        if (!at_once) fd = kernel::OpenRegular(path, oflag & ~O_CREAT, kMode);
+    }
     if (fd >= 0 || errno != ENOENT) return fd;
     // Before it is missed, or made empty, it is looked for where earlier versions kept it.
-    if (MAVOEAUpgrade(szPath, szName) == -1 && (oflag & O_CREAT) != 0 && MayHaveLeftSomething()) {
-        return -1;
-    }
+    bool nowhere = false;
+    const int upgraded = form == EA_FORM_FILE
+                             ? UpgradeMissed(szPath, szName, creates ? nullptr : &nowhere)
+                             : MAVOEAUpgrade(szPath, szName);
+    if (nowhere || (upgraded == -1 && creates && MayHaveLeftSomething())) return -1;
     if (made != nullptr) return OpenOrMake(path, made);
     return kernel::OpenRegular(path, oflag, kMode);
 }

@@ -8,6 +8,12 @@ namespace mavoea {
 // has made the file.
 int OpenOrMakeMetadata(const char* szPath, const char* szName, bool* made);
 
+// MAVOEAUpgrade(), which stands above this folder, for who has just missed the file that it would
+// make: it looks for that one again only before it would replace it. With `nowhere`, that is told
+// whether the object has no metadata of the kind in any layout, whoever may be converting it, so
+// that the file need not be looked for again; errno is ENOENT then.
+int UpgradeMissed(const char* szPath, const char* szName, bool* nowhere);
+
 }  // namespace mavoea
 
 #endif  // MAVOEA_PATH_EA_OPEN_H_

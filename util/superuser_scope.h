@@ -13,7 +13,7 @@ class SuperuserScope {
     SuperuserScope() : former_(kernel::Geteuid()), ok_(former_ == 0 || kernel::Seteuid(0) == 0) {}
     ~SuperuserScope() {
         const ErrnoKeeper keep;
-        if (kernel::Geteuid() != former_) (void)kernel::Seteuid(former_);
+        if (former_ != 0 && kernel::Geteuid() != former_) (void)kernel::Seteuid(former_);
     }
     SuperuserScope(const SuperuserScope&) = delete;
     SuperuserScope& operator=(const SuperuserScope&) = delete;

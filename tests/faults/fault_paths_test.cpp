@@ -326,8 +326,6 @@ TEST(OpenFaults, AStreamIsMadeWithItsDirectoryOrErrnoTells) {
              .errors = {EIO, EACCES, EPERM, EMFILE, EINTR, ENOMEM, EROFS, ENOSPC},
              .outcome = not_opened},
             // The search in older layouts, which must not miss what a new file would hide.
-            {.call = "access", .errors = {ENOENT}, .outcome = {.files = Files::kDone}},
-            {.call = "access", .outcome = unseen},
             {.call = "opendir", .errors = {ENOENT}, .outcome = {.files = Files::kDone}},
             {.call = "opendir", .outcome = unseen},
             {.call = "lstat",

@@ -956,8 +956,6 @@ TEST(RepairFaults, AResourceFileWithAttributesIsConvertedOrStaysAsItIs) {
             {.call = "open", .with = "@MavoEAStream, O_RDWR|O_CREAT", .outcome = NotRepaired()},
             {.call = "open", .with = "@MavoEAStream,", .errors = {ENOENT}, .outcome = kRepaired},
             {.call = "open", .with = "@MavoEAStream,", .outcome = NotRepaired()},
-            {.call = "access", .errors = {ENOENT}, .outcome = kRepaired},
-            {.call = "access", .outcome = NotRepaired()},
             {.call = "opendir", .errors = {ENOENT}, .outcome = kRepaired},
             {.call = "opendir", .outcome = NotRepaired()},
             {.call = "lstat", .errors = {ENOENT}, .outcome = kRepaired},

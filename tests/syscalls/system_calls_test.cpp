@@ -20,6 +20,7 @@
 namespace mavoea::test {
 namespace {
 
+using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 using ::testing::PrintToString;
 
@@ -74,6 +75,13 @@ class SystemCallsTest : public ::testing::Test {
         });
     }
 
+    // Opens a metadata file that is not there.
+    void TraceMissing(const std::string& object, const char* kind) {
+        Trace([&] {
+            return MAVOEAOpen(EA_FORM_FILE, object.c_str(), kind, O_RDONLY, EA_PLACE_EADIR) == -1;
+        });
+    }
+
     // Overwrites the first value of a stream that is open, with as many bytes.
     void TraceOverwritingIn(const StreamImage& image) {
         const std::string path = dir_ / "stream";
@@ -121,19 +129,47 @@ TEST_F(SystemCallsTest, NameTestsMakeNone) {
     EXPECT_THAT(calls_, IsEmpty());
 }
 
-// Two opens of the stream, and between them one look at each place of earlier layouts: the stream,
-// the folder, the "._" file.
-TEST_F(SystemCallsTest, OpeningAMissingStreamOfAnObjectWithoutLegacyMetadataTakesAtMostFive) {
+// One open of the stream, and one look at each place that other layouts have: the "._" file, the EA
+// directory.
+TEST_F(SystemCallsTest, OpeningAMissingStreamOfAnObjectWithoutLegacyMetadataTakesThree) {
     const std::string object = dir_ / "a.txt";
     WriteFile(object, Ascii("data"));
-    Trace([&] {
-        return MAVOEAOpen(EA_FORM_FILE, object.c_str(), MAVOEA_KIND_STREAM, O_RDONLY,
-                          EA_PLACE_EADIR) == -1;
-    });
+    TraceMissing(object, MAVOEA_KIND_STREAM);
     if (IsSkipped() || HasFatalFailure()) return;
-    EXPECT_LE(calls_.size(), 5u) << PrintToString(calls_);
+    EXPECT_EQ(3u, calls_.size()) << PrintToString(calls_);
+    EXPECT_EQ(1, Count({"open"})) << PrintToString(calls_);
     EXPECT_EQ(0, Reads()) << PrintToString(calls_);
     EXPECT_EQ(0, Count({"chdir", "fchdir", "rmdir", "mkdir", "mkdirat"})) << PrintToString(calls_);
+}
+
+// Where there is an EA directory, for others, another process may be converting what is looked for
+// from one place to the other: the file is looked for once more, behind both.
+TEST_F(SystemCallsTest, OpeningAMissingFileBesideOthersMetadataTakesOneMoreOpenAndNoSecondLook) {
+    const std::string object = dir_ / "a.txt";
+    WriteFile(object, Ascii("data"));
+    ASSERT_EQ(0, mkdir((dir_ / "@eaDir").c_str(), 0777));
+    for (const auto& [kind, calls] :
+         {std::pair{MAVOEA_KIND_STREAM, 5u}, {MAVOEA_KIND_RESOURCE, 3u}}) {
+        SCOPED_TRACE(kind);
+        TraceMissing(object, kind);
+        if (IsSkipped() || HasFatalFailure()) return;
+        EXPECT_EQ(calls, calls_.size()) << PrintToString(calls_);
+        EXPECT_EQ(0, Reads()) << PrintToString(calls_);
+    }
+}
+
+// Who is the superuser asks that once, and for no directory where there is the file.
+TEST_F(SystemCallsTest, OpeningAStreamToWriteTakesNoLookAtItsDirectory) {
+    if (geteuid() != 0) GTEST_SKIP() << "this is about the superuser";
+    const std::string object = dir_ / "a.txt";
+    ASSERT_EQ(0, mkdir((dir_ / "@eaDir").c_str(), 0777));
+    WriteFile(dir_ / "@eaDir/a.txt@MavoEAStream", {});
+    Trace([&] {
+        return MAVOEAOpen(EA_FORM_FILE, object.c_str(), MAVOEA_KIND_STREAM, O_RDWR | O_CREAT,
+                          EA_PLACE_EADIR) >= 0;
+    });
+    if (IsSkipped() || HasFatalFailure()) return;
+    EXPECT_THAT(calls_, ElementsAre("geteuid", "open", "statx"));
 }
 
 // A file that is made with O_EXCL needs no look, one for reading and writing no change of its

@@ -234,21 +234,50 @@ TEST_P(EaOpenInEaDirTest, TruncatingCreatesAFileThatIsMissing) {
 }
 
 // Promise: "MAVOEAOpen: Returns a descriptor"
-TEST_P(EaOpenInEaDirTest, AMissingFileFailsWithEnoentAfterASecondLookAndMakesNoEaDirectory) {
+TEST_P(EaOpenInEaDirTest, AMissingFileFailsWithEnoentAndMakesNoEaDirectory) {
     for (const int oflag : {0, O_RDWR, O_RDWR | O_TRUNC}) {
         SCOPED_TRACE(oflag);
         TakeCalls();
         errno = 0;
         ExpectFailed(ENOENT, OpenStream(oflag));
-        const auto opens = OpensOf(stream_);
-        ASSERT_EQ(2u, opens.size());
-        EXPECT_EQ(opens[0], opens[1]);
+        EXPECT_EQ(1u, OpensOf(stream_).size());
         EXPECT_THAT(NamesIn(dir_.path()), ElementsAre("a.txt"));
     }
     ExpectFailed(ENOENT, Open(0, object_.c_str(), "MAVO:Resource", 0));
     ExpectFailed(ENOENT, Open(2, object_.c_str(), kStream, 0));
     EXPECT_THAT(NamesIn(dir_.path()), ElementsAre("a.txt"));
     EXPECT_THAT(TakeCallNames(), Not(Contains("mkdir")));
+}
+
+// Another process may just be converting the "._" file, or the legacy folder, of an object:
+// wherever it is seen no more, the stream is there.
+TEST_P(EaOpenInEaDirTest, AStreamThatAnotherProcessMakesMeanwhileIsOpened) {
+    for (const std::string& legacy : {sidecar_, folder_}) {
+        for (int before = 2;; ++before) {
+            SCOPED_TRACE(legacy + " " + std::to_string(before));
+            std::filesystem::remove_all(ea_dir_);
+            if (legacy == folder_) MakeEaDir();
+            WriteFile(legacy, Ascii("stream"));  // converted by a rename alone
+            int calls = 0;
+            Hooks().before = [&](const std::string&) {
+                if (++calls != before) return;
+                (void)::mkdir(ea_dir_.c_str(), 0777);
+                ASSERT_EQ(0, ::rename(legacy.c_str(), stream_.c_str()));
+            };
+            const Fd fd(OpenStream(0));
+            Hooks().before = nullptr;
+            TakeRecords();
+            if (calls < before) break;
+            EXPECT_EQ("stream", fd.Read());
+        }
+    }
+}
+
+TEST_P(EaOpenInEaDirTest, AMissingFileBesideOthersIsLookedForTwice) {
+    MakeEaDir();
+    TakeCalls();
+    ExpectFailed(ENOENT, OpenStream(O_RDWR | O_TRUNC));
+    EXPECT_THAT(OpensOf(stream_), ElementsAre("O_RDWR|O_TRUNC, 0777", "O_RDWR|O_TRUNC, 0777"));
 }
 
 TEST_P(EaOpenInEaDirTest, AFileThatAppearsBetweenTheTwoLooksIsOpened) {
@@ -305,14 +334,14 @@ TEST_P(EaOpenInEaDirTest, AFileInPlaceOfTheEaDirectoryFailsWithEnotdir) {
 }
 
 // Promise: "MAVOEAOpen: otherwise the codes"
-TEST_P(EaOpenInEaDirTest, AnEaDirectoryThatCannotBeMadeFailsWithItsCodeAndOpensNothing) {
+TEST_P(EaOpenInEaDirTest, AnEaDirectoryThatCannotBeMadeFailsWithItsCodeAndMakesNothing) {
     const std::string object = dir_ / "none/a.txt";
     TakeCalls();
     errno = 0;
     EXPECT_EQ(-1, Open(1, object.c_str(), kStream, O_RDWR | O_CREAT));
     EXPECT_EQ(ENOENT, errno);
     ExpectOnly(0x3C00, "ea_mkdir.c");
-    EXPECT_THAT(OpensOf(dir_ / "none/@eaDir/a.txt@MavoEAStream"), IsEmpty());
+    EXPECT_THAT(OpensOf(dir_ / "none/@eaDir/a.txt@MavoEAStream"), ElementsAre("O_RDWR, 0777"));
 }
 
 TEST_P(EaOpenInEaDirTest, ATrailingSlashOfTheObjectIsIgnored) {
@@ -592,6 +621,34 @@ TEST_P(EaOpenUpgradeTest, CreatingGivesTheUpgradedStreamAndNoEmptyOne) {
     ::close(fd);
     EXPECT_THAT(NamesIn(folder_), ElementsAre("MAVO:Resource"));
     ExpectNothingReported();
+}
+
+// Promise: "MAVOEAUpgrade: 1 the current layout"
+TEST_P(EaOpenUpgradeTest, AFileThatAppearsMeanwhileIsNotReplacedByALegacyOne) {
+    for (const int oflag : {0, O_RDWR | O_CREAT}) {
+        SCOPED_TRACE(oflag);
+        std::filesystem::remove_all(folder_ + "/color");
+        std::filesystem::remove_all(folder_ + "/tags");
+        WriteFile(sidecar_, MacSidecar({.attributes = values_}).bytes);
+        for (const auto& [kind, file] : {std::pair{kStream, stream_}, {kResource, resource_}}) {
+            SCOPED_TRACE(kind);
+            Hooks().before = [&, made = false](const std::string& name) mutable {
+                if (name == "open" || made) return;
+                if (name == "opendir" || (kind == kResource && name == "access")) {
+                    WriteFile(file, Ascii("new"));
+                    made = true;
+                }
+            };
+            const Fd fd(Open(1, object_.c_str(), kind, oflag));
+            Hooks().before = nullptr;
+            EXPECT_EQ("new", fd.Read());
+            ExpectNothingReported();
+        }
+        EXPECT_EQ(MacSidecar({.attributes = values_}).bytes, ReadFile(sidecar_));
+        EXPECT_EQ(Ascii("resource"), ReadFile(legacy_));
+        std::filesystem::remove(stream_);
+        std::filesystem::remove(resource_);
+    }
 }
 
 TEST_P(EaOpenUpgradeTest, TheLegacyResourceFileIsFoundToo) {

@@ -1039,6 +1039,7 @@ TEST_F(FinderInfoTest, AResourceFileThatCannotBeOpenedOrMadeIsNotWritten) {
         ExpectNothingReported();
     }
     EXPECT_EQ(FreshResourceFile(kNone), ReadFile(resource_));
+    std::filesystem::remove(resource_);
     {
         const FailCall fault("mkdir", EROFS);
         EXPECT_EQ(-1, Write(Pattern(32)));
