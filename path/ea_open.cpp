@@ -41,6 +41,13 @@ bool MayHaveLeftSomething() {
            code != MAVOEA_ERR_NAME_TOO_LONG;
 }
 
+// Makes the directory of a metadata file in that form.
+int MakeEADir(int form, const char* szPath) {
+    char dir[kPathBufferSize];
+    if (MAVOEADirPath(form, szPath, dir, MAVOEA_PATH_SIZE) != 0) return -1;
+    return MAVOEAMKDir(form == EA_FORM_FOLDER, dir);
+}
+
 // With `made`, that is told of OpenOrMake().
 int OpenInEADir(int form, const char* szPath, const char* szName, int oflag, bool* made) {
     if (szPath == nullptr || szName == nullptr) {
@@ -51,10 +58,8 @@ int OpenInEADir(int form, const char* szPath, const char* szName, int oflag, boo
     if (MAVOEAPath(form, szPath, szName, path, MAVOEA_PATH_SIZE, EA_PLACE_EADIR) != 0) return -1;
 
     const bool creates = (oflag & O_CREAT) != 0;
-    char dir[kPathBufferSize];
-    if (creates && MAVOEADirPath(form, szPath, dir, MAVOEA_PATH_SIZE) != 0) return -1;
     if (form == EA_FORM_FOLDER) {
-        if (creates && MAVOEAMKDir(1, dir) != 0) return -1;
+        if (creates && MakeEADir(form, szPath) != 0) return -1;
         return kernel::OpenRegular(path, oflag, kMode);
     }
 
@@ -63,7 +68,7 @@ int OpenInEADir(int form, const char* szPath, const char* szName, int oflag, boo
     int fd = at_once ? kernel::OpenRegular(path, oflag & ~O_CREAT, kMode) : -1;
     if (fd < 0 && creates) {
         const int error = errno;
-        if (MAVOEAMKDir(0, dir) != 0) return -1;
+        if (MakeEADir(form, szPath) != 0) return -1;
         errno = error;
         if (!at_once) fd = kernel::OpenRegular(path, oflag & ~O_CREAT, kMode);
     }
