@@ -35,12 +35,8 @@ bool SameParent(const char* source, const char* target) {
     return SplitObject(source).parent == SplitObject(target).parent;
 }
 
-int Move(const char* source, const char* target) {
-    if (kernel::Rename(source, target) == 0) {
-        // What has just been put into a directory keeps it from being empty.
-        if (!SameParent(source, target)) (void)EARemoveEADir(source);
-        return 0;
-    }
+// The rename of source to target has failed, with errno.
+int MoveOtherwise(const char* source, const char* target) {
     if (errno != ENOENT) {
         if (errno != EXDEV) return unit.Fail(Err::kRename);
         // The program would move into a directory, or through a link to one.
@@ -54,6 +50,28 @@ int Move(const char* source, const char* target) {
     }
     (void)EARemoveEADir(source);
     return 0;
+}
+
+int Move(const char* source, const char* target) {
+    if (kernel::Rename(source, target) != 0) return MoveOtherwise(source, target);
+    // What has just been put into a directory keeps it from being empty.
+    if (!SameParent(source, target)) (void)EARemoveEADir(source);
+    return 0;
+}
+
+// Whether it may not be looked at. The upgrade asks as the real user, all else is done as the
+// effective one.
+bool IsHidden(const char* path) {
+    const ErrnoKeeper keep;
+    struct stat info;
+    return kernel::Stat(path, &info) != 0 && errno == EACCES;
+}
+
+// A file that the upgrade has just seen, within its directory. For who may not look there is
+// nothing to move.
+int MoveWithin(const char* source, const char* target) {
+    if (kernel::Rename(source, target) == 0) return 0;
+    return errno == EACCES && IsHidden(source) ? 0 : MoveOtherwise(source, target);
 }
 
 // One item of the EA directory: the file of kind szName, or the whole legacy folder in its form.
@@ -80,12 +98,14 @@ int EARenameEA(int form, const char* szOldPath, const char* szNewPath, const cha
         return unit.Fail(Err::kBadArgument);
     }
 
+    const bool within = SameParent(source, target);
+    if (form == EA_FORM_FILE && within) return MoveWithin(source, target);
     struct stat from;
     if (kernel::Stat(source, &from) != 0) return 0;
     struct stat to;
     if (form == EA_FORM_FILE || kernel::Stat(target, &to) != 0) {
         // The source's directory is there.
-        if (!SameParent(source, target) && MakeParent(target) != 0) return -1;
+        if (!within && MakeParent(target) != 0) return -1;
     } else if (!SameFile(from, to)) {
         if (EARemove(EA_FORM_FOLDER, szNewPath) != 0) return -1;
     }

@@ -1,7 +1,9 @@
 // The SMB archive bit, which tells backups that a file has changed.
 
+#include <errno.h>
+
 #include "include/mavoea.h"
-#include "util/owned.h"
+#include "platform/kernel.h"
 
 using namespace mavoea;
 
@@ -10,7 +12,5 @@ int EASetSmbArchive(const char* szPath) {
         errno = EFAULT;
         return -1;
     }
-    // A FIFO without a writer must not hold the caller up.
-    const UniqueFd fd(kernel::Open(szPath, O_RDONLY | O_NONBLOCK | O_CLOEXEC, 0));
-    return fd ? kernel::SetArchiveBit(fd.get()) : -1;
+    return kernel::SetArchiveBit(szPath);
 }

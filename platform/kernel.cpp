@@ -103,6 +103,7 @@ size_t Fwrite(const void* bytes, size_t size, FILE* stream) {
 int Fclose(FILE* stream) { return ::fclose(stream); }
 
 int SetArchiveBit(int fd) { return marks::SetArchiveBit(fd); }
+int SetArchiveBit(const char* path) { return marks::SetArchiveBit(path); }
 int FileCommand(const char* path, int command) { return marks::FileCommand(path, command); }
 
 void* Allocate(unsigned long long size) {

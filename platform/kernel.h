@@ -79,6 +79,7 @@ int Fclose(FILE* stream);
 
 // The platform kernel's own file-control command 0x202: sets the SMB archive bit.
 int SetArchiveBit(int fd);
+int SetArchiveBit(const char* path);
 
 // The platform kernel's own system call 403: a command of platform/marks.h about the file at path.
 int FileCommand(const char* path, int command);

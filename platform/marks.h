@@ -6,6 +6,8 @@
 #ifndef MAVOEA_PLATFORM_MARKS_H_
 #define MAVOEA_PLATFORM_MARKS_H_
 
+#include <fcntl.h>
+
 namespace mavoea::marks {
 
 // File-control command that sets a file's SMB archive bit.
@@ -20,6 +22,12 @@ inline constexpr int kSetLocked = 522;
 
 // Sets the archive bit of the file on fd. 0, or -1 with errno.
 int SetArchiveBit(int fd);
+
+// The same of the file at path, symbolic links followed, by who may read it.
+int SetArchiveBit(const char* path);
+
+// Opens a file for that. A FIFO without a writer must not hold the caller up.
+inline int OpenToMark(const char* path) { return ::open(path, O_RDONLY | O_NONBLOCK | O_CLOEXEC); }
 
 // Sets or clears the hidden or locked bit of the file at path, symbolic links followed. 0, or -1
 // with errno.

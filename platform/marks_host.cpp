@@ -9,6 +9,7 @@
 #include <atomic>
 
 #include "platform/attribute_word.h"
+#include "platform/descriptors.h"
 #include "platform/include/mavocore.h"
 #include "platform/marks.h"
 
@@ -32,6 +33,17 @@ int ChangeWord(Change change, Get get, Set set) {
     if (changed == word) return 0;
     attribute_word::Encode(changed, bytes);
     return set(bytes, sizeof bytes);
+}
+
+int ChangeWordAt(const char* path, Change change) {
+    return ChangeWord(
+        change,
+        [path](void* bytes, size_t size) {
+            return ::getxattr(path, attribute_word::kName, bytes, size);
+        },
+        [path](const void* bytes, size_t size) {
+            return ::setxattr(path, attribute_word::kName, bytes, size, 0);
+        });
 }
 
 bool FindChange(int command, Change* change) {
@@ -78,6 +90,17 @@ int SetArchiveBit(int fd) {
         });
 }
 
+int SetArchiveBit(const char* path) {
+    if (sets_archive.load(std::memory_order_relaxed)) {
+        const int fd = OpenToMark(path);
+        if (fd < 0) return -1;
+        const int result = SetArchiveBit(fd);
+        CloseQuietly(fd);
+        return result;
+    }
+    return ChangeWordAt(path, {.set = MLIBC_ATTRIBUTE_ARCHIVE});
+}
+
 int FileCommand(const char* path, int command) {
     if (takes_commands.load(std::memory_order_relaxed)) {
         const long result = ::syscall(kFileCommandCall, path, command);
@@ -89,14 +112,7 @@ int FileCommand(const char* path, int command) {
         errno = EINVAL;
         return -1;
     }
-    return ChangeWord(
-        change,
-        [path](void* bytes, size_t size) {
-            return ::getxattr(path, attribute_word::kName, bytes, size);
-        },
-        [path](const void* bytes, size_t size) {
-            return ::setxattr(path, attribute_word::kName, bytes, size, 0);
-        });
+    return ChangeWordAt(path, change);
 }
 
 }  // namespace mavoea::marks

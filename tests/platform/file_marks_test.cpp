@@ -14,6 +14,7 @@
 #include "platform/include/mavocore.h"
 #include "platform/marks.h"
 #include "tests/platform/support/private_mounts.h"
+#include "tests/support/process.h"
 #include "tests/support/temp_dir.h"
 
 namespace mavoea::test {
@@ -179,6 +180,45 @@ TEST_F(FileMarksTest, TheArchiveBitIsKeptInTheSameWord) {
     EXPECT_EQ(0x21u, Word());
     EXPECT_EQ(0, Command(kUnlock));
     EXPECT_EQ(0x1u, Word());
+}
+
+// Once the kernel has said that it does not know the call, it is set by the path alone.
+TEST_F(FileMarksTest, TheArchiveBitIsSetByPathTooWhereALinkLeadsAndWhoeverIsAskedFirst) {
+    const std::string link = dir_ / "link";
+    ASSERT_EQ(0, symlink("a", link.c_str()));
+    ASSERT_EQ(0, mkfifo((dir_ / "fifo").c_str(), 0777));
+    ASSERT_EQ(0, mkdir((dir_ / "folder").c_str(), 0777));
+    for (int i = 0; i < 3; ++i) {
+        SCOPED_TRACE(i);
+        (void)removexattr(path_.c_str(), kAttribute);
+        EXPECT_EQ(0, Command(kHide));
+        EXPECT_EQ(0, marks::SetArchiveBit(link.c_str()));
+        EXPECT_EQ(0x5u, Word());
+        EXPECT_EQ(0, marks::SetArchiveBit((dir_ / "folder").c_str()));
+        EXPECT_EQ(0x1u, WordOf(dir_ / "folder"));
+        EXPECT_EQ(-1, marks::SetArchiveBit((dir_ / "fifo").c_str()));
+        errno = 0;
+        EXPECT_EQ(-1, marks::SetArchiveBit((dir_ / "none").c_str()));
+        EXPECT_EQ(ENOENT, errno);
+    }
+    EXPECT_EQ(Ascii("content"), ReadFile(path_));
+}
+
+TEST_F(FileMarksTest, WhoMayNotReadAFileDoesNotSetItsArchiveBit) {
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
+    ASSERT_EQ(0, chmod(dir_.path().c_str(), 0755));
+    ASSERT_EQ(0, chmod(path_.c_str(), 0222));
+    AsUser(65534, Root::kGivenUp, [this] {
+        for (int i = 0; i < 3; ++i) {
+            errno = 0;
+            EXPECT_EQ(-1, marks::SetArchiveBit(path_.c_str()));
+            EXPECT_EQ(EACCES, errno);
+            // By then the kernel has been asked.
+            const std::string other = "/proc/self/exe";
+            (void)marks::SetArchiveBit(other.c_str());
+        }
+    });
+    EXPECT_EQ(Ascii("(none)"), Stored());
 }
 
 TEST_F(FileMarksTest, AnUnknownCommandIsRefusedAndChangesNothing) {

@@ -626,6 +626,17 @@ int SetArchiveBit(int fd) {
                 [&] { return Hooks().archive ? Hooks().archive(fd) : marks::SetArchiveBit(fd); });
 }
 
+// As a kernel that has the call takes it.
+int SetArchiveBit(const char* path) {
+    const int fd = Open(path, O_RDONLY | O_NONBLOCK | O_CLOEXEC, 0);
+    if (fd < 0) return -1;
+    const int result = SetArchiveBit(fd);
+    const int error = errno;
+    Close(fd);
+    errno = error;
+    return result;
+}
+
 int FileCommand(const char* path, int command) {
     return Call("command", Text(path) + ", " + Number(command), -1, [&] {
         return Hooks().command ? Hooks().command(path, command) : marks::FileCommand(path, command);

@@ -1318,6 +1318,42 @@ TEST_F(EaRenameTest, WhoMayNotWriteTheOldEaDirectoryFailsAndLosesNothing) {
     EXPECT_FALSE(Exists(new_.stream()));
 }
 
+// The upgrade asks as the real user whether there is a file, who may be another one.
+TEST_F(EaRenameTest, ForWhoMayNotLookIntoTheEaDirectoryThereIsNothingToMove) {
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
+    BeWhoWeAre();
+    old_.MakeStream();
+    const ObjectFiles renamed = {old_.parent, "renamed"};
+    for (const mode_t mode : {mode_t{0700}, mode_t{0755}}) {
+        SCOPED_TRACE(mode);
+        ASSERT_EQ(0, ::chmod(old_.ea_dir().c_str(), mode));
+        AsUser(kNobody, Root::kSaved, [&] {
+            ASSERT_EQ(0, ::setresuid(0, 0, 0));
+            ASSERT_EQ(0, ::setresuid(0, kNobody, 0));
+            const bool looks = mode == 0755;
+            EXPECT_EQ(looks ? -1 : 0, Rename(old_, renamed));
+            if (looks) {
+                ExpectOnly(0x2800, kUnit);
+            } else {
+                ExpectNothingReported();
+            }
+        });
+        EXPECT_TRUE(Exists(old_.stream()));
+    }
+}
+
+TEST_F(EaRenameTest, WithinADirectoryTheFilesAreLookedForOnce) {
+    old_.MakeStream();
+    old_.MakeResource();
+    const ObjectFiles renamed = {old_.parent, "renamed"};
+    TakeCallNames();
+    EXPECT_EQ(0, Rename(old_, renamed));
+    const auto names = TakeCallNames();
+    EXPECT_EQ(2, std::count(names.begin(), names.end(), "access"));
+    EXPECT_EQ(1, std::count(names.begin(), names.end(), "stat"));  // the legacy folder
+    EXPECT_EQ(2, std::count(names.begin(), names.end(), "rename"));
+}
+
 TEST_F(EaRenameTest, AUserMovesFilesIntoAnEaDirectoryThatTheSuperuserMakes) {
     MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     BeWhoWeAre();
