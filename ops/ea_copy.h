@@ -24,8 +24,8 @@ inline constexpr int kCopyNameTooLong = -3;  // the name is too long for a "._" 
 
 // The path of dst's EA directory (mode as the form of MAVOEADirPath()) into szBuf, and the
 // directory made. One that exists is kept with mode 1, otherwise removed with all that is in it and
-// made again.
-int EAPrepareEADir(int mode, const char* szPath, char* szBuf, int cbBuf);
+// made again. With `made`, that is told whether it was made here.
+int EAPrepareEADir(int mode, const char* szPath, char* szBuf, int cbBuf, bool* made = nullptr);
 
 // The metadata file of kind `name`, if there is one: by copyFn, or by /bin/cp without one.
 int EACopySidecar(const char* src, const char* dst, const char* name, int move, CopyFn copyFn);

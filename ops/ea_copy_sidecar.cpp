@@ -25,13 +25,15 @@ bool Removed(const char* path) { return kernel::Unlink(path) == 0 || errno == EN
 
 }  // namespace
 
-int EAPrepareEADir(int mode, const char* szPath, char* szBuf, int cbBuf) {
+int EAPrepareEADir(int mode, const char* szPath, char* szBuf, int cbBuf, bool* made) {
     if (szPath == nullptr || szBuf == nullptr || cbBuf <= 0) return -1;
     if (MAVOEADirPath(mode, szPath, szBuf, cbBuf) != 0) {
         unit.Log("%s:%d Failed to get EA path of %s.\n", szPath);
         return -1;
     }
-    if (kernel::Access(szBuf, F_OK) != 0) return MAVOEAMKDir(mode == 0 ? 1 : 0, szBuf);
+    const bool missing = kernel::Access(szBuf, F_OK) != 0;
+    if (made != nullptr) *made = missing;
+    if (missing) return MAVOEAMKDir(mode == 0 ? 1 : 0, szBuf);
     if (mode == 1) return 0;
     if (MLIBCExec("/bin/rm", "-rf", szBuf, nullptr) < 0) {
         unit.Log("%s:%d Failed to rm -rf %s.\n", szBuf);
@@ -45,12 +47,20 @@ int EACopySidecar(const char* src, const char* dst, const char* name, int move, 
     char to[kPathBufferSize];
     char dir[kPathBufferSize];
     if (MAVOEAPath(EA_FORM_FILE, src, name, from, kDerivedPathMax, EA_PLACE_EADIR) != 0) return -1;
-    if (kernel::Access(from, F_OK) != 0) return 0;
+    const bool is_file = LookAt(from) == Found::kFile;
+    if (!is_file && kernel::Access(from, F_OK) != 0) return 0;
     if (MAVOEAPath(EA_FORM_FILE, dst, name, to, kDerivedPathMax, EA_PLACE_EADIR) != 0) return -1;
-    if (EAPrepareEADir(1, dst, dir, kDerivedPathMax) != 0) return -1;
 
+    // A file that is there lies in a directory that is. While one was made, anything may have been
+    // put in both places.
+    const Found target = LookAt(to);
+    bool made = false;
+    if (target != Found::kFile && EAPrepareEADir(1, dst, dir, kDerivedPathMax, &made) != 0) {
+        return -1;
+    }
     const auto copied = [&] {
-        if (!AreMetadataOrMissing(from, to)) return -1;
+        const bool seen = is_file && target != Found::kOther && !made;
+        if (!seen && !AreMetadataOrMissing(from, to)) return -1;
         return copyFn != nullptr ? copyFn(from, to) : MLIBCExec("/bin/cp", "-f", from, to, nullptr);
     };
     if (copied() < 0) {
@@ -58,7 +68,8 @@ int EACopySidecar(const char* src, const char* dst, const char* name, int move, 
         return -1;
     }
     if (move != 0 && !Removed(from)) return unit.Fail(Err::kSystemCall);
-    SetMetadataMode(to, kMode);
+    // A file that was there has mostly kept the mode of an earlier copy.
+    if (target != Found::kFile || !HasMetadataMode(to, kMode)) SetMetadataMode(to, kMode);
     return 0;
 }
 

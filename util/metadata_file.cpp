@@ -29,6 +29,12 @@ bool Names(const char* path, int fd) {
     return false;
 }
 
+bool HasMetadataMode(const char* path, mode_t mode) {
+    const ErrnoKeeper keep;
+    struct stat info;
+    return kernel::Lstat(path, &info) == 0 && info.st_mode == (S_IFREG | mode);
+}
+
 void SetMetadataMode(const char* path, mode_t mode) {
     const ErrnoKeeper keep;
     UniqueFd fd(kernel::OpenRegular(path, O_RDONLY | O_CLOEXEC, 0));
@@ -36,12 +42,15 @@ void SetMetadataMode(const char* path, mode_t mode) {
     if (fd) (void)kernel::Fchmod(fd.get(), mode);
 }
 
-bool IsMetadataOrMissing(const char* path) {
+Found LookAt(const char* path) {
     struct stat info;
-    if (kernel::Lstat(path, &info) != 0) return errno == ENOENT;
+    if (kernel::Lstat(path, &info) != 0) {
+        return errno == ENOENT ? Found::kNothing : Found::kOther;
+    }
     const int refusal = RefusalOf(info.st_mode & S_IFMT);
-    if (refusal != 0) errno = refusal;
-    return refusal == 0;
+    if (refusal == 0) return Found::kFile;
+    errno = refusal;
+    return Found::kOther;
 }
 
 }  // namespace mavoea

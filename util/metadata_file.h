@@ -24,12 +24,22 @@ inline bool SameFile(const struct stat& one, const struct stat& other) {
 // with errno, ESTALE when it names another.
 bool Names(const char* path, int fd);
 
+// Whether it is a metadata file of that mode.
+bool HasMetadataMode(const char* path, mode_t mode);
+
 // Gives the metadata file `mode`, through a descriptor. Best effort: others may own the file.
 void SetMetadataMode(const char* path, mode_t mode);
 
+// What is at a path where a metadata file may be.
+enum class Found { kFile, kNothing, kOther };
+
+// kOther, for what is no regular file or cannot be looked at, with errno as kernel::OpenRegular()
+// sets it.
+Found LookAt(const char* path);
+
 // Whether `path` may be handed to a program that copies or moves metadata: it is a regular file, or
-// missing. Otherwise false, with errno as kernel::OpenRegular() sets it.
-bool IsMetadataOrMissing(const char* path);
+// missing. Otherwise false, with errno as LookAt() sets it.
+inline bool IsMetadataOrMissing(const char* path) { return LookAt(path) != Found::kOther; }
 
 // The same of both ends of a copy.
 inline bool AreMetadataOrMissing(const char* from, const char* to) {

@@ -350,6 +350,15 @@ class Table {
         return outcome;
     }
 
+    // Of those before the first call that has `mark` in it.
+    int CountBefore(const std::string& mark, const char* call, const std::string& with) const {
+        const auto end = std::find_if(calls_.begin(), calls_.end(), [&](const std::string& text) {
+            return text.find(mark) != text.npos;
+        });
+        return static_cast<int>(std::count_if(calls_.begin(), end, [&](const std::string& text) {
+            return text.starts_with(std::string(call) + "(") && text.find(with) != text.npos;
+        }));
+    }
     // Of calls whose text has `with` in it; of all of them with neither.
     int Count(const char* call, const std::string& with = "") const {
         int count = 0;
@@ -649,14 +658,19 @@ void AddSidecar(Table* table, const Way& way, const char* from, const char* to) 
         return Failed(records, lines);
     };
     table->Add("access", Kept(std::string(from) + ", "), {}, table->Gone());
+    // Once the directory has been made for them, both are looked at anew, and that counts.
+    const char* const command = Kept(std::string(from) + ", " + to);
+    const bool made = table->CountBefore(command, "lstat", std::string(to) + ")") == 2;
     for (const char* const file : {from, to}) {
-        table->Add("lstat", Kept(std::string(file) + ")"), {ENOENT}, table->Done());
-        table->Add("lstat", Kept(std::string(file) + ")"), {}, failed({}, true));
+        const char* const with = Kept(std::string(file) + ")");
+        const int last = table->CountBefore(command, "lstat", with);
+        if (made) table->Add("lstat", with, {ENOENT}, table->Done(), last);
+        if (made) table->Add("lstat", with, {}, failed({}, true), last);
+        table->Add("lstat", with, {}, table->Done());
     }
     // What the command leaves in errno is its own.
     Outcome by_command = failed({}, true);
     by_command.any_log = true;
-    const char* const command = Kept(std::string(from) + ", " + to);
     table->Add("MLIBCExec", command, {kExitStatus}, table->Gone());
     table->Add("MLIBCExec", command, {}, by_command);
     table->Add("unlink", from, {ENOENT}, table->Gone(), 1);

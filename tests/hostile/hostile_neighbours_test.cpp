@@ -1278,6 +1278,25 @@ TEST_F(HostileFileTest, ACopyThatMeetsANamedPipeFailsAndLeavesIt) {
     }
 }
 
+// Making the directory takes longer than a look.
+TEST_F(HostileFileTest, ALinkThatIsPutInTheWayWhileTheEADirectoryIsMadeIsNotFollowed) {
+    for (const char* place : {kFromResource, kToResource}) {
+        SCOPED_TRACE(place);
+        Share share;
+        share.Remove("to/@eaDir");
+        std::string before;
+        Hooks().before = [&](const std::string& name) {
+            if (name != "fchmod" || !before.empty()) return;
+            share.PutInTheWay(place, Kind::kLinkToFile);
+            before = share.LookAt(place);
+        };
+        EXPECT_EQ(-1, Copy(share, 1, 1, 0));
+        Hooks().before = nullptr;
+        EXPECT_EQ(before, share.LookAt(place));
+        share.Check();
+    }
+}
+
 // Attributes go into the file of the name as it is, the rest into that of the name made safe.
 TEST_F(HostileFileTest, AttributesAreNotWrittenThroughALinkUnderAnUnsafeName) {
     for (const Kind kind : kLinks) {

@@ -201,6 +201,55 @@ TEST_F(SystemCallsTest, OpeningAStreamTakesOneLookAndForReadingOneChangeOfItsFla
     }
 }
 
+// One look at each file and a rename, one for the legacy folder, and the archive mark by its path.
+TEST_F(SystemCallsTest, RenamingAnObjectsMetadataTakesSix) {
+    const std::string one = dir_ / "a.txt";
+    const std::string other = dir_ / "b.txt";
+    WriteFile(one, {});
+    WriteFile(other, {});
+    ASSERT_EQ(0, mkdir((dir_ / "@eaDir").c_str(), 0777));
+    for (const char* kind : {MAVOEA_KIND_STREAM, MAVOEA_KIND_RESOURCE}) {
+        WriteFile(dir_ / "@eaDir/a.txt@" + kind, {});
+    }
+    bool back = false;
+    ASSERT_EQ(0, EASetSmbArchive(one.c_str()));
+    Trace([&] {
+        EAIndexFlags neither = {.fileIndex = 0, .index = 0};
+        const bool from_other = std::exchange(back, !back);
+        return MAVOEARename((from_other ? other : one).c_str(), (from_other ? one : other).c_str(),
+                            1, &neither) == 0;
+    });
+    if (IsSkipped() || HasFatalFailure()) return;
+    EXPECT_EQ(6u, calls_.size()) << PrintToString(calls_);
+    EXPECT_EQ(0, Count({"open", "close", "fcntl"})) << PrintToString(calls_);
+}
+
+// A file is looked at by the upgrade, at both ends, and for the mode of the copy, which has it.
+TEST_F(SystemCallsTest, CopyingOverMetadataInProcessTakesFourLooksAtEachFile) {
+    const std::string from = dir_ / "a.txt";
+    std::string to = dir_ / "b.txt";
+    WriteFile(from, {});
+    WriteFile(to, {});
+    ASSERT_EQ(0, mkdir((dir_ / "@eaDir").c_str(), 0777));
+    for (const char* kind : {MAVOEA_KIND_STREAM, MAVOEA_KIND_RESOURCE}) {
+        WriteFile(dir_ / "@eaDir/a.txt@" + kind, Pattern(300));
+    }
+    const auto copy = [&](int (*copy_fn)(const char*, const char*)) {
+        return MAVOEACopyEx(from.c_str(), to.data(), 0, 0, 1, 1, 0, 0, copy_fn);
+    };
+    ASSERT_EQ(0, copy([](const char* source, const char* target) {
+                  WriteFile(target, ReadFile(source));
+                  return 0;
+              }));
+    Trace([&] { return copy([](const char*, const char*) { return 0; }) == 0; });
+    if (IsSkipped() || HasFatalFailure()) return;
+    constexpr unsigned kLooks = 2 * 4;
+    constexpr unsigned kLockedState = 3 + 6 + 1 + 6;  // flag and record at each end
+    constexpr unsigned kFolderAndMark = 2;
+    EXPECT_EQ(kLooks + kLockedState + kFolderAndMark, calls_.size()) << PrintToString(calls_);
+    EXPECT_EQ(0, Count({"fchmod", "write", "mkdir"})) << PrintToString(calls_);
+}
+
 TEST_F(SystemCallsTest, ReadingOneValueOfAFewTakesAtMostNineAndTwoReads) {
     for (const int count : {1, 10, 100}) {
         SCOPED_TRACE(count);

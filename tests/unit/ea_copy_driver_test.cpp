@@ -565,6 +565,30 @@ TEST_F(CopyDriverTest, TheRealCommandsCopyAndMove) {
     ExpectNothingReported();
 }
 
+TEST_F(CopyDriverTest, ACopyOverMetadataHasItsModeWhateverThatHad) {
+    const CopyWorld::Call call = {.src_type = 1, .dst_type = 1};
+    ASSERT_EQ(0, world_.Copy(call));
+    for (const mode_t mode : {mode_t{0600}, mode_t{04777}, mode_t{0777}}) {
+        SCOPED_TRACE(mode);
+        for (const char* kind : {"@MavoResource", "@MavoEAStream"}) {
+            // The command gives the copy the mode of what it copies.
+            for (const char* end : {"src/@eaDir/object", "dst/@eaDir/object"}) {
+                ASSERT_EQ(0, chmod((world_ / end).append(kind).c_str(), mode));
+            }
+        }
+        world_.TakeKernel();
+        EXPECT_EQ(0, world_.Copy(call));
+        const auto calls = world_.TakeKernel();
+        for (const char* kind : {"@MavoResource", "@MavoEAStream"}) {
+            const std::string path = std::string("dst/@eaDir/object") + kind;
+            EXPECT_EQ(0777, ModeOf(world_ / path));
+            const auto changes =
+                std::count(calls.begin(), calls.end(), "fchmod(" + path + ", 0777)");
+            EXPECT_EQ(mode == 0777 ? 0 : 1, changes);
+        }
+    }
+}
+
 // ---- Types that take nothing --------------------------------------------------------------------
 
 // Promise: "MAVOEACopyEx: 0 when"
