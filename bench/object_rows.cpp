@@ -218,7 +218,7 @@ void AddObjectRows(const Place& place, std::vector<Row>* rows) {
     }
     rows->push_back({.work = "copy an object's metadata, in process",
                      .where = place.name,
-                     .aim = 2,
+                     .aim = place.durable ? 1.3 : 1.4,
                      .library = Copying(place, CopyThroughLibrary),
                      .floor = Copying(place, CopyByHand)});
 }

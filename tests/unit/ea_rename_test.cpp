@@ -1342,6 +1342,35 @@ TEST_F(EaRenameTest, ForWhoMayNotLookIntoTheEaDirectoryThereIsNothingToMove) {
     }
 }
 
+TEST_F(EaRenameTest, OnlyWhatMayNeitherBeRenamedNorLookedAtIsNotThere) {
+    old_.MakeStream();
+    const ObjectFiles renamed = {old_.parent, "renamed"};
+    struct {
+        int rename;
+        int stat;
+        int result;
+    } const cases[] = {{EACCES, EACCES, 0},
+                       {EACCES, 0, -1},
+                       {EACCES, EIO, -1},
+                       {EIO, EACCES, -1},
+                       {EPERM, EACCES, -1}};
+    for (const auto& c : cases) {
+        SCOPED_TRACE(std::to_string(c.rename) + ", " + std::to_string(c.stat));
+        Hooks().fails = [&](const std::string& call) {
+            if (call.starts_with("rename(" + old_.stream())) return c.rename;
+            return call == "stat(" + old_.stream() + ")" ? c.stat : 0;
+        };
+        EXPECT_EQ(c.result, Rename(old_, renamed));
+        Hooks().fails = nullptr;
+        if (c.result == 0) {
+            ExpectNothingReported();
+        } else {
+            ExpectOnly(0x2800, kUnit);
+        }
+        EXPECT_TRUE(Exists(old_.stream()));
+    }
+}
+
 TEST_F(EaRenameTest, WithinADirectoryTheFilesAreLookedForOnce) {
     old_.MakeStream();
     old_.MakeResource();
