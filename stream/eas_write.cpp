@@ -62,9 +62,8 @@ int Create(EASHandle* h, const char* name, ByteView value, unsigned offset) {
     memset(data + old_data.length, 0, offset);
     std::copy(value.begin(), value.end(), data + old_data.length + offset);
 
-    for (EASEntry& entry : Attributes(*h)) entry.offset += record_size;
     h->entries[attributes.count] = {
-        .offset = static_cast<std::uint32_t>(attributes.data.end()),
+        .offset = static_cast<std::uint32_t>(old_data.end()),
         .length = static_cast<std::uint32_t>(length),
         .flags = 0,
         .nameLength = name_size,
@@ -72,7 +71,7 @@ int Create(EASHandle* h, const char* name, ByteView value, unsigned offset) {
     };
     attributes.data.length += static_cast<std::uint32_t>(length);
     ++attributes.count;
-    image.PutHead(survey.header, h);
+    image.PutHead(survey.header, h, record_size);
     return Commit(h, image, total_size, fork, &room);
 }
 

@@ -20,7 +20,9 @@ int MAVOEASWriteHeader(EASHandle* h) {
     const StreamHeader header = LoadHeader(*h);
     // Sizes that pass the format's 32 bits are no sizes.
     const Range data = header.attributes.data;
-    if (!FitsTogether(*h, data) || !FitsStream(data.end(), 0)) return unit.Fail(Err::kRead);
+    if (FitTogether(*h, data) == Fit::kNot || !FitsStream(data.end(), 0)) {
+        return unit.Fail(Err::kRead);
+    }
 
     StreamImage image(TableEnd(*h));
     if (!image.ok()) return unit.Fail(Err::kMemory);

@@ -49,17 +49,23 @@ std::uint64_t TableEnd(const EASHandle& h) {
     return end;
 }
 
-bool FitsTogether(const EASHandle& h, Range data) {
+Fit FitTogether(const EASHandle& h, Range data) {
     const std::span<EASEntry> attributes = Attributes(h);
-    if (std::cmp_greater(attributes.size(), h.capacity)) return false;
+    if (std::cmp_greater(attributes.size(), h.capacity)) return Fit::kNot;
+    Fit fit = Fit::kAll;
     std::uint64_t table_end = kStreamHeaderSize;
     std::uint64_t next = data.offset;
     for (const EASEntry& entry : attributes) {
-        if (entry.name == nullptr || (entry.length != 0 && entry.offset != next)) return false;
+        if (entry.name == nullptr) return Fit::kNot;
+        if (entry.offset != next) {
+            if (entry.length != 0) return Fit::kNot;
+            fit = Fit::kBarEmpty;
+        }
         table_end += RecordSize(entry.nameLength);
         next += entry.length;
     }
-    return next == data.end() && data.offset >= table_end;
+    if (next != data.end() || data.offset < table_end) return Fit::kNot;
+    return fit;
 }
 
 int SurveyTable(EASHandle* h, const Unit& unit, Survey* found, int line) {
@@ -80,9 +86,9 @@ int SurveyTable(EASHandle* h, const Unit& unit, Survey* found, int line) {
         data.offset = kStreamHeaderSize;  // Whatever it was, nothing lies there.
         return 0;
     }
-    if (!FitsTogether(*h, data) || data.end() > found->file_size) {
-        return unit.Fail(Err::kRead, line);
-    }
+    const Fit fit = FitTogether(*h, data);
+    if (fit == Fit::kNot || data.end() > found->file_size) return unit.Fail(Err::kRead, line);
+    if (fit == Fit::kAll) return 0;
     std::uint64_t next = data.offset;
     for (EASEntry& entry : attributes) {
         entry.offset = static_cast<std::uint32_t>(next);
@@ -134,7 +140,7 @@ bool FitsStream(std::uint64_t total_size, std::uint32_t fork_length) {
     return total_size < kStreamSizeMax && total_size + fork_length <= kStreamSizeMax;
 }
 
-void StreamImage::PutHead(StreamHeader header, EASHandle* h) {
+void StreamImage::PutHead(StreamHeader header, EASHandle* h, std::uint32_t moved) {
     AttributeHeader& attributes = header.attributes;
     attributes.total_size = static_cast<std::uint32_t>(attributes.data.end());
     // Wherever the file had its Finder info, the header has it here.
@@ -147,7 +153,8 @@ void StreamImage::PutHead(StreamHeader header, EASHandle* h) {
 
     std::memcpy(At(0), h->header, kStreamHeaderSize);
     std::uint8_t* to = At(kStreamHeaderSize);
-    for (const EASEntry& entry : Attributes(*h)) {
+    for (EASEntry& entry : Attributes(*h)) {
+        entry.offset += moved;
         EncodeAttributeRecord({.value = {entry.offset, entry.length},
                                .flags = entry.flags,
                                .name_size = entry.nameLength},

@@ -28,7 +28,12 @@ std::uint64_t TableEnd(const EASHandle& h);
 
 // Whether the table, and where `data` says that the values lie, fit together: values must lie one
 // behind the other in table order; between table and values there may be a gap.
-bool FitsTogether(const EASHandle& h, Range data);
+enum class Fit {
+    kNot,
+    kBarEmpty,  // but an empty value has an offset that its place does not call for
+    kAll,
+};
+Fit FitTogether(const EASHandle& h, Range data);
 
 // What a rewrite starts from: h's header and the file's size, once offsets, lengths and counts have
 // been found to fit together and to lie in the file. Empty values, whose offset means nothing, are
@@ -105,8 +110,9 @@ class StreamImage {
     void Cut(std::uint64_t end) { end_ = end; }
 
     // Makes `header` h's, with the sizes that follow from its data, and puts it and h's table into
-    // the image. What lies between table and values is cleared.
-    void PutHead(StreamHeader header, EASHandle* h);
+    // the image. What lies between table and values is cleared. The values of the table have moved
+    // up by `moved` bytes, which its offsets then do, too.
+    void PutHead(StreamHeader header, EASHandle* h, std::uint32_t moved = 0);
 
     // Where values are kept, the others are written before header and table: no record changes but
     // for the last one's length.

@@ -60,6 +60,16 @@ constexpr void StoreBe32(std::uint32_t value, std::uint8_t* at) {
     at[2] = static_cast<std::uint8_t>(value >> 8);
     at[3] = static_cast<std::uint8_t>(value);
 }
+constexpr void StoreBe64(std::uint64_t value, std::uint8_t* at) {
+    at[0] = static_cast<std::uint8_t>(value >> 56);
+    at[1] = static_cast<std::uint8_t>(value >> 48);
+    at[2] = static_cast<std::uint8_t>(value >> 40);
+    at[3] = static_cast<std::uint8_t>(value >> 32);
+    at[4] = static_cast<std::uint8_t>(value >> 24);
+    at[5] = static_cast<std::uint8_t>(value >> 16);
+    at[6] = static_cast<std::uint8_t>(value >> 8);
+    at[7] = static_cast<std::uint8_t>(value);
+}
 constexpr void StoreBe16(std::uint16_t value, std::uint8_t* at) {
     at[0] = static_cast<std::uint8_t>(value >> 8);
     at[1] = static_cast<std::uint8_t>(value);
