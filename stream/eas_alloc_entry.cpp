@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "include/mavoea.h"
+#include "stream/large_block.h"
 #include "stream/names.h"
 #include "util/owned.h"
 #include "util/unit.h"
@@ -30,7 +31,7 @@ int MAVOEASAllocEntry(EASHandle* h, int count) {
     if (!std::in_range<std::int32_t>(capacity)) return unit.Fail(Err::kMemory);
 
     void* const table =
-        kernel::Reallocate(h->entries, static_cast<std::uint64_t>(capacity) * sizeof(EASEntry));
+        ResizeBlock(h->entries, static_cast<std::uint64_t>(capacity) * sizeof(EASEntry));
     if (table == nullptr) return unit.Fail(Err::kMemory);
     MoveNameBlock(h->entries, static_cast<EASEntry*>(table));
     h->entries = static_cast<EASEntry*>(table);

@@ -8,6 +8,7 @@
 #include "format/ea_stream.h"
 #include "include/mavoea.h"
 #include "stream/internal.h"
+#include "stream/large_block.h"
 #include "stream/layout.h"
 #include "stream/names.h"
 #include "util/file_io.h"
@@ -99,7 +100,7 @@ class TableReader {
           most_(file_size - kStreamHeaderSize),
           likely_(end > kStreamHeaderSize ? end - kStreamHeaderSize : 0),
           here_(first.From(kStreamHeaderSize)) {}
-    ~TableReader() { kernel::Free(block_); }
+    ~TableReader() { FreeBlock(block_); }
     TableReader(const TableReader&) = delete;
     TableReader& operator=(const TableReader&) = delete;
 

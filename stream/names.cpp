@@ -1,5 +1,6 @@
 #include "stream/names.h"
 
+#include "stream/large_block.h"
 #include "util/owned.h"
 
 namespace mavoea {
@@ -25,8 +26,7 @@ NameBlock** LinkTo(const EASEntry* table) {
 }  // namespace
 
 NameBlock* ResizeNameBlock(NameBlock* block, std::uint64_t size) {
-    auto* const resized =
-        static_cast<NameBlock*>(kernel::Reallocate(block, sizeof(NameBlock) + size));
+    auto* const resized = static_cast<NameBlock*>(ResizeBlock(block, sizeof(NameBlock) + size));
     if (resized != nullptr) resized->size = static_cast<std::size_t>(size);
     return resized;
 }
@@ -51,9 +51,9 @@ void FreeStream(EASHandle* h) {
     NameBlock** const link = LinkTo(h->entries);
     if (NameBlock* const block = *link) {
         *link = block->next;
-        kernel::Free(block);
+        FreeBlock(block);
     }
-    kernel::Free(h->entries);
+    FreeBlock(h->entries);
     kernel::Free(h);
 }
 

@@ -152,14 +152,14 @@ TEST(StreamOpenFaults, WithoutALockThereIsNoneToGetOrRelease) {
 
 TEST(StreamOpenFaults, ALargeTableIsReadInPartsAndFreedInWhole) {
     StreamImage image;
-    for (int i = 0; i < 600; ++i) {
+    for (int i = 0; i < 3000; ++i) {
         image.attributes.push_back({"attribute of a long name, number " + std::to_string(i), {}});
     }
     Bytes bytes = image.Build();
     // A name without its NUL is copied.
     const std::size_t name_end = image.RecordAt(5) + 11 + image.attributes[5].name.size();
     bytes[name_end] = '!';
-    FaultCase c = Opening("open a stream of 600 attributes", bytes, F_WRLCK);
+    FaultCase c = Opening("open a stream of 3,000 attributes", bytes, F_WRLCK);
     // The file seems to end while its table is read.
     c.rules = Rules{{.call = "pread",
                      .with = ", 8192)",

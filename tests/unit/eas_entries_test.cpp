@@ -1301,6 +1301,8 @@ class EasNamesTest : public EasEntriesTest {
         Reopen();
     }
 
+    static std::string NameOfMany(int index) { return "user.attribute." + std::to_string(index); }
+
     // What a caller does who gives an attribute another name.
     static char* Copy(const std::string& name) {
         auto* const copy = static_cast<char*>(kernel::Allocate(name.size() + 1));
@@ -1384,10 +1386,10 @@ TEST_F(EasNamesTest, AreFreedWithTheTableWhicheverOfThemAreStillThere) {
     for (const int count : kFewAndMany) {
         SCOPED_TRACE(count);
         OpenMany(count);
-        const int one = TakeAllocations().live - live_;
+        const int one = TakeAllocations().live;
         const Handle other = Open();
         ASSERT_NE(nullptr, other);
-        live_ += one;
+        live_ += TakeAllocations().live - one;
         for (int i = 0; i < count; ++i) {
             Bytes buffer(static_cast<std::size_t>(count));
             ASSERT_EQ(0,
@@ -1425,6 +1427,76 @@ TEST_F(EasNamesTest, ACopyOfAHandleCanBeClosedInItsPlace) {
         Change(h());
         ExpectNothingLeft();
     }
+}
+
+// What a stream's table and names may take of the heap when they take no large block.
+constexpr unsigned kSmallBlock = 1023;
+
+TEST_F(EasNamesTest, OfALargeStreamTakeNoLargeBlockOfTheHeap) {
+    OpenMany(32);
+    const Handle small = Open();
+    const Handle other_small = Open();
+    StreamImage large;
+    for (int i = 0; i < 1000; ++i) large.attributes.push_back({NameOfMany(i), {}});
+    Fill(large);
+    for (int i = 0; i < 3; ++i) {
+        TakeAllocations();
+        const Handle handle = Open();
+        ASSERT_NE(nullptr, handle);
+        EXPECT_GE(kSmallBlock, TakeAllocations().largest);
+        EXPECT_EQ(NameOfMany(999), Names(handle).back());
+        EXPECT_EQ(0, MAVOEASSearch(handle.get(), NameOfMany(0).c_str()));
+    }
+}
+
+TEST_F(EasNamesTest, OfSeveralLargeStreamsAreApart) {
+    OpenMany(600);
+    const std::vector<std::string> names = Names(handle_);
+    Handle second = Open();
+    Handle third = Open();
+    Change(second.get());
+    EXPECT_EQ(names, Names(handle_));
+    EXPECT_EQ(names, Names(third));
+    const std::vector<std::string> changed = Names(second);
+    handle_ = Open();
+    EXPECT_EQ(changed, Names(handle_));
+    EXPECT_EQ(changed, Names(second));
+    EXPECT_EQ(names, Names(third));
+    second.reset();
+    third.reset();
+    EXPECT_EQ(changed, Names(handle_));
+    EXPECT_EQ(1, Write(handle_, "last", "x"));
+    EXPECT_EQ(changed.size() + 1, Names(Open()).size());
+    ExpectNothingLeft();
+}
+
+// Promise: "MAVOEASAllocEntry: 0x200"
+TEST_F(EasNamesTest, OfALargeStreamStayWhenItsTableGrows) {
+    OpenMany(600);
+    TakeAllocations();
+    ASSERT_EQ(0, MAVOEASAllocEntry(h(), 100));
+    EXPECT_EQ(0u, TakeAllocations().total);
+    {
+        const FailCall fault("malloc", ENOMEM);
+        ASSERT_EQ(-1, MAVOEASAllocEntry(h(), 3000));
+        EXPECT_TRUE(fault.fired());
+    }
+    EXPECT_THAT(TakeCodes(), ElementsAre(0x200));
+    EXPECT_EQ(700, h()->capacity);
+    EXPECT_EQ(600u, Names(handle_).size());
+    ASSERT_EQ(0, MAVOEASAllocEntry(h(), 3000));
+    EXPECT_EQ(3700, h()->capacity);
+    Handle other = Open();
+    EXPECT_EQ(Names(other), Names(handle_));
+    for (int i = 600; i < 3700; ++i) ASSERT_EQ(nullptr, h()->entries[i].name) << i;
+    Change(h());
+    EXPECT_EQ(600u, Names(other).size());
+    handle_.reset();
+    other.reset();
+    TakeAllocations();
+    handle_ = Open();
+    EXPECT_GE(kSmallBlock, TakeAllocations().largest);  // given back when it was outgrown
+    ExpectNothingLeft();
 }
 
 // ---- Update entry -------------------------------------------------------------------------------

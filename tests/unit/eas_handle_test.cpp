@@ -277,10 +277,17 @@ int CodeOfOpenFailure(const std::string& call) {
 TEST_F(EasHandleTest, EveryFailingCallOfAnOpenIsRecordedOnceAndLeavesNothingBehind) {
     StreamImage long_table;
     for (int i = 0; i < 600; ++i) long_table.attributes.push_back({"name" + std::to_string(i), {}});
-    for (const Bytes& bytes : {Bytes{}, PlainAppleDouble(Pattern(32), Pattern(9)), Image().Build(),
-                               long_table.Build()}) {
+    struct Case {
+        Bytes bytes;
+        bool beside_another;  // which has taken what the library keeps for one large stream
+    };
+    for (const auto& [bytes, beside_another] :
+         {Case{{}, false}, Case{PlainAppleDouble(Pattern(32), Pattern(9)), false},
+          Case{Image().Build(), false}, Case{long_table.Build(), false},
+          Case{long_table.Build(), true}}) {
         SCOPED_TRACE(bytes.size());
         Fill(bytes);
+        const Handle other = beside_another ? Open(F_UNLCK) : nullptr;
         const int live = TakeAllocations().live;
         for (int nth = 1;; ++nth) {
             SCOPED_TRACE(nth);
@@ -318,6 +325,9 @@ TEST_F(EasHandleTest, EveryFailingCallOfAnOpenIsRecordedOnceAndLeavesNothingBehi
             EXPECT_EQ(F_UNLCK, LockInTheWay(path_, F_WRLCK));
         }
         EXPECT_EQ(bytes, Contents());
+        TakeAllocations();
+        EXPECT_NE(nullptr, Open(F_UNLCK));
+        EXPECT_EQ(beside_another, TakeAllocations().largest >= 1024);
     }
 }
 
