@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <string.h>
 #include <strings.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -161,6 +162,17 @@ bool WriteDurably(int fd, std::span<const std::uint8_t> bytes, std::int64_t offs
            fsync(fd) == 0;
 }
 
+bool HasNoStream(const char* path) {
+    char at[4096];
+    StreamPath(path, "MavoEAStream", at);
+    if (open(at, O_RDONLY) >= 0) return false;
+    struct stat info;
+    *strrchr(at, '@') = '\0';
+    if (stat(at, &info) == 0) return false;
+    AppleDoublePath(path, at);
+    return stat(at, &info) != 0;
+}
+
 bool LockAndReplace(const char* path, std::span<const std::uint8_t> bytes) {
     const int fd = open(path, O_RDWR | O_CREAT, 0777);
     struct flock lock = {};
@@ -170,6 +182,14 @@ bool LockAndReplace(const char* path, std::span<const std::uint8_t> bytes) {
                       WriteDurably(fd, bytes);
     close(fd);
     return done;
+}
+
+bool CloseUpAndWriteDurably(int fd, std::span<std::uint8_t> whole, std::size_t head_size,
+                            std::size_t value_size) {
+    const std::size_t moved = whole.size() - head_size - value_size;
+    return pread(fd, whole.data() + head_size, moved, static_cast<off_t>(head_size + value_size)) ==
+               static_cast<ssize_t>(moved) &&
+           WriteDurably(fd, whole);
 }
 
 bool MoveUpAndWriteDurably(int fd, std::int64_t from, std::int64_t length, std::int64_t by,

@@ -43,9 +43,18 @@ int ListNames(const char* path, MLIBCSzList** list);
 // One pwrite at `offset`, and an fsync.
 bool WriteDurably(int fd, std::span<const std::uint8_t> bytes, std::int64_t offset = 0);
 
+// Looks for the stream of an object: the file, the folder and the "._" file that it may be in.
+// Whether there is none of them.
+bool HasNoStream(const char* path);
+
 // Opens the stream to write, making it where it is missing, locks and reads it, writes `bytes` in
 // its place and syncs them, and closes it, which drops the lock.
 bool LockAndReplace(const char* path, std::span<const std::uint8_t> bytes);
+
+// Closes up over the first `value_size` bytes behind the head: reads what lies behind those into
+// `whole`, which has the head before it and the new last value behind it, and writes all of that.
+bool CloseUpAndWriteDurably(int fd, std::span<std::uint8_t> whole, std::size_t head_size,
+                            std::size_t value_size);
 
 // Lengthens the file and moves the last `length` bytes up by `by`, from the back in steps of
 // 16 KiB; then WriteDurably() of `head`.

@@ -227,57 +227,130 @@ Prepare SettingByHand(const Place& place) {
     };
 }
 
-// The same value again, which is the last one then.
-struct Again {
-    const char* title;
+// ---- Overwriting a value of a large stream ------------------------------------------------------
+
+// So many values of one size.
+struct Large {
     int count;
     std::size_t size;
+    const char* last;  // the title where the same value is overwritten again, the last one then
+    const char* first;
 };
 
-constexpr Again kAgain[] = {{"durable overwrite of the last of 10 x 1 MB", 10, 1'000'000},
-                            {"durable overwrite of the last of 1,000 x 1 KiB", kMany, 1024}};
+constexpr Large kLarge[] = {{10, 1'000'000, "durable overwrite of the last of 10 x 1 MB",
+                             "durable overwrite of the first of 10 x 1 MB"},
+                            {kMany, 1024, "durable overwrite of the last of 1,000 x 1 KiB",
+                             "durable overwrite of the first of 1,000 x 1 KiB"}};
 
-StreamImage ImageOf(const Again& again, const Bytes& last) {
-    StreamImage image = ImageOf(again.count);
-    for (Attribute& attribute : image.attributes) attribute.value = test::Pattern(again.size);
+StreamImage ImageOf(const Large& large, const Bytes& last) {
+    StreamImage image = ImageOf(large.count);
+    for (Attribute& attribute : image.attributes) attribute.value = test::Pattern(large.size);
     image.attributes.back().value = last;
     return image;
 }
 
-Prepare OverwritingTheLastThroughLibrary(const Place& place, const Again& again) {
-    return [place, again] {
+Prepare OverwritingTheLastThroughLibrary(const Place& place, const Large& large) {
+    return [place, large] {
         const std::string path = place.NewPath();
-        test::WriteFile(path, ImageOf(again, test::Pattern(again.size, 1)).Build());
+        test::WriteFile(path, ImageOf(large, test::Pattern(large.size, 1)).Build());
         const auto stream = std::make_shared<Stream>(path, O_RDWR, F_WRLCK);
-        const Bytes value = test::Pattern(again.size, 99);
-        const auto overwrite = [stream, value, name = NameOf(again.count - 1)] {
+        const Bytes value = test::Pattern(large.size, 99);
+        const auto overwrite = [stream, value, name = NameOf(large.count - 1)] {
             Require(MAVOEASWrite(stream->handle(), name.c_str(), value.data(),
                                  static_cast<unsigned>(value.size()), 0,
                                  EAS_WRITE_OVERWRITE) == static_cast<int>(value.size()),
                     "cannot overwrite an attribute");
         };
         overwrite();
-        Require(stream->Content() == ImageOf(again, value).Build(),
+        Require(stream->Content() == ImageOf(large, value).Build(),
                 "not the stream that is due after an overwrite");
         return Repeat(overwrite);
     };
 }
 
-Prepare OverwritingTheLastByHand(const Place& place, const Again& again) {
-    return [place, again] {
+Prepare OverwritingTheLastByHand(const Place& place, const Large& large) {
+    return [place, large] {
         const std::string path = place.NewPath();
-        test::WriteFile(path, ImageOf(again, test::Pattern(again.size, 1)).Build());
+        test::WriteFile(path, ImageOf(large, test::Pattern(large.size, 1)).Build());
         const auto file = std::make_shared<File>(path, O_RDWR);
-        const Bytes value = test::Pattern(again.size, 99);
+        const Bytes value = test::Pattern(large.size, 99);
         const auto overwrite = [file, value,
-                                at = file->Size() - static_cast<std::int64_t>(again.size)] {
+                                at = file->Size() - static_cast<std::int64_t>(large.size)] {
             Require(floor::WriteDurably(file->fd(), value, at), "cannot write a file");
         };
         overwrite();
         Require(
-            file->Read(0, static_cast<std::size_t>(file->Size())) == ImageOf(again, value).Build(),
+            file->Read(0, static_cast<std::size_t>(file->Size())) == ImageOf(large, value).Build(),
             "not the stream that is due after an overwrite");
         return Repeat(overwrite);
+    };
+}
+
+// The stream behind an overwrite of the first of them.
+StreamImage ImageAfterFirst(const Large& large, const Bytes& value) {
+    StreamImage image = ImageOf(large, value);
+    for (int i = 0; i < large.count; ++i) {
+        image.attributes[static_cast<std::size_t>(i)].name = NameOf((i + 1) % large.count);
+    }
+    return image;
+}
+
+// The attributes in turn, so that each is the first one.
+Prepare OverwritingTheFirstThroughLibrary(const Place& place, const Large& large) {
+    return [place, large] {
+        const std::string path = place.NewPath();
+        test::WriteFile(path, ImageOf(large, test::Pattern(large.size)).Build());
+        const auto stream = std::make_shared<Stream>(path, O_RDWR, F_WRLCK);
+        const Bytes value = test::Pattern(large.size, 99);
+        auto overwrite = [stream, value, count = large.count, next = 0]() mutable {
+            Require(MAVOEASWrite(stream->handle(), NameOf(next).c_str(), value.data(),
+                                 static_cast<unsigned>(value.size()), 0,
+                                 EAS_WRITE_OVERWRITE) == static_cast<int>(value.size()),
+                    "cannot overwrite an attribute");
+            next = (next + 1) % count;
+        };
+        overwrite();
+        Require(stream->Content() == ImageAfterFirst(large, value).Build(),
+                "not the stream that is due after an overwrite");
+        return Repeat(overwrite);
+    };
+}
+
+Prepare OverwritingTheFirstByHand(const Place& place, const Large& large) {
+    return [place, large] {
+        const std::string path = place.NewPath();
+        test::WriteFile(path, ImageOf(large, test::Pattern(large.size)).Build());
+        const auto file = std::make_shared<File>(path, O_RDWR);
+        const Bytes image = ImageAfterFirst(large, test::Pattern(large.size, 99)).Build();
+        const std::size_t head = image.size() - static_cast<std::size_t>(large.count) * large.size;
+        const auto overwrite = [file, whole = std::make_shared<Bytes>(image), head,
+                                size = large.size] {
+            Require(floor::CloseUpAndWriteDurably(file->fd(), *whole, head, size),
+                    "cannot write a file");
+        };
+        overwrite();
+        Require(file->Read(0, image.size() + 1) == image,
+                "not the stream that is due after an overwrite");
+        return Repeat(overwrite);
+    };
+}
+
+// ---- Looking for a stream -----------------------------------------------------------------------
+
+bool FindsNothing(const char* object) {
+    return MAVOEAOpen(EA_FORM_FILE, object, MAVOEA_KIND_STREAM, O_RDONLY, EA_PLACE_EADIR) < 0;
+}
+
+// An object without metadata, beside one that has some.
+template <class LooksFor>
+Prepare Missing(const Place& place, LooksFor finds_nothing) {
+    return [place, finds_nothing] {
+        const std::string object = NewObject(place) + ".without";
+        test::WriteFile(object, {});
+        Require(finds_nothing(object.c_str()), "an object without metadata has some");
+        return Repeat([object, finds_nothing] {
+            Require(finds_nothing(object.c_str()), "an object without metadata has some");
+        });
     };
 }
 
@@ -434,9 +507,14 @@ void AddStreamRows(const Place& place, const Place& fast, std::vector<Row>* rows
                          .library = Reading(place, kind.count, ReadThroughLibrary),
                          .floor = Reading(place, kind.count, floor::ReadValue)});
     }
+    rows->push_back({.work = "look for a stream where there is no metadata",
+                     .where = place.name,
+                     .aim = 1.6,
+                     .library = Missing(place, FindsNothing),
+                     .floor = Missing(place, floor::HasNoStream)});
     rows->push_back({.work = "open, enumerate 1,000 names, close",
                      .where = place.name,
-                     .aim = 2.5,
+                     .aim = 1.3,
                      .library = Listing(place, ListThroughLibrary),
                      .floor = Listing(place, floor::ListNames)});
     rows->push_back({.work = "durable overwrite, 1 of 10 values",
@@ -451,13 +529,19 @@ void AddStreamRows(const Place& place, const Place& fast, std::vector<Row>* rows
                      .library = SettingThroughLibrary(place),
                      .floor = SettingByHand(place),
                      .waits = place.durable});
-    for (const Again& again : kAgain) {
-        if (!place.durable) break;  // beside a sync that does nothing, it is all memory
-        rows->push_back({.work = again.title,
+    for (const Large& large : kLarge) {
+        rows->push_back({.work = large.first,
+                         .where = place.name,
+                         .aim = 1.3,
+                         .library = OverwritingTheFirstThroughLibrary(place, large),
+                         .floor = OverwritingTheFirstByHand(place, large),
+                         .waits = place.durable});
+        if (!place.durable) continue;  // beside a sync that does nothing, it is all memory
+        rows->push_back({.work = large.last,
                          .where = place.name,
                          .aim = 1.1,
-                         .library = OverwritingTheLastThroughLibrary(place, again),
-                         .floor = OverwritingTheLastByHand(place, again),
+                         .library = OverwritingTheLastThroughLibrary(place, large),
+                         .floor = OverwritingTheLastByHand(place, large),
                          .waits = true});
     }
     for (const int count : {100, kMany}) {
