@@ -16,6 +16,10 @@ bool LiesInBlock(const char* name) {
     return false;
 }
 
+void FreeName(char* name) {
+    if (!LiesInBlock(name)) kernel::Free(name);
+}
+
 // The link to the block of `table`, or the one behind the last.
 NameBlock** LinkTo(const EASEntry* table) {
     NameBlock** link = &blocks;
@@ -42,12 +46,12 @@ void MoveNameBlock(const EASEntry* from, const EASEntry* to) {
 }
 
 void FreeEntry(EASEntry* entry) {
-    if (!LiesInBlock(entry->name)) kernel::Free(entry->name);
+    FreeName(entry->name);
     *entry = {};
 }
 
 void FreeStream(EASHandle* h) {
-    for (std::int32_t i = 0; i < h->capacity; ++i) FreeEntry(&h->entries[i]);
+    for (std::int32_t i = 0; i < h->capacity; ++i) FreeName(h->entries[i].name);
     NameBlock** const link = LinkTo(h->entries);
     if (NameBlock* const block = *link) {
         *link = block->next;
