@@ -1102,6 +1102,138 @@ TEST(CrashPointsTest, ADanglingEADirectoryIsThereOrNot) {
     });
 }
 
+// ---- Last steps ---------------------------------------------------------------------------------
+
+// What is told of an object is noted where no operation on these volumes looks: with the file of a
+// fork on another kind of volume.
+std::string NotesOf(const World& world) { return ForkFile(world.dst().object()); }
+std::string NameOfNote(const std::string& note) { return "user.note." + note; }
+
+void TakeNotes(const World& world) {
+    const auto take = [&](const std::string& note) {
+        if (::setxattr(NotesOf(world).c_str(), NameOfNote(note).c_str(), "", 0, 0) != 0) abort();
+        return 0;
+    };
+    Hooks().archive = [=](int) { return take("archive bit"); };
+    Platform().index = [=](const std::string& call) {
+        if (Hooks().before) Hooks().before("index");
+        return take(call.starts_with("MLIBMavoFileIndexAdd") ? "file index" : "index");
+    };
+}
+
+// By the rights of the object or, as the platform does, by a mark.
+bool IsLocked(const std::string& object) {
+    constexpr int kSetLocked = 522;
+    int command = 0;
+    const ssize_t size = ::getxattr(object.c_str(), kHiddenMark, &command, sizeof command);
+    return (ModeOf(object) & 0222) == 0 || (size == sizeof command && command == kSetLocked);
+}
+
+// Which of them have been made.
+std::string LastSteps(const World& world) {
+    const ObjectFiles& dst = world.dst();
+    std::set<std::string> made;
+    if (Exists(dst.resource()) && ModeOf(dst.resource()) == 0777) made.insert("resource's mode");
+    if (Exists(dst.stream()) && ModeOf(dst.stream()) == 0777) made.insert("stream's mode");
+    if (IsLocked(dst.object())) made.insert("lock");
+    for (const char* const note : {"archive bit", "index", "file index"}) {
+        if (::getxattr(NotesOf(world).c_str(), NameOfNote(note).c_str(), nullptr, 0) == 0) {
+            made.insert(note);
+        }
+    }
+    return made.empty() ? "none" : Listed(made);
+}
+
+// From an object without write bits, which are the lock where volumes keep it in the mode.
+Operation LastStepsOfCopy(int from, int to, bool move, std::vector<Stage> stages) {
+    return {
+        .name = std::string("last steps of a ") + (move ? "move" : "copy") + " from type " +
+                std::to_string(from) + " to type " + std::to_string(to),
+        .prepare =
+            [=](const World& world) {
+                world.Fill(from);
+                TakeNotes(world);
+                if (::chmod(world.src().object().c_str(), 0444) != 0) abort();
+            },
+        .run =
+            [=](const World& world) {
+                std::string dst = world.dst().object();
+                return MAVOEACopy(world.src().object().c_str(), dst.data(), move ? 1 : 0, 0, from,
+                                  to, 1, 1);
+            },
+        .cost = LastSteps,
+        .stages = std::move(stages),
+    };
+}
+
+// Promise: "Last steps: These come last"
+// Promise: "Last steps: Running the operation again"
+TEST(CrashPointsTest, WhatAnOperationDoesLastIsMadeUpForByAnother) {
+    const Umask mask(022);
+    for (const bool move : {false, true}) {
+        KillEverywhere(LastStepsOfCopy(0, 0, move,
+                                       {{"", "none"},
+                                        {"chmod", "lock"},
+                                        {"archive", "archive bit, lock"},
+                                        {"index", "archive bit, index, lock"},
+                                        {"index", "archive bit, file index, index, lock"}}));
+        KillEverywhere(LastStepsOfCopy(
+            0, 1, move,
+            {{"", "none"},
+             {"fchmod", "resource's mode"},
+             {"fchmod", "resource's mode, stream's mode"},
+             {"command", "lock, resource's mode, stream's mode"},
+             {"archive", "archive bit, lock, resource's mode, stream's mode"},
+             {"index", "archive bit, index, lock, resource's mode, stream's mode"},
+             {"index", "archive bit, file index, index, lock, resource's mode, stream's mode"}}));
+    }
+    KillEverywhere(LastStepsOfCopy(
+        1, 1, false,
+        {{"", "none"},
+         {"fchmod", "resource's mode"},
+         {"fchmod", "resource's mode, stream's mode"},
+         {"archive", "archive bit, resource's mode, stream's mode"},
+         {"index", "archive bit, index, resource's mode, stream's mode"},
+         {"index", "archive bit, file index, index, resource's mode, stream's mode"}}));
+    Operation rename = RenameOf("last steps of a rename, type 1", 1, true,
+                                {{"", "none"},
+                                 {"index", "index"},
+                                 {"index", "file index, index"},
+                                 {"archive", "archive bit, file index, index"}});
+    rename.prepare = [prepare = rename.prepare](const World& world) {
+        prepare(world);
+        TakeNotes(world);
+    };
+    rename.cost = LastSteps;
+    KillEverywhere(rename);
+    Operation removal =
+        ObjectRemovalOf("last steps of a removal, type 1", 1,
+                        {{"", "none"}, {"index", "index"}, {"index", "file index, index"}});
+    removal.prepare = [prepare = removal.prepare](const World& world) {
+        prepare(world);
+        TakeNotes(world);
+    };
+    removal.cost = LastSteps;
+    KillEverywhere(removal);
+}
+
+// Promise: "Last steps: The mode of a file"
+TEST(CrashPointsTest, AFileThatAMoveHasTakenFromItsSourceMayKeepItsMode) {
+    const Umask mask(022);
+    const std::string without_resource = "0: archive bit, file index, index, stream's mode";
+    const std::string without_stream = "0: archive bit, file index, index, resource's mode";
+    KillEverywhere(LastStepsOfCopy(
+        1, 1, true,
+        {{"", "none"},
+         {"unlink", "none", without_resource},
+         {"fchmod", "resource's mode"},
+         {"unlink", "resource's mode", without_stream},
+         {"fchmod", "resource's mode, stream's mode"},
+         {"archive", "archive bit, resource's mode, stream's mode"},
+         {"index", "archive bit, index, resource's mode, stream's mode"},
+         {"index", "archive bit, file index, index, resource's mode, stream's mode"}}));
+}
+
 // ---- EA directories -----------------------------------------------------------------------------
 
 // A directory that is there is left as it is, so that what one lacks it lacks for good.

@@ -83,7 +83,13 @@ class Log {
             ids_[InodeOf(path)] = names_[path];
             contents_.push_back(bytes);
         }
-        Hooks().fsync = [](int) { return 0; };
+        Hooks().fsync = [](int fd) {
+            // A directory's would sync its names, which this model does not know of.
+            struct stat info;
+            EXPECT_EQ(0, fstat(fd, &info));
+            EXPECT_FALSE(S_ISDIR(info.st_mode)) << "a directory is synced";
+            return 0;
+        };
         Hooks().sync = [] {};
         Hooks().changed = [this](const FileChange& change) { Add(change); };
     }
@@ -406,6 +412,7 @@ constexpr std::size_t kFork = 20000;
 // Promise: "What a crash costs: `tests/crash/power_loss_test.cpp` puts"
 // Promise: "A loss of power: a new stream"
 // Promise: "A loss of power: write, overwrite"
+// Promise: "A loss of power: Names have no sync"
 TEST(PowerLossTest, AChangeOfAStreamMayCostAnyOfItsValues) {
     LosePower(OnStream(WriteToAnEmptyFile(), "new, old"));
     LosePower(OnStream(WriteOf("write a new attribute", kSize, 0, std::nullopt, 1000),
@@ -639,6 +646,7 @@ TEST(PowerLossTest, AnImportOnOpenLosesNothing) {
 }
 
 // Promise: "A loss of power: upgrade"
+// Promise: "A loss of power: Names have no sync"
 TEST(PowerLossTest, AnUpgradeOfAttributeFilesIsDoneOrNot) {
     LosePower({
         .name = "upgrade of attribute files",
@@ -770,6 +778,7 @@ Operation CopyOf(int from, int to, bool move, const std::string& during, const s
 
 // Once it has succeeded a copy may be incomplete: its source is still there.
 // Promise: "A loss of power: copy"
+// Promise: "A loss of power: Names have no sync"
 TEST(PowerLossTest, ACopyMayBeIncompleteBehindItsSuccessButItsSourceIsNot) {
     LosePower(CopyOf(0, 0, false, "new, old", "new, old"));
     LosePower(CopyOf(0, 1, false, "new, old", "new, old"));
@@ -789,6 +798,79 @@ TEST(PowerLossTest, AMoveRemovesItsSourceBeforeItsCopyHasBeenSynced) {
                      "half, new, old; LOST Finder info, fork, user.one, user.two"));
     LosePower(CopyOf(1, 2, true, "half, new, old; LOST Finder info, fork, user.one, user.two",
                      "half, new, old; LOST Finder info, fork, user.one, user.two"));
+}
+
+// ---- Renames and removals -----------------------------------------------------------------------
+
+ObjectFiles Renamed(const ObjectFiles& object) { return {object.parent, "renamed"}; }
+
+void FillObject(const ObjectFiles& object, int type) {
+    if (type == 0) {
+        WriteFile(object.sidecar(), ResourceWithAttributes());
+    } else {
+        WriteFile(object.stream(), ImageOf(Attributes()).Build());
+        WriteFile(object.resource(), PlainAppleDouble(OldFinderInfo(), Fork()));
+    }
+}
+
+// The caller has renamed the object before.
+Operation RenameOf(int type, const std::string& left) {
+    return {
+        .name = "rename, type " + std::to_string(type),
+        .prepare =
+            [=](const ObjectFiles& object) {
+                FillObject(object, type);
+                std::filesystem::rename(object.object(), Renamed(object).object());
+            },
+        .run =
+            [=](const ObjectFiles& object) {
+                return MAVOEARename(object.object().c_str(), Renamed(object).object().c_str(), type,
+                                    nullptr);
+            },
+        .cost = [=](const ObjectFiles& object) -> Cost {
+            const Items wanted = WantedItems();
+            const Items former = Found(object, type);
+            const Items now = Found(Renamed(object), type);
+            const auto under_new = WholeIn(now, wanted).size();
+            return {under_new == wanted.size() ? "new"
+                    : under_new == 0           ? "old"
+                                               : "some names old",
+                    LostFrom(wanted, {former, now})};
+        },
+        .during = left,
+        .after = left,
+    };
+}
+
+// Of an object that the caller has removed before.
+Operation RemovalOf(int type, const std::string& left) {
+    return {
+        .name = "remove, type " + std::to_string(type),
+        .prepare =
+            [=](const ObjectFiles& object) {
+                FillObject(object, type);
+                std::filesystem::remove(object.object());
+            },
+        .run =
+            [=](const ObjectFiles& object) {
+                return MAVOEARemove(object.object().c_str(), type, nullptr);
+            },
+        .cost = [=](const ObjectFiles& object) -> Cost {
+            const auto there = WholeIn(Found(object, type), WantedItems()).size();
+            return {there == 0 ? "new" : there == WantedItems().size() ? "old" : "some names old"};
+        },
+        .during = left,
+        .after = left,
+    };
+}
+
+// Promise: "A loss of power: Names have no sync"
+// Promise: "A loss of power: rename, remove"
+TEST(PowerLossTest, WhatARenameOrARemovalHasDoneMayNotBeThere) {
+    LosePower(RenameOf(0, "new, old"));
+    LosePower(RenameOf(1, "new, old, some names old"));
+    LosePower(RemovalOf(0, "new, old"));
+    LosePower(RemovalOf(1, "new, old, some names old"));
 }
 
 }  // namespace
