@@ -27,7 +27,7 @@ for folder in adouble stream xattr; do
     [ -d $folder ] && check $folder path format util platform
 done
 [ -d ops ] && check ops adouble stream xattr path format util platform
-below="adouble format util platform"
+below="adouble stream format util platform"
 # shellcheck disable=SC2086: lists of words
 for room in say place store walk transfer; do
     check tools/$room $below

@@ -40,6 +40,7 @@ enum class Shape {
     kDescriptor,  // 0, an open file
     kListing,     // 0, an open directory whose names it reads
     kData,        // 0, an open file whose data it reads or writes
+    kSync,        // 0, an open file
 };
 
 struct Call {
@@ -138,6 +139,9 @@ const std::map<std::uint64_t, Call>& Calls() {
         MAVOEA_CALL(copy_file_range, kData),
         MAVOEA_CALL(pread64, kData),
         MAVOEA_CALL(pwrite64, kData),
+        MAVOEA_CALL(fsync, kSync),
+        MAVOEA_CALL(fdatasync, kSync),
+        MAVOEA_CALL(syncfs, kSync),
 #undef MAVOEA_CALL
         // The headers may not know these yet; their numbers are the same everywhere.
         {452, {"fchmodat2", Shape::kAt}},
@@ -173,6 +177,7 @@ class StopAtCalls {
         std::vector<std::uint32_t> numbers;
         for (const auto& [number, call] : Calls()) {
             if (stops == Stops::kAtNames && call.shape == Shape::kData) continue;
+            if (stops != Stops::kAtSyncsToo && call.shape == Shape::kSync) continue;
             numbers.push_back(static_cast<std::uint32_t>(number));
         }
         const std::size_t allow = 1 + 3 * std::size(kStatusCalls) + numbers.size();
@@ -237,10 +242,14 @@ std::string TextAt(pid_t process, std::uint64_t address) {
     return text;
 }
 
-std::string DescriptorFile(pid_t process, std::uint64_t descriptor) {
+std::string DescriptorPath(pid_t process, std::uint64_t descriptor) {
     const std::string of = "/proc/" + std::to_string(process);
     const int fd = static_cast<int>(descriptor);
-    return LinkTarget(fd == AT_FDCWD ? of + "/cwd" : of + "/fd/" + std::to_string(fd));
+    return fd == AT_FDCWD ? of + "/cwd" : of + "/fd/" + std::to_string(fd);
+}
+
+std::string DescriptorFile(pid_t process, std::uint64_t descriptor) {
+    return LinkTarget(DescriptorPath(process, descriptor));
 }
 
 std::string Tidy(const std::string& path) {
@@ -327,6 +336,7 @@ class Tracer {
         call_.process = process;
         call_.look_ups.clear();
         call_.open_file.clear();
+        call_.descriptor.clear();
         const auto& arguments = info.seccomp.args;
         const auto cwd = static_cast<std::uint64_t>(AT_FDCWD);
         switch (found->second.shape) {
@@ -351,7 +361,8 @@ class Tracer {
             case Shape::kDescriptor:
             case Shape::kListing:
             case Shape::kData:
-                call_.open_file = DescriptorFile(process, arguments[0]);
+            case Shape::kSync:
+                SetOpenFile(process, arguments[0]);
                 break;
         }
         const bool begins =
@@ -360,6 +371,11 @@ class Tracer {
         if (call_.nth == 0 && !begins) return;
         ++call_.nth;
         watching_ = at_call_(call_);
+    }
+
+    void SetOpenFile(pid_t process, std::uint64_t descriptor) {
+        call_.open_file = DescriptorFile(process, descriptor);
+        call_.descriptor = DescriptorPath(process, descriptor);
     }
 
     void AddPath(pid_t process, std::uint64_t directory, std::uint64_t address) {
@@ -375,7 +391,7 @@ class Tracer {
         }
         if (!path.starts_with('/')) from = DescriptorFile(process, directory);
         if (path.empty()) {
-            call_.open_file = from;
+            SetOpenFile(process, directory);
         } else if (path.front() == '/') {
             call_.look_ups.push_back({Tidy(path), from});
         } else {
@@ -461,10 +477,12 @@ std::vector<std::string> FileCall::FilesWithoutNames(const std::string& tree) co
     return files;
 }
 
+bool FileCall::Syncs() const { return name.find("sync") != std::string::npos; }
+
 bool FileCall::Changes() const {
     constexpr const char* kReading[] = {"getxattr", "listxattr", "statfs",         "chdir",
                                         "exec",     "open",      "name_to_handle", "pread"};
-    return !OnlyLooks() &&
+    return !OnlyLooks() && !Syncs() &&
            std::none_of(std::begin(kReading), std::end(kReading), [this](const char* reading) {
                return name.find(reading) != std::string::npos;
            });

@@ -28,8 +28,9 @@ struct FileCall {
     int nth = 0;       // from 1
     std::string name;  // "openat"
     std::vector<LookUp> look_ups;
-    std::string open_file;  // what its descriptor leads to, where it looks up no name
-    pid_t process = 0;      // that makes it
+    std::string open_file;   // what its descriptor leads to, where it looks up no name
+    std::string descriptor;  // a path that leads to the same, also where that has no name
+    pid_t process = 0;       // that makes it
 
     // Whether what the name `path` stands for matters to it: it looks that up, or passes through
     // it, or lists the directory that has it.
@@ -39,6 +40,8 @@ struct FileCall {
     // The files in the directory `tree` that the process has open and that have no name, or none
     // any more: paths that lead to them.
     std::vector<std::string> FilesWithoutNames(const std::string& tree) const;
+    // Whether it has what was written put on disk.
+    bool Syncs() const;
     // Whether it may change what is there. Those that open files, and may make them, do not count.
     bool Changes() const;
 };
@@ -52,8 +55,8 @@ struct StoppedRun : ToolResult {
 };
 
 // Where a run stops: at calls with names and attributes, or also where data is read and written at
-// an offset.
-enum class Stops { kAtNames, kAtDataToo };
+// an offset, or also where that is synced.
+enum class Stops { kAtNames, kAtDataToo, kAtSyncsToo };
 
 // Runs the tool and calls `at_call` before each of its file calls, counted from the first that
 // names a file in the directory `tree`. All of the tool stands still meanwhile. No other child of

@@ -525,6 +525,14 @@ void Inode::SetTimes(const timespec (&times)[2]) const {
     if (result != 0 && errno != EPERM) throw SystemFailure(path(), errno);
 }
 
+void Inode::Sync() const {
+    if (!by_path_) return file_->Sync();
+    const File opened(::open(ProcPath().c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC),
+                      path());
+    if (opened.fd() < 0) throw SystemFailure(path(), errno);
+    opened.Sync();
+}
+
 // ---- Temporary files ----------------------------------------------------------------------------
 
 std::string TemporaryName() {

@@ -236,6 +236,9 @@ class Inode {
     bool TrySetOwner(uid_t owner, gid_t group) const;
     void SetTimes(const timespec (&times)[2]) const;  // of access and modification
 
+    // Its data and attributes are on disk. For files that can be read and directories.
+    void Sync() const;
+
  private:
     Inode(std::shared_ptr<const File> file, bool by_path)
         : file_(std::move(file)), by_path_(by_path), info_(file_->Status()) {}

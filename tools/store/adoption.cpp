@@ -72,8 +72,9 @@ class ObjectAdoption {
         std::vector<Missing> missing;
         const Writer& writer = WriterFor(object_);
         const Metadata fitting = writer.Fit(metadata, object_, &missing);
+        const auto inode = Inode::Open(object_.place);
         const Written written =
-            writer.Write(object_, *Inode::Open(object_.place), fitting, {.old = Old::kKept});
+            writer.Write(object_, *inode, fitting, {.old = Old::kKept, .first = First::kResource});
         missing.insert(missing.end(), written.missing.begin(), written.missing.end());
         const auto again = WhatIsMissing(fitting, ReadCurrent());
         missing.insert(missing.end(), again.begin(), again.end());
@@ -84,8 +85,11 @@ class ObjectAdoption {
                 "see where it lies with: mavoea list -l PATH");
         }
         const bool had_head = !sidecars_.resource && sidecars_.legacy_resource;
-        RemoveAdopted(missing, written);
-        if (had_head && !sidecars_.legacy_resource) GiveMarks(fitting);
+        const std::vector<Found> going = TakeAdopted(missing, written);
+        if (had_head && !sidecars_.legacy_resource) GiveMarks(*inode, fitting);
+        // Record and marks are in none of the files that have been synced.
+        if (!going.empty() && inode->HoldsContents()) inode->Sync();
+        RemoveFiles(going);
     }
 
     // As services see it, that know nothing of earlier layouts.
@@ -98,7 +102,8 @@ class ObjectAdoption {
         return ReadMetadata(object_, current);
     }
 
-    void RemoveAdopted(const std::vector<Missing>& missing, const Written& written) {
+    // The files that are not needed any more.
+    std::vector<Found> TakeAdopted(const std::vector<Missing>& missing, const Written& written) {
         std::vector<Found> going;
         const auto consider = [&](const Found& found, bool arrived) {
             const std::string path = found.path();
@@ -122,7 +127,7 @@ class ObjectAdoption {
         for (auto* one : {&sidecars_.apple_double, &sidecars_.legacy_resource}) {
             if (*one && consider(**one, missing.empty())) one->reset();
         }
-        RemoveFiles(going);
+        return going;
     }
 
     bool HasStray(const std::string& path) const {
@@ -136,16 +141,15 @@ class ObjectAdoption {
 
     // What a legacy resource file says of the object itself. Nobody may write it who might not
     // before.
-    void GiveMarks(const Metadata& metadata) {
-        const auto inode = Inode::Open(object_.place);
-        if (!inode->HoldsContents()) return;
+    void GiveMarks(const Inode& inode, const Metadata& metadata) {
+        if (!inode.HoldsContents()) return;
         if (!metadata.entries.contains(EntryId::kAfpFileInfo) && !metadata.finder_info) {
             adoption_.notes.emplace_back(
                 "its legacy resource file says nothing of its read-only and hidden marks");
         }
-        const mode_t mode = inode->Status().st_mode & kPermissionBits;
+        const mode_t mode = inode.Status().st_mode & kPermissionBits;
         if ((metadata.AfpAttributes().value_or(0) & kAfpNoWrite) != 0 && (mode & kWriteBits) != 0) {
-            LockMode(*inode, mode);
+            LockMode(inode, mode);
         }
     }
 

@@ -22,6 +22,7 @@ std::unique_ptr<ChangedFile> ChangedFile::Open(const Place& object, const Place&
     if (!make) return nullptr;
     changed->rights_ = Rights::Of(*Inode::Open(object));
     changed->made_ = std::make_unique<TemporaryFile>(file);
+    changed->directory_ = file.directory;
     return changed;
 }
 
@@ -30,6 +31,7 @@ void ChangedFile::Commit() {
     rights_.Give(made_->file());
     made_->file().Sync();
     made_->GiveToNewTarget();
+    directory_->Sync();
     made_.reset();
 }
 

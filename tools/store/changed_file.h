@@ -26,6 +26,7 @@ class ChangedFile {
 
     std::shared_ptr<const File> existing_;
     std::unique_ptr<TemporaryFile> made_;
+    DirectoryRef directory_;  // of a file that is made
     Rights rights_;
 };
 

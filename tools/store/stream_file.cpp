@@ -4,6 +4,7 @@
 
 #include <limits>
 
+#include "stream/internal.h"
 #include "tools/say/messages.h"
 #include "tools/store/apple_double_file.h"
 #include "tools/store/layout.h"
@@ -38,13 +39,15 @@ void StreamFile::Set(const std::string& name, const Bytes& value) const {
         throw Failure(kFailed, file_.path(), "the value has 2 GiB or more", "use a smaller value");
     }
     RefuseToLoseEntries();
-    // A write never makes a value shorter.
-    if (const auto old_size = SizeOf(name); old_size && *old_size > value.size()) Remove(name);
+    const auto old_size = SizeOf(name);
     const ErrorMark mark;
-    if (MAVOEASWrite(handle_.get(), name.c_str(), value.data(), static_cast<unsigned>(value.size()),
-                     0, EAS_WRITE_OVERWRITE) < 0) {
-        throw LibraryFailure(file_.path(), mark.Get());
-    }
+    // A write never makes a value shorter.
+    const int result =
+        old_size && *old_size > value.size()
+            ? EASReplace(handle_.get(), name.c_str(), value)
+            : MAVOEASWrite(handle_.get(), name.c_str(), value.data(),
+                           static_cast<unsigned>(value.size()), 0, EAS_WRITE_OVERWRITE);
+    if (result < 0) throw LibraryFailure(file_.path(), mark.Get());
 }
 
 bool StreamFile::Remove(const std::string& name) const {

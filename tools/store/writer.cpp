@@ -544,6 +544,7 @@ Written Writer::Write(const Object& to, const Inode& inode, const Metadata& fitt
     Written written;
     const Sidecars old = Sidecars::Find(to, Sidecars::Services::kFind);
     std::vector<Part> parts = PartsOf(fitting);
+    if (options.first == First::kResource) std::reverse(parts.begin(), parts.end());
     std::erase_if(parts, [](const Part& part) { return part.pieces.empty(); });
     if (!parts.empty() || !fitting.services.empty()) {
         RequireOwnNames(to);

@@ -29,9 +29,15 @@ enum class Durability { kNow, kLater };
 // What becomes of files beside the object that are not written anew.
 enum class Old { kRemoved, kKept };
 
+// Which of a stream and a resource file gets its name first. Attributes that are in the resource
+// file must not go from there before they are in the stream; once that is there, nobody looks into
+// what earlier versions kept.
+enum class First { kStream, kResource };
+
 struct WriteOptions {
     Durability durability = Durability::kNow;
     Old old = Old::kRemoved;
+    First first = First::kStream;
     std::optional<mode_t> mode = {};  // that the object will have, if it is not yet the one it has
 
     // The object has just been made by this process: it has no marks yet.
@@ -60,6 +66,7 @@ class Writer {
         Pieces pieces;
         WholeFile whole;  // of the source: every byte of it is in the pieces
     };
+    // The stream first, if there is one.
     virtual std::vector<Part> PartsOf(const Metadata& fitting) const = 0;
 
     // What is kept with the object itself.
