@@ -88,7 +88,8 @@ class ObjectAdoption {
         const std::vector<Found> going = TakeAdopted(missing, written);
         if (had_head && !sidecars_.legacy_resource) GiveMarks(*inode, fitting);
         // Record and marks are in none of the files that have been synced.
-        if (!going.empty() && inode->HoldsContents()) inode->Sync();
+        const bool kept_with_object = had_head || object_.kind() == VolumeKind::kFileEA;
+        if (kept_with_object && inode->HoldsContents()) inode->Sync();
         RemoveFiles(going);
     }
 
