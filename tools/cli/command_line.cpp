@@ -313,13 +313,12 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
         SpeakAs(own_name);
         return ParseAs(one.command, *habit, arguments);
     }
-    if (auto word = FindCommand(arguments)) {
+    const auto word = FindCommand(arguments);
+    if (word) {
         if (word->syntax == nullptr) throw NoCommand(arguments[word->index]);
         const Command command = word->syntax->command;
         const auto behind = arguments.subspan(word->index + 1);
-        if (const auto habit = HabitOf(command)) {
-            return ParseAs(command, *habit, behind, *std::move(word));
-        }
+        if (const auto habit = HabitOf(command)) return ParseAs(command, *habit, behind, *word);
     }
 
     Options options;
@@ -338,11 +337,12 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
         ->allow_extra_args(false)
         ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
 
+    // Commands and their arguments take longer to set up than many a command to run: there is only
+    // the one that is named, or may be.
     for (const Syntax& syntax : kCommands) {
+        if (word && word->syntax != &syntax) continue;
         CLI::App* const sub = app.add_subcommand(syntax.name, syntax.what);
         sub->callback([&options, &syntax] { options.command = syntax.command; });
-        // Whoever does not name a command does without its arguments, which take longer to set up
-        // than many a command to run.
         const std::string_view name = syntax.name;
         if (std::find(arguments.begin(), arguments.end(), name) != arguments.end()) {
             syntax.add_arguments(sub, &options);
