@@ -630,7 +630,9 @@ TEST_P(EaOpenUpgradeTest, AFileThatAppearsMeanwhileIsNotReplacedByALegacyOne) {
         std::filesystem::remove_all(folder_ + "/color");
         std::filesystem::remove_all(folder_ + "/tags");
         WriteFile(sidecar_, MacSidecar({.attributes = values_}).bytes);
-        for (const auto& [kind, file] : {std::pair{kStream, stream_}, {kResource, resource_}}) {
+        for (const auto& one : {std::pair{kStream, stream_}, {kResource, resource_}}) {
+            const auto& kind = one.first;
+            const std::string& file = one.second;
             SCOPED_TRACE(kind);
             Hooks().before = [&, made = false](const std::string& name) mutable {
                 if (name == "open" || made) return;

@@ -50,14 +50,17 @@ class ForeignChanger final : public Changer {
     bool Remove(const std::string& name) override {
         switch (KindOf(name)) {
             case Kind::kAttribute:
-            case Kind::kLocked:
-                return RemoveSpellings(Datum::kAttribute, name) | RemoveFromFile(name);
+            case Kind::kLocked: {
+                const bool removed = RemoveSpellings(Datum::kAttribute, name);
+                return RemoveFromFile(name) || removed;
+            }
             case Kind::kFinderInfo:
                 return RemoveFinderInfo();
             case Kind::kResourceFork:
                 break;
         }
-        return RemoveSpellings(Datum::kFork, {}) | RemoveFork();
+        const bool removed = RemoveSpellings(Datum::kFork, {});
+        return RemoveFork() || removed;
     }
 
  private:
