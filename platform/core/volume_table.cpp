@@ -37,11 +37,13 @@ constexpr NamedType kNamedTypes[] = {
     {"netatalk", MAVO_VOLUME_NETATALK},
     {"netatalk-samba", MAVO_VOLUME_NETATALK_SAMBA},
     {"linux", MAVO_VOLUME_LINUX},
+    {"samba-all-streams", MAVO_VOLUME_SAMBA_ALL_STREAMS},
 };
 
 constexpr bool IsPlatformType(int type) { return type >= 0 && type <= kPlatformTypeMax; }
 constexpr bool IsType(int type) {
-    return IsPlatformType(type) || (type >= MAVO_VOLUME_SAMBA && type <= MAVO_VOLUME_LINUX);
+    return IsPlatformType(type) ||
+           (type >= MAVO_VOLUME_SAMBA && type <= MAVO_VOLUME_SAMBA_ALL_STREAMS);
 }
 
 // The type that TYPE means, -1 for none.

@@ -112,11 +112,12 @@ MAVOCORE_API int MLIBMavoIndexAddEx(const char* szPath, const char* szOldPath, i
  * their own. A volume table may say so; to MAVOGetFSType(), and to whoever asks it, such a path is
  * of no known type (-1, ENOTSUP), and nothing is written there that those programs do not know. */
 enum {
-    MAVO_VOLUME_SAMBA = 100,          /* vfs_fruit with netatalk's records, vfs_streams_xattr */
-    MAVO_VOLUME_SAMBA_STREAM = 101,   /* the same with "fruit:metadata = stream" */
-    MAVO_VOLUME_NETATALK = 102,       /* netatalk, "ea = sys" */
-    MAVO_VOLUME_NETATALK_SAMBA = 103, /* netatalk, "ea = samba" */
-    MAVO_VOLUME_LINUX = 104           /* one extended attribute of the user namespace for each */
+    MAVO_VOLUME_SAMBA = 100,            /* vfs_fruit with netatalk's records, vfs_streams_xattr */
+    MAVO_VOLUME_SAMBA_STREAM = 101,     /* the same with "fruit:metadata = stream" */
+    MAVO_VOLUME_NETATALK = 102,         /* netatalk, "ea = sys" */
+    MAVO_VOLUME_NETATALK_SAMBA = 103,   /* netatalk, "ea = samba" */
+    MAVO_VOLUME_LINUX = 104,            /* one extended attribute of the user namespace for each */
+    MAVO_VOLUME_SAMBA_ALL_STREAMS = 105 /* as 101 and with "fruit:resource = stream" */
 };
 
 /* Declares, for this process, that the directory szPath (absolute) is a volume of `type`, 0 to 12
@@ -126,7 +127,7 @@ MAVOCORE_API int MAVOVolumeDeclare(const char* szPath, int type);
 
 /* The type that a volume table's TYPE means: a number from 0 to 12, or "appledouble" (0), "eadir"
  * (1), "fileea" (2), "xattr" (7), "samba" (100), "samba-stream" (101), "netatalk" (102),
- * "netatalk-samba" (103), "linux" (104). -1 when it means none. */
+ * "netatalk-samba" (103), "linux" (104), "samba-all-streams" (105). -1 when it means none. */
 MAVOCORE_API int MAVOVolumeTypeFromName(const char* szName);
 
 /* Where an entry of the volume table comes from. */

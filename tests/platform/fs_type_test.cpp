@@ -217,8 +217,9 @@ TEST_F(FsTypeTest, TheTableDecidesBeforeTheFilesystem) {
 
 TEST_F(FsTypeTest, WhatOtherProgramsKeepIsOfNoKnownType) {
     const std::string volume = dir_ / "volume";
-    for (int type : {MAVO_VOLUME_SAMBA, MAVO_VOLUME_SAMBA_STREAM, MAVO_VOLUME_NETATALK,
-                     MAVO_VOLUME_NETATALK_SAMBA, MAVO_VOLUME_LINUX}) {
+    for (int type :
+         {MAVO_VOLUME_SAMBA, MAVO_VOLUME_SAMBA_STREAM, MAVO_VOLUME_NETATALK,
+          MAVO_VOLUME_NETATALK_SAMBA, MAVO_VOLUME_LINUX, MAVO_VOLUME_SAMBA_ALL_STREAMS}) {
         EXPECT_EQ(0, MAVOVolumeDeclare(volume.c_str(), type));
         errno = 0;
         EXPECT_EQ(-1, MAVOGetFSType((volume + "/a").c_str(), 1));
@@ -236,7 +237,7 @@ TEST_F(FsTypeTest, AProcessDeclaresVolumesOfItsOwn) {
     EXPECT_EQ(0, MAVOVolumeDeclare((volume + "/").c_str(), 0));
     EXPECT_EQ(0, MAVOGetFSType((volume + "/a").c_str(), 1));
 
-    for (int type : {-1, 13, 99, 105, INT_MIN, INT_MAX}) {
+    for (int type : {-1, 13, 99, 106, INT_MIN, INT_MAX}) {
         errno = 0;
         EXPECT_EQ(-1, MAVOVolumeDeclare(volume.c_str(), type));
         EXPECT_EQ(EINVAL, errno);

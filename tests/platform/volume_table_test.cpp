@@ -542,7 +542,7 @@ TEST(VolumeTableCheckTest, ArgumentsThatAreMissingAreRefused) {
     EXPECT_EQ(EINVAL, errno);
 }
 
-TEST(VolumeTypeFromNameTest, NumbersFrom0To12AndNineNamesAreTypes) {
+TEST(VolumeTypeFromNameTest, NumbersFrom0To12AndTenNamesAreTypes) {
     for (int type = 0; type <= 12; ++type) {
         EXPECT_EQ(type, MAVOVolumeTypeFromName(std::to_string(type).c_str()));
     }
@@ -555,6 +555,7 @@ TEST(VolumeTypeFromNameTest, NumbersFrom0To12AndNineNamesAreTypes) {
     EXPECT_EQ(102, MAVOVolumeTypeFromName("netatalk"));
     EXPECT_EQ(103, MAVOVolumeTypeFromName("netatalk-samba"));
     EXPECT_EQ(104, MAVOVolumeTypeFromName("linux"));
+    EXPECT_EQ(105, MAVOVolumeTypeFromName("samba-all-streams"));
     for (const char* none : {"", "13", "99", "100", "104", "-1", "+1", " 1", "1 ", "1x", "eadir2",
                              "EADir", "Samba", "samba-"}) {
         EXPECT_EQ(-1, MAVOVolumeTypeFromName(none)) << none;

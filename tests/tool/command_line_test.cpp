@@ -196,9 +196,8 @@ TEST(VolumeOptionTest, ADeclarationThatMeansNothingIsRefused) {
     EXPECT_THAT(RunTool({"--volume", "/x=ext5", "list", "/"}),
                 Failed(2,
                        "--volume /x=ext5: unknown volume type \"ext5\"; take a number from 0 to "
-                       "12, appledouble, eadir, fileea, xattr, samba, samba-stream, netatalk, "
-                       "netatalk-samba or "
-                       "linux"));
+                       "12, appledouble, eadir, fileea, xattr, samba, samba-stream, "
+                       "samba-all-streams, netatalk, netatalk-samba or linux"));
     EXPECT_THAT(RunTool({"--volume", "/x", "list", "/"}),
                 Failed(2,
                        "--volume /x: not of the form PATH=TYPE; for example --volume "

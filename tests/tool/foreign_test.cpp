@@ -171,6 +171,7 @@ class ForeignTest : public ::testing::Test {
 
     Share samba_{"samba"};
     Share stream_{"samba-stream"};
+    Share all_streams_{"samba-all-streams"};
     Share netatalk_{"netatalk"};
     Share netatalk_samba_{"netatalk-samba"};
     Share linux_{"linux"};
@@ -190,6 +191,11 @@ TEST_F(ForeignTest, WhatIsSetLiesWhereItsProgramLooksForIt) {
         {stream_,
          {{kColourStream, red + Bytes{0}}, {kAfpInfo, AfpInfo(FinderInfo()) + Bytes{0}}},
          true},
+        {all_streams_,
+         {{kColourStream, red + Bytes{0}},
+          {kAfpInfo, AfpInfo(FinderInfo()) + Bytes{0}},
+          {kAfpResource, Ascii("fork") + Bytes{0}}},
+         false},
         {netatalk_, {{"user." + kColour, red}, {kRecord, Record(FinderInfo())}}, true},
         {netatalk_samba_,
          {{"user." + kColour, red + Bytes{0}}, {kRecord, Record(FinderInfo())}},
@@ -401,7 +407,8 @@ TEST_F(ForeignTest, WhatIsDamagedIsToldAndTheRestIsShown) {
 
 TEST_F(ForeignTest, TheLockIsWhatClientsHonour) {
     SetAttribute(samba_.file(), kDosAttributes, Dos(0x22));
-    for (const Share* share : {&samba_, &stream_, &netatalk_, &netatalk_samba_, &linux_}) {
+    for (const Share* share :
+         {&samba_, &stream_, &all_streams_, &netatalk_, &netatalk_samba_, &linux_}) {
         EXPECT_EQ(Ascii("0"), share->Get(kLocked));
         EXPECT_THAT(share->Run({"lock", share->file()}), Succeeded());
         EXPECT_EQ(Ascii("1"), share->Get(kLocked));
@@ -412,7 +419,8 @@ TEST_F(ForeignTest, TheLockIsWhatClientsHonour) {
     struct stat info;
     ASSERT_EQ(0, stat(linux_.file().c_str(), &info));
     EXPECT_EQ(0444U, info.st_mode & 0777);
-    for (const Share* share : {&samba_, &stream_, &netatalk_, &netatalk_samba_, &linux_}) {
+    for (const Share* share :
+         {&samba_, &stream_, &all_streams_, &netatalk_, &netatalk_samba_, &linux_}) {
         EXPECT_THAT(share->Run({"unlock", share->file()}), Succeeded());
         EXPECT_EQ(Ascii("0"), share->Get(kLocked));
     }
@@ -468,6 +476,11 @@ TEST_F(ForeignTest, WhereTellsWhoseMetadataItHasFoundAndHowToSaySo) {
     };
     tells(netatalk_, "netatalk", kRecord);
     tells(stream_, "samba-stream", "user.DosStream.AFP_AfpInfo");
+    SetAttribute(all_streams_.file(), kAfpInfo, AfpInfo(FinderInfo()) + Bytes{0});
+    SetAttribute(all_streams_.file(), kAfpResource, Ascii("fork") + Bytes{0});
+    tells(all_streams_, "samba-all-streams", "user.DosStream.AFP_Resource");
+    SetAttribute(all_streams_.file(), kRecord, Record(FinderInfo()));
+    tells(all_streams_, "samba-stream", "user.DosStream.AFP_AfpInfo");
     tells(linux_, "linux", "user." + kFinderInfoName);
     tells(samba_, "samba", kDosAttributes);
     EXPECT_THAT(RunTool({"where", netatalk_samba_.file()}).out, Not(HasSubstr("other programs")));
@@ -478,7 +491,8 @@ TEST_F(ForeignTest, WhereTellsWhoseMetadataItHasFoundAndHowToSaySo) {
 // ---- From place to place ------------------------------------------------------------------------
 
 const char* const kAllTypes[] = {
-    "samba", "samba-stream", "netatalk", "netatalk-samba", "linux", "0", "1", "2"};
+    "samba", "samba-stream", "samba-all-streams", "netatalk", "netatalk-samba", "linux", "0", "1",
+    "2"};
 
 class ForeignTravelTest : public ::testing::TestWithParam<std::tuple<const char*, const char*>> {
  protected:

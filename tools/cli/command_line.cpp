@@ -34,7 +34,7 @@ constexpr const char* kExamples = R"(Examples:
   mavoea dump --record letter.txt
 
 Volume types: a number from 0 to 12, or appledouble (0), eadir (1), fileea (2), xattr (7); and what
-other programs keep: samba, samba-stream, netatalk, netatalk-samba, linux.
+other programs keep: samba, samba-stream, samba-all-streams, netatalk, netatalk-samba, linux.
 Names like any other: com.apple.FinderInfo, com.apple.ResourceFork, and mavoea.locked, which is 1
 for a file that Macs may not write, rename or delete.
 Recursive work goes on after a failure, and tells at its end what failed.

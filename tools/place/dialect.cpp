@@ -20,6 +20,13 @@ constexpr Dialect kSambaStream = {.name = "samba-stream",
                                   .names = Dialect::Names::kStream,
                                   .fork = Dialect::Fork::kAppleDouble,
                                   .marks = Dialect::Marks::kDosAttributes};
+constexpr Dialect kSambaAllStreams = {.name = "samba-all-streams",
+                                      .program = "Samba",
+                                      .title = "Samba, with streams for forks as well",
+                                      .finder_info = Dialect::FinderInfo::kStream,
+                                      .names = Dialect::Names::kStream,
+                                      .fork = Dialect::Fork::kAttribute,
+                                      .marks = Dialect::Marks::kDosAttributes};
 constexpr Dialect kNetatalk = {.name = "netatalk",
                                .program = "netatalk",
                                .title = "netatalk",
@@ -52,6 +59,8 @@ const Dialect* DialectOf(int type) {
             return &kSamba;
         case MAVO_VOLUME_SAMBA_STREAM:
             return &kSambaStream;
+        case MAVO_VOLUME_SAMBA_ALL_STREAMS:
+            return &kSambaAllStreams;
         case MAVO_VOLUME_NETATALK:
             return &kNetatalk;
         case MAVO_VOLUME_NETATALK_SAMBA:

@@ -72,7 +72,7 @@ int RequireTypeName(const std::string& type_name, const std::string& option) {
     if (type >= 0) return type;
     throw Failure(kFailed, option, "unknown volume type \"" + type_name + "\"",
                   "take a number from 0 to 12, appledouble, eadir, fileea, xattr, samba, "
-                  "samba-stream, netatalk, netatalk-samba or linux");
+                  "samba-stream, samba-all-streams, netatalk, netatalk-samba or linux");
 }
 
 constexpr const char* kDeclareVolume =

@@ -48,14 +48,19 @@ std::optional<Sign> SignIn(const std::vector<std::string>& attributes) {
     const auto is_stream = [](const std::string& name) {
         return DecodeStreamAttribute(name).has_value();
     };
-    const auto is_afp_info = [](const std::string& name) {
-        const auto stream = DecodeStreamAttribute(name);
-        return stream && stream->name.text() == kAfpInfoStream;
+    const auto is_stream_of = [](std::string_view wanted) {
+        return [wanted](const std::string& name) {
+            const auto stream = DecodeStreamAttribute(name);
+            return stream && stream->name.text() == wanted;
+        };
     };
     const auto is = [](std::string_view wanted) {
         return [wanted](const std::string& name) { return name == wanted; };
     };
-    if (has(is_afp_info)) {
+    if (has(is_stream_of(kAfpResourceStream)) && !has(is(kRecordAttribute))) {
+        return Sign{DialectOf(MAVO_VOLUME_SAMBA_ALL_STREAMS), "user.DosStream.AFP_Resource"};
+    }
+    if (has(is_stream_of(kAfpInfoStream))) {
         return Sign{DialectOf(MAVO_VOLUME_SAMBA_STREAM), "user.DosStream.AFP_AfpInfo"};
     }
     if (has(is_stream)) return Sign{DialectOf(MAVO_VOLUME_SAMBA), "user.DosStream.*"};

@@ -20,7 +20,6 @@ namespace {
 using Datum = Spelling::Datum;
 
 constexpr std::string_view kUser = "user.";
-constexpr std::string_view kAfpResourceStream = "AFP_Resource";
 constexpr std::size_t kValueMax = 65536;  // the kernel's
 
 Datum DatumOf(std::string_view name) {

@@ -4,6 +4,7 @@
 
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "tools/place/dialect.h"
@@ -13,6 +14,8 @@ namespace mavoea::tool {
 
 // netatalk's record, as netatalk and Samba call it.
 inline constexpr char kRecordAttribute[] = "user.org.netatalk.Metadata";
+// The stream that is a fork to Samba's clients.
+inline constexpr std::string_view kAfpResourceStream = "AFP_Resource";
 
 struct Spelling {
     enum class Datum { kRecord, kAfpInfo, kFinderInfo, kFork, kAttribute };
