@@ -106,11 +106,12 @@ def mac_file(attributes, fork=b"the fork", filler=MAC_FILLER):
 class ShareTest(unittest.TestCase):
     """A client on the share that a test is about, and a file on it."""
 
+    files = 0
+
     def open(self, share):
         self.mac = Mac(server, share)
         self.addCleanup(self.mac.close)
         self.folder = server.share(share)
-        self.files = 0
         self.make()
 
     def make(self):

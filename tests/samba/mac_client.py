@@ -102,24 +102,24 @@ class Mac:
     def streams(self, path):
         """The named streams and their sizes, without the data itself."""
         with self._opened(path, FILE_READ_ATTRIBUTES) as file:
-            info = self._smb.queryInfo(self._tree, file, fileInfoClass=SMB2_FILE_STREAM_INFO)
-        found = {}
-        while info:
-            following, length, size, _ = struct.unpack_from("<IIQQ", info)
-            name = info[24 : 24 + length].decode("utf-16le")
-            found[name[1:].removesuffix(":$DATA")] = size
-            info = info[following:] if following else b""
-        found.pop("", None)
-        return found
+            return self._streams(file)
 
     # ---- Attributes ---------------------------------------------------------------------------
 
     def attributes(self, path):
-        return self._basic_info(path)[4]
+        with self._opened(path, FILE_READ_ATTRIBUTES) as file:
+            return self._basic_info(file)[4]
 
     def creation_time(self, path):
         """In 100 ns from 1601-01-01."""
-        return self._basic_info(path)[0]
+        with self._opened(path, FILE_READ_ATTRIBUTES) as file:
+            return self._basic_info(file)[0]
+
+    def look(self, path):
+        """Attributes, creation time and streams."""
+        with self._opened(path, FILE_READ_ATTRIBUTES) as file:
+            created, _, _, _, attributes = self._basic_info(file)
+            return attributes, created, self._streams(file)
 
     def set_attributes(self, path, attributes, creation_time=0):
         """An attribute word of 0 leaves the attributes, a time of 0 the time; NORMAL is none."""
@@ -129,10 +129,20 @@ class Mac:
 
     # ---- Inside -------------------------------------------------------------------------------
 
-    def _basic_info(self, path):
-        with self._opened(path, FILE_READ_ATTRIBUTES) as file:
-            info = self._smb.queryInfo(self._tree, file, fileInfoClass=SMB2_FILE_BASIC_INFO)
+    def _basic_info(self, file):
+        info = self._smb.queryInfo(self._tree, file, fileInfoClass=SMB2_FILE_BASIC_INFO)
         return struct.unpack_from("<QQQQI", info)
+
+    def _streams(self, file):
+        info = self._smb.queryInfo(self._tree, file, fileInfoClass=SMB2_FILE_STREAM_INFO)
+        found = {}
+        while info:
+            following, length, size, _ = struct.unpack_from("<IIQQ", info)
+            name = info[24 : 24 + length].decode("utf-16le")
+            found[name[1:].removesuffix(":$DATA")] = size
+            info = info[following:] if following else b""
+        found.pop("", None)
+        return found
 
     def _write(self, file, data):
         for at in range(0, len(data), PIECE):

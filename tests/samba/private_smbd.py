@@ -122,7 +122,7 @@ class Smbd:
         with open(disk, "wb") as file:
             file.truncate(256 << 20)
         os.mkdir(self._volume)
-        _run("mkfs.ext4", "-q", "-O", "ea_inode", disk)
+        _run("mkfs.ext4", "-q", "-b", "4096", "-O", "ea_inode", disk)
         try:
             _run("mount", "-o", "loop", disk, self._volume)
         except RuntimeError as error:
