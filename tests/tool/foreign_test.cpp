@@ -389,6 +389,43 @@ TEST_F(ForeignTest, WhatAMacHasLeftBesideAnObjectComesFirstForSamba) {
     EXPECT_EQ(Ascii("fork"), samba_.Get(kForkName));
 }
 
+TEST_F(ForeignTest, WhatIsMeantIsWrittenBeforeAMacsFileMakesRoomForIt) {
+    // An attribute for which attributes have no room.
+    const std::string large(66000, 'x');
+    Bytes file = FromHex("0005160700020000") + Ascii("Mac OS X        ") +
+                 FromHex("0002000000090000003200010226000000020001025800000004");
+    file = file + FinderInfo(5) + FromHex("0000") + Ascii("ATTR") + FromHex("00000000") +
+           FromHex(
+               "00010258"
+               "00000088"
+               "000101d0") +
+           Bytes(12) +
+           FromHex(
+               "0000"
+               "0001") +
+           FromHex(
+               "00000088"
+               "000101d0"
+               "0000"
+               "02") +
+           Ascii("x") + Bytes{0};
+    file.resize(0x88);
+    file = file + Ascii(large) + Ascii("fork");
+    WriteFile(samba_.beside(), file);
+    const std::string comment = samba_.path() + "/comment";
+    Bytes head = FromHex("0005160700020000") + Bytes(16) +
+                 FromHex(
+                     "0001"
+                     "00000004"
+                     "00000026"
+                     "00000007");
+    WriteFile(comment, head + Ascii("comment"));
+    const ToolResult result = samba_.Run({"import", comment, samba_.file()});
+    EXPECT_EQ(2, result.status);
+    EXPECT_THAT(result.err, HasSubstr("no room for its 66000 bytes"));
+    EXPECT_EQ(file, ReadFile(samba_.beside()));
+}
+
 TEST_F(ForeignTest, WhatIsDamagedIsToldAndTheRestIsShown) {
     ASSERT_THAT(samba_.Set(kColour, Ascii("red")), Succeeded());
     SetAttribute(samba_.file(), kRecord, Bytes(401, 0xFF));
@@ -458,6 +495,11 @@ TEST_F(ForeignTest, NothingIsWrittenBesideAnotherProgramsMetadataUnlessItsTypeIs
     EXPECT_THAT(RunTool({"cp", samba_.file(), elsewhere / "copy"}), Succeeded());
     EXPECT_EQ("red", RunTool({"get", elsewhere / "copy", kColour}).out);
     EXPECT_EQ(std::nullopt, Attribute(elsewhere / "copy", kColourStream));
+    // Whatever has such a program's name is taken along, by whomever else it is signed.
+    SetAttribute(samba_.file(), "user." + kFinderInfoName, FinderInfo());
+    EXPECT_THAT(RunTool({"cp", samba_.file(), elsewhere / "both"}), Succeeded());
+    EXPECT_EQ(FinderInfo(), RunTool({"get", elsewhere / "both", kFinderInfoName}).bytes());
+    EXPECT_EQ("red", RunTool({"get", elsewhere / "both", kColour}).out);
     // Whoever says that it is of another type is believed.
     EXPECT_EQ(0, RunTool({"--volume", samba_.path() + "=1", "set", other, kColour, "x"}).status);
 }

@@ -41,6 +41,7 @@ constexpr Dialect kNetatalkSamba = {.name = "netatalk-samba",
                                     .names = Dialect::Names::kPlainWithNul,
                                     .fork = Dialect::Fork::kAppleDouble,
                                     .marks = Dialect::Marks::kRecord};
+#endif
 constexpr Dialect kLinux = {.name = "linux",
                             .program = "another program",
                             .title = "attributes as they are",
@@ -48,7 +49,6 @@ constexpr Dialect kLinux = {.name = "linux",
                             .names = Dialect::Names::kPlain,
                             .fork = Dialect::Fork::kAttribute,
                             .marks = Dialect::Marks::kHost};
-#endif
 
 }  // namespace
 
@@ -75,5 +75,7 @@ const Dialect* DialectOf(int type) {
     return nullptr;
 #endif
 }
+
+const Dialect& AnyDialect() { return kLinux; }
 
 }  // namespace mavoea::tool

@@ -25,6 +25,9 @@ struct Dialect {
 // Null for types that are the platform's.
 const Dialect* DialectOf(int type);
 
+// The one in which all that has a name of such programs' has a meaning.
+const Dialect& AnyDialect();
+
 }  // namespace mavoea::tool
 
 #endif  // MAVOEA_TOOLS_PLACE_DIALECT_H_

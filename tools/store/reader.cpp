@@ -227,6 +227,7 @@ void AddUndeclared(const Object& object, const Inode& inode, Metadata* metadata)
     const auto sign = SignIn(inode.AttributeNames());
     if (!sign) return;
     AddForeignAttributes(*sign->dialect, inode, metadata);
+    AddForeignAttributes(AnyDialect(), inode, metadata);
     TakeMarksFromWord(metadata);
 }
 

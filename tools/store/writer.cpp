@@ -539,6 +539,20 @@ void RequireUnlocked(const Sidecars& sidecars) {
     }
 }
 
+namespace {
+
+// What its files hold is not written over before all of it is on disk elsewhere.
+void RequireWritten(const Object& to, const Inode& inode, const Written& written) {
+    if (!written.missing.empty()) {
+        throw Failure(kFailed, to.path(),
+                      "not all of it could be written: " + Joined(written.missing),
+                      "what lies beside it is as it was");
+    }
+    if (inode.HoldsContents()) inode.Sync();
+}
+
+}  // namespace
+
 Written Writer::Write(const Object& to, const Inode& inode, const Metadata& fitting,
                       const WriteOptions& options) const {
     Written written;
@@ -567,9 +581,13 @@ Written Writer::Write(const Object& to, const Inode& inode, const Metadata& fitt
         beside.*part.place = files.Last();
         if (part.whole) written.whole.insert(part.whole->path());
     }
+    if (WritesObjectFirst()) {
+        WriteToObject(inode, fitting, &written);
+        if (options.durability == Durability::kNow) RequireWritten(to, inode, written);
+    }
     files.GiveNames();
     if (options.old == Old::kRemoved) RemoveOld(to, old, files);
-    WriteToObject(inode, fitting, &written);
+    if (!WritesObjectFirst()) WriteToObject(inode, fitting, &written);
     WriteMarks(to, inode, fitting, options.is_new);
     // What else there is, is looked for by name.
     const bool alone = fitting.services.empty() && !old.problem && !old.Any();

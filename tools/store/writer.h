@@ -69,8 +69,10 @@ class Writer {
     // The stream first, if there is one.
     virtual std::vector<Part> PartsOf(const Metadata& fitting) const = 0;
 
-    // What is kept with the object itself.
+    // What is kept with the object itself: after its files, or before, where they may hold what is
+    // to be kept there from now on.
     virtual void WriteToObject(const Inode&, const Metadata&, Written*) const {}
+    virtual bool WritesObjectFirst() const { return false; }
 };
 
 // For volumes of a type; Failure for those that keep nothing.

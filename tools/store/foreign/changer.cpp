@@ -127,8 +127,10 @@ class ForeignChanger final : public Changer {
     }
 
     void SetFork(const Bytes& value) const {
+        // Samba looks for it there, too, if it is told to.
         const bool in_attribute = dialect_.fork == Dialect::Fork::kAttribute ||
-                                  inode_->Attribute(SpellFork(dialect_).attribute).has_value();
+                                  (dialect_.names == Dialect::Names::kStream &&
+                                   inode_->Attribute(SpellFork(dialect_).attribute).has_value());
         if (in_attribute) {
             Store(*inode_, SpellFork(dialect_), value);
             (void)RemoveSpellings(Datum::kFork, {}, SpellFork(dialect_).attribute);
@@ -139,6 +141,7 @@ class ForeignChanger final : public Changer {
         if (file->file().Size() == 0) file->file().Write(0, EncodeForkHead(0));
         AppleDoubleFile(*file).SetFork(value);
         file->Commit();
+        (void)RemoveSpellings(Datum::kFork, {});
     }
 
     bool RemoveFork() const {
@@ -146,6 +149,7 @@ class ForeignChanger final : public Changer {
         if (!opened) return false;
         AppleDoubleFile file(*opened);
         if (file.ForkLength() == 0) return false;
+        inode_->Sync();
         file.SetFork({});
         return true;
     }
@@ -161,7 +165,9 @@ class ForeignChanger final : public Changer {
 
     bool RemoveFromFile(const std::string& name) const {
         const auto opened = OpenFile(false);
-        return opened && StreamFile(*opened).Remove(name);
+        if (!opened) return false;
+        inode_->Sync();
+        return StreamFile(*opened).Remove(name);
     }
 
     // The "._" file, if there is one or it is to be made.

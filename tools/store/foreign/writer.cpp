@@ -50,6 +50,8 @@ class ForeignWriter final : public Writer {
         return {{&Sidecars::apple_double, "", EncodeForkFile(fitting.fork->value), nullptr}};
     }
 
+    bool WritesObjectFirst() const override { return true; }
+
     void WriteToObject(const Inode& inode, const Metadata& fitting,
                        Written* written) const override {
         Attributes(dialect_, inode, written).Write(fitting);
