@@ -23,7 +23,7 @@ class FileReader {
  public:
     FileReader(std::shared_ptr<const File> file, Metadata* metadata)
         : file_(std::move(file)),
-          source_({file_->path()}),
+          origin_({file_->path()}),
           layout_(ReadLayout(*file_)),
           metadata_(*metadata),
           gathering_(metadata) {}
@@ -71,17 +71,17 @@ class FileReader {
         if (!index || layout_.entries[*index].data.length == 0) return;
         Range range = layout_.entries[*index].data;
         if (range.length < kFinderInfoSize) {
-            return gathering_.AddStray("Finder info", "it has fewer bytes than it should", source_);
+            return gathering_.AddStray("Finder info", "it has fewer bytes than it should", origin_);
         }
         range.length = kFinderInfoSize;
-        gathering_.AddFinderInfo(Stretch(range, "its Finder info passes"), source_);
+        gathering_.AddFinderInfo(Stretch(range, "its Finder info passes"), origin_);
     }
 
     void ReadAttributes() {
         if (!layout_.HasAttributeArea()) return;
         if (!layout_.attributes || layout_.attributes->magic != kAttributeMagic) {
             return gathering_.AddStray("what is behind the Finder info", "it is of no known kind",
-                                       source_);
+                                       origin_);
         }
         if (layout_.records.size() < layout_.attributes->count) {
             Damaged("its attribute table passes");
@@ -110,7 +110,7 @@ class FileReader {
         const auto index = layout_.FindEntry(EntryId::kResourceFork);
         if (!index || layout_.entries[*index].data.length == 0) return;
         gathering_.AddFork(Stretch(layout_.entries[*index].data, "its resource fork passes"),
-                           source_);
+                           origin_);
     }
 
     void ReadEntries() {
@@ -120,12 +120,12 @@ class FileReader {
                                entry.id == EntryId::kResourceFork || entry.id == EntryId::kNone;
             if (known || entry.data.length == 0 || IsPrivate(entry.id)) continue;
             if (layout_.FindEntry(entry.id) != i) continue;
-            gathering_.AddEntry(entry.id, Stretch(entry.data, "an entry passes"), source_);
+            gathering_.AddEntry(entry.id, Stretch(entry.data, "an entry passes"), origin_);
         }
     }
 
     std::shared_ptr<const File> file_;
-    Source source_;
+    Origin origin_;
     Layout layout_;
     Metadata& metadata_;
     Gathering gathering_;
@@ -151,10 +151,10 @@ WholeFile ReadFound(const Sidecars::Found& found, Metadata* metadata) {
     return file;
 }
 
-void ReadRecord(const Bytes& block, const Source& source, Metadata* metadata) {
+void ReadRecord(const Bytes& block, const Origin& origin, Metadata* metadata) {
     const Layout layout = ReadLayout(ByteView(block));
     if (!CheckRecord(layout, RecordPlace::kAttribute).violations.empty()) {
-        throw Failure(kFailed, source.holder, "its netatalk record is damaged", kLookAtRecord);
+        throw Failure(kFailed, origin.holder, "its netatalk record is damaged", kLookAtRecord);
     }
     const auto bytes = [&](Range range) {
         const ByteView part = ByteView(block).subspan(range.offset, range.length);
@@ -166,9 +166,9 @@ void ReadRecord(const Bytes& block, const Source& source, Metadata* metadata) {
         if (range.length == 0 || range.end() > block.size() || IsPrivate(entry.id)) continue;
         if (entry.id == EntryId::kFinderInfo) {
             if (range.length < kFinderInfoSize) continue;
-            gathering.AddFinderInfo(bytes({range.offset, std::uint32_t{kFinderInfoSize}}), source);
+            gathering.AddFinderInfo(bytes({range.offset, std::uint32_t{kFinderInfoSize}}), origin);
         } else if (Content value = bytes(range); !IsAllZero(value.All())) {
-            gathering.AddEntry(entry.id, std::move(value), source);
+            gathering.AddEntry(entry.id, std::move(value), origin);
         }
     }
 }

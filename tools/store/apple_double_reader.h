@@ -19,7 +19,7 @@ void ReadFile(std::shared_ptr<const File> file, Metadata* metadata);
 WholeFile ReadFound(const Sidecars::Found& found, Metadata* metadata);
 
 // A record of an object's attribute. Throws Failure when it is damaged.
-void ReadRecord(const Bytes& block, const Source& source, Metadata* metadata);
+void ReadRecord(const Bytes& block, const Origin& origin, Metadata* metadata);
 
 }  // namespace mavoea::tool
 

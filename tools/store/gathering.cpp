@@ -27,25 +27,25 @@ std::string WhereText(const std::string& holder, const std::string& spelling) {
     return Printable(holder) + (spelling.empty() ? "" : " (" + Printable(spelling) + ')');
 }
 
-void Gathering::AddFinderInfo(Content value, const Source& source) {
+void Gathering::AddFinderInfo(Content value, const Origin& origin) {
     if (!value.damaged() && IsAllZero(value.All())) return;
-    Take(&metadata_.finder_info, "Finder info", std::move(value), source);
+    Take(&metadata_.finder_info, "Finder info", std::move(value), origin);
 }
 
-void Gathering::AddFork(Content value, const Source& source) {
+void Gathering::AddFork(Content value, const Origin& origin) {
     auto& known = metadata_.fork;
     if (value.size() == 0 || (known && IsBlankFork(value))) return;
     if (known && IsBlankFork(known->value)) known.reset();
-    Take(&known, "resource fork", std::move(value), source);
+    Take(&known, "resource fork", std::move(value), origin);
 }
 
-void Gathering::AddEntry(EntryId id, Content value, const Source& source) {
+void Gathering::AddEntry(EntryId id, Content value, const Origin& origin) {
     if (!value.damaged() && !Speaks(id, value)) return;
     std::optional<Metadata::Item> item;
     if (const auto other = metadata_.entries.find(id); other != metadata_.entries.end()) {
         item = other->second;
     }
-    Take(&item, NameOfEntry(id), std::move(value), source);
+    Take(&item, NameOfEntry(id), std::move(value), origin);
     metadata_.entries.insert_or_assign(id, *std::move(item));
 }
 
@@ -66,17 +66,17 @@ void Gathering::AddAttribute(Metadata::Attribute attribute) {
     }
 }
 
-void Gathering::AddStray(const std::string& item, const std::string& reason, const Source& source) {
+void Gathering::AddStray(const std::string& item, const std::string& reason, const Origin& origin) {
     metadata_.strays.push_back(
-        {item + " in " + WhereText(source.holder, source.spelling), reason, source.holder});
+        {item + " in " + WhereText(origin.holder, origin.spelling), reason, origin.holder});
 }
 
 void Gathering::Take(std::optional<Metadata::Item>* item, const std::string& name, Content value,
-                     const Source& source) {
+                     const Origin& origin) {
     if (!*item) {
-        *item = Metadata::Item{std::move(value), source.holder, source.spelling};
+        *item = Metadata::Item{std::move(value), origin.holder, origin.spelling};
     } else if (Differs((*item)->value, value)) {
-        AddStray("a second " + name, OtherThanIn((*item)->holder, (*item)->spelling), source);
+        AddStray("a second " + name, OtherThanIn((*item)->holder, (*item)->spelling), origin);
     }
 }
 

@@ -9,7 +9,7 @@
 namespace mavoea::tool {
 
 // Where something was read: a file, and an attribute of it.
-struct Source {
+struct Origin {
     std::string holder;
     std::string spelling = {};
 };
@@ -23,19 +23,19 @@ class Gathering {
     explicit Gathering(Metadata* metadata) : metadata_(*metadata) {}
 
     // 32 bytes; all zero says nothing.
-    void AddFinderInfo(Content value, const Source& source);
+    void AddFinderInfo(Content value, const Origin& origin);
     // An empty one says nothing, and one that stands for none gives way to any other.
-    void AddFork(Content value, const Source& source);
+    void AddFork(Content value, const Origin& origin);
     // The lock is kept as it is; what else says nothing is left out.
-    void AddEntry(EntryId id, Content value, const Source& source);
+    void AddEntry(EntryId id, Content value, const Origin& origin);
     // Of two of one name in one file the last is meant.
     void AddAttribute(Metadata::Attribute attribute);
 
-    void AddStray(const std::string& item, const std::string& reason, const Source& source);
+    void AddStray(const std::string& item, const std::string& reason, const Origin& origin);
 
  private:
     void Take(std::optional<Metadata::Item>* item, const std::string& name, Content value,
-              const Source& source);
+              const Origin& origin);
 
     Metadata& metadata_;
 };

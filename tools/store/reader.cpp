@@ -158,7 +158,7 @@ class FileEaReader final : public EaDirectoryReader {
             if (!inode.HoldsContents()) return;
             metadata->whole_record = inode.Attribute(kNetatalkAttribute);
             if (metadata->whole_record) {
-                ReadRecord(*metadata->whole_record, {inode.path(), {}}, metadata);
+                ReadRecord(*metadata->whole_record, {inode.path()}, metadata);
             }
         });
     }

@@ -36,38 +36,38 @@ class ForeignReader {
 
  private:
     void Add(const Spelling& spelling, Bytes value) {
-        const Source source = {inode_.path(), spelling.attribute};
+        const Origin origin = {inode_.path(), spelling.attribute};
         switch (spelling.datum) {
             case Datum::kRecord:
-                return ReadRecord(value, source, &metadata_);
+                return ReadRecord(value, origin, &metadata_);
             case Datum::kAfpInfo:
-                return AddAfpInfo(value, source);
+                return AddAfpInfo(value, origin);
             case Datum::kFinderInfo:
                 if (value.size() == kFinderInfoSize) {
-                    return gathering_.AddFinderInfo(Content(std::move(value)), source);
+                    return gathering_.AddFinderInfo(Content(std::move(value)), origin);
                 }
                 return gathering_.AddStray(
                     "Finder info", "it has " + std::to_string(value.size()) + " bytes, and not 32",
-                    source);
+                    origin);
             case Datum::kFork:
-                return gathering_.AddFork(Content(std::move(value)), source);
+                return gathering_.AddFork(Content(std::move(value)), origin);
             case Datum::kAttribute:
                 return gathering_.AddAttribute(
-                    {spelling.name, Content(std::move(value)), 0, source.holder, source.spelling});
+                    {spelling.name, Content(std::move(value)), 0, origin.holder, origin.spelling});
         }
     }
 
-    void AddAfpInfo(const Bytes& value, const Source& source) {
+    void AddAfpInfo(const Bytes& value, const Origin& origin) {
         const auto info = DecodeAfpInfo(value);
         if (!info) {
-            throw Failure(kFailed, source.holder,
+            throw Failure(kFailed, origin.holder,
                           "its " + std::string(kAfpInfoStream) + " is damaged",
-                          "look at it with: getfattr -n " + source.spelling + " -e hex PATH");
+                          "look at it with: getfattr -n " + origin.spelling + " -e hex PATH");
         }
         gathering_.AddFinderInfo(Content(Bytes(info->finder_info.begin(), info->finder_info.end())),
-                                 source);
+                                 origin);
         if (info->backup_time != kNoBackupTime) {
-            gathering_.AddEntry(EntryId::kFileDates, Content(DatesOf(*info)), source);
+            gathering_.AddEntry(EntryId::kFileDates, Content(DatesOf(*info)), origin);
         }
     }
 
