@@ -4,6 +4,7 @@
 
 #include "format/ea_stream.h"
 #include "format/netatalk_record.h"
+#include "tools/store/fitting.h"
 
 namespace mavoea::tool {
 namespace {
@@ -61,6 +62,19 @@ class Entries {
     std::map<EntryId, Bytes> bytes_;
 };
 
+// Whether the "._" file of the source says all that there is to say.
+bool IsWhole(const Metadata& metadata) {
+    if (!metadata.whole_apple_double) return false;
+    const std::string& path = metadata.whole_apple_double->path();
+    const auto held = [&](const Metadata::Item& item) { return item.holder == path; };
+    return std::all_of(metadata.attributes.begin(), metadata.attributes.end(),
+                       [&](const auto& attribute) { return attribute.holder == path; }) &&
+           (!metadata.finder_info || held(*metadata.finder_info)) &&
+           (!metadata.fork || held(*metadata.fork)) &&
+           std::all_of(metadata.entries.begin(), metadata.entries.end(),
+                       [&](const auto& entry) { return held(entry.second); });
+}
+
 }  // namespace
 
 Pieces EncodeStream(const Metadata& metadata) {
@@ -109,6 +123,16 @@ Pieces EncodeWithHead(const Metadata& metadata) {
     return pieces;
 }
 
+Pieces EncodeAppleDouble(const Metadata& metadata) {
+    if (const WholeFile& whole = metadata.whole_apple_double) {
+        return {Content(whole, 0, whole->Size())};
+    }
+    if (!metadata.attributes.empty()) return EncodeStream(metadata);
+    if (!metadata.entries.empty()) return EncodeWithHead(metadata);
+    if (metadata.finder_info || metadata.fork) return EncodePlain(metadata);
+    return {};
+}
+
 Bytes EncodeRecordBlock(const Metadata& metadata) {
     Bytes block(kAttributeBlockSize);
     EncodeRecord(kFreshRecord, Entries(metadata), 0, block);
@@ -148,6 +172,19 @@ void FitStream(Metadata* metadata, std::vector<Missing>* missing) {
         left -= size;
         return false;
     });
+}
+
+void FitAppleDouble(Metadata* metadata, std::vector<Missing>* missing) {
+    if (IsWhole(*metadata)) return;
+    metadata->whole_apple_double.reset();
+    DropDamaged(metadata);
+    FitStream(metadata, missing);
+    if (!metadata->attributes.empty()) {
+        FitEntries(
+            metadata, [](EntryId) { return std::uint32_t{0}; }, "a \"._\" file with attributes",
+            missing);
+    }
+    FitEntries(metadata, RoomInHead, "a \"._\" file", missing);
 }
 
 }  // namespace mavoea::tool

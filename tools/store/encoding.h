@@ -24,6 +24,10 @@ Pieces EncodePlain(const Metadata& metadata);
 // The head with all entries that it has a place for, and the fork.
 Pieces EncodeWithHead(const Metadata& metadata);
 
+// A "._" file: what FitAppleDouble() has left of it, in the layout that has a place for that; none
+// where there is nothing.
+Pieces EncodeAppleDouble(const Metadata& metadata);
+
 // The record of an object, as an attribute.
 Bytes EncodeRecordBlock(const Metadata& metadata);
 
@@ -34,6 +38,10 @@ std::uint32_t RoomInRecord(EntryId id);
 // What is too much for a stream, or has no name that could stand in one, goes from `metadata` to
 // `missing`.
 void FitStream(Metadata* metadata, std::vector<Missing>* missing);
+
+// The same of what a "._" file has no place for; services' files are left alone. One that says all
+// that there is to say goes as it is.
+void FitAppleDouble(Metadata* metadata, std::vector<Missing>* missing);
 
 }  // namespace mavoea::tool
 

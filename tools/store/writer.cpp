@@ -262,46 +262,14 @@ class AppleDoubleWriter final : public Writer {
             MissAll(&metadata, "its name is too long for a \"._\" file", missing);
             return metadata;
         }
-        if (IsWhole(metadata)) return metadata;
-        metadata.whole_apple_double.reset();
-        DropDamaged(&metadata);
-        FitStream(&metadata, missing);
-        if (!metadata.attributes.empty()) {
-            FitEntries(
-                &metadata, [](EntryId) { return std::uint32_t{0}; },
-                "a \"._\" file with attributes", missing);
-        }
-        FitEntries(&metadata, RoomInHead, "a \"._\" file", missing);
+        FitAppleDouble(&metadata, missing);
         return metadata;
     }
 
  protected:
     std::vector<Part> PartsOf(const Metadata& fitting) const override {
-        return {{&Sidecars::apple_double, "", PiecesOf(fitting), fitting.whole_apple_double}};
-    }
-
- private:
-    // Whether the file of the source says all that there is to say.
-    static bool IsWhole(const Metadata& metadata) {
-        if (!metadata.whole_apple_double) return false;
-        const std::string& path = metadata.whole_apple_double->path();
-        const auto held = [&](const Metadata::Item& item) { return item.holder == path; };
-        return std::all_of(metadata.attributes.begin(), metadata.attributes.end(),
-                           [&](const auto& attribute) { return attribute.holder == path; }) &&
-               (!metadata.finder_info || held(*metadata.finder_info)) &&
-               (!metadata.fork || held(*metadata.fork)) &&
-               std::all_of(metadata.entries.begin(), metadata.entries.end(),
-                           [&](const auto& entry) { return held(entry.second); });
-    }
-
-    static Pieces PiecesOf(const Metadata& metadata) {
-        if (const WholeFile& whole = metadata.whole_apple_double) {
-            return {Content(whole, 0, whole->Size())};
-        }
-        if (!metadata.attributes.empty()) return EncodeStream(metadata);
-        if (!metadata.entries.empty()) return EncodeWithHead(metadata);
-        if (metadata.finder_info || metadata.fork) return EncodePlain(metadata);
-        return {};
+        return {
+            {&Sidecars::apple_double, "", EncodeAppleDouble(fitting), fitting.whole_apple_double}};
     }
 };
 
