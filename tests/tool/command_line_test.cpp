@@ -31,9 +31,11 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
         {{"remove", object}, "NAME is required"},
         {{"lock"}, "PATH is required"},
         {{"unlock"}, "PATH is required"},
-        {{"import"}, "APPLEDOUBLE is required"},
+        {{"import"}, "FILE is required"},
         {{"import", object}, "PATH is required"},
         {{"import", object, object, object}, "The following argument was not expected: " + object},
+        {{"export"}, "PATH is required"},
+        {{"export", object}, "FILE is required"},
         {{"upgrade", "-r"}, "PATH is required"},
         {{"upgrade", "--record", object}, "The following argument was not expected: --record"},
         {{"repair"}, "PATH is required"},
@@ -64,31 +66,15 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
 TEST(CommandLineTest, HelpAndVersionAreWrittenToStandardOutput) {
     const ToolResult help = RunTool({"--help"});
     EXPECT_THAT(help, Succeeded());
-    for (const char* text : {"where",
-                             "list",
-                             "get",
-                             "set",
-                             "remove",
-                             "cp",
-                             "mv",
-                             "rm",
-                             "lock",
-                             "unlock",
-                             "import",
-                             "upgrade",
-                             "repair",
-                             "clean",
-                             "convert",
-                             "dump",
-                             "--volume PATH=TYPE",
-                             "--json",
-                             "Examples:",
-                             "Exit status:",
-                             "Volume types:"}) {
+    for (const char* text :
+         {"where",   "list",      "get",          "set",          "remove", "cp",
+          "mv",      "rm",        "lock",         "unlock",       "import", "export",
+          "upgrade", "repair",    "clean",        "convert",      "dump",   "--volume PATH=TYPE",
+          "--json",  "Examples:", "Exit status:", "Volume types:"}) {
         EXPECT_THAT(help.out, HasSubstr(text));
     }
     for (const char* command : {"where", "list", "get", "set", "remove", "lock", "unlock", "import",
-                                "upgrade", "repair", "clean", "convert", "dump"}) {
+                                "export", "upgrade", "repair", "clean", "convert", "dump"}) {
         EXPECT_THAT(RunTool({command, "--help"}), Succeeded());
     }
     const ToolResult version = RunTool({"--version"});

@@ -22,6 +22,8 @@ constexpr const char* kExamples = R"(Examples:
   mavoea remove letter.txt com.example.colour
   mavoea lock letter.txt
   mavoea import ._letter.txt letter.txt
+  mavoea import letter.hqx /srv/share
+  mavoea export --format macbinary letter.txt letter.bin
   mavoea cp -r /srv/share/letters /mnt/share
   mavoea mv letter.txt /mnt/share
   mavoea rm -r /srv/share/letters
@@ -138,10 +140,28 @@ constexpr Syntax kCommands[] = {
     {Command::kLock, "lock", "Lock files: Macs may not write, rename or delete them", AddTree},
     {Command::kUnlock, "unlock", "Unlock files", AddTree},
     {Command::kImport, "import",
-     "Give an object the attributes, Finder info and resource fork of a \"._\" file",
+     "Give an object the metadata in an AppleDouble (\"._\"), AppleSingle, MacBinary or BinHex "
+     "file",
      [](CLI::App* sub, Options* options) {
-         sub->add_option("APPLEDOUBLE", options->apple_double, "An AppleDouble file")->required();
+         sub->add_option("FILE", options->archive, "The file; its content says what it is")
+             ->required();
+         AddPath(sub, options,
+                 "The object. All but AppleDouble hold data as well: they make a file that is "
+                 "missing, in a directory one of their own name, and are refused where there is "
+                 "other data");
+         sub->add_flag("--data", options->replaces_data, "Replace other data by what FILE holds");
+     }},
+    {Command::kExport, "export", "Write an object's metadata into a file as Macs have them",
+     [](CLI::App* sub, Options* options) {
+         sub->add_option("--format", options->format,
+                         "appledouble (metadata only), or with the data applesingle, macbinary, "
+                         "binhex")
+             ->type_name("FORMAT")
+             ->default_val("appledouble");
+         sub->add_flag("-f,--force", options->force, "Replace a FILE that is there");
          AddPath(sub, options, "A file or directory");
+         sub->add_option("FILE", options->archive, "A new file; \"-\": standard output")
+             ->required();
      }},
     {Command::kCopy, "cp", "Copy objects with their metadata, with the options of cp", AddNothing},
     {Command::kMove, "mv", "Move or rename objects with their metadata, with the options of mv",
@@ -363,7 +383,7 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
     for (std::string& path : options.paths) path = Unguarded(std::move(path));
     for (std::string& volume : options.volumes) volume = Unguarded(std::move(volume));
     options.name = Unguarded(std::move(options.name));
-    options.apple_double = Unguarded(std::move(options.apple_double));
+    options.archive = Unguarded(std::move(options.archive));
     options.destination = Unguarded(std::move(options.destination));
     options.to = Unguarded(std::move(options.to));
     if (options.value) options.value = Unguarded(*std::move(options.value));

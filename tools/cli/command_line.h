@@ -20,6 +20,7 @@ enum class Command {
     kLock,
     kUnlock,
     kImport,
+    kExport,
     kCopy,
     kMove,
     kDelete,
@@ -38,8 +39,11 @@ struct Options {
 
     std::vector<std::string> paths;  // one, but for list, lock, unlock, upgrade and repair
     std::string name;
-    std::string apple_double;  // import
-    bool details = false;      // list -l
+    std::string archive;         // import, export
+    std::string format;          // export
+    bool force = false;          // export
+    bool replaces_data = false;  // import
+    bool details = false;        // list -l
     bool recursive = false;
     bool yes = false;                  // clean: what is listed is removed
     int wait = 2;                      // clean: seconds between its two looks

@@ -13,6 +13,7 @@
 #include "tools/move/convert.h"
 #include "tools/move/copy.h"
 #include "tools/move/delete.h"
+#include "tools/move/export.h"
 #include "tools/move/import.h"
 #include "tools/place/file.h"
 #include "tools/place/volume.h"
@@ -218,7 +219,16 @@ ExitStatus Run(const Options& options) {
         case Command::kUnlock:
             return Lock(options, false);
         case Command::kImport:
-            return Import(options.apple_double, options.paths.front(), options.json);
+            return Import({.file = options.archive,
+                           .path = options.paths.front(),
+                           .replaces_data = options.replaces_data,
+                           .json = options.json});
+        case Command::kExport:
+            return Export({.path = options.paths.front(),
+                           .file = options.archive,
+                           .format = options.format,
+                           .force = options.force,
+                           .json = options.json});
         case Command::kCopy:
             return Copy(options.copy);
         case Command::kMove:
