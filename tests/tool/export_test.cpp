@@ -295,6 +295,30 @@ TEST_P(ExportTest, EveryTruncationIsRefusedAndMakesNothing) {
     }
 }
 
+TEST_P(ExportTest, DamageIsNamedAndMakesNothing) {
+    const std::vector<std::string> before = NamesIn(share_.path());
+    const std::string again = "; get it once more from where it came from";
+    const auto expect = [&](const Bytes& bytes, const std::string& what) {
+        EXPECT_THAT(share_.Import(bytes, share_.other()),
+                    Failed(2, share_.archive() + ": damaged: " + what + again));
+        EXPECT_EQ(before, NamesIn(share_.path()));
+    };
+    expect(Hex("00 05 16 00 00 02 00 00 00*16 00 02 "
+               "00 00 00 01 00 00 00 00 00 00 00 28 00 00 00 02 00 00 00 00 00 00 00 28"),
+           "its entries share bytes");
+    expect(Hex("00 05 16 00 00 02 00 00 00*16 00 41") + Repeat(0, 65 * 12),
+           "it declares 65 entries");
+    const auto damaged = [](std::size_t from_end) {
+        Bytes bytes = kBinHex;
+        std::uint8_t& digit = bytes[bytes.size() - from_end];
+        digit = digit == '!' ? '"' : '!';
+        return bytes;
+    };
+    expect(damaged(7), "its resource fork is not what its checksum says");
+    expect(damaged(40), "its data fork is not what its checksum says");
+    expect(damaged(80), "its head is not what its checksum says");
+}
+
 // ---- What is there already ----------------------------------------------------------------------
 
 class ArchiveTest : public ::testing::Test {
