@@ -290,6 +290,28 @@ TEST_F(ForeignTest, AValueThatHasNoRoomIsNamedWithItsSizeAndTheLimit) {
                 HasSubstr("no room for its 65536 bytes"));
 }
 
+TEST_F(ForeignTest, AnAttributeWithoutAValueIsKeptAndThatClientsDoNotSeeItIsTold) {
+    const std::string note =
+        ": \"" + kColour + "\" has no value, and Samba's clients do not see such attributes\n";
+    ToolResult result = samba_.Set(kColour, {});
+    EXPECT_EQ(0, result.status);
+    EXPECT_EQ("mavoea: note: " + samba_.file() + note, result.err);
+    EXPECT_EQ(Bytes{0}, Attribute(samba_.file(), kColourStream));
+    EXPECT_THAT(linux_.Set(kColour, {}), Succeeded());
+    EXPECT_THAT(samba_.Set(kFinderInfoName, Bytes(32)), Succeeded());
+
+    const Share to("samba");
+    const auto copy_from = [&](const Share& from, const std::string& type) {
+        return RunTool({"--volume", from.path() + '=' + type, "--volume", to.path() + "=samba",
+                        "cp", from.file(), to.path() + "/copy"});
+    };
+    EXPECT_THAT(copy_from(samba_, "samba"), Succeeded());
+    result = copy_from(linux_, "linux");
+    EXPECT_EQ(0, result.status);
+    EXPECT_EQ("mavoea: note: " + to.path() + "/copy" + note, result.err);
+    EXPECT_EQ(Bytes{0}, Attribute(to.path() + "/copy", kColourStream));
+}
+
 TEST_F(ForeignTest, ANameThatMeansSomethingElseIsRefused) {
     for (const char* const name : {"AFP_AfpInfo", "AFP_Resource", "a/b"}) {
         EXPECT_EQ(2, samba_.Set(name, Ascii("x")).status) << name;

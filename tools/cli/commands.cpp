@@ -24,6 +24,7 @@
 #include "tools/show/where.h"
 #include "tools/store/adoption.h"
 #include "tools/store/change.h"
+#include "tools/store/foreign/spelling.h"
 #include "tools/store/layout.h"
 #include "tools/store/record.h"
 #include "tools/transfer/pending.h"
@@ -84,6 +85,7 @@ ExitStatus Set(const Options& options) {
     const Object object = FindObject(options.paths.front());
     const Bytes value = ValueToSet(options);
     OpenToChange(object)->Set(options.name, value);
+    if (const auto note = NoteOfUnseen(object, options.name, value.size())) Note(*note);
     if (options.json) {
         Json json;
         json.SetText("path", object.path());

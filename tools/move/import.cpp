@@ -14,6 +14,7 @@
 #include "tools/store/adoption.h"
 #include "tools/store/change.h"
 #include "tools/store/foreign/detection.h"
+#include "tools/store/foreign/spelling.h"
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
@@ -117,6 +118,9 @@ class ObjectImport {
             if (Has(name, value)) return;
             changer_->Set(name, value.All());
             if (!Has(name, value)) Miss(NameOfAttribute(name), "what is there differs");
+            if (auto note = NoteOfUnseen(object_, name, value.size())) {
+                notes_.push_back(*std::move(note));
+            }
         } catch (const Failure& failure) {
             failures_.push_back(Printable(object_.path()) + ": \"" + Printable(name) +
                                 "\" was not taken over: " + failure.what());

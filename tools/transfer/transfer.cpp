@@ -637,10 +637,20 @@ void Transfer::Finish(Leg* leg) {
                        Joined(missing),
                    "keep the original, or take the rest along by hand");
     }
+    NoteUnseen(*leg);
     for (const std::string& path : leg->wanted.earlier) {
         options_.on_note(Printable(leg->to.path()) +
                          ": has in the current layout what an earlier version kept in " +
                          Printable(path));
+    }
+}
+
+void Transfer::NoteUnseen(const Leg& leg) const {
+    for (const Metadata::Attribute& attribute : leg.wanted.attributes) {
+        const std::uint64_t size = attribute.value.size();
+        const auto note = NoteOfUnseen(leg.to, attribute.name, size);
+        // It tells nothing new where it was not seen before.
+        if (note && !NoteOfUnseen(leg.from, attribute.name, size)) options_.on_note(*note);
     }
 }
 

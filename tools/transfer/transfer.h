@@ -123,6 +123,7 @@ class Transfer {
     void CopyInodeTo(const Leg& leg, int source, int target) const;
     void Finish(Leg* leg);
     void NoteOrphan(const Leg& leg) const;
+    void NoteUnseen(const Leg& leg) const;
     void NoteCopied(const Leg& leg);
     void Remember(const struct stat& info);
     void NoteMade(const Place& to, const struct stat& info);

@@ -180,6 +180,16 @@ void Store(const Inode& inode, const Spelling& spelling, Bytes value) {
                   "check the disk");
 }
 
+std::optional<std::string> NoteOfUnseen(const Object& object, const std::string& name,
+                                        std::uint64_t size) {
+    const Dialect* const dialect = object.dialect();
+    const bool seen = dialect == nullptr || dialect->names != Dialect::Names::kStream || size > 0 ||
+                      KindOf(name) != Kind::kAttribute;
+    if (seen) return std::nullopt;
+    return Printable(object.path()) + ": " + NameOfAttribute(name) +
+           " has no value, and Samba's clients do not see such attributes";
+}
+
 bool Drop(const Inode& inode, const Spelling& spelling) {
     const auto stream = DecodeStreamAttribute(spelling.attribute);
     const auto value = stream ? inode.Attribute(spelling.attribute) : std::nullopt;

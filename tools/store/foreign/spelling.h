@@ -2,6 +2,7 @@
 #ifndef MAVOEA_TOOLS_STORE_FOREIGN_SPELLING_H_
 #define MAVOEA_TOOLS_STORE_FOREIGN_SPELLING_H_
 
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -9,6 +10,7 @@
 
 #include "tools/place/dialect.h"
 #include "tools/place/directory.h"
+#include "tools/place/volume.h"
 
 namespace mavoea::tool {
 
@@ -53,6 +55,9 @@ bool IsForeignInAny(const std::string& attribute);
 
 // Stores it. A Failure that names the limit where the file system has no room for it.
 void Store(const Inode& inode, const Spelling& spelling, Bytes value);
+// What is to be told of an attribute that has been stored and that clients do not see all the same.
+std::optional<std::string> NoteOfUnseen(const Object& object, const std::string& name,
+                                        std::uint64_t size);
 // False: there was none.
 bool Drop(const Inode& inode, const Spelling& spelling);
 
