@@ -268,6 +268,16 @@ class RecordTest(ShareTest):
         self.assertEqual(afp_info(bytes(32)), self.read("AFP_AfpInfo"))
         self.assert_fails(NOT_FOUND, self.write, "AFP_AfpInfo", afp_info())
 
+    def test_a_time_of_creation_that_is_not_known_is_in_2068_unless_dates_have_no_length(self):
+        unknown = record()[:354] + h("80000000") * 4 + record()[370:]
+        none = with_entry(1, 8, 354, 0)
+        for data, created in ((unknown, 946684800 + 0x80000000), (none, 10**9)):
+            self.make()
+            os.utime(self.path, (10**9, 10**9))
+            self.put(RECORD, data)
+            self.write("a", b"value")
+            self.assertEqual(created, self.mac.creation_time(self.name) // 10**7 - 11644473600)
+
     def test_the_afp_word_locks_nothing(self):
         data = record()[:370] + h("000001a0") + bytes(28)
         self.put(RECORD, data)

@@ -292,6 +292,16 @@ class WriteTest(ToolTest):
         self.assertEqual(before, self.client_s())
         self.mac.write(self.name, b"other")
 
+    def test_the_time_of_creation_stays_when_there_was_no_record(self):
+        self.open("netatalk")
+        for name, value in ((FINDER_INFO_NAME, FINDER_INFO), ("colour", b"red")):
+            self.make()
+            os.utime(self.path, (10**9, 10**9))
+            created = self.mac.creation_time(self.name)
+            self.set(name, value)
+            self.write("another", b"value")  # then smbd takes it from the record
+            self.assertEqual(created, self.mac.creation_time(self.name))
+
     def test_a_plain_colon_is_replaced_by_what_clients_can_call(self):
         self.open("netatalk")
         self.put("user.DosStream.a:b:$DATA", b"plain\0")
@@ -497,13 +507,14 @@ class ConvertTest(ToolTest):
         self.assertEqual(2 if no_place_for else 0, result.returncode)
 
     def on_disk(self, name):
-        """All that smbd goes by; the dates of its records are nothing to it."""
+        """What smbd keeps, but for the dates in its records."""
         self.name = name
         self.path = os.path.join(self.folder, name)
         self.double = os.path.join(os.path.dirname(self.path), f"._{os.path.basename(name)}")
         found = {one: os.getxattr(self.path, one) for one in os.listxattr(self.path)}
         if RECORD in found:
-            found[RECORD] = found[RECORD][:354] + found[RECORD][370:]
+            record = found[RECORD]
+            found[RECORD] = record[:38] + record[50:354] + record[370:]
         if os.path.exists(self.double):
             found["._"] = self.get_double()
         return found

@@ -84,7 +84,7 @@ class ForeignChanger final : public Changer {
         if (dialect_.finder_info == Dialect::FinderInfo::kRecord) {
             ForeignRecord record = ForeignRecord::Read(*inode_);
             record.Set(EntryId::kFinderInfo, value);
-            record.Store(*inode_);
+            record.Store(*inode_, dialect_);
             (void)RemoveSpellings(Datum::kAfpInfo, {});
             (void)RemoveSpellings(Datum::kFinderInfo, {});
         } else {
@@ -122,7 +122,7 @@ class ForeignChanger final : public Changer {
         ForeignRecord record = ForeignRecord::Read(*inode_);
         if (IsAllZero(record.Entry(EntryId::kFinderInfo))) return false;
         record.Set(EntryId::kFinderInfo, Bytes(kFinderInfoSize));
-        record.Store(*inode_);
+        record.Store(*inode_, dialect_);
         return true;
     }
 

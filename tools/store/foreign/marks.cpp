@@ -121,7 +121,7 @@ void SetForeignLock(const Dialect& dialect, const Inode& inode, bool locked) {
     if (wanted == word) return;
     StoreBe16(wanted, at);
     record.Set(EntryId::kAfpFileInfo, std::move(info));
-    record.Store(inode);
+    record.Store(inode, dialect);
 }
 
 }  // namespace mavoea::tool

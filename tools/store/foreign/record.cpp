@@ -67,24 +67,33 @@ bool ForeignRecord::SaysAnything() const {
     });
 }
 
-Bytes ForeignRecord::Encode() const {
-    Bytes unknown(kFileDatesSize);
-    for (std::size_t at = 0; at < unknown.size(); at += sizeof kUnknownDate) {
-        StoreBe32(kUnknownDate, &unknown[at]);
+// Dates that are not known have no length for Samba, which takes an unknown time of creation for
+// one in 2068, and are unknown ones for netatalk.
+Bytes ForeignRecord::Encode(const Dialect& dialect) const {
+    auto layout = kFreshRecord;
+    Bytes dates = Entry(EntryId::kFileDates);
+    if (dates.empty() && dialect.marks == Dialect::Marks::kDosAttributes) {
+        for (RecordEntry& entry : layout) {
+            if (static_cast<EntryId>(entry.id) == EntryId::kFileDates) entry.data.length = 0;
+        }
+    } else if (dates.empty()) {
+        dates.resize(kFileDatesSize);
+        for (std::size_t at = 0; at < dates.size(); at += sizeof kUnknownDate) {
+            StoreBe32(kUnknownDate, &dates[at]);
+        }
     }
     Bytes block(kAttributeBlockSize);
     const auto bytes_of = [&](std::uint32_t id) -> ByteView {
-        const Bytes& bytes = Entry(static_cast<EntryId>(id));
-        const bool no_dates = bytes.empty() && static_cast<EntryId>(id) == EntryId::kFileDates;
-        return no_dates ? unknown : bytes;
+        return static_cast<EntryId>(id) == EntryId::kFileDates ? dates
+                                                               : Entry(static_cast<EntryId>(id));
     };
-    EncodeRecord(kFreshRecord, bytes_of, 0, block);
+    EncodeRecord(layout, bytes_of, 0, block);
     return block;
 }
 
-void ForeignRecord::Store(const Inode& object) const {
+void ForeignRecord::Store(const Inode& object, const Dialect& dialect) const {
     if (!there_ && !SaysAnything()) return;
-    const Bytes block = Encode();
+    const Bytes block = Encode(dialect);
     if (!SmbdTakes(ReadLayout(ByteView(block)), block.size())) {
         throw Failure(kFailed, object.path(), "its netatalk record would be damaged",
                       "nothing has been written");

@@ -6,6 +6,7 @@
 #include <optional>
 
 #include "format/apple_double.h"
+#include "tools/place/dialect.h"
 #include "tools/place/directory.h"
 
 namespace mavoea::tool {
@@ -27,10 +28,10 @@ class ForeignRecord {
 
     // Never one that smbd would remove. A record that says nothing is stored only where there is
     // one already.
-    void Store(const Inode& object) const;
+    void Store(const Inode& object, const Dialect& dialect) const;
 
  private:
-    Bytes Encode() const;
+    Bytes Encode(const Dialect& dialect) const;
 
     std::map<EntryId, Bytes> entries_;
     bool there_ = false;
