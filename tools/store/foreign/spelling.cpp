@@ -131,7 +131,7 @@ bool IsForeign(const std::string& attribute, const Dialect& dialect) {
 bool IsForeignInAny(const std::string& attribute) {
     return attribute == kRecordAttribute || DecodeStreamAttribute(attribute) ||
            (attribute.starts_with(kUser) &&
-            DatumOf(std::string_view(attribute).substr(kUser.size())) != Datum::kAttribute);
+            DatumOf(attribute.substr(kUser.size())) != Datum::kAttribute);
 }
 
 std::optional<Bytes> Spelling::Value(const Inode& inode) const {
