@@ -39,7 +39,7 @@ void TakeLock(Metadata* metadata) {
 
 Archive ReadAppleSingle(const std::shared_ptr<const File>& file, const AppleSingle& single) {
     Archive archive = {.format = ArchiveFormat::kAppleSingle};
-    const Source source = {file->path()};
+    const Origin origin = {file->path()};
     Gathering gathering(&archive.metadata);
     std::uint64_t total = 0;
     if (single.entry_count() > kEntryMax) {
@@ -62,16 +62,16 @@ Archive ReadAppleSingle(const std::shared_ptr<const File>& file, const AppleSing
             const std::string name(bytes.begin(), bytes.end());
             archive.name = IsUtf8(name) ? name : FromMacRoman(name);
         } else if (static_cast<EntryId>(id) == EntryId::kResourceFork) {
-            gathering.AddFork(std::move(value), source);
+            gathering.AddFork(std::move(value), origin);
         } else if (static_cast<EntryId>(id) != EntryId::kFinderInfo) {
-            gathering.AddEntry(static_cast<EntryId>(id), std::move(value), source);
+            gathering.AddEntry(static_cast<EntryId>(id), std::move(value), origin);
         } else if (range.length < kFinderInfoSize) {
-            gathering.AddStray("Finder info", "it has fewer bytes than it should", source);
+            gathering.AddStray("Finder info", "it has fewer bytes than it should", origin);
         } else {
-            gathering.AddFinderInfo(Content(file, range.offset, kFinderInfoSize), source);
+            gathering.AddFinderInfo(Content(file, range.offset, kFinderInfoSize), origin);
             if (!IsAllZero(value.Read(kFinderInfoSize, kHeadMax))) {
                 gathering.AddStray("what is behind the Finder info", "it is of no known kind",
-                                   source);
+                                   origin);
             }
         }
     }
@@ -88,7 +88,7 @@ std::uint32_t AfpTime(std::optional<std::int64_t> time) {
     return static_cast<std::uint32_t>(since);
 }
 
-void AddDates(const MacBinaryHead& head, const Source& source, Archive* archive) {
+void AddDates(const MacBinaryHead& head, const Origin& origin, Archive* archive) {
     if (head.modification_time != 0) archive->modified = FromMacTime(head.modification_time);
     if (head.creation_time == 0) return;
     Bytes dates(kFileDatesSize);
@@ -97,24 +97,24 @@ void AddDates(const MacBinaryHead& head, const Source& source, Archive* archive)
     out.U32(AfpTime(archive->modified));
     out.U32(kUnknownDate);
     out.U32(kUnknownDate);
-    Gathering(&archive->metadata).AddEntry(EntryId::kFileDates, Content(std::move(dates)), source);
+    Gathering(&archive->metadata).AddEntry(EntryId::kFileDates, Content(std::move(dates)), origin);
 }
 
 Archive ReadMacBinary(const std::shared_ptr<const File>& file, const MacBinary& binary) {
     Archive archive = {.format = ArchiveFormat::kMacBinary};
-    const Source source = {file->path()};
+    const Origin origin = {file->path()};
     const MacBinaryHead& head = binary.head;
     archive.name = FromMacRoman(head.name);
     archive.data = Content(file, binary.data_offset, head.data_length);
     archive.metadata.locked = head.locked;
     Gathering gathering(&archive.metadata);
-    gathering.AddFinderInfo(Content({head.finder_info.begin(), head.finder_info.end()}), source);
-    gathering.AddFork(Content(file, binary.resource_offset, head.resource_length), source);
+    gathering.AddFinderInfo(Content({head.finder_info.begin(), head.finder_info.end()}), origin);
+    gathering.AddFork(Content(file, binary.resource_offset, head.resource_length), origin);
     if (head.comment_length > 0) {
         gathering.AddEntry(EntryId::kComment,
-                           Content(file, binary.comment_offset, head.comment_length), source);
+                           Content(file, binary.comment_offset, head.comment_length), origin);
     }
-    AddDates(head, source, &archive);
+    AddDates(head, origin, &archive);
     return archive;
 }
 
@@ -160,13 +160,13 @@ Archive ReadBinHex(const std::shared_ptr<const File>& file, const DirectoryRef& 
     Archive archive = {.format = ArchiveFormat::kBinHex};
     archive.name = FromMacRoman(head->name());
     archive.data = Content(unpacked.shared_file(), 0, head->data_length);
-    const Source source = {file->path()};
+    const Origin origin = {file->path()};
     Gathering gathering(&archive.metadata);
     Bytes finder_info(head->finder_info.begin(), head->finder_info.end());
     finder_info.resize(kFinderInfoSize);
-    gathering.AddFinderInfo(Content(std::move(finder_info)), source);
+    gathering.AddFinderInfo(Content(std::move(finder_info)), origin);
     gathering.AddFork(Content(unpacked.shared_file(), head->data_length, head->resource_length),
-                      source);
+                      origin);
     return archive;
 }
 
