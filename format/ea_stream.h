@@ -129,7 +129,8 @@ inline void EncodeAttributeRecord(const AttributeRecord& record, const char* nam
                                   std::uint8_t* to) {
     StoreBe32(0, to + RecordSize(record.name_size) - 4);  // the padding, or what is written over it
     // As one: of two neighbouring words compilers make one store of eight single bytes.
-    StoreBe64(std::uint64_t{record.value.offset} << 32 | record.value.length, to);
+    constexpr std::uint64_t kHighWord = std::uint64_t{1} << 32;
+    StoreBe64(record.value.offset * kHighWord + record.value.length, to);
     StoreBe16(record.flags, to + 8);
     to[10] = record.name_size;
     CopyShort(to + AttributeRecord::kFixedSize, name, record.name_size);
