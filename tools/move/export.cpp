@@ -124,14 +124,7 @@ Json ExportJson(const ExportOptions& options, const Object& object, const Archiv
     json.SetText("file", options.file);
     json.Set("format", options.format);
     if (archive.data) json.Set("dataFork", archive.data->size());
-    Json left = Json::Array();
-    for (const Missing& one : missing) {
-        Json entry;
-        entry.SetText("name", one.item);
-        entry.SetText("reason", one.reason);
-        left.Add(std::move(entry));
-    }
-    json.Set("missing", std::move(left));
+    json.Set("missing", MissingJson(missing));
     return json;
 }
 

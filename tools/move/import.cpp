@@ -358,14 +358,7 @@ Json ImportJson(const std::string& source, const std::string& path, const Archiv
     json.Set("attributes", std::move(attributes));
     json.Set("finderInfo", metadata.finder_info.has_value());
     json.Set("resourceFork", metadata.fork ? metadata.fork->value.size() : 0);
-    Json missing = Json::Array();
-    for (const Missing& one : import.missing()) {
-        Json entry;
-        entry.SetText("name", one.item);
-        entry.SetText("reason", one.reason);
-        missing.Add(std::move(entry));
-    }
-    json.Set("notTakenOver", std::move(missing));
+    json.Set("notTakenOver", MissingJson(import.missing()));
     SetMessages(json, "failures", import.failures());
     return json;
 }

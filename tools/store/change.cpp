@@ -198,13 +198,12 @@ class AttributeChanger final : public Changer {
 
 // ---- The lock -----------------------------------------------------------------------------------
 
-constexpr std::uint16_t kLocking = kAfpNoWrite | kAfpNoRename | kAfpNoDelete;
 // What the library sets in records that say something of the lock.
 constexpr std::uint16_t kLockedByLibrary = 0xA000;
 
 std::uint16_t WithLock(std::uint16_t word, bool locked) {
     return static_cast<std::uint16_t>(locked ? word | kLockedByLibrary
-                                             : word & ~(kLocking | kLockedByLibrary));
+                                             : word & ~(kAfpLocking | kLockedByLibrary));
 }
 
 void SetRecordLock(const Object& object, const Inode& inode, bool locked) {

@@ -23,10 +23,8 @@ namespace {
 // The write bits that a locked file had, as text: "0220".
 constexpr const char* kFormerBits = "user.mavoea.writable";
 
-constexpr std::uint16_t kLocking = kAfpNoWrite | kAfpNoRename | kAfpNoDelete;
-
 bool LockedByRecord(const Metadata& metadata) {
-    return (metadata.AfpAttributes().value_or(0) & kLocking) != 0;
+    return (metadata.AfpAttributes().value_or(0) & kAfpLocking) != 0;
 }
 
 std::optional<mode_t> FormerBits(const Inode& inode) {
@@ -59,12 +57,12 @@ std::uint32_t AttributeWordOf(const Inode& inode, bool listed) {
 
 }  // namespace
 
-void ReadMarks(const Object& object, const Inode& inode, Metadata* metadata) {
+void ReadMarks(const Object& object, const Inode& inode, const std::vector<std::string>& names,
+               Metadata* metadata) {
     if (!inode.HoldsContents()) return;
     const Dialect* const dialect = object.dialect();
     const bool by_dos =
         dialect != nullptr ? dialect->marks == Dialect::Marks::kDosAttributes : !object.declared;
-    const std::vector<std::string> names = inode.AttributeNames();
     const auto has = [&](const char* name) {
         return std::find(names.begin(), names.end(), name) != names.end();
     };

@@ -19,8 +19,10 @@ inline bool LocksByMode(const Object& object) {
 inline constexpr mode_t kWriteBits = 0222;
 inline constexpr mode_t kPermissionBits = 07777;
 
-// Reads all three into *metadata. What records say is in its AFP word already. Throws Failure.
-void ReadMarks(const Object& object, const Inode& inode, Metadata* metadata);
+// Reads all three into *metadata. What records say is in its AFP word already; `names`: those of
+// the object's attributes. Throws Failure.
+void ReadMarks(const Object& object, const Inode& inode, const std::vector<std::string>& names,
+               Metadata* metadata);
 
 // The platform's own locked flag. Setting it where the file system has no place for it does
 // nothing.

@@ -119,6 +119,17 @@ std::vector<Missing> ItemsOf(const Metadata& metadata, const std::string& reason
     return items;
 }
 
+Json MissingJson(const std::vector<Missing>& missing) {
+    Json list = Json::Array();
+    for (const Missing& one : missing) {
+        Json entry;
+        entry.SetText("name", one.item);
+        entry.SetText("reason", one.reason);
+        list.Add(std::move(entry));
+    }
+    return list;
+}
+
 std::string Joined(const std::vector<Missing>& missing) {
     constexpr std::size_t kMost = 20;
     std::string text;
@@ -141,10 +152,9 @@ bool SaysSomething(EntryId id, const Bytes& bytes) {
 
 Bytes WithoutLock(EntryId id, Bytes bytes) {
     if (id != EntryId::kAfpFileInfo || bytes.size() < kAfpFileInfoSize) return bytes;
-    constexpr std::uint16_t kLocking = kAfpNoWrite | kAfpNoRename | kAfpNoDelete;
     constexpr std::uint16_t kLockedByLibrary = 0xA000;
     std::uint8_t* const word = &bytes[kAfpAttributesOffset];
-    StoreBe16(static_cast<std::uint16_t>(LoadBe16(word) & ~(kLocking | kLockedByLibrary)), word);
+    StoreBe16(static_cast<std::uint16_t>(LoadBe16(word) & ~(kAfpLocking | kLockedByLibrary)), word);
     return bytes;
 }
 

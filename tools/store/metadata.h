@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "format/apple_double.h"
+#include "tools/say/json.h"
 #include "tools/say/messages.h"
 #include "tools/store/content.h"
 
@@ -23,6 +24,9 @@ inline constexpr std::string_view kResourceForkName = "com.apple.ResourceFork";
 inline constexpr std::string_view kLockedName = "mavoea.locked";
 
 enum class Kind { kAttribute, kFinderInfo, kResourceFork, kLocked };
+
+// What in the AFP word says that a file is locked.
+inline constexpr std::uint16_t kAfpLocking = kAfpNoWrite | kAfpNoRename | kAfpNoDelete;
 
 constexpr Kind KindOf(std::string_view name) {
     if (name == kFinderInfoName) return Kind::kFinderInfo;
@@ -112,6 +116,8 @@ std::vector<Missing> WhatIsMissing(const Metadata& wanted, const Metadata& found
 
 // All that there is to name, each with that reason. Services' files are not among it.
 std::vector<Missing> ItemsOf(const Metadata& metadata, const std::string& reason);
+
+Json MissingJson(const std::vector<Missing>& missing);
 
 // "Finder info (it is not there), \"colour\" (it is not there)"; of very many the first only.
 std::string Joined(const std::vector<Missing>& missing);

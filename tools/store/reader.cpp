@@ -222,9 +222,8 @@ class AttributeReader final : public Reader {
 };
 
 // What another program keeps of an object where nobody has said that it does.
-void AddUndeclared(const Object& object, const Inode& inode, Metadata* metadata) {
-    if (object.declared || !inode.HoldsContents()) return;
-    const auto sign = SignIn(inode.AttributeNames());
+void AddUndeclared(const Inode& inode, const std::vector<std::string>& names, Metadata* metadata) {
+    const auto sign = SignIn(names);
     if (!sign) return;
     AddForeignAttributes(*sign->dialect, inode, metadata);
     AddForeignAttributes(AnyDialect(), inode, metadata);
@@ -244,10 +243,16 @@ Metadata ReadMetadata(const Object& object, const Inode& inode, const Sidecars& 
         AddFolder(sidecars, &metadata);
     } else if (reader != nullptr && !object.is_root()) {
         metadata = reader->Read(inode, sidecars);
-        Noting(&metadata, [&] { AddUndeclared(object, inode, &metadata); });
     }
     if (sidecars.problem) metadata.problems.push_back(*sidecars.problem);
-    Noting(&metadata, [&] { ReadMarks(object, inode, &metadata); });
+    if (!inode.HoldsContents()) return metadata;
+    Noting(&metadata, [&] {
+        const std::vector<std::string> names = inode.AttributeNames();
+        if (reader != nullptr && !object.is_root() && !object.declared) {
+            Noting(&metadata, [&] { AddUndeclared(inode, names, &metadata); });
+        }
+        ReadMarks(object, inode, names, &metadata);
+    });
     return metadata;
 }
 

@@ -9,7 +9,6 @@
 namespace mavoea::tool {
 namespace {
 
-constexpr std::uint16_t kAfpLocking = kAfpNoWrite | kAfpNoRename | kAfpNoDelete;
 constexpr std::uint16_t kAfpMarks = kAfpLocking | kAfpInvisible | kAfpSystem | kAfpBackup;
 constexpr std::uint32_t kDosMarks = kDosReadOnly | kDosHidden | kDosSystem | kDosArchive;
 
