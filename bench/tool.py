@@ -355,6 +355,34 @@ def compare_memory(options, room):
         print(f"{name.ljust(20)}" + "".join(f"{value:8.1f}" for value in peaks))
 
 
+def spawned(command):
+    """How long a process takes that is started with as little ado as can be."""
+    begin = time.perf_counter()
+    nowhere = [(os.POSIX_SPAWN_OPEN, 1, "/dev/null", os.O_WRONLY, 0)]
+    process = os.posix_spawnp(command[0], command, os.environ, file_actions=nowhere)
+    _, status = os.waitpid(process, 0)
+    if status != 0:
+        sys.exit(f"{' '.join(command)}: status {os.waitstatus_to_exitcode(status)}")
+    return time.perf_counter() - begin
+
+
+def compare_start(options, room):
+    """One small thing asked of one file: starting is most of that."""
+    volumes = Volumes(options.tool, make_room(room, "start"), 1)
+    path = volumes.path("ext4") + "/letter"
+    write(path, b"")
+    os.setxattr(path, "user.colour", b"blue")
+    getfattr = ["getfattr", "--absolute-names"]
+    pairs = {"list": [*getfattr, path], "get": [*getfattr, "-n", "user.colour", path]}
+    for name, theirs in pairs.items():
+        ours = [*volumes.command((volumes.path("ext4"), PLAIN)), name, path]
+        if name == "get":
+            ours.append("user.colour")
+        times = [(spawned(ours), spawned(theirs)) for _ in range(100 * options.rounds)]
+        mine, others = (statistics.median(column) for column in zip(*times))
+        print(f"{name.ljust(5)} {mine / others:5.2f} ({mine * 1e6:.0f} / {others * 1e6:.0f} us)")
+
+
 def make_room(room, name):
     path = f"{room}/{name}"
     os.mkdir(path)
@@ -371,6 +399,7 @@ def main():
     parser.add_argument("--only", default="", metavar="PATTERN",
                         help='rows such as "cp -r 1 to 0", "list -r 7"')
     parser.add_argument("--memory", action="store_true", help="how much memory it takes, instead")
+    parser.add_argument("--start", action="store_true", help="the tool's start, instead")
     parser.add_argument("--markdown", action="store_true", help="print the table for the README")
     parser.add_argument("--tool", default=f"{here}/../build/release/bin/mavoea", metavar="FILE")
     options = parser.parse_args()
@@ -382,7 +411,8 @@ def main():
         os.execvp("unshare", ["unshare", "-m", sys.executable, *sys.argv])
     room = tempfile.mkdtemp(prefix="mavoea-bench-")
     try:
-        (compare_memory if options.memory else compare)(options, room)
+        measure = compare_memory if options.memory else compare_start if options.start else compare
+        measure(options, room)
     finally:
         subprocess.run(["umount", "-q", "-R", room], stderr=subprocess.DEVNULL, check=False)
         for point, _, _ in os.walk(room, topdown=False):

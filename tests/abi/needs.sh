@@ -1,8 +1,8 @@
 #!/bin/sh
-# needs.sh LIBRARY SONAME LIST: the library has this soname and needs, at run time, nothing but what
-# LIST has (one soname a line).
+# needs.sh FILE SONAME LIST: the library (a program's soname is empty) has this soname and needs, at
+# run time, nothing but what LIST has (one soname a line).
 set -eu
-dynamic=$(readelf -d "$1")
+dynamic=$(LC_ALL=C readelf -d "$1")
 soname=$(echo "$dynamic" | sed -n 's/.*(SONAME).*\[\(.*\)\]/\1/p')
 [ "$soname" = "$2" ] || { echo "soname is $soname, not $2" >&2; exit 1; }
 needed=$(echo "$dynamic" | sed -n 's/.*(NEEDED).*\[\(.*\)\]/\1/p')

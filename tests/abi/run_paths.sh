@@ -2,7 +2,7 @@
 # run_paths.sh CMAKE BUILD BINDIR LIBDIR MOVES [EMULATOR...]: no program and no library of the build
 # tree, and of what is installed from it into BINDIR and LIBDIR (absolute paths), has a run path with
 # an element that is empty or relative, which means the working directory, or lies in the build tree.
-# MOVES is yes where run paths are built in: the tool then runs from a copy of bin and lib, too.
+# MOVES is yes where run paths are built in: programs then run from a copy of bin and lib, too.
 set -eu
 cmake=$1
 build=$2
@@ -52,12 +52,15 @@ check_all() {
     [ $count -gt 0 ] || fail "no program and no library in $*"
 }
 
-# runs TOOL EMULATOR...: it finds its libraries, and does not look for them in the working directory.
+# runs PROGRAM ARGUMENT EMULATOR...: it finds its libraries, and does not look for them in the working
+# directory. An empty argument is none.
 runs() {
-    tool=$1
-    shift
-    (cd "$work/elsewhere" && env -u LD_LIBRARY_PATH "$@" "$tool" --version > /dev/null) ||
-        fail "$tool does not run"
+    program=$1
+    argument=$2
+    shift 2
+    # shellcheck disable=SC2086: none where it is empty
+    (cd "$work/elsewhere" && env -u LD_LIBRARY_PATH "$@" "$program" $argument > /dev/null) ||
+        fail "$program does not run"
 }
 
 check_all "$build/bin" "$build/lib"
@@ -71,10 +74,11 @@ if [ "$moves" = yes ]; then
         : > "$work/elsewhere/$(basename "$library")"
     done
     cp -P "$build"/lib/lib*.so.* "$work/copy/lib"
-    cp "$build/bin/mavoea" "$work/copy/bin"
-    runs "$work/copy/bin/mavoea" "$@"
+    cp "$build/bin/mavoea" "$build/bin/c_client_test" "$work/copy/bin"
+    runs "$work/copy/bin/mavoea" --version "$@"
+    runs "$work/copy/bin/c_client_test" "" "$@"
     if [ $# -eq 0 ]; then # libraries of an emulated machine are not all installed
-        runs "$work/installed$bindir/mavoea"
+        runs "$work/installed$bindir/mavoea" --version
         [ -e "$work/installed$libdir/libmavoea.so.5" ] || fail "no libmavoea.so.5 in $libdir"
     fi
 fi
