@@ -1,4 +1,4 @@
-// Trees from one kind of volume to another through the tool, and the comparison behind it.
+// Trees from one kind of volume to another through the tool.
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>
@@ -15,6 +15,7 @@
 #include "tests/support/record_builder.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/tool.h"
+#include "tests/tool/volumes.h"
 
 namespace mavoea::test {
 namespace {
@@ -37,62 +38,6 @@ const char* NameOf(int type) {
             return "xattr";
     }
 }
-
-// All that is in a directory: the bytes of files, and what else there is.
-std::map<std::string, Bytes> Snapshot(const std::string& directory) {
-    std::map<std::string, Bytes> all;
-    for (const std::string& name : Tree(directory)) {
-        const std::filesystem::path path = directory + '/' + name;
-        const bool is_file =
-            std::filesystem::is_regular_file(std::filesystem::symlink_status(path));
-        all[name] = is_file ? ReadFile(path) : Bytes();
-    }
-    return all;
-}
-
-// Volumes beside each other, each a directory that is declared to be of a type.
-class Volumes {
- public:
-    const std::string& path() const { return dir_.path(); }
-
-    // It need not be there yet; it is declared to the tool once it is.
-    std::string Declare(const std::string& name, int type) {
-        const std::string volume = dir_ / name;
-        declared_.emplace_back(volume, type);
-        return volume;
-    }
-
-    std::string Make(const std::string& name, int type) {
-        const std::string volume = Declare(name, type);
-        MakeDir(volume);
-        return volume;
-    }
-
-    ToolResult Run(const Arguments& arguments, const std::string& input = {}) const {
-        Arguments all;
-        for (const auto& [volume, type] : declared_) {
-            if (!Exists(volume)) continue;
-            all.insert(all.end(), {"--volume", volume + '=' + std::to_string(type)});
-        }
-        all.insert(all.end(), arguments.begin(), arguments.end());
-        return RunTool(all, input);
-    }
-
-    void Set(const std::string& path, const std::string& name, const Bytes& value) const {
-        ASSERT_THAT(Run({"set", path, name}, std::string(value.begin(), value.end())), Succeeded());
-    }
-
-    ToolResult Convert(const std::string& from, const std::string& to, const std::string& type,
-                       Arguments options = {"-r"}) const {
-        options.insert(options.begin(), "convert");
-        options.insert(options.end(), {"--to", type, from, to});
-        return Run(options);
-    }
-
- private:
-    TempDir dir_;
-    std::vector<std::pair<std::string, int>> declared_;
-};
 
 // ---- Every pair ---------------------------------------------------------------------------------
 
@@ -205,13 +150,13 @@ INSTANTIATE_TEST_SUITE_P(Types, ConvertPairTest, ::testing::ValuesIn(Thinned(All
 TEST_P(ConvertPairTest, ATreeGoesThereAndBackAndIsTheSame) {
     const std::string source = volumes_.Make("source", from());
     MakeTree(source);
-    const auto before = Snapshot(source);
+    const auto before = Contents(source);
     const std::string all = HasMacAttributes() ? "12" : "10";
 
     const std::string there = volumes_.path() + "/there";
     const ToolResult forth = volumes_.Convert(source, there, NameOf(to()));
     volumes_.Declare("there", to());
-    EXPECT_EQ(before, Snapshot(source));
+    EXPECT_EQ(before, Contents(source));
     if (MayLose(from(), to()) && forth.status != 0) return ExpectTold(source, there, forth);
     EXPECT_THAT(forth, Succeeded());
     EXPECT_EQ(all + " converted, " + all + " compared, 0 differences, 0 failed\n", forth.out);
@@ -223,10 +168,9 @@ TEST_P(ConvertPairTest, ATreeGoesThereAndBackAndIsTheSame) {
     if (MayLose(to(), from()) && result.status != 0) return ExpectTold(there, back, result);
     EXPECT_THAT(result, Succeeded());
     CheckTree(back);
-    const ToolResult same =
-        volumes_.Convert(source, back, NameOf(from()), {"-r", "--compare-only"});
+    const ToolResult same = volumes_.Run({"diff", "-r", "--data", source, back});
     EXPECT_THAT(same, Succeeded());
-    EXPECT_EQ(all + " compared, 0 differences, 0 failed\n", same.out);
+    EXPECT_EQ("", same.out);
 }
 
 TEST_P(ConvertPairTest, WhatIsAtTheDestinationIsReplaced) {
@@ -243,190 +187,6 @@ TEST_P(ConvertPairTest, WhatIsAtTheDestinationIsReplaced) {
     if (MayLose(from(), to()) && result.status != 0) return;
     EXPECT_THAT(result, Succeeded());
     EXPECT_EQ("blue", volumes_.Run({"get", there + "/file", "user.colour"}).out);
-}
-
-// ---- The comparison -----------------------------------------------------------------------------
-
-// A tree on an EA-directory volume and its copy on an AppleDouble volume, which are the same.
-class CompareTest : public ::testing::Test {
- protected:
-    void SetUp() override {
-        MAVOEA_SKIP_UNLESS_ROOT();
-        MAVOEA_SKIP_WITHOUT_ATTRIBUTES(volumes_.path());
-        source_ = volumes_.Make("source", 1);
-        copy_ = volumes_.Declare("copy", 0);
-        MakeDir(source_ + "/folder");
-        WriteFile(source_ + "/file", Pattern(1100000));
-        volumes_.Set(source_ + "/file", "colour", Ascii("blue"));
-        volumes_.Set(source_ + "/file", "shape", Ascii("round"));
-        volumes_.Set(source_ + "/file", kFinderInfo, Pattern(32, 0x40));
-        volumes_.Set(source_ + "/file", kFork, Pattern(100));
-        WriteFile(source_ + "/folder/plain", Ascii("data"));
-        ASSERT_EQ(0, symlink("file", (source_ + "/link").c_str()));
-        ASSERT_THAT(volumes_.Convert(source_, copy_, "appledouble"), Succeeded());
-        ASSERT_EQ("5 compared, 0 differences, 0 failed\n", Compare().out);
-    }
-
-    ToolResult Compare(const std::string& option = "-r") const {
-        return volumes_.Convert(source_, copy_, "appledouble", {option, "--compare-only"});
-    }
-
-    // That the comparison finds this, and nothing else; and changes nothing.
-    void ExpectFound(const std::string& line, int compared = 5) const {
-        const auto before = std::pair(Snapshot(source_), Snapshot(copy_));
-        const ToolResult result = Compare();
-        EXPECT_EQ(2, result.status);
-        EXPECT_EQ("", result.err);
-        EXPECT_EQ(line + '\n' + std::to_string(compared) + " compared, 1 difference, 0 failed\n",
-                  result.out);
-        EXPECT_EQ(before, std::pair(Snapshot(source_), Snapshot(copy_)));
-    }
-
-    void Change(const std::string& name, const Bytes& value) const {
-        volumes_.Set(copy_ + "/file", name, value);
-    }
-
-    Volumes volumes_;
-    std::string source_;
-    std::string copy_;
-};
-
-TEST_F(CompareTest, AByteOfTheDataIsFoundWhereverItIs) {
-    for (const std::size_t at : {0U, 1048575U, 1048576U, 1099999U}) {
-        Bytes data = Pattern(1100000);
-        data[at] ^= 1;
-        WriteFile(copy_ + "/file", data);
-        ExpectFound(source_ + "/file: data: different at byte " + std::to_string(at));
-    }
-}
-
-TEST_F(CompareTest, DataOfAnotherLengthIsFound) {
-    Bytes data = Pattern(1100000);
-    data.pop_back();
-    WriteFile(copy_ + "/file", data);
-    ExpectFound(source_ + "/file: data: different at byte 1099999");
-    WriteFile(copy_ + "/file", Pattern(1100000) + Ascii("x"));
-    ExpectFound(source_ + "/file: data: different at byte 1100000");
-    WriteFile(copy_ + "/file", {});
-    ExpectFound(source_ + "/file: data: different at byte 0");
-}
-
-TEST_F(CompareTest, AValueThatDiffersIsFoundByItsName) {
-    Change("colour", Ascii("blUe"));
-    ExpectFound(source_ + "/file: \"colour\": different at byte 2");
-}
-
-TEST_F(CompareTest, AValueThatGoesOnIsFound) {
-    Change("colour", Ascii("blueish"));
-    ExpectFound(source_ + "/file: \"colour\": different at byte 4");
-}
-
-TEST_F(CompareTest, AnAttributeThatIsMissingIsFound) {
-    ASSERT_THAT(volumes_.Run({"remove", copy_ + "/file", "colour"}), Succeeded());
-    ExpectFound(source_ + "/file: \"colour\": missing");
-}
-
-TEST_F(CompareTest, AnExtraAttributeIsFoundWhateverIsInItsName) {
-    Change("two\nlines", {});
-    ExpectFound(source_ + "/file: \"two\\x0Alines\": extra");
-}
-
-TEST_F(CompareTest, AByteOfTheFinderInfoIsFound) {
-    Bytes info = Pattern(32, 0x40);
-    info[31] ^= 0x80;
-    Change(kFinderInfo, info);
-    ExpectFound(source_ + "/file: \"com.apple.FinderInfo\": different at byte 31");
-    Change(kFinderInfo, Bytes(32));
-    ExpectFound(source_ + "/file: \"com.apple.FinderInfo\": missing");
-}
-
-TEST_F(CompareTest, AByteOfTheResourceForkIsFound) {
-    Bytes fork = Pattern(100);
-    fork[50] ^= 1;
-    Change(kFork, fork);
-    ExpectFound(source_ + "/file: \"com.apple.ResourceFork\": different at byte 50");
-    Change(kFork, {});
-    ExpectFound(source_ + "/file: \"com.apple.ResourceFork\": missing");
-}
-
-TEST_F(CompareTest, TheLockIsFoundBothWays) {
-    ASSERT_THAT(volumes_.Run({"lock", copy_ + "/file"}), Succeeded());
-    ExpectFound(source_ + "/file: \"mavoea.locked\": extra");
-    ASSERT_THAT(volumes_.Run({"unlock", copy_ + "/file"}), Succeeded());
-    ASSERT_THAT(volumes_.Run({"lock", source_ + "/file"}), Succeeded());
-    ExpectFound(source_ + "/file: \"mavoea.locked\": missing");
-}
-
-TEST_F(CompareTest, AnObjectThatIsMissingOrExtraIsFound) {
-    WriteFile(copy_ + "/folder/another", {});
-    ExpectFound(copy_ + "/folder/another: extra");
-    ASSERT_EQ(0, unlink((copy_ + "/folder/another").c_str()));
-    ASSERT_EQ(0, unlink((copy_ + "/folder/plain").c_str()));
-    ExpectFound(source_ + "/folder/plain: missing", 4);
-}
-
-TEST_F(CompareTest, AnObjectOfAnotherTypeIsFound) {
-    ASSERT_EQ(0, unlink((copy_ + "/folder/plain").c_str()));
-    MakeDir(copy_ + "/folder/plain");
-    ExpectFound(source_ + "/folder/plain: type: different");
-}
-
-TEST_F(CompareTest, ALinkThatLeadsElsewhereIsFound) {
-    ASSERT_EQ(0, unlink((copy_ + "/link").c_str()));
-    ASSERT_EQ(0, symlink("filter", (copy_ + "/link").c_str()));
-    ExpectFound(source_ + "/link: target: different at byte 3");
-}
-
-TEST_F(CompareTest, WithoutRecursionOnlyTheObjectItselfIsCompared) {
-    ASSERT_EQ(0, unlink((copy_ + "/folder/plain").c_str()));
-    const ToolResult result = volumes_.Convert(source_, copy_, "appledouble", {"--compare-only"});
-    EXPECT_THAT(result, Succeeded());
-    EXPECT_EQ("1 compared, 0 differences, 0 failed\n", result.out);
-}
-
-TEST_F(CompareTest, WhatCannotBeReadIsAFailureAndTheRestIsCompared) {
-    WriteFile(source_ + "/@eaDir/file@MavoEAStream", Hex("00 05 16 07  00 02"));
-    Bytes data = Pattern(1100000);
-    data[7] ^= 1;
-    WriteFile(copy_ + "/file", data);
-    const ToolResult result = Compare();
-    EXPECT_EQ(2, result.status);
-    EXPECT_EQ(source_ +
-                  "/file: data: different at byte 7\n"
-                  "5 compared, 1 difference, 1 failed\n",
-              result.out);
-    EXPECT_THAT(result.err, HasSubstr("mavoea: " + source_ + "/@eaDir/file@MavoEAStream: "));
-}
-
-TEST_F(CompareTest, ACopyThatIsNotThereIsNotFound) {
-    const std::string nowhere = volumes_.path() + "/nowhere";
-    EXPECT_THAT(volumes_.Convert(source_, nowhere, "0", {"--compare-only"}),
-                Failed(1, nowhere + ": No such file or directory; check the path"));
-}
-
-TEST_F(CompareTest, JsonHasEveryDifference) {
-    WriteFile(copy_ + "/file", Ascii("data"));
-    Change(
-        "sh\xFF"
-        "ape",
-        Ascii("x"));
-    const ToolResult all =
-        volumes_.Convert(source_, copy_, "appledouble", {"--json", "-r", "--compare-only"});
-    EXPECT_EQ(2, all.status);
-    const nlohmann::json json = all.json();
-    EXPECT_EQ(0, json["converted"]);
-    EXPECT_EQ(5, json["compared"]);
-    EXPECT_EQ(0, json["failed"]);
-    EXPECT_EQ(false, json["interrupted"]);
-    ASSERT_EQ(2U, json["differences"].size());
-    EXPECT_EQ(source_ + "/file", json["differences"][0]["path"]);
-    EXPECT_EQ("data", json["differences"][0]["aspect"]);
-    EXPECT_EQ("different", json["differences"][0]["what"]);
-    EXPECT_EQ(0, json["differences"][0]["offset"]);
-    EXPECT_FALSE(json["differences"][0].contains("because"));
-    EXPECT_EQ("attribute", json["differences"][1]["aspect"]);
-    EXPECT_EQ("extra", json["differences"][1]["what"]);
-    EXPECT_EQ("7368ff617065", json["differences"][1]["nameHex"]);
 }
 
 // ---- What copies lose, and what only looks like it ----------------------------------------------
@@ -561,8 +321,10 @@ TEST_F(ConvertTest, FilesThatKeepAttributesOfTheirOwnGetNoExtraOnes) {
     ASSERT_EQ(0, setxattr((source + "/file").c_str(), "user.own", "x", 1, 0));
     EXPECT_THAT(volumes_.Convert(source, there(), "7"), Succeeded());
     ASSERT_EQ(0, setxattr((there() + "/file").c_str(), "user.own", "y", 1, 0));
-    EXPECT_EQ(source + "/file: \"user.own\": extra\n2 compared, 1 difference, 0 failed\n",
-              volumes_.Convert(source, there(), "7", {"-r", "--compare-only"}).out);
+    volumes_.Declare("there", 7);
+    EXPECT_EQ("Files " + source + "/file and " + there() +
+                  "/file differ: \"user.own\" only in the second\n",
+              volumes_.Run({"diff", "-r", source, there()}).out);
 }
 
 TEST_F(ConvertTest, AVolumeThatIsOnlyCopiedToIsComparedByItsEaDirectory) {
@@ -572,8 +334,10 @@ TEST_F(ConvertTest, AVolumeThatIsOnlyCopiedToIsComparedByItsEaDirectory) {
     EXPECT_THAT(volumes_.Convert(source, there(), "12"), Succeeded());
     EXPECT_TRUE(Exists(there() + "/@eaDir/file@MavoEAStream"));
     ASSERT_EQ(0, unlink((there() + "/@eaDir/file@MavoEAStream").c_str()));
-    EXPECT_EQ(source + "/file: \"colour\": missing\n2 compared, 1 difference, 0 failed\n",
-              volumes_.Convert(source, there(), "12", {"-r", "--compare-only"}).out);
+    volumes_.Declare("there", 12);
+    EXPECT_EQ(
+        "Files " + source + "/file and " + there() + "/file differ: \"colour\" only in the first\n",
+        volumes_.Run({"diff", "-r", source, there()}).out);
 }
 
 TEST_F(ConvertTest, WhatTheFileSystemDoesNotTakeIsAFailureAndADifference) {

@@ -184,9 +184,10 @@ TEST_P(ExportTest, WhatTheFormatHoldsComesBackAsItWas) {
         ASSERT_EQ(0, unlink(back.file().c_str()));
         EXPECT_THAT(share_.Export(format), Succeeded());
         EXPECT_THAT(back.Run({"import", share_.archive(), back.path()}), Succeeded());
-        EXPECT_EQ(0, RunTool({"--volume", share_.path() + '=' + share_.type(), "convert", "--to",
-                              back.type(), "--compare-only", share_.file(), back.file()})
-                         .status);
+        EXPECT_THAT(RunTool({"--volume", share_.path() + '=' + share_.type(), "--volume",
+                             back.path() + '=' + back.type(), "diff", "--data", share_.file(),
+                             back.file()}),
+                    Succeeded());
         EXPECT_EQ(kData, ReadFile(back.file()));
     }
 }
@@ -202,9 +203,10 @@ TEST_P(ExportTest, AppleSingleAndMacBinaryKeepCommentAndLock) {
         EXPECT_THAT(share_.Export(format), Succeeded());
         EXPECT_THAT(back.Run({"import", share_.archive(), back.path()}), Succeeded());
         EXPECT_EQ("1", back.Run({"get", back.file(), kLocked}).out);
-        EXPECT_EQ(0, RunTool({"--volume", share_.path() + '=' + share_.type(), "convert", "--to",
-                              back.type(), "--compare-only", share_.file(), back.file()})
-                         .status);
+        EXPECT_THAT(RunTool({"--volume", share_.path() + '=' + share_.type(), "--volume",
+                             back.path() + '=' + back.type(), "diff", "--data", share_.file(),
+                             back.file()}),
+                    Succeeded());
     }
 }
 

@@ -32,6 +32,7 @@ constexpr const char* kExamples = R"(Examples:
   mavoea repair -r /srv/share
   mavoea clean -r /srv/share
   mavoea convert -r --to appledouble /srv/share /mnt/share
+  mavoea diff -r /srv/share /mnt/share
   mavoea dump @eaDir/letter.txt@MavoEAStream
   mavoea dump --record letter.txt
 
@@ -199,11 +200,27 @@ constexpr Syntax kCommands[] = {
              ->type_name("TYPE")
              ->required();
          AddAllowLoss(sub, options);
-         sub->add_flag("--compare-only", options->compare_only, "Copy nothing, only compare");
          AddSource(sub, options);
          sub->add_option("DST", options->destination,
                          "The copy's own path, not that of the directory around it")
              ->required();
+     }},
+    {Command::kDiff, "diff", "Compare the metadata of two objects or trees on volumes of any kinds",
+     [](CLI::App* sub, Options* options) {
+         AddRecursive(sub, options);
+         sub->add_flag("--data", options->data, "What is in the files, too");
+         CLI::Option* const brief =
+             sub->add_flag("-q,--brief", options->brief, "Only which objects differ");
+         sub->add_flag("-i,--itemize-changes", options->itemized,
+                       "A line as rsync's for what would make the second like the first: > data, c "
+                       "target, . neither; kind; data, attributes, Finder info, resource fork, "
+                       "entries such as comments and dates, marks, what services keep")
+             ->excludes(brief);
+         sub->add_option_function<std::string>(
+                "A", [=](const std::string& path) { options->paths = {path}; }, "The first")
+             ->required();
+         sub->add_option("B", options->destination, "The second")->required();
+         sub->footer("Exit status: 0 equal; 1 different; 2 something could not be compared.");
      }},
     {Command::kDump, "dump", "Show and check every field of an EA stream or AppleDouble file",
      [](CLI::App* sub, Options* options) {

@@ -29,6 +29,7 @@ enum class Command {
     kRepair,
     kClean,
     kConvert,
+    kDiff,
     kDump
 };
 
@@ -49,10 +50,12 @@ struct Options {
     int wait = 2;                      // clean: seconds between its two looks
     bool all = false;                  // clean: things of other services, too
     std::string to;                    // convert: the destination's volume type
-    std::string destination;           // convert, carry
-    bool compare_only = false;         // convert
+    std::string destination;           // convert, carry; diff: the second
     bool verbose = false;              // carry
     bool allow_loss = false;           // convert
+    bool data = false;                 // diff
+    bool brief = false;                // diff
+    bool itemized = false;             // diff
     bool record = false;               // dump: the record of an object
     bool hex = false;                  // get, set
     std::optional<std::string> value;  // set: none of the two means standard input

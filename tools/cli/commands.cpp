@@ -20,6 +20,7 @@
 #include "tools/say/output.h"
 #include "tools/say/text.h"
 #include "tools/show/attributes.h"
+#include "tools/show/diff.h"
 #include "tools/show/dump.h"
 #include "tools/show/where.h"
 #include "tools/store/adoption.h"
@@ -256,8 +257,15 @@ ExitStatus Run(const Options& options) {
                             .destination = options.destination,
                             .type = options.to,
                             .recursive = options.recursive,
-                            .compare_only = options.compare_only,
                             .json = options.json});
+        case Command::kDiff:
+            return Diff({.first = options.paths.front(),
+                         .second = options.destination,
+                         .recursive = options.recursive,
+                         .data = options.data,
+                         .brief = options.brief,
+                         .itemized = options.itemized,
+                         .json = options.json});
         case Command::kDump:
             break;
     }

@@ -3,43 +3,36 @@
 #include <sys/stat.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <cstdint>
 #include <filesystem>
 #include <iostream>
-#include <set>
 #include <vector>
 
 #include "tools/place/volume.h"
 #include "tools/say/interrupt.h"
 #include "tools/say/output.h"
 #include "tools/say/progress.h"
-#include "tools/transfer/comparison.h"
 #include "tools/transfer/pending.h"
 #include "tools/transfer/transfer.h"
+#include "tools/transfer/tree_comparison.h"
 #include "tools/transfer/tree_copy.h"
 
 namespace mavoea::tool {
 namespace {
-
-struct Pair {
-    Place from;
-    Place to;
-};
 
 class Conversion final : private TreeCopy {
  public:
     Conversion(const ConvertOptions& options, Pair top)
         : options_(options),
           top_(std::move(top)),
-          progress_(options.compare_only ? "comparing" : "converting"),
+          progress_("converting"),
           transfer_({.watch = {.on_bytes = [this](std::uint64_t) { Show(in_hand_); },
                                .give_up = InterruptedAgain},
                      .on_note = [this](const std::string& note) { notes_.push_back(note); }}) {}
 
     // What was not there before has been read back as it was written: it needs no second look.
     void CopyAndCompare() {
-        const bool is_new = !top_.to.Status();
+        const bool is_new = !top_.second.Status();
         Copy();
         if (is_new && failures_.empty()) {
             compared_ = converted_;
@@ -49,18 +42,29 @@ class Conversion final : private TreeCopy {
     }
 
     void Copy() {
-        CopyTree(top_.from, top_.to);
-        Try(top_.to.path(), [&] { transfer_.MakeDurable(); });
+        CopyTree(top_.first, top_.second);
+        Try(top_.second.path(), [&] { transfer_.MakeDurable(); });
     }
 
     void Compare() {
-        std::vector<Pair> pairs = {top_};
-        while (!pairs.empty() && Interrupted() == 0) {
-            const Pair pair = std::move(pairs.back());
-            pairs.pop_back();
-            Show(pair.from.path());
-            Try(pair.from.path(), [&] { CompareObject(pair, &pairs); });
-        }
+        CompareTrees(
+            top_, options_.recursive, Compared(),
+            {.on_pair = [this](const Pair& pair) { Show(pair.first.path()); },
+             .compared =
+                 [this](const Pair&, const std::vector<Difference>& differences) {
+                     for (const Difference& difference : differences) Add(difference);
+                     ++compared_;
+                 },
+             .alone =
+                 [this](const Pair& pair, Side side) {
+                     const bool missing = side == Side::kFirst;
+                     Add({.path = (missing ? pair.first : pair.second).path(),
+                          .what = missing ? Difference::What::kMissing : Difference::What::kExtra});
+                 },
+             .fails = [this](const Pair& pair,
+                             const Failure& failure) { AddFailure(pair.first.path(), failure); },
+             .stopped = [] { return Interrupted() != 0; },
+             .give_up = InterruptedAgain});
     }
 
     ExitStatus Summarize() {
@@ -68,8 +72,7 @@ class Conversion final : private TreeCopy {
         if (options_.json) {
             PrintJson();
         } else {
-            if (!options_.compare_only) std::cout << converted_ << " converted, ";
-            std::cout << compared_ << " compared, " << differences_
+            std::cout << converted_ << " converted, " << compared_ << " compared, " << differences_
                       << (differences_ == 1 ? " difference, " : " differences, ")
                       << failures_.size() << " failed\n";
         }
@@ -109,34 +112,6 @@ class Conversion final : private TreeCopy {
 
     void Fail(const Place& from, const Failure& failure) override {
         AddFailure(from.path(), failure);
-    }
-
-    void CompareObject(const Pair& pair, std::vector<Pair>* pairs) {
-        const auto info = pair.from.Status();
-        if (!info) throw SystemFailure(pair.from.path(), ENOENT);
-        const auto there = pair.to.Status();
-        if (!there) {
-            return Add({.path = pair.from.path(), .what = Difference::What::kMissing});
-        }
-        const ComparisonReceiver receiver = {
-            .differs = [this](const Difference& difference) { Add(difference); },
-            .fails = [&](const Failure& failure) { AddFailure(pair.from.path(), failure); },
-            .give_up = InterruptedAgain};
-        tool::Compare(ObjectAt(pair.from, &*info), ObjectAt(pair.to, &*there), receiver);
-        ++compared_;
-        if (!options_.recursive || !S_ISDIR(info->st_mode) || !S_ISDIR(there->st_mode)) return;
-        const DirectoryRef from = pair.from.directory->OpenIn(pair.from.name);
-        const DirectoryRef to = pair.to.directory->OpenIn(pair.to.name);
-        std::vector<Directory::Entry> entries = ObjectsIn(from);
-        std::set<std::string> known;
-        for (auto entry = entries.rbegin(); entry != entries.rend(); ++entry) {
-            pairs->push_back({{from, entry->name}, {to, entry->name}});
-            known.insert(entry->name);
-        }
-        for (const Directory::Entry& entry : ObjectsIn(to)) {
-            if (known.contains(entry.name)) continue;
-            Add({.path = to->PathOf(entry.name), .what = Difference::What::kExtra});
-        }
     }
 
     template <class Work>
@@ -230,17 +205,10 @@ ExitStatus Convert(const ConvertOptions& options) {
     const Object target = ObjectAt(destination, nullptr);
     if (source.keeping() == Keeping::kNone) throw NoStore(source);
     if (AsReadable(target).keeping() == Keeping::kNone) throw NoStore(target);
-    if (options.compare_only && !destination.Status()) {
-        throw SystemFailure(destination.path(), ENOENT);
-    }
 
     WatchForInterrupts();
     Conversion conversion(options, {source.place, destination});
-    if (options.compare_only) {
-        conversion.Compare();
-    } else {
-        conversion.CopyAndCompare();
-    }
+    conversion.CopyAndCompare();
     return conversion.Summarize();
 }
 

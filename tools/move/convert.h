@@ -13,7 +13,6 @@ struct ConvertOptions {
     std::string destination;  // of the copy itself; its parent is there
     std::string type;         // of the destination's volume, as --volume takes it
     bool recursive = false;
-    bool compare_only = false;
     bool json = false;
 };
 

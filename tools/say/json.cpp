@@ -56,4 +56,6 @@ void Json::Add(Json value) { value_->push_back(std::move(*value.value_)); }
 
 std::string Json::Text() const { return Dump(*value_, 2); }
 
+std::string Json::Line() const { return Dump(*value_, -1); }
+
 }  // namespace mavoea::tool

@@ -54,6 +54,8 @@ class Json {
 
     // Two blanks a level, without a line feed at the end; U+FFFD for what is no UTF-8.
     std::string Text() const;
+    // The same on one line.
+    std::string Line() const;
 
  private:
     Json(std::in_place_t, std::uint64_t number);

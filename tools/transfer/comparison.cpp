@@ -99,8 +99,12 @@ Values ValuesOf(const Metadata& metadata) {
 
 class Comparison {
  public:
-    Comparison(const Object& original, const Object& copy, const ComparisonReceiver& receiver)
-        : original_(AsReadable(original)), copy_(AsReadable(copy)), receiver_(receiver) {}
+    Comparison(const Object& original, const Object& copy, const Compared& compared,
+               const ComparisonReceiver& receiver)
+        : original_(AsReadable(original)),
+          copy_(AsReadable(copy)),
+          compared_(compared),
+          receiver_(receiver) {}
 
     void Run() {
         const struct stat info = StatusOf(original_.place);
@@ -108,7 +112,7 @@ class Comparison {
         if ((info.st_mode & S_IFMT) != (there.st_mode & S_IFMT)) {
             return receiver_.differs({.path = original_.path(), .aspect = Aspect::kType});
         }
-        if (S_ISREG(info.st_mode)) Try([&] { CompareData(); });
+        if (S_ISREG(info.st_mode) && compared_.data) Try([&] { CompareData(); });
         if (S_ISLNK(info.st_mode)) Try([&] { CompareTargets(); });
         if ((S_ISBLK(info.st_mode) || S_ISCHR(info.st_mode)) && info.st_rdev != there.st_rdev) {
             receiver_.differs({.path = original_.path(), .aspect = Aspect::kTarget});
@@ -138,7 +142,7 @@ class Comparison {
         for (std::uint64_t at = 0;; at += kPiece) {
             if (receiver_.give_up()) {
                 throw Failure(kFailed, original_.path(), "it was not compared to its end",
-                              "compare again with --compare-only");
+                              "compare again with: mavoea diff --data");
             }
             const Content piece(original->Read(at, kPiece));
             if (const auto offset = FirstDifference(piece, Content(copy->Read(at, kPiece)))) {
@@ -181,8 +185,7 @@ class Comparison {
         for (const Values* values : {&original, &copy}) {
             for (const auto& [key, value] : *values) keys.insert(key);
         }
-        const bool in_inode = original_.keeping() == Keeping::kXattr ||
-                              copy_.keeping() == Keeping::kXattr || copy_.dialect() != nullptr;
+        const bool in_inode = KeepsInInode(original_) || KeepsInInode(copy_);
         // What cannot be read has been told, and may hold what seems not to be there.
         const bool original_is_known = wanted.problems.empty();
         const bool copy_is_known = found.problems.empty();
@@ -193,11 +196,12 @@ class Comparison {
                 .path = original_.path(), .aspect = key.aspect, .name = key.name};
             if (there == copy.end()) {
                 if (!copy_is_known) continue;
+                if (!compared_.copied && in_inode && InodeHas(copy_, original_, *value)) continue;
                 difference.what = What::kMissing;
             } else if (value == original.end()) {
                 if (!original_is_known) continue;
                 // An attribute that the original has as every file may have some.
-                if (in_inode && InodeHas(key.name, there->second)) continue;
+                if (in_inode && InodeHas(original_, copy_, *there)) continue;
                 difference.what = What::kExtra;
             } else if (value->second.damaged() || there->second.damaged()) {
                 continue;  // told as what cannot be read
@@ -229,35 +233,55 @@ class Comparison {
         }
     }
 
-    bool InodeHas(const std::string& name, const Content& value) const {
-        const auto inode = Inode::Open(original_.place);
+    static bool KeepsInInode(const Object& object) {
+        return object.keeping() == Keeping::kXattr || object.dialect() != nullptr;
+    }
+
+    // Whether an object has itself what is metadata of the other one, under the name that it has
+    // there.
+    static bool InodeHas(const Object& object, const Object& other,
+                         const Values::value_type& item) {
+        if (item.first.aspect != Aspect::kAttribute) return false;
+        const auto inode = Inode::Open(object.place);
         if (!inode->HoldsContents()) return false;
+        const std::string& name = item.first.name;
         std::optional<Bytes> own = inode->Attribute(name);
-        if (const Dialect* const dialect = copy_.dialect()) {
+        if (const Dialect* const dialect = other.dialect()) {
             const auto spelling = SpellAttribute(name, *dialect);
             own = spelling ? spelling->Value(*inode) : std::nullopt;
         }
-        return own && *own == value.All();
+        return own && *own == item.second.All();
     }
 
     const Object original_;
     const Object copy_;
+    const Compared& compared_;
     const ComparisonReceiver& receiver_;
 };
 
 }  // namespace
 
+std::string ItemText(const Difference& difference) {
+    switch (difference.aspect) {
+        case Aspect::kObject:
+            return {};
+        case Aspect::kAttribute:
+            return '"' + Printable(difference.name) + '"';
+        case Aspect::kEntry:
+            return "AppleDouble " + difference.name;
+        case Aspect::kService:
+            return "of another service, \"" + Printable(difference.name) + '"';
+        case Aspect::kType:
+        case Aspect::kData:
+        case Aspect::kTarget:
+            break;
+    }
+    return WordOf(difference.aspect);
+}
+
 std::string DifferenceText(const Difference& difference) {
     std::string text = Printable(difference.path) + ": ";
-    if (difference.aspect == Aspect::kAttribute) {
-        text += '"' + Printable(difference.name) + "\": ";
-    } else if (difference.aspect == Aspect::kEntry) {
-        text += "AppleDouble " + difference.name + ": ";
-    } else if (difference.aspect == Aspect::kService) {
-        text += "of another service, \"" + Printable(difference.name) + "\": ";
-    } else if (difference.aspect != Aspect::kObject) {
-        text += std::string(WordOf(difference.aspect)) + ": ";
-    }
+    if (const std::string item = ItemText(difference); !item.empty()) text += item + ": ";
     text += WordOf(difference.what);
     if (difference.offset) text += " at byte " + std::to_string(*difference.offset);
     return text;
@@ -265,7 +289,7 @@ std::string DifferenceText(const Difference& difference) {
 
 Json DifferenceJson(const Difference& difference) {
     Json json;
-    json.SetText("path", difference.path);
+    if (!difference.path.empty()) json.SetText("path", difference.path);
     json.Set("aspect", WordOf(difference.aspect));
     if (!difference.name.empty()) json.SetText("name", difference.name);
     json.Set("what", WordOf(difference.what));
@@ -273,8 +297,9 @@ Json DifferenceJson(const Difference& difference) {
     return json;
 }
 
-void Compare(const Object& original, const Object& copy, const ComparisonReceiver& receiver) {
-    Comparison(original, copy, receiver).Run();
+void Compare(const Object& first, const Object& second, const Compared& compared,
+             const ComparisonReceiver& receiver) {
+    Comparison(first, second, compared, receiver).Run();
 }
 
 }  // namespace mavoea::tool

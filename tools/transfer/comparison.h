@@ -1,4 +1,4 @@
-// An object and its copy on another volume: whether they say the same, through the library's eyes.
+// Two objects, on volumes of any kinds: whether they say the same, wherever they keep it.
 #ifndef MAVOEA_TOOLS_TRANSFER_COMPARISON_H_
 #define MAVOEA_TOOLS_TRANSFER_COMPARISON_H_
 
@@ -26,16 +26,25 @@ struct Difference {
     };
     enum class What { kMissing, kExtra, kDifferent };
 
-    std::string path;  // of the original; of the copy where that alone is there
+    std::string path = {};  // of the first; of the second where that alone is there
     Aspect aspect = Aspect::kObject;
     What what = What::kDifferent;
     std::string name = {};                     // of the attribute or entry
     std::optional<std::uint64_t> offset = {};  // of the first byte that differs, from 0
 };
 
-// On one line, for people: "PATH: "NAME": different at byte 5".
+// For people: ""NAME"", "AppleDouble comment", "data"; empty for the object itself.
+std::string ItemText(const Difference& difference);
+// On one line: "PATH: "NAME": different at byte 5".
 std::string DifferenceText(const Difference& difference);
 Json DifferenceJson(const Difference& difference);
+
+struct Compared {
+    bool data = true;
+    // The second is a copy of the first, which may have attributes that every file may have and
+    // that are metadata only where the copy is. Otherwise neither comes before the other.
+    bool copied = true;
+};
 
 struct ComparisonReceiver {
     std::function<void(Difference)> differs;
@@ -45,7 +54,8 @@ struct ComparisonReceiver {
 
 // Compares two objects that are there, one aspect after the other, and goes on where one of them
 // cannot be read.
-void Compare(const Object& original, const Object& copy, const ComparisonReceiver& receiver);
+void Compare(const Object& first, const Object& second, const Compared& compared,
+             const ComparisonReceiver& receiver);
 
 }  // namespace mavoea::tool
 
