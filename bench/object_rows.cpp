@@ -59,11 +59,14 @@ class Objects {
 
 // ---- The archive mark ---------------------------------------------------------------------------
 
-// Sets it as a host keeps it, unless it is set.
+// Sets it as a host keeps it, unless it is set. Of a file that has no DOS attributes, in which it
+// would be as well.
 void MarkByHand(const std::string& path) {
     constexpr char kName[] = "user.mavo.attributes";
     constexpr unsigned char kArchive[] = {0, 0, 0, 1};
     unsigned char word[sizeof kArchive] = {};
+    unsigned char dos[256];
+    Require(getxattr(path.c_str(), "user.DOSATTRIB", dos, sizeof dos) < 0, "a file of Samba's");
     if (getxattr(path.c_str(), kName, word, sizeof word) == sizeof word &&
         std::equal(std::begin(word), std::end(word), std::begin(kArchive))) {
         return;

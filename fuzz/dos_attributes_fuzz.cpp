@@ -5,8 +5,8 @@
 #include <cstdint>
 #include <vector>
 
-#include "format/dos_attributes.h"
 #include "fuzz/support/platform.h"
+#include "platform/dos_attributes.h"
 
 using namespace mavoea;
 using mavoea::fuzz::Fail;

@@ -1,5 +1,5 @@
-// The marks on a kernel that does not know the platform's calls: an extended attribute of the file,
-// which libmavocore's MLIBCFileStat() shows in the attribute word.
+// The marks on a kernel that does not know the platform's calls: extended attributes of the file
+// (attribute_word.h), which libmavocore's MLIBCFileStat() shows in the attribute word.
 
 #include <errno.h>
 #include <fcntl.h>
@@ -7,9 +7,12 @@
 #include <unistd.h>
 
 #include <atomic>
+#include <cstdint>
+#include <span>
 
 #include "platform/attribute_word.h"
 #include "platform/descriptors.h"
+#include "platform/dos_attributes.h"
 #include "platform/include/mavocore.h"
 #include "platform/marks.h"
 
@@ -21,28 +24,52 @@ struct Change {
     unsigned clear = 0;
 };
 
-// Changes the word that `get` reads and `set` stores. A file without a word has none of the bits,
-// and gets no word to say so.
+// Changes what DOS attributes say, where there are any that are understood, in place: they keep all
+// else that is in them. `get` and `set` take an attribute's name first.
+template <class Get, class Set>
+int ChangeDosAttributes(Change change, Get get, Set set) {
+    unsigned char bytes[kDosAttributesMax];
+    const ssize_t size = get(kDosAttributesName, bytes, sizeof bytes);
+    if (size < 0) return attribute_word::MeansNone(errno) ? 0 : -1;
+    const std::span value(bytes, static_cast<std::size_t>(size));
+    auto dos = DecodeDosAttributes(value);
+    if (!dos) return 0;
+    const std::uint32_t changed = (dos->attributes | attribute_word::ToDos(change.set)) &
+                                  ~attribute_word::ToDos(change.clear);
+    if (changed == dos->attributes) return 0;
+    if (SetDosAttributes(value, changed)) {
+        return set(kDosAttributesName, value.data(), value.size());
+    }
+    // A text, which Samba replaces as well.
+    dos->attributes = changed;
+    const auto encoded = EncodeDosAttributes(*dos);
+    return set(kDosAttributesName, encoded.data(), encoded.size());
+}
+
+// Changes the word, and what of it is shared. A file without a word has none of the bits, and gets
+// no word to say so.
 template <class Get, class Set>
 int ChangeWord(Change change, Get get, Set set) {
     unsigned char bytes[attribute_word::kSize];
-    const ssize_t size = get(bytes, sizeof bytes);
-    if (size < 0 && errno != ENODATA && errno != ERANGE) return -1;
+    const ssize_t size = get(attribute_word::kName, bytes, sizeof bytes);
+    if (size < 0 && !attribute_word::MeansNone(errno)) return -1;
+    const bool shared = ((change.set | change.clear) & attribute_word::kSharedBits) != 0;
+    if (shared && ChangeDosAttributes(change, get, set) != 0) return -1;
     const unsigned word = attribute_word::Decode(bytes, size);
     const unsigned changed = (word | change.set) & ~change.clear;
     if (changed == word) return 0;
     attribute_word::Encode(changed, bytes);
-    return set(bytes, sizeof bytes);
+    return set(attribute_word::kName, bytes, sizeof bytes);
 }
 
 int ChangeWordAt(const char* path, Change change) {
     return ChangeWord(
         change,
-        [path](void* bytes, size_t size) {
-            return ::getxattr(path, attribute_word::kName, bytes, size);
+        [path](const char* name, void* bytes, size_t size) {
+            return ::getxattr(path, name, bytes, size);
         },
-        [path](const void* bytes, size_t size) {
-            return ::setxattr(path, attribute_word::kName, bytes, size, 0);
+        [path](const char* name, const void* bytes, size_t size) {
+            return ::setxattr(path, name, bytes, size, 0);
         });
 }
 
@@ -82,11 +109,11 @@ int SetArchiveBit(int fd) {
     }
     return ChangeWord(
         {.set = MLIBC_ATTRIBUTE_ARCHIVE},
-        [fd](void* bytes, size_t size) {
-            return ::fgetxattr(fd, attribute_word::kName, bytes, size);
+        [fd](const char* name, void* bytes, size_t size) {
+            return ::fgetxattr(fd, name, bytes, size);
         },
-        [fd](const void* bytes, size_t size) {
-            return ::fsetxattr(fd, attribute_word::kName, bytes, size, 0);
+        [fd](const char* name, const void* bytes, size_t size) {
+            return ::fsetxattr(fd, name, bytes, size, 0);
         });
 }
 

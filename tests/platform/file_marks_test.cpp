@@ -23,6 +23,7 @@ namespace {
 using marks::FileCommand;
 
 constexpr char kAttribute[] = "user.mavo.attributes";
+constexpr char kDosAttribute[] = "user.DOSATTRIB";
 
 // The commands, by the numbers that the platform's kernel knows.
 constexpr int kHide = 0x203;
@@ -30,6 +31,7 @@ constexpr int kShow = 0x206;
 constexpr int kUnlock = 521;
 constexpr int kLock = 522;
 
+constexpr std::uint32_t kArchive = 0x1;
 constexpr std::uint32_t kHidden = 0x4;
 constexpr std::uint32_t kLocked = 0x20;
 
@@ -58,14 +60,21 @@ class FileMarksTest : public ::testing::Test {
     void Store(const Bytes& bytes) const {
         ASSERT_EQ(0, setxattr(path_.c_str(), kAttribute, bytes.data(), bytes.size(), 0));
     }
-    static Bytes StoredIn(const std::string& path) {
-        Bytes bytes(64);
-        const ssize_t size = getxattr(path.c_str(), kAttribute, bytes.data(), bytes.size());
+    static Bytes StoredIn(const std::string& path, const char* attribute = kAttribute) {
+        Bytes bytes(1024);
+        const ssize_t size = getxattr(path.c_str(), attribute, bytes.data(), bytes.size());
         if (size < 0) return Ascii(errno == ENODATA ? "(none)" : "(not read)");
         bytes.resize(static_cast<std::size_t>(size));
         return bytes;
     }
     Bytes Stored() const { return StoredIn(path_); }
+
+    void StoreDos(const Bytes& bytes) const {
+        ASSERT_EQ(0, setxattr(path_.c_str(), kDosAttribute, bytes.data(), bytes.size(), 0));
+    }
+    Bytes StoredDos() const { return StoredIn(path_, kDosAttribute); }
+
+    int Archive() const { return marks::SetArchiveBit(path_.c_str()); }
 
     const TempDir dir_;
     const std::string path_ = dir_ / "a";
@@ -219,6 +228,129 @@ TEST_F(FileMarksTest, WhoMayNotReadAFileDoesNotSetItsArchiveBit) {
         }
     });
     EXPECT_EQ(Ascii("(none)"), Stored());
+}
+
+// ---- Files of Samba's shares --------------------------------------------------------------------
+
+// DOS attributes of each version, with read-only and system, and what else is kept in place.
+struct DosVersion {
+    const char* before;
+    std::size_t attributes_at;
+};
+constexpr DosVersion kDosVersions[] = {
+    {"'0x05' 00 00 01 00 01 00 00 00 05 00 00 00 44 33 22 11 08 07 06 05 04 03 02 01 "
+     "18 17 16 15 14 13 12 11 28 DA 02 22 13 79 DD 01 28 27 26 25 24 23 22 21",
+     12},
+    {"'0x05' 00 00 02 00 02 00 00 00 BB AA 00 00 05 00 00 00 44 33 22 11 "
+     "08 07 06 05 04 03 02 01 18 17 16 15 14 13 12 11 28 DA 02 22 13 79 DD 01 "
+     "28 27 26 25 24 23 22 21 48 47 46 45 44 43 42 41 'n' 00",
+     16},
+    {"'0x05' 00 00 03 00 03 00 00 00 11 00 00 00 05 00 00 00 44 33 22 11 "
+     "08 07 06 05 04 03 02 01 18 17 16 15 14 13 12 11 28 DA 02 22 13 79 DD 01 "
+     "28 27 26 25 24 23 22 21",
+     16},
+    {"00 00 04 00 04 00 00 00 11 00 00 00 05 00 00 00 08 07 06 05 04 03 02 01 "
+     "28 DA 02 22 13 79 DD 01",
+     12},
+    {"00 00 05 00 05 00 00 00 11 00 00 00 05 00 00 00 28 DA 02 22 13 79 DD 01", 12},
+};
+
+// Promise: "Attribute word: Where an object"
+TEST_F(FileMarksTest, DosAttributesAreChangedInPlaceAndSayWhatIsHiddenAndToBeArchived) {
+    for (const DosVersion& version : kDosVersions) {
+        SCOPED_TRACE(version.before);
+        (void)removexattr(path_.c_str(), kAttribute);
+        Bytes dos = Hex(version.before);
+        StoreDos(dos);
+        EXPECT_EQ(0u, Word());
+        EXPECT_EQ(0, Command(kHide));
+        dos[version.attributes_at] = 0x07;
+        EXPECT_EQ(dos, StoredDos());
+        EXPECT_EQ(Hex("00 00 00 04"), Stored());
+        EXPECT_EQ(0, Archive());
+        dos[version.attributes_at] = 0x27;
+        EXPECT_EQ(dos, StoredDos());
+        EXPECT_EQ(kHidden | kArchive, Word());
+        EXPECT_EQ(0, Command(kLock));
+        EXPECT_EQ(dos, StoredDos());
+        EXPECT_EQ(kHidden | kArchive | kLocked, Word());
+        EXPECT_EQ(0, Command(kShow));
+        dos[version.attributes_at] = 0x25;
+        EXPECT_EQ(dos, StoredDos());
+        EXPECT_EQ(kArchive | kLocked, Word());
+        EXPECT_EQ(Hex("00 00 00 21"), Stored());
+    }
+}
+
+TEST_F(FileMarksTest, WhatAClientHasChangedCountsAndNotTheWordOfBefore) {
+    Store(Hex("80 00 00 05"));
+    StoreDos(Hex("00 00 05 00 05 00 00 00 11 00 00 00 01 00 00 00 28 DA 02 22 13 79 DD 01"));
+    EXPECT_EQ(0x80000000u, Word());
+    EXPECT_EQ(0, Command(kShow));
+    EXPECT_EQ(Hex("80 00 00 01"), Stored());
+    StoreDos(Hex("00 00 05 00 05 00 00 00 11 00 00 00 22 00 00 00 28 DA 02 22 13 79 DD 01"));
+    EXPECT_EQ(0x80000005u, Word());
+    EXPECT_EQ(0, Archive());
+    EXPECT_EQ(Hex("80 00 00 01"), Stored());
+}
+
+TEST_F(FileMarksTest, AttributesAsATextBecomeOnesOfTheCurrentVersion) {
+    StoreDos(Ascii("0x2"));
+    EXPECT_EQ(kHidden, Word());
+    EXPECT_EQ(0, Command(kHide));
+    EXPECT_EQ(Ascii("0x2"), StoredDos());
+    EXPECT_EQ(0, Archive());
+    EXPECT_EQ(Hex("00 00 05 00 05 00 00 00 01 00 00 00 22 00 00 00 00 00 00 00 00 00 00 00"),
+              StoredDos());
+}
+
+TEST_F(FileMarksTest, NobodyGetsDosAttributes) {
+    for (const int command : {kHide, kLock, kShow, kUnlock}) EXPECT_EQ(0, Command(command));
+    EXPECT_EQ(0, Archive());
+    EXPECT_EQ(Ascii("(none)"), StoredDos());
+}
+
+// Samba reads 256 bytes at most.
+TEST_F(FileMarksTest, DosAttributesThatAreNotUnderstoodCountAsNoneAndStay) {
+    const Bytes whole =
+        Hex("00 00 05 00 05 00 00 00 11 00 00 00 02 00 00 00 28 DA 02 22 13 79 DD 01");
+    Bytes longest = whole;
+    longest.resize(256);
+    StoreDos(longest);
+    EXPECT_EQ(kHidden, Word());
+    Bytes longer = whole;
+    longer.resize(257);
+    std::vector<Bytes> values = {longer, Bytes(256, 0xFF), Bytes(1000, '2'), Ascii("x2")};
+    for (std::size_t size = 0; size < whole.size(); ++size) {
+        values.emplace_back(whole.begin(), whole.begin() + static_cast<std::ptrdiff_t>(size));
+    }
+    for (const Bytes& value : values) {
+        SCOPED_TRACE(value.size());
+        StoreDos(value);
+        (void)removexattr(path_.c_str(), kAttribute);
+        EXPECT_EQ(0u, Word());
+        EXPECT_EQ(0, Command(kHide));
+        EXPECT_EQ(0, Archive());
+        EXPECT_EQ(kHidden | kArchive, Word());
+        EXPECT_EQ(value, StoredDos());
+    }
+}
+
+TEST_F(FileMarksTest, NoByteOfDosAttributesIsToBeFeared) {
+    for (const DosVersion& version : kDosVersions) {
+        const Bytes whole = Hex(version.before);
+        for (std::size_t at = 0; at < whole.size(); ++at) {
+            for (unsigned byte = 0; byte < 256; ++byte) {
+                Bytes value = whole;
+                value[at] = static_cast<std::uint8_t>(byte);
+                StoreDos(value);
+                ASSERT_EQ(0, Command(kHide)) << at << ": " << byte;
+                ASSERT_EQ(kHidden, Word() & kHidden) << at << ": " << byte;
+                ASSERT_EQ(0, Command(kShow)) << at << ": " << byte;
+                ASSERT_EQ(0u, Word() & kHidden) << at << ": " << byte;
+            }
+        }
+    }
 }
 
 TEST_F(FileMarksTest, AnUnknownCommandIsRefusedAndChangesNothing) {

@@ -452,6 +452,26 @@ class CommandTest(ToolTest):
             with Mac(server, share) as there:
                 self.assertEqual(before, self.client_s(copy, there))
 
+    @on_each_share
+    def test_clients_and_the_library_agree_on_what_is_hidden_and_to_be_archived(self):
+        """On a volume of the library's own, which is a share."""
+        volume = f"--volume={self.folder}=eadir"
+        word = "user.mavo.attributes"
+        for make in (self.make, self.make_directory):
+            make()
+            for marks, copied in ((HIDDEN, 5), (READ_ONLY, 1), (HIDDEN | ARCHIVE, 5)):
+                self.mac.set_attributes(self.name, marks)
+                copy = f"{self.path}-{marks}"
+                self.tool(volume, "cp", "-r", self.path, copy)
+                self.assertEqual(copied, os.getxattr(copy, word)[3], marks)
+                seen = self.mac.attributes(os.path.basename(copy))
+                self.assertEqual(marks & MARKS, seen & MARKS)
+            self.mac.set_attributes(self.name, HIDDEN)
+            self.put(word, bytes(4))
+            self.tool(volume, "mv", self.path, f"{self.path}-moved")
+            seen = self.mac.attributes(f"{self.name}-moved")
+            self.assertEqual(HIDDEN | ARCHIVE, seen & MARKS)
+
     @on_each_object(MARKS)
     def test_what_is_removed_is_gone(self, _):
         self.tool("rm", "-r", self.path)

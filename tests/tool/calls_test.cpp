@@ -77,8 +77,8 @@ class CallsTest : public ::testing::TestWithParam<Work> {
 
 INSTANTIATE_TEST_SUITE_P(
     All, CallsTest,
-    ::testing::Values(Work{"Copy", kAppleDouble, {"cp", "-r"}, true, 32},
-                      Work{"Copy", kEaDirectory, {"cp", "-r"}, true, 33},
+    ::testing::Values(Work{"Copy", kAppleDouble, {"cp", "-r"}, true, 33},
+                      Work{"Copy", kEaDirectory, {"cp", "-r"}, true, 34},
                       Work{"List", kAppleDouble, {"list", "-r"}, false, 10},
                       Work{"List", kEaDirectory, {"list", "-r"}, false, 9},
                       Work{"Remove", kAppleDouble, {"rm", "-r"}, false, 16},

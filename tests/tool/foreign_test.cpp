@@ -16,6 +16,8 @@
 namespace mavoea::test {
 namespace {
 
+namespace fs = std::filesystem;
+
 using ::testing::AllOf;
 using ::testing::HasSubstr;
 using ::testing::Not;
@@ -502,6 +504,29 @@ TEST_F(ForeignTest, TheLockIsWhatClientsHonour) {
 }
 
 // ---- Not treading on them -----------------------------------------------------------------------
+
+TEST_F(ForeignTest, WhatClientsHaveHiddenIsHiddenOnVolumesOfTheLibrarysOwnToo) {
+    const std::string word = "user.mavo.attributes";
+    const Share from{"eadir"};
+    const Share to{"eadir"};
+    struct Case {
+        std::uint8_t word, dos, copied_word;
+    };
+    // The word is what was so before a client changed the other. What is copied is to be archived.
+    for (const Case& one : {Case{0x00, 0x02, 0x05}, Case{0x04, 0x20, 0x01}, Case{0x05, 0x02, 0x05},
+                            Case{0x01, 0x00, 0x01}}) {
+        SCOPED_TRACE(int{one.word});
+        SetAttribute(from.file(), word, {0, 0, 0, one.word});
+        SetAttribute(from.file(), kDosAttributes, Dos(one.dos));
+        fs::remove(to.file());
+        EXPECT_THAT(from.Run({"--volume", to.path() + "=eadir", "cp", from.file(), to.file()}),
+                    Succeeded());
+        EXPECT_EQ((Bytes{0, 0, 0, one.copied_word}), Attribute(to.file(), word));
+        EXPECT_EQ(Dos(one.dos), Attribute(to.file(), kDosAttributes));
+    }
+    EXPECT_THAT(from.Run({"mv", from.file(), from.file() + "-moved"}), Succeeded());
+    EXPECT_EQ(Dos(0x20), Attribute(from.file() + "-moved", kDosAttributes));
+}
 
 TEST_F(ForeignTest, NothingIsWrittenBesideAnotherProgramsMetadataUnlessItsTypeIsDeclared) {
     ASSERT_THAT(samba_.Set(kColour, Ascii("red")), Succeeded());

@@ -1,7 +1,7 @@
 // The bytes of Samba's DOS attributes. Those of versions 1 to 5 are what its own library packs, and
 // what its smbd made of every case is what is expected here.
 
-#include "format/dos_attributes.h"
+#include "platform/dos_attributes.h"
 
 #include <gmock/gmock.h>
 

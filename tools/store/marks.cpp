@@ -6,11 +6,11 @@
 #include <vector>
 
 #include "adouble/ea_copy_lock.h"
-#include "format/dos_attributes.h"
 #include "format/flush_time.h"
 #include "format/netatalk_record.h"
 #include "include/mavoea.h"
 #include "platform/attribute_word.h"
+#include "platform/dos_attributes.h"
 #include "platform/file_status.h"
 #include "platform/kernel.h"
 #include "platform/marks.h"
@@ -38,15 +38,18 @@ std::optional<mode_t> FormerBits(const Inode& inode) {
     return bits & kWriteBits;
 }
 
-// `listed`: whether the object has the attribute in which hosts keep it.
-std::uint32_t AttributeWordOf(const Inode& inode, bool listed) {
+// `listed`: whether the object has the attribute in which hosts keep it; `dos`: its DOS attributes.
+std::uint32_t AttributeWordOf(const Inode& inode, bool listed,
+                              const std::optional<DosAttributes>& dos) {
 #if MAVOEA_HOST_PLATFORM
-    if (!listed) return 0;
-    // As the host's own function finds it, which takes a path.
-    const auto word = inode.Attribute(attribute_word::kName);
-    return word ? attribute_word::Decode(word->data(), static_cast<ssize_t>(word->size())) : 0;
+    // As the host's own function finds it, which takes a path and looks whether there are any.
+    const auto bytes = listed ? inode.Attribute(attribute_word::kName) : std::nullopt;
+    const std::uint32_t word =
+        bytes ? attribute_word::Decode(bytes->data(), static_cast<ssize_t>(bytes->size())) : 0;
+    return dos ? attribute_word::WithDos(word, dos->attributes) : word;
 #else
     (void)listed;
+    (void)dos;
     FileStatus status;
     if (!ReadFileStatus(inode.ProcPath().c_str(), &status)) {
         throw SystemFailure(inode.path(), errno);
@@ -66,14 +69,15 @@ void ReadMarks(const Object& object, const Inode& inode, const std::vector<std::
     const auto has = [&](const char* name) {
         return std::find(names.begin(), names.end(), name) != names.end();
     };
-    const bool has_dos =
-        has(kDosAttributesName) &&
-        ReadDosAttributes(inode, by_dos ? LockedBy::kDosAttributes : LockedBy::kOthers, metadata);
+    const auto dos = has(kDosAttributesName) ? DosAttributesOf(inode) : std::nullopt;
+    if (dos) {
+        TakeDosAttributes(*dos, by_dos ? LockedBy::kDosAttributes : LockedBy::kOthers, metadata);
+    }
     if (dialect != nullptr) TakeMarksFromWord(metadata);
     if (dialect != nullptr && dialect->marks != Dialect::Marks::kHost) return;
-    const std::uint32_t word = AttributeWordOf(inode, has(attribute_word::kName));
+    const std::uint32_t word = AttributeWordOf(inode, has(attribute_word::kName), dos);
     metadata->hidden = metadata->hidden || (word & MLIBC_ATTRIBUTE_HIDDEN) != 0;
-    if (!has_dos) metadata->archived = (word & MLIBC_ATTRIBUTE_ARCHIVE) != 0;
+    metadata->archived = (word & MLIBC_ATTRIBUTE_ARCHIVE) != 0;
     const bool locked = LocksByMode(object)
                             ? (inode.Status().st_mode & kWriteBits) == 0
                             : (word & MLIBC_ATTRIBUTE_LOCKED) != 0 || LockedByRecord(*metadata);

@@ -145,16 +145,19 @@ bool Contains(const std::vector<std::string>& paths, const std::string& path) {
 void WriteMarks(const Object& to, const Inode& inode, const Metadata& metadata, bool is_new) {
     if (!inode.HoldsContents()) return;
     const Dialect* const dialect = to.dialect();
+    if (dialect == nullptr || dialect->marks == Dialect::Marks::kHost) {
+        if (!LocksByMode(to) && (metadata.locked || !is_new)) SetLockFlag(inode, metadata.locked);
+        if (metadata.hidden) SetHidden(inode, true);
+        SetArchived(inode);
+    }
     try {
+        // Behind all that sets the archive mark: what travels with a time of creation says itself
+        // whether it has that.
         const bool by_dos = dialect != nullptr && dialect->marks == Dialect::Marks::kDosAttributes;
         WriteDosAttributes(inode, by_dos ? Into::kAny : Into::kNeeded, metadata);
     } catch (const Failure&) {
         // What is not there is found, and named, by who reads it back.
     }
-    if (dialect != nullptr && dialect->marks != Dialect::Marks::kHost) return;
-    if (!LocksByMode(to) && (metadata.locked || !is_new)) SetLockFlag(inode, metadata.locked);
-    if (metadata.hidden) SetHidden(inode, true);
-    SetArchived(inode);
 }
 
 // ---- What other services keep -------------------------------------------------------------------

@@ -9,8 +9,8 @@
 #include <exception>
 #include <set>
 
-#include "format/dos_attributes.h"
 #include "format/netatalk_record.h"
+#include "platform/dos_attributes.h"
 #include "tools/say/job.h"
 #include "tools/say/messages.h"
 #include "tools/say/text.h"

@@ -4,8 +4,8 @@
 #include <memory>
 
 #include "format/afp_info.h"
-#include "format/dos_attributes.h"
 #include "format/samba_stream.h"
+#include "platform/dos_attributes.h"
 #include "platform/include/mavocore.h"
 #include "tools/say/messages.h"
 #include "tools/say/text.h"

@@ -3,7 +3,6 @@
 #include <sys/stat.h>
 
 #include "format/apple_double.h"
-#include "format/dos_attributes.h"
 #include "tools/store/foreign/record.h"
 
 namespace mavoea::tool {
@@ -21,11 +20,6 @@ std::uint16_t AfpMarksOf(const Metadata& metadata) {
 std::uint32_t DosMarksOf(const Metadata& metadata) {
     return (metadata.locked ? kDosReadOnly : 0) | (metadata.hidden ? kDosHidden : 0) |
            (metadata.system ? kDosSystem : 0) | (metadata.archived ? kDosArchive : 0);
-}
-
-std::optional<DosAttributes> DosAttributesOf(const Inode& inode) {
-    const auto value = inode.Attribute(kDosAttributesName);
-    return value ? DecodeDosAttributes(*value) : std::nullopt;
 }
 
 // In place, where there are any.
@@ -78,17 +72,19 @@ std::optional<Bytes> WordWithMarks(const Metadata& metadata) {
     return bytes;
 }
 
-bool ReadDosAttributes(const Inode& inode, LockedBy locked_by, Metadata* metadata) {
-    const auto dos = DosAttributesOf(inode);
-    if (!dos) return false;
-    metadata->created = dos->creation_time;
-    metadata->system = metadata->system || (dos->attributes & kDosSystem) != 0;
-    metadata->hidden = metadata->hidden || (dos->attributes & kDosHidden) != 0;
-    metadata->archived = (dos->attributes & kDosArchive) != 0;
+std::optional<DosAttributes> DosAttributesOf(const Inode& inode) {
+    const auto value = inode.Attribute(kDosAttributesName);
+    return value ? DecodeDosAttributes(*value) : std::nullopt;
+}
+
+void TakeDosAttributes(const DosAttributes& dos, LockedBy locked_by, Metadata* metadata) {
+    metadata->created = dos.creation_time;
+    metadata->system = metadata->system || (dos.attributes & kDosSystem) != 0;
+    metadata->hidden = metadata->hidden || (dos.attributes & kDosHidden) != 0;
+    metadata->archived = (dos.attributes & kDosArchive) != 0;
     if (locked_by == LockedBy::kDosAttributes) {
-        metadata->locked = metadata->locked || (dos->attributes & kDosReadOnly) != 0;
+        metadata->locked = metadata->locked || (dos.attributes & kDosReadOnly) != 0;
     }
-    return true;
 }
 
 void WriteDosAttributes(const Inode& inode, Into into, const Metadata& metadata) {

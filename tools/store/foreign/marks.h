@@ -6,6 +6,7 @@
 #include <cstdint>
 #include <optional>
 
+#include "platform/dos_attributes.h"
 #include "tools/place/dialect.h"
 #include "tools/place/directory.h"
 #include "tools/store/metadata.h"
@@ -22,8 +23,9 @@ std::optional<Bytes> WordWithMarks(const Metadata& metadata);
 // wherever the object is.
 enum class LockedBy { kDosAttributes, kOthers };
 
-// False where the object has none that Samba understands.
-bool ReadDosAttributes(const Inode& inode, LockedBy locked_by, Metadata* metadata);
+// None where the object has none that Samba understands.
+std::optional<DosAttributes> DosAttributesOf(const Inode& inode);
+void TakeDosAttributes(const DosAttributes& dos, LockedBy locked_by, Metadata* metadata);
 
 // Puts marks and creation time into the DOS attributes; `into`: also where there are none, and
 // nothing is to be said that has no other place. Throws Failure.

@@ -7,8 +7,8 @@
 #include <cerrno>
 
 #include "format/afp_info.h"
-#include "format/dos_attributes.h"
 #include "format/samba_stream.h"
+#include "platform/dos_attributes.h"
 #include "tools/say/messages.h"
 #include "tools/say/text.h"
 #include "tools/store/marks.h"

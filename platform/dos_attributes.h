@@ -18,15 +18,16 @@
 //                                         8  change time
 //
 // Version 2 begins as version 3, with flags that mean nothing now. Or the value is the text alone.
-#ifndef MAVOEA_FORMAT_DOS_ATTRIBUTES_H_
-#define MAVOEA_FORMAT_DOS_ATTRIBUTES_H_
+//
+// Of the layouts on disk this one stands down here: hosts keep marks of a file in it.
+#ifndef MAVOEA_PLATFORM_DOS_ATTRIBUTES_H_
+#define MAVOEA_PLATFORM_DOS_ATTRIBUTES_H_
 
 #include <array>
 #include <cstddef>
 #include <cstdint>
 #include <optional>
-
-#include "util/bytes.h"
+#include <span>
 
 namespace mavoea {
 
@@ -43,16 +44,19 @@ struct DosAttributes {
     std::optional<std::uint64_t> creation_time;  // in 100 ns from 1601-01-01 UTC
 };
 
+// The most bytes that Samba reads; a longer value is none to it.
+inline constexpr std::size_t kDosAttributesMax = 256;
+
 // None of what Samba does not understand either, and takes for no attributes at all.
-std::optional<DosAttributes> DecodeDosAttributes(ByteView bytes);
+std::optional<DosAttributes> DecodeDosAttributes(std::span<const std::uint8_t> bytes);
 
 // Changes the attributes of a value of version 1 to 5 and keeps all else of it. False, and the
 // bytes are as they were, for every other value: what stands in for that is made anew.
-[[nodiscard]] bool SetDosAttributes(ByteSpan bytes, std::uint32_t attributes);
+[[nodiscard]] bool SetDosAttributes(std::span<std::uint8_t> bytes, std::uint32_t attributes);
 
 inline constexpr std::size_t kDosAttributesSize = 24;
 std::array<std::uint8_t, kDosAttributesSize> EncodeDosAttributes(const DosAttributes& value);
 
 }  // namespace mavoea
 
-#endif  // MAVOEA_FORMAT_DOS_ATTRIBUTES_H_
+#endif  // MAVOEA_PLATFORM_DOS_ATTRIBUTES_H_

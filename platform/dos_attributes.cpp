@@ -1,9 +1,12 @@
-#include "format/dos_attributes.h"
+#include "platform/dos_attributes.h"
 
 #include <algorithm>
 
 namespace mavoea {
 namespace {
+
+using ByteView = std::span<const std::uint8_t>;
+using ByteSpan = std::span<std::uint8_t>;
 
 constexpr std::uint32_t kAttributesValid = 0x01;
 constexpr std::uint32_t kCreationTimeValid = 0x10;
@@ -91,6 +94,7 @@ std::optional<std::uint32_t> DecodeText(ByteView bytes) {
 }  // namespace
 
 std::optional<DosAttributes> DecodeDosAttributes(ByteView bytes) {
+    if (bytes.size() > kDosAttributesMax) return std::nullopt;
     const auto fields = FindFields(bytes);
     if (!fields) {
         const auto attributes = DecodeText(bytes);
