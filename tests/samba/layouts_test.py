@@ -698,6 +698,10 @@ class DosAttributesTest(ShareTest):
                 self.mac.set_attributes(self.name, HIDDEN)
                 self.expect(HIDDEN, created)
 
+    def test_256_bytes_are_read(self):
+        self.put(DOS_ATTRIBUTES, h(self.HEAD + "23000000" + self.TAIL).ljust(256, b"\0"))
+        self.assertEqual(READ_ONLY | HIDDEN | ARCHIVE, self.mac.attributes(self.name))
+
     def test_anything_else_is_no_attributes(self):
         good = self.HEAD + "23000000" + self.TAIL
         for what, value in {
@@ -706,11 +710,67 @@ class DosAttributesTest(ShareTest):
             "two versions": good.replace("0500 0500", "0500 0400"),
             "empty": "",
             "two NULs": "0000",
+            "257 bytes": good + "00" * 233,
         }.items():
             with self.subTest(what):
                 self.make()
                 self.put(DOS_ATTRIBUTES, h(value))
                 self.assertEqual(NORMAL, self.mac.attributes(self.name))
+
+
+# ---- What the tool does not know ----------------------------------------------------------------
+
+
+class DepotTest(ShareTest):
+    def setUp(self):
+        self.open("depot")
+
+    def test_streams_are_files_of_a_directory_in_the_share_s_root_and_the_object_says_so(self):
+        self.write("colour", b"red")
+        self.write("AFP_AfpInfo", afp_info())
+        self.write("AFP_Resource", b"the fork")
+        (first,) = os.listdir(os.path.join(self.folder, ".streams"))
+        (second,) = os.listdir(os.path.join(self.folder, ".streams", first))
+        for digits in (first, second):
+            self.assertRegex(digits, "^[0-9A-F]{2}$")
+        (of_object,) = os.listdir(os.path.join(self.folder, ".streams", first, second))
+        streams = os.path.join(self.folder, ".streams", first, second, of_object)
+        self.assertEqual(
+            {":colour:$DATA", ":AFP_AfpInfo:$DATA", ":AFP_Resource:$DATA"}, {*os.listdir(streams)}
+        )
+        self.assertEqual(b"1", self.get("user.SAMBA_STREAMS"))
+        self.assertEqual({}, self.streams_on_disk())
+        self.assertFalse(os.path.exists(self.double))
+
+
+class ForkInAttributeTest(ShareTest):
+    def test_clients_cannot_store_a_fork_in_an_attribute_and_nothing_is_on_disk(self):
+        self.open("xattr")
+        before = os.listxattr(self.path)
+        self.assert_fails(NOT_SUPPORTED, self.write, "AFP_Resource", b"the fork")
+        self.assertEqual(before, os.listxattr(self.path))
+        self.assertFalse(os.path.exists(self.double))
+
+
+class NativeEncodingTest(ShareTest):
+    """Names with characters that SMB forbids, where they are stored as they are."""
+
+    PLAIN, MAPPED = "user.DosStream.a:b:$DATA", "user.DosStream.a\uf022b:$DATA"
+
+    def setUp(self):
+        self.open("native")
+
+    def test_a_client_s_name_is_stored_as_it_is_meant(self):
+        self.write("a\uf022b", b"value")
+        self.assertEqual({os.fsencode(self.PLAIN): b"value\0"}, self.streams_on_disk())
+
+    def test_only_that_spelling_is_read(self):
+        self.put(self.MAPPED, b"mapped\0")
+        self.assert_fails(NAME_NOT_FOUND, self.read, "a\uf022b")
+        self.put(self.PLAIN, b"plain\0")
+        self.assertEqual(b"plain", self.read("a\uf022b"))
+        os.removexattr(self.path, self.PLAIN)
+        self.assert_fails(NAME_NOT_FOUND, self.read, "a\uf022b")
 
 
 if __name__ == "__main__":

@@ -26,6 +26,9 @@ SHARES = {
     "stream": {"fruit:metadata": "stream", "fruit:resource": "file"},
     "all-streams": {"fruit:metadata": "stream", "fruit:resource": "stream"},
     "native": {"fruit:metadata": "netatalk", "fruit:resource": "file", "fruit:encoding": "native"},
+    "depot": {"fruit:metadata": "stream", "fruit:resource": "stream",
+              "vfs objects": "catia fruit streams_depot"},
+    "xattr": {"fruit:metadata": "netatalk", "fruit:resource": "xattr"},
 }
 
 ALONE = "MAVOEA_SMBD_ALONE"

@@ -479,6 +479,21 @@ class CommandTest(ToolTest):
         self.assertFalse(os.path.lexists(self.double))
 
 
+class DepotTest(ToolTest):
+    def test_streams_that_are_kept_elsewhere_are_told_and_nothing_is_written_beside_them(self):
+        self.open("depot")
+        self.fill(fork=b"the fork")
+        before = self.client_s()
+        for volume in ([], [f"--volume={self.folder}=samba-all-streams"]):
+            for command in ("list", self.path), ("set", self.path, "a", "b"), ("lock", self.path):
+                result = self.start(*volume, *command)
+                self.assertEqual((2, b""), (result.returncode, result.stdout), command)
+                self.assertIn(f"by {self.folder}/.streams".encode(), result.stderr)
+        where = json.loads(self.tool("where", "--json", self.path))
+        self.assertEqual(f"{self.folder}/.streams", where["unknownStreams"])
+        self.assertEqual(before, self.client_s())
+
+
 # ---- Conversions --------------------------------------------------------------------------------
 
 

@@ -183,7 +183,8 @@ TEST(VolumeOptionTest, ADeclarationThatMeansNothingIsRefused) {
                 Failed(2,
                        "--volume /x=ext5: unknown volume type \"ext5\"; take a number from 0 to "
                        "12, appledouble, eadir, fileea, xattr, samba, samba-stream, "
-                       "samba-all-streams, netatalk, netatalk-samba or linux"));
+                       "samba-all-streams, netatalk, netatalk-samba or linux; Samba's "
+                       "streams_depot and \"fruit:resource = xattr\" are not known"));
     EXPECT_THAT(RunTool({"--volume", "/x", "list", "/"}),
                 Failed(2,
                        "--volume /x: not of the form PATH=TYPE; for example --volume "

@@ -468,7 +468,8 @@ TEST_F(ConvertTest, TypesThatCannotBeAreRefused) {
     EXPECT_EQ(
         "mavoea: --to bogus: unknown volume type \"bogus\"; take a number from 0 to 12, "
         "appledouble, eadir, fileea, xattr, samba, samba-stream, samba-all-streams, netatalk, "
-        "netatalk-samba or linux\n",
+        "netatalk-samba or linux; Samba's streams_depot and \"fruit:resource = xattr\" are not "
+        "known\n",
         volumes_.Convert(source, there(), "bogus").err);
     for (const char* type : {"4", "8", "9", "11"}) {
         const ToolResult result = volumes_.Convert(source, there(), type);

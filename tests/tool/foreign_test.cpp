@@ -560,6 +560,103 @@ TEST_F(ForeignTest, NothingIsWrittenBesideAnotherProgramsMetadataUnlessItsTypeIs
     EXPECT_EQ(0, RunTool({"--volume", samba_.path() + "=1", "set", other, kColour, "x"}).status);
 }
 
+// ---- streams_depot ------------------------------------------------------------------------------
+
+// As smbd lays it out: directories by a hash of the object's device and inode.
+class DepotTest : public ForeignTest {
+ protected:
+    static void MakeDepot(const std::string& root) {
+        const fs::path streams = root + "/.streams/94/DE/01070000000000000E00000000000000";
+        fs::create_directories(streams);
+        WriteFile(streams / ":colour:$DATA", Ascii("red"));
+    }
+    static auto Refuses(const std::string& path, const std::string& by) {
+        return Failed(2, path + ": Samba keeps streams elsewhere there, by " + by +
+                             ", in a way that is not known: streams_depot; have smbd serve it "
+                             "with streams_xattr, and copy what clients see onto that");
+    }
+
+    const TempDir undeclared_;
+    const TempDir elsewhere_;
+};
+
+TEST_F(DepotTest, NothingIsWrittenBesideIt) {
+    const std::string depot = samba_.path() + "/.streams";
+    const std::string below = samba_.path() + "/d/e/b";
+    fs::create_directories(samba_.path() + "/d/e");
+    WriteFile(below, Ascii("data"));
+    const std::string other = undeclared_ / "a";
+    WriteFile(other, Ascii("data"));
+    MakeDepot(samba_.path());
+    MakeDepot(undeclared_.path());
+    for (const std::string& path : {samba_.file(), below}) {
+        const auto before = Attributes(path);
+        EXPECT_THAT(samba_.Run({"set", path, kColour, "red"}), Refuses(path, depot));
+        EXPECT_THAT(samba_.Run({"remove", path, kColour}), Refuses(path, depot));
+        EXPECT_THAT(samba_.Run({"lock", path}), Refuses(path, depot));
+        EXPECT_EQ(before, Attributes(path));
+    }
+    EXPECT_THAT(samba_.Run({"set", samba_.path(), kColour, "red"}), Refuses(samba_.path(), depot));
+    EXPECT_THAT(RunTool({"set", other, kColour, "red"}),
+                Refuses(other, undeclared_.path() + "/.streams"));
+    // A copy with metadata as well; the data of one without goes.
+    EXPECT_THAT(stream_.Set(kColour, Ascii("red")), Succeeded());
+    const ToolResult copied = samba_.Run({"--volume", stream_.path() + "=samba-stream", "cp",
+                                          stream_.file(), samba_.path() + "/copy"});
+    EXPECT_NE(0, copied.status);
+    EXPECT_THAT(copied.err, HasSubstr("streams_depot"));
+    EXPECT_EQ((std::map<std::string, Bytes>{}), Attributes(samba_.path() + "/d/e"));
+}
+
+TEST_F(DepotTest, WhoReadsIsToldThatNotAllIsRead) {
+    WriteFile(undeclared_ / "a", Ascii("data"));
+    EXPECT_THAT(samba_.Set(kColour, Ascii("red")), Succeeded());
+    MakeDepot(samba_.path());
+    MakeDepot(undeclared_.path());
+    const std::string depot = samba_.path() + "/.streams";
+    const ToolResult listed = samba_.Run({"list", samba_.file()});
+    EXPECT_EQ(2, listed.status);
+    EXPECT_EQ(kColour + "\n", listed.out);
+    EXPECT_THAT(listed.err, HasSubstr("by " + depot + ", in a way that is not known"));
+    EXPECT_EQ(2, RunTool({"list", undeclared_ / "a"}).status);
+    // What could not be read keeps a moved object where it is.
+    const ToolResult moved = samba_.Run({"--volume", elsewhere_.path() + "=1", "convert", "--to",
+                                         "eadir", samba_.file(), elsewhere_ / "a"});
+    EXPECT_EQ(2, moved.status);
+    EXPECT_THAT(moved.err, HasSubstr("streams_depot"));
+
+    const ToolResult where = samba_.Run({"where", samba_.file()});
+    EXPECT_THAT(where.out, HasSubstr("\n  other programs: Samba, with streams_depot, by " + depot));
+    EXPECT_EQ(depot, samba_.Run({"--json", "where", samba_.file()}).json()["unknownStreams"]);
+}
+
+TEST_F(DepotTest, AnObjectSaysItselfThatItHasStreamsInOne) {
+    SetAttribute(samba_.file(), "user.SAMBA_STREAMS", Bytes{'1'});
+    EXPECT_THAT(samba_.Set(kColour, Ascii("red")), Refuses(samba_.file(), "user.SAMBA_STREAMS"));
+    const ToolResult listed = samba_.Run({"list", samba_.file()});
+    EXPECT_EQ(2, listed.status);
+    EXPECT_THAT(listed.err, HasSubstr("by user.SAMBA_STREAMS, in a way that is not known"));
+    WriteFile(samba_.path() + "/b", Ascii("data"));
+    EXPECT_THAT(samba_.Run({"set", samba_.path() + "/b", kColour, "red"}), Succeeded());
+}
+
+TEST_F(DepotTest, WhoHasDeclaredAnotherProgramsTypeIsNotAsked) {
+    MakeDepot(netatalk_.path());
+    EXPECT_THAT(netatalk_.Set(kColour, Ascii("red")), Succeeded());
+    EXPECT_THAT(netatalk_.Run({"list", netatalk_.file()}), Succeeded());
+}
+
+TEST_F(DepotTest, AnyOtherDirectoryOfThatNameIsNone) {
+    fs::create_directories(samba_.path() + "/.streams/music/94");
+    WriteFile(samba_.path() + "/.streams/95", {});
+    fs::create_directory_symlink("music", samba_.path() + "/.streams/mu");
+    EXPECT_THAT(samba_.Set(kColour, Ascii("red")), Succeeded());
+    const TempDir target;
+    MakeDepot(target.path());
+    fs::create_directory_symlink(target.path() + "/.streams", stream_.path() + "/.streams");
+    EXPECT_THAT(stream_.Set(kColour, Ascii("red")), Succeeded());
+}
+
 TEST_F(ForeignTest, WhereTellsWhoseMetadataItHasFoundAndHowToSaySo) {
     SetAttribute(netatalk_.file(), kRecord, Record(FinderInfo()));
     SetAttribute(stream_.file(), kAfpInfo, AfpInfo(FinderInfo()) + Bytes{0});

@@ -194,7 +194,7 @@ TEST_F(VolumeTableTest, AMalformedLineEndsEveryCommandBeforeItDoesAnything) {
     SetTable("# volumes\n" + dir() + " 1\n/typo eadri\n/another\n");
     ExpectEveryCommandToEndWith(
         AllOf(OneLine(std::string(kTable) + ":3", "does not end in a volume type"),
-              EndsWith("; mend the line\n")));
+              HasSubstr("; mend the line; for a type, take a number from 0 to 12, appledouble,")));
 }
 
 TEST_F(VolumeTableTest, EveryWayToBeMalformedIsTold) {

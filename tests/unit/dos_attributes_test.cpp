@@ -241,5 +241,13 @@ TEST(DosAttributesTest, AFreshValueWithoutACreationTimeDoesNotTellOne) {
                 ElementsAreArray(Hex("00 00 05 00 05 00 00 00 01 00 00 00 EF CD AB 89 00*8")));
 }
 
+TEST(DosAttributesTest, OfMoreThan256BytesThereAreNone) {
+    Bytes bytes = kVersion5;
+    bytes.resize(256);
+    ExpectDecoded(bytes, 0x23, kTime);
+    bytes.resize(257);
+    EXPECT_FALSE(DecodeDosAttributes(bytes));
+}
+
 }  // namespace
 }  // namespace mavoea::test

@@ -67,12 +67,16 @@ int TypeOfFileSystem(const Place& place, bool is_directory) {
 }
 
 #if MAVOEA_HOST_PLATFORM
+// What a type may be; behind that, ways of Samba's that none is for.
+constexpr const char* kTypes =
+    "take a number from 0 to 12, appledouble, eadir, fileea, xattr, samba, samba-stream, "
+    "samba-all-streams, netatalk, netatalk-samba or linux; Samba's streams_depot and "
+    "\"fruit:resource = xattr\" are not known";
+
 int RequireTypeName(const std::string& type_name, const std::string& option) {
     const int type = MAVOVolumeTypeFromName(type_name.c_str());
     if (type >= 0) return type;
-    throw Failure(kFailed, option, "unknown volume type \"" + type_name + "\"",
-                  "take a number from 0 to 12, appledouble, eadir, fileea, xattr, samba, "
-                  "samba-stream, samba-all-streams, netatalk, netatalk-samba or linux");
+    throw Failure(kFailed, option, "unknown volume type \"" + type_name + "\"", kTypes);
 }
 
 constexpr const char* kDeclareVolume =
@@ -261,7 +265,7 @@ void RequireVolumeTable() {
     }
     if (found == 0) return;
     throw Failure(kFailed, std::string(MAVO_VOLUME_TABLE) + ':' + std::to_string(line), problem,
-                  "mend the line");
+                  std::string("mend the line; for a type, ") + kTypes);
 #endif
 }
 

@@ -90,6 +90,10 @@ ExitStatus Where(const std::string& path, bool json) {
     const std::string source = TypeSource(object);
     const std::vector<MetadataPlace> places = PlacesOf(object);
     const std::optional<Sign> sign = FindSign(object.place);
+    const auto inode = Inode::Open(object.place);
+    const std::string depot =
+        FindDepot(object, inode.get(),
+                  inode->HoldsContents() ? inode->AttributeNames() : std::vector<std::string>());
     if (json) {
         Json result;
         result.SetText("path", object.path());
@@ -102,6 +106,7 @@ ExitStatus Where(const std::string& path, bool json) {
         if (sign) {
             result.Set("found", Json::Object({{"type", sign->dialect->name}, {"by", sign->text}}));
         }
+        if (!depot.empty()) result.SetText("unknownStreams", depot);
         Print(result);
     } else {
         std::cout << Printable(object.path()) << "\n  volume type: " << TypeId(object.type) << ", "
@@ -110,6 +115,10 @@ ExitStatus Where(const std::string& path, bool json) {
         if (sign) {
             std::cout << "  other programs: " << sign->dialect->title << ", by " << sign->text
                       << "; --volume PATH=" << sign->dialect->name << " declares it\n";
+        }
+        if (!depot.empty()) {
+            std::cout << "  other programs: Samba, with streams_depot, by " << Printable(depot)
+                      << "; this is not known, and nothing is written beside it\n";
         }
     }
     if (object.keeping() == Keeping::kNone) throw NoStore(object);

@@ -248,6 +248,9 @@ Metadata ReadMetadata(const Object& object, const Inode& inode, const Sidecars& 
     if (!inode.HoldsContents()) return metadata;
     Noting(&metadata, [&] {
         const std::vector<std::string> names = inode.AttributeNames();
+        if (const std::string depot = FindDepot(object, &inode, names); !depot.empty()) {
+            metadata.problems.push_back(DepotIsUnknown(object, depot));
+        }
         if (reader != nullptr && !object.is_root() && !object.declared) {
             Noting(&metadata, [&] { AddUndeclared(inode, names, &metadata); });
         }

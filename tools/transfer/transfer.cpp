@@ -308,9 +308,9 @@ void RequireUnlockedTarget(const Leg& leg) {
 // What is written beside another program's metadata, or left there with other data, nobody sees.
 void RequireSeen(const Leg& leg) {
     const Metadata& wanted = leg.wanted;
-    if (leg.to.declared) return;
     const bool writes = wanted.HasAny() || wanted.locked || wanted.hidden || wanted.system;
-    if (writes || (leg.replaces && SignOf(leg.to.place))) RequireDeclared(leg.to);
+    const bool leaves = leg.replaces && !leg.to.declared && SignOf(leg.to.place);
+    if (writes || leaves) RequireDeclared(leg.to);
 }
 
 // What was to arrive, and what a writer said of it.

@@ -1,6 +1,7 @@
 #include "tools/store/foreign/detection.h"
 
 #include <algorithm>
+#include <filesystem>
 #include <memory>
 
 #include "format/afp_info.h"
@@ -14,6 +15,8 @@
 
 namespace mavoea::tool {
 namespace {
+
+namespace fs = std::filesystem;
 
 // Of many objects some tell it, as all are of one share.
 std::optional<Sign> SignAmong(const DirectoryRef& directory) {
@@ -39,7 +42,63 @@ const std::optional<Sign>& SignInDirectory(const DirectoryRef& directory) {
     return sign;
 }
 
+// ---- streams_depot ------------------------------------------------------------------------------
+
+// What it gives to an object that has streams, so that a later one of the same inode has none.
+constexpr std::string_view kDepotAttribute = "user.SAMBA_STREAMS";
+constexpr const char* kDepotName = ".streams";
+
+// The first of the two levels of directories in it has names of two digits each.
+bool IsDepot(const fs::path& path) {
+    std::error_code error;
+    if (!fs::is_directory(fs::symlink_status(path, error))) return false;
+    constexpr std::string_view kDigits = "0123456789ABCDEF";
+    fs::directory_iterator entries(path, error);
+    for (; !error && entries != fs::directory_iterator(); entries.increment(error)) {
+        const std::string name = entries->path().filename();
+        if (entries->symlink_status(error).type() != fs::file_type::directory) continue;
+        if (name.size() == 2 && name.find_first_not_of(kDigits) == std::string::npos) return true;
+    }
+    return false;
+}
+
+// In a directory or one of those above it, as text: a share has one in its root. Kept for the next
+// object.
+const std::string& DepotAbove(const DirectoryRef& directory) {
+    static std::weak_ptr<const Directory> last;
+    static std::string depot;
+    if (last.lock() == directory) return depot;
+    last = directory;
+    depot.clear();
+    for (fs::path at = directory->location();; at = at.parent_path()) {
+        if (IsDepot(at / kDepotName)) depot = at / kDepotName;
+        if (!depot.empty() || at == at.parent_path()) return depot;
+    }
+}
+
 }  // namespace
+
+std::string FindDepot(const Object& object, const Inode* inode,
+                      const std::vector<std::string>& attributes) {
+    const Dialect* const dialect = object.dialect();
+    const bool is_sambas = dialect != nullptr && dialect->names == Dialect::Names::kStream;
+    if (object.declared && !is_sambas) return {};
+    if (const std::string& above = DepotAbove(object.place.directory); !above.empty()) return above;
+    if (inode != nullptr && S_ISDIR(inode->info().st_mode)) {
+        const fs::path own = fs::path(object.place.location()) / kDepotName;
+        if (IsDepot(own)) return own;
+    }
+    const bool has_some =
+        std::find(attributes.begin(), attributes.end(), kDepotAttribute) != attributes.end();
+    return has_some ? std::string(kDepotAttribute) : std::string();
+}
+
+Failure DepotIsUnknown(const Object& object, const std::string& depot) {
+    return {kFailed, object.path(),
+            "Samba keeps streams elsewhere there, by " + Printable(depot) +
+                ", in a way that is not known: streams_depot",
+            "have smbd serve it with streams_xattr, and copy what clients see onto that"};
+}
 
 std::optional<Sign> SignIn(const std::vector<std::string>& attributes) {
     const auto has = [&](const auto& matches) {
@@ -89,8 +148,16 @@ std::optional<Sign> FindSign(const Place& place) {
 }
 
 void RequireDeclared(const Object& object) {
+    if (object.declared && object.dialect() == nullptr) return;
+    const auto inode = Inode::Find(object.place);
+    std::vector<std::string> attributes;
+    if (inode && inode->HoldsContents()) attributes = inode->AttributeNames();
+    if (const std::string depot = FindDepot(object, inode.get(), attributes); !depot.empty()) {
+        throw DepotIsUnknown(object, depot);
+    }
     if (object.declared) return;
-    const auto sign = FindSign(object.place);
+    auto sign = SignIn(attributes);
+    if (!sign) sign = SignInDirectory(object.place.directory);
     if (!sign) return;
     const std::string& directory = object.place.directory->location();
     throw Failure(kFailed, object.path(),

@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "tools/place/volume.h"
+#include "tools/say/messages.h"
 
 namespace mavoea::tool {
 
@@ -24,8 +25,16 @@ std::optional<Sign> SignOf(const Place& place);
 // The same, or by those of its directory and of some that are in it.
 std::optional<Sign> FindSign(const Place& place);
 
-// Failure where another program keeps metadata and nobody has said that it does: it would not see
-// what is written.
+// Where Samba keeps the streams of an object as files of a directory of their own, streams_depot,
+// which is not read here: that directory, or the attribute that it gives to whoever has some. Empty
+// where nothing is known of one. `inode`: the object's, null while there is none; `attributes`: the
+// names of its own. Where somebody has declared a type that is not Samba's nobody looks.
+std::string FindDepot(const Object& object, const Inode* inode,
+                      const std::vector<std::string>& attributes);
+Failure DepotIsUnknown(const Object& object, const std::string& depot);
+
+// Failure where another program keeps metadata and nobody has said that it does, or in a way that
+// is not known: it would not see what is written.
 void RequireDeclared(const Object& object);
 
 }  // namespace mavoea::tool
