@@ -5,7 +5,7 @@
 #include "format/apple_single.h"
 #include "format/bin_hex.h"
 #include "format/mac_binary.h"
-#include "tools/move/mac_text.h"
+#include "tools/say/mac_text.h"
 #include "tools/store/gathering.h"
 #include "tools/store/reader.h"
 

@@ -1,4 +1,4 @@
-#include "tools/move/mac_text.h"
+#include "tools/say/mac_text.h"
 
 #include <algorithm>
 #include <array>

@@ -1,6 +1,6 @@
 // Names and times as archives of Macs have them.
-#ifndef MAVOEA_TOOLS_MOVE_MAC_TEXT_H_
-#define MAVOEA_TOOLS_MOVE_MAC_TEXT_H_
+#ifndef MAVOEA_TOOLS_SAY_MAC_TEXT_H_
+#define MAVOEA_TOOLS_SAY_MAC_TEXT_H_
 
 #include <cstdint>
 #include <optional>
@@ -26,4 +26,4 @@ std::optional<std::uint32_t> ToMacTime(std::int64_t time);
 
 }  // namespace mavoea::tool
 
-#endif  // MAVOEA_TOOLS_MOVE_MAC_TEXT_H_
+#endif  // MAVOEA_TOOLS_SAY_MAC_TEXT_H_
