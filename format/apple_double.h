@@ -52,10 +52,8 @@ struct EntryDescriptor {
     Range data;
 };
 
-// Finder info: 32 bytes, which are the Finder's. The flags, 16 bits, are at 8.
+// Finder info has 32 bytes; see finder_info.h.
 inline constexpr std::size_t kFinderInfoSize = 32;
-inline constexpr std::size_t kFinderFlagsOffset = 8;
-inline constexpr std::uint16_t kFinderInvisible = 0x4000;
 
 // What Macs write where a file that has no resource fork must have one: an empty fork with this
 // text in it.

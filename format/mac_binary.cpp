@@ -3,6 +3,7 @@
 #include <algorithm>
 
 #include "format/crc16.h"
+#include "format/finder_info.h"
 
 namespace mavoea {
 namespace {
@@ -13,12 +14,42 @@ constexpr std::uint32_t kSignature = 0x6D42494E;  // "mBIN"
 constexpr std::uint8_t kVersion3 = 130;
 constexpr std::uint8_t kVersionNeeded = 129;
 
-// In Finder info.
-constexpr std::size_t kTypeAndCreator = 0;
-constexpr std::size_t kPlace = 10;
-constexpr std::size_t kPlaceSize = 6;
-constexpr std::size_t kScript = 24;
-constexpr std::size_t kExtendedFlags = 25;
+// Where the Finder info is: type, creator and the high byte of the flags, and behind a zero place and
+// window; the flags' low byte; the extended flags.
+constexpr std::size_t kTypeAt = 65;
+constexpr std::size_t kHighFlagsAt = 73;
+constexpr std::size_t kPlaceAt = 75;
+constexpr std::size_t kLowFlagsAt = 101;
+constexpr std::size_t kExtendedFlagsAt = 106;
+
+// Versions before the third have no extended flags, and the first has zeros for the low flags.
+FinderInfoBytes DecodeFinderInfo(ByteView head, int version) {
+    FileFinderInfo info;
+    BeReader in(head.subspan(kTypeAt));
+    in.Copy(info.type);
+    in.Copy(info.creator);
+    info.item.flags = static_cast<std::uint16_t>(head[kHighFlagsAt] << 8 | head[kLowFlagsAt]);
+    BeReader place(head.subspan(kPlaceAt));
+    info.item.place.down = static_cast<std::int16_t>(place.U16());
+    info.item.place.across = static_cast<std::int16_t>(place.U16());
+    info.item.window = place.U16();
+    if (version > 2) info.item.extended_flags = LoadBe16(&head[kExtendedFlagsAt]);
+    return EncodeFinderInfo(info);
+}
+
+void EncodeInto(ByteSpan head, FinderInfoView finder_info) {
+    const FileFinderInfo info = DecodeFileFinderInfo(finder_info);
+    BeWriter out(head.subspan(kTypeAt));
+    out.Copy(info.type);
+    out.Copy(info.creator);
+    head[kHighFlagsAt] = static_cast<std::uint8_t>(info.item.flags >> 8);
+    head[kLowFlagsAt] = static_cast<std::uint8_t>(info.item.flags);
+    BeWriter place(head.subspan(kPlaceAt));
+    place.U16(static_cast<std::uint16_t>(info.item.place.down));
+    place.U16(static_cast<std::uint16_t>(info.item.place.across));
+    place.U16(info.item.window);
+    StoreBe16(info.item.extended_flags, &head[kExtendedFlagsAt]);
+}
 
 bool AllZeros(ByteView bytes) {
     return std::all_of(bytes.begin(), bytes.end(), [](std::uint8_t byte) { return byte == 0; });
@@ -48,9 +79,7 @@ std::optional<MacBinary> DecodeMacBinary(ByteView head, std::uint64_t file_size)
     MacBinaryHead& info = file.head;
     info.name = {reinterpret_cast<const char*>(&head[2]), name_size};
 
-    std::copy_n(&head[65], 8, info.finder_info.begin() + kTypeAndCreator);
-    info.finder_info[kFinderFlagsOffset] = head[73];
-    std::copy_n(&head[75], kPlaceSize, info.finder_info.begin() + kPlace);
+    info.finder_info = DecodeFinderInfo(head, file.version);
     info.locked = (head[81] & 1) != 0;
     info.data_length = LoadBe32(&head[83]);
     info.resource_length = LoadBe32(&head[87]);
@@ -59,12 +88,7 @@ std::optional<MacBinary> DecodeMacBinary(ByteView head, std::uint64_t file_size)
     info.comment_length = LoadBe16(&head[99]);
     // Version 1 has zeros from here on.
     if (head[123] > kVersionNeeded) return std::nullopt;
-    info.finder_info[kFinderFlagsOffset + 1] = head[101];
     const std::uint16_t second_header = LoadBe16(&head[120]);
-    if (file.version > 2) {
-        info.finder_info[kScript] = head[106];
-        info.finder_info[kExtendedFlags] = head[107];
-    }
     if (info.data_length > kMacBinaryForkMax || info.resource_length > kMacBinaryForkMax) {
         return std::nullopt;
     }
@@ -89,19 +113,14 @@ std::optional<std::array<std::uint8_t, kMacBinaryHeadSize>> EncodeMacBinaryHead(
     std::array<std::uint8_t, kMacBinaryHeadSize> bytes{};
     bytes[1] = static_cast<std::uint8_t>(head.name.size());
     std::copy(head.name.begin(), head.name.end(), &bytes[2]);
-    std::copy_n(head.finder_info.begin() + kTypeAndCreator, 8, &bytes[65]);
-    bytes[73] = head.finder_info[kFinderFlagsOffset];
-    std::copy_n(head.finder_info.begin() + kPlace, kPlaceSize, &bytes[75]);
+    EncodeInto(bytes, head.finder_info);
     bytes[81] = head.locked ? 1 : 0;
     StoreBe32(head.data_length, &bytes[83]);
     StoreBe32(head.resource_length, &bytes[87]);
     StoreBe32(head.creation_time, &bytes[91]);
     StoreBe32(head.modification_time, &bytes[95]);
     StoreBe16(head.comment_length, &bytes[99]);
-    bytes[101] = head.finder_info[kFinderFlagsOffset + 1];
     StoreBe32(kSignature, &bytes[102]);
-    bytes[106] = head.finder_info[kScript];
-    bytes[107] = head.finder_info[kExtendedFlags];
     bytes[122] = kVersion3;
     bytes[123] = kVersionNeeded;
     StoreBe16(Crc16(ByteView(bytes).first(kChecked)), &bytes[kChecked]);

@@ -23,6 +23,7 @@ constexpr Target kTargets[] = {
     {"upgrade_fuzz", WriteUpgradeSeeds},
     {"afp_info_fuzz", WriteAfpInfoSeeds},
     {"dos_attributes_fuzz", WriteDosAttributesSeeds},
+    {"finder_info_fuzz", WriteFinderInfoSeeds},
     {"samba_stream_fuzz", WriteSambaStreamSeeds},
     {"apple_single_fuzz", WriteAppleSingleSeeds},
     {"mac_binary_fuzz", WriteMacBinarySeeds},

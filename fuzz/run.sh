@@ -25,6 +25,7 @@ import_fuzz 100000 4096
 resource_copy_fuzz 100000 4096
 afp_info_fuzz 100000 128
 dos_attributes_fuzz 100000 128
+finder_info_fuzz 100000 64
 samba_stream_fuzz 100000 512
 apple_single_fuzz 100000 512
 mac_binary_fuzz 100000 512

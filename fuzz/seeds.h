@@ -14,6 +14,7 @@ void WriteResourceCopySeeds(const std::string& directory);
 void WriteUpgradeSeeds(const std::string& directory);
 void WriteAfpInfoSeeds(const std::string& directory);
 void WriteDosAttributesSeeds(const std::string& directory);
+void WriteFinderInfoSeeds(const std::string& directory);
 void WriteSambaStreamSeeds(const std::string& directory);
 void WriteAppleSingleSeeds(const std::string& directory);
 void WriteMacBinarySeeds(const std::string& directory);

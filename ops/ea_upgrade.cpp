@@ -11,6 +11,7 @@
 #include <string_view>
 
 #include "format/apple_double.h"
+#include "format/finder_info.h"
 #include "include/mavoea.h"
 #include "ops/folder.h"
 #include "ops/new_file.h"

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cerrno>
 
+#include "format/finder_info.h"
 #include "format/netatalk_record.h"
 #include "tools/store/apple_double_reader.h"
 #include "tools/store/by_kind.h"
@@ -143,7 +144,8 @@ class EaDirectoryReader : public Reader {
     static bool SaysInvisible(const Metadata& metadata) {
         if (metadata.finder_info && !metadata.finder_info->value.damaged()) {
             const Bytes info = metadata.finder_info->value.All();
-            if ((LoadBe16(&info[kFinderFlagsOffset]) & kFinderInvisible) != 0) return true;
+            const auto view = FinderInfoView(info.begin(), kFinderInfoSize);
+            if ((DecodeFileFinderInfo(view).item.flags & kFinderInvisible) != 0) return true;
         }
         return (metadata.AfpAttributes().value_or(0) & kAfpInvisible) != 0;
     }
