@@ -14,8 +14,8 @@ constexpr std::uint32_t kSignature = 0x6D42494E;  // "mBIN"
 constexpr std::uint8_t kVersion3 = 130;
 constexpr std::uint8_t kVersionNeeded = 129;
 
-// Where the Finder info is: type, creator and the high byte of the flags, and behind a zero place and
-// window; the flags' low byte; the extended flags.
+// Where the Finder info is: type, creator and the high byte of the flags, and behind a zero place
+// and window; the flags' low byte; the extended flags.
 constexpr std::size_t kTypeAt = 65;
 constexpr std::size_t kHighFlagsAt = 73;
 constexpr std::size_t kPlaceAt = 75;

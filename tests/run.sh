@@ -26,7 +26,8 @@ sh tests/packages.sh g++ cmake ninja-build pkg-config libacl1-dev libattr1-dev l
     nlohmann-json3-dev libgtest-dev libgmock-dev libbenchmark-dev acl attr binutils \
     e2fsprogs xfsprogs btrfs-progs clang-format clang-tidy clang libclang-rt-14-dev cppcheck git \
     python3 abigail-tools util-linux g++-powerpc-linux-gnu gcc-powerpc-linux-gnu qemu-user \
-    googletest dpkg-dev make samba samba-vfs-modules smbclient python3-impacket
+    googletest dpkg-dev make autoconf automake libtool libplist-dev samba samba-vfs-modules \
+    smbclient python3-impacket
 
 build_and_test release
 step "coreutils' tests of cp, mv and rm"

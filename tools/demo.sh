@@ -5,7 +5,8 @@
 # Installs what the build takes.
 set -eu
 cd "$(dirname "$0")/.."
-sh tests/packages.sh g++ cmake ninja-build libacl1-dev libattr1-dev libcli11-dev nlohmann-json3-dev
+sh tests/packages.sh g++ cmake ninja-build libacl1-dev libattr1-dev libcli11-dev libplist-dev \
+    nlohmann-json3-dev
 cmake --preset release -DMAVOEA_TESTS=OFF -DMAVOEA_BENCH=OFF -B build/demo
 cmake --build build/demo
 

@@ -1,11 +1,12 @@
 #!/bin/sh
 # libraries.sh [PREFIX]: puts what the powerpc build links and includes, besides the cross compiler's
-# own libraries, under PREFIX (build/powerpc-libraries). libattr and libacl are built from Debian's
-# source packages, as Debian has no powerpc ones; CLI11 and nlohmann-json are headers of this
+# own libraries, under PREFIX (build/powerpc-libraries). libattr, libacl and libplist are built from
+# Debian's source packages, as Debian has no powerpc ones; CLI11 and nlohmann-json are headers of this
 # machine's packages, without the rest of its /usr/include. With everything in place nothing is done.
 #
-# Needs dpkg-dev, make, gcc-powerpc-linux-gnu, libcli11-dev and nlohmann-json3-dev. The system's own
-# package lists and sources are left as they are.
+# Needs dpkg-dev, make, autoconf, automake, libtool, pkg-config, gcc-powerpc-linux-gnu,
+# g++-powerpc-linux-gnu, libcli11-dev and nlohmann-json3-dev. The system's own package lists and
+# sources are left as they are.
 set -eu
 here=$(cd "$(dirname "$0")" && pwd)
 prefix=${1:-$here/../../build/powerpc-libraries}
@@ -20,7 +21,7 @@ mkdir -p "$prefix/include" "$prefix/share/cmake"
 work=$(mktemp -d)
 trap 'rm -rf "$work"' EXIT
 mkdir "$work/source"
-sh "$here/../source_packages.sh" "$work/source" attr acl
+sh "$here/../source_packages.sh" "$work/source" attr acl libplist
 
 # ---- Building -------------------------------------------------------------------------------------
 
@@ -29,20 +30,29 @@ sh "$here/../source_packages.sh" "$work/source" attr acl
 stage=$work/stage
 export LD_RUN_PATH='$ORIGIN'
 build() {
-    cd "$work"/source/"$1"-*/
+    package=$1
+    shift
+    cd "$work"/source/"$package"-*/
     # Debian's patches are younger than the files generated from what they change; those need not be
     # generated again, which would take the autotools.
-    touch aclocal.m4
-    find . -name Makefile.in -exec touch {} +
-    touch configure include/config.h.in
+    if [ -f configure ]; then
+        touch aclocal.m4
+        find . -name Makefile.in -exec touch {} +
+        touch configure include/config.h.in
+    else
+        autoreconf --force --install > autoreconf.log 2>&1 || { cat autoreconf.log; exit 1; }
+    fi
     ./configure --quiet --host=$host --prefix=/usr --libdir=/usr/lib --sysconfdir=/etc \
-        --disable-static --disable-nls CPPFLAGS="-I$stage/usr/include" LDFLAGS="-L$stage/usr/lib"
+        --disable-static --disable-nls CPPFLAGS="-I$stage/usr/include" LDFLAGS="-L$stage/usr/lib" \
+        "$@"
     make -s -j 2 > make.log 2>&1 && make -s install DESTDIR="$stage" >> make.log 2>&1 ||
         { cat make.log; exit 1; }
-    rm -f "$stage"/usr/lib/lib"$1".la
+    rm -f "$stage"/usr/lib/*.la
 }
 (build attr)
 (build acl)
+(build libplist --without-cython)
+rm -f "$stage"/usr/lib/libplist++*
 rm -rf "$prefix/lib"
 mkdir "$prefix/lib"
 cp -P "$stage"/usr/lib/lib*.so* "$prefix/lib"

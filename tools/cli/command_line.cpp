@@ -19,6 +19,7 @@ constexpr const char* kExamples = R"(Examples:
   mavoea set letter.txt com.apple.ResourceFork --file letter.rsrc
   mavoea get letter.txt com.apple.FinderInfo --hex
   mavoea list -l letter.txt
+  mavoea show letter.txt
   mavoea remove letter.txt com.example.colour
   mavoea lock letter.txt
   mavoea import ._letter.txt letter.txt
@@ -114,6 +115,8 @@ constexpr Syntax kCommands[] = {
          AddRecursive(sub, options);
          AddPaths(sub, options);
      }},
+    {Command::kShow, "show",
+     "Show in words what is known: Finder info, comment, tags, dates, marks, attributes", AddTree},
     {Command::kGet, "get", "Write a value to standard output",
      [](CLI::App* sub, Options* options) {
          sub->add_flag("--hex", options->hex, "As a hex dump");

@@ -14,6 +14,7 @@ namespace mavoea::tool {
 enum class Command {
     kWhere,
     kList,
+    kShow,
     kGet,
     kSet,
     kRemove,

@@ -22,6 +22,7 @@
 #include "tools/show/attributes.h"
 #include "tools/show/diff.h"
 #include "tools/show/dump.h"
+#include "tools/show/object_info.h"
 #include "tools/show/where.h"
 #include "tools/store/adoption.h"
 #include "tools/store/change.h"
@@ -211,6 +212,9 @@ ExitStatus Run(const Options& options) {
                          .details = options.details,
                          .recursive = options.recursive,
                          .json = options.json});
+        case Command::kShow:
+            return Show(
+                {.paths = options.paths, .recursive = options.recursive, .json = options.json});
         case Command::kGet:
             return GetValue(options);
         case Command::kSet:

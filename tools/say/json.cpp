@@ -21,6 +21,7 @@ Json::Json(const char* text) : value_(std::make_unique<Value>(text)) {}
 Json::Json(std::string_view text) : value_(std::make_unique<Value>(text)) {}
 Json::Json(const std::string& text) : value_(std::make_unique<Value>(text)) {}
 Json::Json(const std::vector<std::string>& texts) : value_(std::make_unique<Value>(texts)) {}
+Json::Json(double number) : value_(std::make_unique<Value>(number)) {}
 Json::Json(std::in_place_t, std::uint64_t number) : value_(std::make_unique<Value>(number)) {}
 Json::Json(std::in_place_t, std::int64_t number) : value_(std::make_unique<Value>(number)) {}
 Json::Json(const Json& other) : value_(std::make_unique<Value>(*other.value_)) {}
@@ -55,7 +56,6 @@ void Json::SetText(const std::string& key, std::string_view text) {
 void Json::Add(Json value) { value_->push_back(std::move(*value.value_)); }
 
 std::string Json::Text() const { return Dump(*value_, 2); }
-
 std::string Json::Line() const { return Dump(*value_, -1); }
 
 }  // namespace mavoea::tool

@@ -30,6 +30,7 @@ class Json {
     Json(std::string_view text);
     Json(const std::string& text);
     Json(const std::vector<std::string>& texts);
+    Json(double number);  // null where it is no number
     template <std::unsigned_integral Number>
     Json(Number number) : Json(std::in_place, std::uint64_t{number}) {}
     template <std::signed_integral Number>
@@ -54,6 +55,7 @@ class Json {
 
     // Two blanks a level, without a line feed at the end; U+FFFD for what is no UTF-8.
     std::string Text() const;
+
     // The same on one line.
     std::string Line() const;
 

@@ -75,44 +75,20 @@ class Listing {
     explicit Listing(const ListOptions& options) : options_(options) {}
 
     ExitStatus Run() {
-        VisitObjects(
-            options_.paths, options_.recursive,
-            {.work = [this](const Object& object,
-                            const std::string& shown) { return Show(object, shown); },
-             .on_failure = [this](const std::string&, const Failure& failure) { Add(failure); }});
+        const ExitStatus status =
+            LookAtObjects(options_.paths, options_.recursive,
+                          [this](const Object& object, const std::string& shown,
+                                 const Metadata& metadata) { Show(object, shown, metadata); });
         if (options_.json) Print(json_);
-        return status_;
+        return status;
     }
 
  private:
-    void Add(const Failure& failure) {
-        Report(failure.what());
-        status_ = std::max(status_, failure.status());
-    }
-
-    bool Show(const Object& object, const std::string& shown) {
-        try {
-            const Metadata metadata = ReadAll(object);
-            const std::vector<Line> lines = LinesOf(object, metadata);
-            if (options_.json) {
-                AddJson(object, metadata, lines);
-            } else if (!lines.empty() || !options_.recursive) {
-                AddText(shown, lines);
-            }
-            TellStrays(object, metadata);
-            for (const Failure& problem : metadata.problems) Add(problem);
-        } catch (const Failure& failure) {
-            if (!options_.recursive || !HasGone(object.place, failure)) Add(failure);
-        }
-        return true;
-    }
-
-    // Other programs keep one thing in several places.
-    void TellStrays(const Object& object, const Metadata& metadata) const {
-        if (options_.json || (object.dialect() == nullptr && object.declared)) return;
-        for (const Metadata::Stray& stray : metadata.strays) {
-            Note(stray.item + ": " + stray.reason);
-        }
+    void Show(const Object& object, const std::string& shown, const Metadata& metadata) {
+        const std::vector<Line> lines = LinesOf(object, metadata);
+        if (options_.json) return AddJson(object, metadata, lines);
+        if (!lines.empty() || !options_.recursive) AddText(shown, lines);
+        TellStrays(object, metadata);
     }
 
     void AddText(const std::string& path, const std::vector<Line>& lines) {
@@ -134,15 +110,6 @@ class Listing {
         }
     }
 
-    static void SetStrays(const Metadata& metadata, Json* entry) {
-        if (metadata.strays.empty()) return;
-        Json strays = Json::Array();
-        for (const Metadata::Stray& stray : metadata.strays) {
-            strays.Add(Json::Object({{"item", stray.item}, {"reason", stray.reason}}));
-        }
-        entry->Set("strays", std::move(strays));
-    }
-
     void AddJson(const Object& object, const Metadata& metadata, const std::vector<Line>& lines) {
         Json attributes = Json::Array();
         for (const Line& line : lines) {
@@ -158,14 +125,13 @@ class Listing {
         entry.SetText("path", object.path());
         entry.Set("type", TypeJson(object.type));
         entry.Set("attributes", std::move(attributes));
-        if (object.dialect() != nullptr || !object.declared) SetStrays(metadata, &entry);
+        SetStrays(object, metadata, &entry);
         json_.Add(std::move(entry));
     }
 
     const ListOptions& options_;
     Json json_ = Json::Array();
     bool first_ = true;
-    ExitStatus status_ = kSuccess;
 };
 
 std::optional<Content> Find(const Metadata& metadata, const std::string& name) {
@@ -192,7 +158,46 @@ void WriteRaw(const Content& value) {
     }
 }
 
+// Other programs keep one thing in several places.
+bool MayHaveStrays(const Object& object) { return object.dialect() != nullptr || !object.declared; }
+
 }  // namespace
+
+ExitStatus LookAtObjects(const std::vector<std::string>& paths, bool recursive, const Look& look) {
+    ExitStatus status = kSuccess;
+    const auto add = [&](const Failure& failure) {
+        Report(failure.what());
+        status = std::max(status, failure.status());
+    };
+    const auto work = [&](const Object& object, const std::string& shown) {
+        try {
+            const Metadata metadata = ReadAll(object);
+            look(object, shown, metadata);
+            for (const Failure& problem : metadata.problems) add(problem);
+        } catch (const Failure& failure) {
+            if (!recursive || !HasGone(object.place, failure)) add(failure);
+        }
+        return true;
+    };
+    VisitObjects(paths, recursive,
+                 {.work = work,
+                  .on_failure = [&](const std::string&, const Failure& failure) { add(failure); }});
+    return status;
+}
+
+void TellStrays(const Object& object, const Metadata& metadata) {
+    if (!MayHaveStrays(object)) return;
+    for (const Metadata::Stray& stray : metadata.strays) Note(stray.item + ": " + stray.reason);
+}
+
+void SetStrays(const Object& object, const Metadata& metadata, Json* entry) {
+    if (!MayHaveStrays(object) || metadata.strays.empty()) return;
+    Json strays = Json::Array();
+    for (const Metadata::Stray& stray : metadata.strays) {
+        strays.Add(Json::Object({{"item", stray.item}, {"reason", stray.reason}}));
+    }
+    entry->Set("strays", std::move(strays));
+}
 
 ExitStatus List(const ListOptions& options) { return Listing(options).Run(); }
 

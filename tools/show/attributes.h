@@ -2,12 +2,25 @@
 #ifndef MAVOEA_TOOLS_SHOW_ATTRIBUTES_H_
 #define MAVOEA_TOOLS_SHOW_ATTRIBUTES_H_
 
+#include <functional>
 #include <string>
 #include <vector>
 
+#include "tools/place/volume.h"
+#include "tools/say/json.h"
 #include "tools/say/messages.h"
+#include "tools/store/metadata.h"
 
 namespace mavoea::tool {
+
+// Hands out what each object has. What cannot be looked at is told, and is a failure; `look` may
+// throw one, too. Returns the gravest status.
+using Look = std::function<void(const Object&, const std::string& shown, const Metadata&)>;
+ExitStatus LookAtObjects(const std::vector<std::string>& paths, bool recursive, const Look& look);
+
+// What an object has twice, where other programs may have kept it, told and as "strays".
+void TellStrays(const Object& object, const Metadata& metadata);
+void SetStrays(const Object& object, const Metadata& metadata, Json* entry);
 
 struct ListOptions {
     std::vector<std::string> paths;

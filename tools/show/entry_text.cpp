@@ -2,9 +2,10 @@
 
 #include <array>
 #include <cstdint>
-#include <ctime>
 #include <vector>
 
+#include "tools/say/mac_text.h"
+#include "tools/show/dates.h"
 #include "util/bytes.h"
 
 namespace mavoea::tool {
@@ -12,22 +13,9 @@ namespace {
 
 // ---- File dates: four times, each in signed seconds since 2000-01-01 UTC ------------------------
 
-constexpr std::int64_t kAfpEpoch = 946684800;
-constexpr std::uint32_t kUnknownDate = 0x80000000;
 constexpr std::size_t kDateSize = 4;
 constexpr std::array<const char*, 4> kDateNames = {"created", "modified", "backedUp", "accessed"};
 constexpr std::array<const char*, 4> kDateLabels = {"created", "modified", "backed up", "accessed"};
-
-std::string IsoTime(std::int64_t unix_time) {
-    const auto time = static_cast<std::time_t>(unix_time);
-    std::tm fields{};
-    std::array<char, 32> text{};
-    if (::gmtime_r(&time, &fields) == nullptr ||
-        std::strftime(text.data(), text.size(), "%Y-%m-%dT%H:%M:%SZ", &fields) == 0) {
-        return "unknown";
-    }
-    return text.data();
-}
 
 struct Date {
     std::int64_t seconds = 0;  // since 2000-01-01 UTC
@@ -37,7 +25,7 @@ struct Date {
 Date DecodeDate(std::uint32_t stored) {
     if (stored == kUnknownDate) return {static_cast<std::int32_t>(stored), "unknown"};
     const std::int64_t seconds = static_cast<std::int32_t>(stored);
-    return {seconds, IsoTime(kAfpEpoch + seconds)};
+    return {seconds, *DateText(kAfpEpoch + seconds)};
 }
 
 // As many as are there whole.
