@@ -2,8 +2,11 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <pty.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <filesystem>
 #include <memory>
 
@@ -15,6 +18,7 @@ namespace mavoea::test {
 namespace {
 
 using ::testing::HasSubstr;
+using ::testing::Not;
 
 // On type 7 names are those of the file's own attributes, where users have "user." only.
 class AttributesTest : public ::testing::TestWithParam<int> {
@@ -150,6 +154,102 @@ TEST_P(AttributesTest, AValueComesFromTheCommandLineAFileOrStandardInput) {
     EXPECT_EQ(Hex("01 00 02"), volume_->Get("user.a").bytes());
     EXPECT_THAT(volume_->Run({"set", object, "user.a"}, "from input"), Succeeded());
     EXPECT_EQ("from input", volume_->Get("user.a").out);
+}
+
+TEST_P(AttributesTest, HexadecimalDigitsMayStandAsOtherProgramsShowThem) {
+    for (const char* digits : {"0x00ff4a", "0X00FF4A", "00:ff:4a", "0x00 FF:4a\n"}) {
+        ASSERT_THAT(volume_->Set("user.a", Ascii("former")), Succeeded());
+        EXPECT_THAT(volume_->Run({"set", volume_->object(), "user.a", "--hex", digits}),
+                    Succeeded());
+        EXPECT_EQ(Hex("00 FF 4A"), volume_->Get("user.a").bytes()) << digits;
+    }
+}
+
+TEST_P(AttributesTest, EveryNameThatAListShowsIsTakenBack) {
+    std::string all;
+    for (int byte = 1; byte < 256; ++byte) all += static_cast<char>(byte);
+    const std::string names[] = {"user." + all.substr(0, 127), "user." + all.substr(127),
+                                 "user.a\\x41\\"};
+    for (const std::string& name : names) {
+        ASSERT_THAT(volume_->Run({"set", volume_->object(), name, "blue"}), Succeeded());
+        const ToolResult list = volume_->List();
+        ASSERT_EQ(1, std::count(list.out.begin(), list.out.end(), '\n')) << list.out;
+        const std::string shown = list.out.substr(0, list.out.size() - 1);
+        EXPECT_EQ("blue", volume_->Run({"get", "--escaped", volume_->object(), shown}).out);
+        EXPECT_THAT(volume_->Run({"set", "--escaped", volume_->object(), shown, "red"}),
+                    Succeeded());
+        EXPECT_EQ("red", volume_->Get(name).out);
+        EXPECT_EQ(list.out, volume_->List().out);
+        EXPECT_THAT(volume_->Run({"remove", "--escaped", volume_->object(), shown}), Succeeded());
+        EXPECT_EQ("", volume_->List().out);
+    }
+}
+
+TEST_P(AttributesTest, ABrokenEscapeIsNoName) {
+    for (const char* name : {"a\\", "a\\q", "\\x", "\\x0", "\\xg0", "\\x00", "\\X41"}) {
+        for (Arguments run : {Arguments{"get"}, {"set"}, {"remove"}}) {
+            run.insert(run.end(), {"--escaped", volume_->object(), name});
+            const ToolResult result = volume_->Run(run, "value");
+            EXPECT_EQ(2, result.status) << name;
+            EXPECT_THAT(result.err, HasSubstr("begins no escape; write \"\\x0A\" for a control"));
+        }
+    }
+    EXPECT_EQ("", volume_->List().out);
+}
+
+// ---- Terminals ----------------------------------------------------------------------------------
+
+// What a command says on a terminal, and its exit status.
+struct Shown {
+    std::string text;
+    int status = -1;
+};
+
+Shown RunOnTerminal(const Arguments& arguments) {
+    ToolStart tool(arguments);
+    Shown shown;
+    int terminal = -1;
+    const pid_t child = forkpty(&terminal, nullptr, nullptr, nullptr);
+    if (child < 0) return shown;
+    if (child == 0) {
+        tool.Exec();
+        _exit(127);
+    }
+    char part[1024];
+    for (ssize_t size; (size = read(terminal, part, sizeof part)) > 0;) {
+        shown.text.append(part, static_cast<std::size_t>(size));
+    }
+    int status = 0;
+    waitpid(child, &status, 0);
+    close(terminal);
+    if (WIFEXITED(status)) shown.status = WEXITSTATUS(status);
+    return shown;
+}
+
+TEST_P(AttributesTest, ATerminalIsGivenTextOnly) {
+    const auto get = [&](Arguments options) {
+        options.insert(options.begin(),
+                       {"--volume", volume_->path() + "=" + std::to_string(GetParam()), "get"});
+        options.insert(options.end(), {volume_->object(), "user.a"});
+        return RunOnTerminal(options);
+    };
+    ASSERT_THAT(volume_->Set("user.a", Ascii("na\xC3\xAFve\tblue")), Succeeded());
+    if (get({}).status < 0) GTEST_SKIP() << "there are no terminals here";
+    EXPECT_EQ("na\xC3\xAFve\tblue", get({}).text);
+    // A command of terminals, in one byte too, a Latin-1 letter, and a letter of two bytes cut.
+    for (const char* value : {"\x1B[2J", "\xC2\x9B", "na\xEFve", "\xC3", "\r", "\x7F"}) {
+        ASSERT_THAT(volume_->Set("user.a", Ascii(value)), Succeeded());
+        const Shown refused = get({});
+        EXPECT_EQ(2, refused.status);
+        EXPECT_THAT(refused.text, HasSubstr("\"user.a\" is not text for a terminal, it has "));
+        EXPECT_THAT(refused.text, HasSubstr("--hex, lead the output into a file, or give --raw"));
+        if (std::string(value) != "\r") {  // of which a terminal has its own
+            EXPECT_THAT(refused.text, Not(HasSubstr(value)));
+        }
+        EXPECT_EQ(0, get({"--hex"}).status);
+        EXPECT_EQ(value, get({"--raw"}).text);
+        EXPECT_EQ(Ascii(value), volume_->Get("user.a").bytes());
+    }
 }
 
 TEST_P(AttributesTest, AHexDumpShowsOffsetsBytesAndText) {

@@ -84,7 +84,7 @@ TEST(CommandLineTest, HelpAndVersionAreWrittenToStandardOutput) {
 
 TEST(CommandLineTest, HexadecimalDigitsMustBeInPairs) {
     const Volume volume(0);
-    for (const char* value : {"0", "zz", "001", "0 0", "0x00"}) {
+    for (const char* value : {"0", "zz", "001", "0 0", "0x0", "0x0x00", "x00", "0:0", "00-00"}) {
         EXPECT_THAT(volume.Run({"set", "--hex", volume.object(), "a", value}),
                     Failed(2, volume.object() +
                                   ": VALUE is not hexadecimal digits; give two digits for each "

@@ -46,7 +46,7 @@ Exit status: 0 done; 1 not found, the object or the attribute; 2 anything else t
 Of cp, mv and rm: 1 something could not be done; 2 all objects arrived, and not all metadata; 130 and
 143 interrupted, after the object in hand. Under the names cp, mv and rm the tool is that command.
 A NAME or VALUE that begins with '-' stands behind "--". Control characters in names are shown as
-"\x0A", backslashes doubled; --json has names as they are.)";
+"\x0A", backslashes doubled, and --escaped takes them so; --json has names as they are.)";
 
 // CLI11 takes "[a,b]" apart where an option has several values. A byte in front keeps it whole.
 constexpr char kGuard = '\x01';
@@ -97,6 +97,8 @@ void AddNothing(CLI::App* /*sub*/, Options* /*options*/) {}
 
 void AddName(CLI::App* sub, Options* options) {
     sub->add_option("NAME", options->name, "The attribute's name")->required();
+    sub->add_flag("--escaped", options->escaped,
+                  "NAME is as list shows it: \"\\x0A\" and its like, backslashes doubled");
 }
 
 struct Syntax {
@@ -119,7 +121,8 @@ constexpr Syntax kCommands[] = {
      "Show in words what is known: Finder info, comment, tags, dates, marks, attributes", AddTree},
     {Command::kGet, "get", "Write a value to standard output",
      [](CLI::App* sub, Options* options) {
-         sub->add_flag("--hex", options->hex, "As a hex dump");
+         CLI::Option* const hex = sub->add_flag("--hex", options->hex, "As a hex dump");
+         sub->add_flag("--raw", options->raw, "As it is, to a terminal, too")->excludes(hex);
          AddPath(sub, options, "A file or directory");
          AddName(sub, options);
      }},
@@ -134,7 +137,11 @@ constexpr Syntax kCommands[] = {
                 "Take the value from a file")
              ->type_name("FILE")
              ->excludes(value);
-         sub->add_flag("--hex", options->hex, "VALUE is hexadecimal digits")->needs(value);
+         sub->add_flag(
+                "--hex", options->hex,
+                "VALUE is hexadecimal digits, behind \"0x\" or not; blanks and colons between "
+                "pairs are left out")
+             ->needs(value);
      }},
     {Command::kRemove, "remove", "Remove an attribute",
      [](CLI::App* sub, Options* options) {

@@ -59,6 +59,8 @@ struct Options {
     bool itemized = false;             // diff
     bool record = false;               // dump: the record of an object
     bool hex = false;                  // get, set
+    bool raw = false;                  // get: to a terminal, too
+    bool escaped = false;              // get, set, remove: the name is as list shows it
     std::optional<std::string> value;  // set: none of the two means standard input
     std::optional<std::string> file;
 

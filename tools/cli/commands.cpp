@@ -35,27 +35,37 @@
 namespace mavoea::tool {
 namespace {
 
-void CheckName(const Options& options) {
-    if (options.name.empty()) {
+// The attribute's name, as it is on disk.
+std::string NameIn(const Options& options) {
+    const auto name = options.escaped ? FromPrintable(options.name) : options.name;
+    if (!name) {
+        throw Failure(
+            kFailed, options.paths.front(),
+            "a backslash in \"" + options.name + "\" begins no escape",
+            "write \"\\x0A\" for a control character and \"\\\\\" for a backslash, as list "
+            "does");
+    }
+    if (name->empty()) {
         throw Failure(kFailed, options.paths.front(), "the attribute's name is empty",
                       "give it a name");
     }
-    if (options.name.size() >= kNameSizeMax) {
+    if (name->size() >= kNameSizeMax) {
         throw Failure(kFailed, options.paths.front(),
-                      "the attribute's name has " + std::to_string(options.name.size()) +
+                      "the attribute's name has " + std::to_string(name->size()) +
                           " bytes, at most " + std::to_string(kNameSizeMax - 1) + " are possible",
                       "use a shorter name");
     }
+    return *name;
 }
 
 // ---- get, set, remove ---------------------------------------------------------------------------
 
 ExitStatus GetValue(const Options& options) {
-    CheckName(options);
     const Format format = options.json  ? Format::kJson
                           : options.hex ? Format::kHexDump
-                                        : Format::kRaw;
-    return Get(options.paths.front(), options.name, format);
+                          : options.raw ? Format::kRaw
+                                        : Format::kPlain;
+    return Get(options.paths.front(), NameIn(options), format);
 }
 
 Bytes ValueToSet(const Options& options) {
@@ -83,15 +93,15 @@ std::unique_ptr<Changer> OpenToChange(const Object& object) {
 }
 
 ExitStatus Set(const Options& options) {
-    CheckName(options);
+    const std::string name = NameIn(options);
     const Object object = FindObject(options.paths.front());
     const Bytes value = ValueToSet(options);
-    OpenToChange(object)->Set(options.name, value);
-    if (const auto note = NoteOfUnseen(object, options.name, value.size())) Note(*note);
+    OpenToChange(object)->Set(name, value);
+    if (const auto note = NoteOfUnseen(object, name, value.size())) Note(*note);
     if (options.json) {
         Json json;
         json.SetText("path", object.path());
-        json.SetText("name", options.name);
+        json.SetText("name", name);
         json.Set("size", value.size());
         Print(json);
     }
@@ -99,15 +109,15 @@ ExitStatus Set(const Options& options) {
 }
 
 ExitStatus Remove(const Options& options) {
-    CheckName(options);
+    const std::string name = NameIn(options);
     const Object object = FindObject(options.paths.front());
-    if (!OpenToChange(object)->Remove(options.name)) {
-        throw NoAttribute(options.paths.front(), options.name);
+    if (!OpenToChange(object)->Remove(name)) {
+        throw NoAttribute(options.paths.front(), name);
     }
     if (options.json) {
         Json json;
         json.SetText("path", object.path());
-        json.SetText("name", options.name);
+        json.SetText("name", name);
         json.Set("removed", true);
         Print(json);
     }

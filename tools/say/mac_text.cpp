@@ -4,6 +4,8 @@
 #include <array>
 #include <ctime>
 
+#include "tools/say/text.h"
+
 namespace mavoea::tool {
 namespace {
 
@@ -22,26 +24,7 @@ constexpr std::array<std::uint16_t, 128> kMacRoman = {
     0x00AF, 0x02D8, 0x02D9, 0x02DA, 0x00B8, 0x02DD, 0x02DB, 0x02C7,
 };
 
-constexpr std::uint32_t kNoLetter = UINT32_MAX;
 constexpr std::int64_t kMacEpoch = -2082844800;  // 1904-01-01, in seconds since 1970-01-01
-
-// Takes the first letter off `text`, which is not empty; kNoLetter where that is no UTF-8.
-std::uint32_t TakeLetter(std::string_view* text) {
-    const auto byte = [&](std::size_t i) { return static_cast<std::uint8_t>((*text)[i]); };
-    const std::uint8_t first = byte(0);
-    const std::size_t size = first < 0x80 ? 1 : first < 0xE0 ? 2 : first < 0xF0 ? 3 : 4;
-    if ((first >= 0x80 && first < 0xC2) || first > 0xF4 || size > text->size()) return kNoLetter;
-    std::uint32_t letter = size == 1 ? first : first & (0x7FU >> size);
-    for (std::size_t i = 1; i < size; ++i) {
-        if ((byte(i) & 0xC0) != 0x80) return kNoLetter;
-        letter = letter << 6 | (byte(i) & 0x3FU);
-    }
-    constexpr std::array<std::uint32_t, 5> kLeast = {0, 0, 0x80, 0x800, 0x10000};
-    if (letter < kLeast[size] || letter > 0x10FFFF) return kNoLetter;
-    if (letter >= 0xD800 && letter < 0xE000) return kNoLetter;
-    text->remove_prefix(size);
-    return letter;
-}
 
 }  // namespace
 

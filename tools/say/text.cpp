@@ -20,6 +20,15 @@ constexpr int DigitValue(char c) {
 
 constexpr bool IsBlank(char c) { return c == ' ' || (c >= '\t' && c <= '\r'); }
 
+// The byte that two digits mean at that place; none where there are none.
+constexpr std::optional<std::uint8_t> HexByte(std::string_view text, std::size_t at) {
+    if (at + 1 >= text.size()) return std::nullopt;
+    const int high = DigitValue(text[at]);
+    const int low = DigitValue(text[at + 1]);
+    if (high < 0 || low < 0) return std::nullopt;
+    return static_cast<std::uint8_t>(high << 4 | low);
+}
+
 }  // namespace
 
 std::string HexNumber(std::uint64_t value, int digits) {
@@ -39,16 +48,16 @@ std::string HexDigits(ByteView bytes) {
 }
 
 std::optional<Bytes> ParseHex(std::string_view text) {
+    if (text.starts_with("0x") || text.starts_with("0X")) text.remove_prefix(2);
     Bytes bytes;
     for (std::size_t at = 0; at < text.size();) {
-        if (IsBlank(text[at])) {
+        if (IsBlank(text[at]) || text[at] == ':') {
             ++at;
             continue;
         }
-        const int high = DigitValue(text[at]);
-        const int low = at + 1 < text.size() ? DigitValue(text[at + 1]) : -1;
-        if (high < 0 || low < 0) return std::nullopt;
-        bytes.push_back(static_cast<std::uint8_t>(high << 4 | low));
+        const auto byte = HexByte(text, at);
+        if (!byte) return std::nullopt;
+        bytes.push_back(*byte);
         at += 2;
     }
     return bytes;
@@ -87,6 +96,53 @@ std::string Printable(std::string_view text) {
         }
     }
     return safe;
+}
+
+std::optional<std::string> FromPrintable(std::string_view text) {
+    std::string plain;
+    for (std::size_t at = 0; at < text.size(); ++at) {
+        if (text[at] != '\\') {
+            plain += text[at];
+            continue;
+        }
+        const char kind = ++at < text.size() ? text[at] : '\0';
+        const auto byte = kind == 'x' ? HexByte(text, at + 1) : std::nullopt;
+        if (kind == '\\') {
+            plain += kind;
+        } else if (byte.value_or(0) != 0) {
+            plain += static_cast<char>(*byte);
+            at += 2;
+        } else {
+            return std::nullopt;
+        }
+    }
+    return plain;
+}
+
+std::uint32_t TakeLetter(std::string_view* text) {
+    const auto byte = [&](std::size_t i) { return static_cast<std::uint8_t>((*text)[i]); };
+    const std::uint8_t first = byte(0);
+    const std::size_t size = first < 0x80 ? 1 : first < 0xE0 ? 2 : first < 0xF0 ? 3 : 4;
+    if ((first >= 0x80 && first < 0xC2) || first > 0xF4 || size > text->size()) return kNoLetter;
+    std::uint32_t letter = size == 1 ? first : first & (0x7FU >> size);
+    for (std::size_t i = 1; i < size; ++i) {
+        if ((byte(i) & 0xC0) != 0x80) return kNoLetter;
+        letter = letter << 6 | (byte(i) & 0x3FU);
+    }
+    constexpr std::array<std::uint32_t, 5> kLeast = {0, 0, 0x80, 0x800, 0x10000};
+    if (letter < kLeast[size] || letter > 0x10FFFF) return kNoLetter;
+    if (letter >= 0xD800 && letter < 0xE000) return kNoLetter;
+    text->remove_prefix(size);
+    return letter;
+}
+
+bool IsShownByTerminals(std::string_view text) {
+    while (!text.empty()) {
+        const std::uint32_t letter = TakeLetter(&text);
+        const bool control = letter < 0x20 || (letter >= 0x7F && letter < 0xA0);
+        if (letter == kNoLetter || (control && letter != '\t' && letter != '\n')) return false;
+    }
+    return true;
 }
 
 }  // namespace mavoea::tool

@@ -20,8 +20,8 @@ std::string HexNumber(std::uint64_t value, int digits = 8);
 // Two digits a byte, without blanks.
 std::string HexDigits(ByteView bytes);
 
-// The bytes that pairs of hexadecimal digits mean, white space between pairs ignored; none when it
-// is anything else.
+// The bytes that pairs of hexadecimal digits mean, behind "0x" or not; white space and colons
+// between pairs are ignored. None when it is anything else.
 std::optional<Bytes> ParseHex(std::string_view text);
 
 // 16 bytes a line: offset, digits, text.
@@ -30,6 +30,19 @@ std::string HexDump(ByteView bytes);
 // A name or path on one line of a terminal: control characters as "\x0A", a backslash doubled, all
 // other bytes as they are.
 std::string Printable(std::string_view text);
+
+// What Printable() has made of it, undone; "\\x" and two digits stand for any byte but NUL. None
+// when an escape is broken.
+std::optional<std::string> FromPrintable(std::string_view text);
+
+// Takes the first letter off `text`, which is not empty; kNoLetter where that is no UTF-8, overlong
+// forms and surrogates among it.
+inline constexpr std::uint32_t kNoLetter = UINT32_MAX;
+std::uint32_t TakeLetter(std::string_view* text);
+
+// Whether a terminal shows all of it and does nothing besides: UTF-8 without control characters,
+// but for tabs and line ends.
+bool IsShownByTerminals(std::string_view text);
 
 }  // namespace mavoea::tool
 

@@ -1,6 +1,7 @@
 #include "tools/show/attributes.h"
 
 #include <fcntl.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <iomanip>
@@ -149,6 +150,20 @@ std::optional<Content> Find(const Metadata& metadata, const std::string& name) {
     return attribute != nullptr ? std::optional(attribute->value) : std::nullopt;
 }
 
+// What a terminal would take for commands may do anything to it.
+void RequireShowable(const std::string& path, const std::string& name, const Content& value) {
+    if (::isatty(STDOUT_FILENO) != 1) return;
+    // More than that nobody reads on a terminal.
+    const bool small = value.size() <= kSmallFile;
+    const Bytes bytes = small ? value.All() : Bytes();
+    const std::string_view text(reinterpret_cast<const char*>(bytes.data()), bytes.size());
+    if (small && IsShownByTerminals(text)) return;
+    throw Failure(kFailed, path,
+                  NameOfAttribute(name) + (small ? " is not text" : " is too long") +
+                      " for a terminal, it has " + std::to_string(value.size()) + " bytes",
+                  "show it with --hex, lead the output into a file, or give --raw");
+}
+
 void WriteRaw(const Content& value) {
     constexpr std::uint64_t kPiece = std::uint64_t{1} << 20;
     for (std::uint64_t at = 0; at < value.size(); at += kPiece) {
@@ -215,6 +230,9 @@ ExitStatus Get(const std::string& path, const std::string& name, Format format) 
         throw Failure(metadata.problems.front());
     }
     switch (format) {
+        case Format::kPlain:
+            RequireShowable(object.path(), name, *value);
+            [[fallthrough]];
         case Format::kRaw:
             WriteRaw(*value);
             break;

@@ -33,7 +33,8 @@ struct ListOptions {
 // is a failure.
 ExitStatus List(const ListOptions& options);
 
-enum class Format { kRaw, kHexDump, kJson };
+// `kPlain`: as it is, but nothing that a terminal would take for more than text goes to one.
+enum class Format { kPlain, kRaw, kHexDump, kJson };
 
 ExitStatus Get(const std::string& path, const std::string& name, Format format);
 
