@@ -40,7 +40,21 @@ extern "C" {
 #endif
 
 struct flock64;
+#ifndef MLIBC_SZ_LIST_DECLARED
+#define MLIBC_SZ_LIST_DECLARED
 typedef struct MLIBCSzList MLIBCSzList; /* the platform's string list, see mavocore.h */
+#endif
+
+/* ---- Version -------------------------------------------------------------------------------- */
+
+/* The version of this header. Its major number is that of the soname. */
+#define MAVOEA_VERSION_MAJOR 5
+#define MAVOEA_VERSION_MINOR 0
+#define MAVOEA_VERSION_PATCH 0
+
+/* As one number to compare with: 50203 is 5.2.3. */
+#define MAVOEA_VERSION \
+    (MAVOEA_VERSION_MAJOR * 10000 + MAVOEA_VERSION_MINOR * 100 + MAVOEA_VERSION_PATCH)
 
 /* ---- Constants ------------------------------------------------------------------------------ */
 

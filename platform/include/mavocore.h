@@ -28,7 +28,11 @@ MAVOCORE_API int MLIBCErrorGetLine(void);         /* line on top, 0 when the sta
 /* ---- String lists --------------------------------------------------------------------------- */
 /* A growable list of NUL-terminated strings; it owns copies of what is pushed. */
 
+/* C99 takes a typedef once, and mavoea.h has this one, too. */
+#ifndef MLIBC_SZ_LIST_DECLARED
+#define MLIBC_SZ_LIST_DECLARED
 typedef struct MLIBCSzList MLIBCSzList;
+#endif
 
 /* An empty list with room for `capacity` strings, 0 or more; it grows past them. NULL with errno
  * EINVAL or ENOMEM. The caller frees it with MLIBCSzListFree(). */

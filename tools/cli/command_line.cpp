@@ -375,7 +375,7 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
         "mavoea");
     app.require_subcommand(1);
     app.fallthrough();
-    app.set_version_flag("--version", "mavoea " MAVOEA_VERSION, "Show the version");
+    app.set_version_flag("--version", "mavoea " MAVOEA_TOOL_VERSION, "Show the version");
     app.add_flag("--json", options.json, "Write JSON; bytes are hexadecimal digits");
     app.add_option("--volume", options.volumes,
                    "Declare a directory's volume type for this run; may be repeated")

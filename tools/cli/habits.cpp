@@ -587,7 +587,7 @@ std::variant<HabitOptions, int> ParseHabit(Habit habit, std::span<const char* co
                     PrintHelp(habit);
                     return 0;
                 case kVersion:
-                    std::cout << Speaker() << " (mavoea) " MAVOEA_VERSION "\n";
+                    std::cout << Speaker() << " (mavoea) " MAVOEA_TOOL_VERSION "\n";
                     return 0;
                 case kNoPreserveRoot: {
                     const std::string_view word = arguments[static_cast<std::size_t>(::optind - 1)];
