@@ -312,6 +312,26 @@ class WriteTest(ToolTest):
         self.tool("remove", self.path, "a:b")
         self.assertEqual({}, self.streams_on_disk())
 
+    def test_a_backup_time_makes_nobody_younger(self):
+        """A record has all four dates, and smbd takes an unknown one for one in 2068."""
+        self.open("stream")
+        self.mac.write(self.name, b"data")
+        self.write("AFP_AfpInfo", afp_info(FINDER_INFO, bytes.fromhex("11223344")))
+        for created in (TIME, None):
+            self.mac.set_attributes(self.name, NORMAL, created or 0)
+            if created is None:
+                os.removexattr(self.path, "user.DOSATTRIB")
+            copy = f"{self.name}-{created}"
+            self.tool("cp", "-p", self.path, os.path.join(server.share("netatalk"), copy))
+            with Mac(server, "netatalk") as there:
+                there.write(f"{copy}:a", b"value")  # then smbd takes it from the record
+                shown = there.creation_time(copy)
+                self.assertEqual(FINDER_INFO, there.read(f"{copy}:AFP_AfpInfo")[16:48])
+            if created is None:
+                self.assertLessEqual(shown, self.mac.creation_time(self.name))
+            else:
+                self.assertEqual(created // 10**7, shown // 10**7)
+
     def test_an_empty_attribute_is_kept_and_clients_do_not_find_it(self):
         self.open("netatalk")
         result = self.start("set", self.path, "empty")

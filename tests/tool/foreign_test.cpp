@@ -1,6 +1,7 @@
 // Places of other programs: what Samba, netatalk and those that copy attributes keep, byte for
 // byte.
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <sys/xattr.h>
@@ -56,6 +57,11 @@ Bytes operator+(Bytes one, const Bytes& other) {
 
 void Put(Bytes& into, std::size_t at, const Bytes& bytes) {
     std::copy(bytes.begin(), bytes.end(), into.begin() + static_cast<std::ptrdiff_t>(at));
+}
+
+Bytes Stretch(const Bytes& bytes, std::size_t at, std::size_t size) {
+    const auto begin = bytes.begin() + static_cast<std::ptrdiff_t>(at);
+    return {begin, begin + static_cast<std::ptrdiff_t>(size)};
 }
 
 // A record as Samba writes it: comment at 154, dates at 354, Finder info at 122, AFP info at 370.
@@ -558,6 +564,64 @@ TEST_F(ForeignTest, NothingIsWrittenBesideAnotherProgramsMetadataUnlessItsTypeIs
     EXPECT_EQ("red", RunTool({"get", elsewhere / "both", kColour}).out);
     // Whoever says that it is of another type is believed.
     EXPECT_EQ(0, RunTool({"--volume", samba_.path() + "=1", "set", other, kColour, "x"}).status);
+}
+
+// Samba takes a time of creation that a record does not know for one in 2068.
+TEST_F(ForeignTest, ARecordThatKnowsWhenItsObjectWasBackedUpKnowsWhenItWasMade) {
+    Bytes info = AfpInfo(FinderInfo());
+    Put(info, 12, FromHex("11223344"));
+    SetAttribute(stream_.file(), kAfpInfo, info + Bytes{0});
+    SetAttribute(stream_.file(), kDosAttributes, Dos(0x20));
+    const std::string to = samba_.path() + "/b";
+    EXPECT_THAT(samba_.Run({"--volume", stream_.path() + "=samba-stream", "convert", "--to",
+                            "samba", stream_.file(), to}),
+                Succeeded());
+    Bytes record = Record(FinderInfo());
+    Put(record, 354, FromHex("32933d59800000001122334480000000"));
+    EXPECT_EQ(record, Attribute(to, kRecord));
+
+    // Without DOS attributes it is the oldest time that is known; the copy is a new file.
+    lremovexattr(stream_.file().c_str(), kDosAttributes.c_str());
+    const timespec times[] = {{1000000000, 0}, {1000000000, 0}};
+    ASSERT_EQ(0, utimensat(AT_FDCWD, stream_.file().c_str(), times, 0));
+    const std::string other = samba_.path() + "/c";
+    EXPECT_THAT(samba_.Run({"--volume", stream_.path() + "=samba-stream", "convert", "--to",
+                            "samba", stream_.file(), other}),
+                Succeeded());
+    Put(record, 354, FromHex("11223344800000001122334480000000"));
+    EXPECT_EQ(record, Attribute(other, kRecord));
+
+    // netatalk knows that nothing is known, until a record of its is changed where Samba reads it.
+    Put(record, 354, FromHex("80000000800000001122334480000000"));
+    SetAttribute(other, kRecord, record);
+    ASSERT_EQ(0, utimensat(AT_FDCWD, other.c_str(), times, 0));
+    EXPECT_THAT(samba_.Run({"set", other, kFinderInfoName, "--hex", std::string(64, '1')}),
+                Succeeded());
+    EXPECT_EQ(FromHex("032d8680"), Stretch(*Attribute(other, kRecord), 354, 4));
+}
+
+TEST_F(ForeignTest, DatesThatAreKeptInTwoPlacesAreReadTogether) {
+    Bytes record = Record(FinderInfo());
+    Put(record, 354, FromHex("01020304050607081122334480000000"));
+    SetAttribute(samba_.file(), kRecord, record);
+    const std::string away = stream_.path() + "/b";
+    const std::string back = samba_.path() + "/b";
+    const std::string volume = stream_.path() + "=samba-stream";
+    EXPECT_THAT(
+        samba_.Run({"--volume", volume, "convert", "--to", "samba-stream", samba_.file(), away}),
+        Succeeded());
+    EXPECT_EQ(FromHex("11223344"), Stretch(*Attribute(away, kAfpInfo), 12, 4));
+    EXPECT_THAT(samba_.Run({"--volume", volume, "convert", "--to", "samba", away, back}),
+                Succeeded());
+    EXPECT_EQ(record, Attribute(back, kRecord));
+
+    // Two that are both known and differ are two values.
+    Bytes info = AfpInfo(FinderInfo());
+    Put(info, 12, FromHex("11223345"));
+    SetAttribute(away, kAfpInfo, info + Bytes{0});
+    const ToolResult copied = samba_.Run({"--volume", volume, "cp", away, samba_.path() + "/c"});
+    EXPECT_EQ(2, copied.status);
+    EXPECT_THAT(copied.err, HasSubstr("a second file dates"));
 }
 
 // ---- streams_depot ------------------------------------------------------------------------------

@@ -26,6 +26,12 @@ std::unique_ptr<ChangedFile> ChangedFile::Open(const Place& object, const Place&
     return changed;
 }
 
+bool ChangedFile::HoldAgain() const {
+    if (!existing_) return false;
+    LockFile(*existing_, Access::kWrite);
+    return existing_->Status().st_nlink == 1;
+}
+
 void ChangedFile::Commit() {
     if (!made_) return;
     rights_.Give(made_->file());

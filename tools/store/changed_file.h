@@ -21,6 +21,10 @@ class ChangedFile {
 
     void Commit();
 
+    // For another change: locks it anew, since whoever closes any descriptor of it lets go of the
+    // lock. False when it was made, or has another name or none by now: then it is to be opened.
+    bool HoldAgain() const;
+
  private:
     ChangedFile() = default;
 

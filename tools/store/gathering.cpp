@@ -44,6 +44,13 @@ void Gathering::AddEntry(EntryId id, Content value, const Origin& origin) {
     std::optional<Metadata::Item> item;
     if (const auto other = metadata_.entries.find(id); other != metadata_.entries.end()) {
         item = other->second;
+        const bool whole = !value.damaged() && !item->value.damaged();
+        if (whole && id == EntryId::kFileDates) {
+            if (auto dates = JoinedDates(item->value.All(), value.All())) {
+                other->second.value = Content(*std::move(dates));
+                return;
+            }
+        }
     }
     Take(&item, NameOfEntry(id), std::move(value), origin);
     metadata_.entries.insert_or_assign(id, *std::move(item));

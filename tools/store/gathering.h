@@ -26,7 +26,8 @@ class Gathering {
     void AddFinderInfo(Content value, const Origin& origin);
     // An empty one says nothing, and one that stands for none gives way to any other.
     void AddFork(Content value, const Origin& origin);
-    // The lock is kept as it is; what else says nothing is left out.
+    // The lock is kept as it is; what else says nothing is left out. Dates that are known in one
+    // place only count.
     void AddEntry(EntryId id, Content value, const Origin& origin);
     // Of two of one name in one file the last is meant.
     void AddAttribute(Metadata::Attribute attribute);

@@ -78,7 +78,7 @@ std::vector<Missing> WhatIsMissing(const Metadata& wanted, const Metadata& found
         if (at == found.entries.end()) {
             const Bytes bytes = item.value.damaged() ? Bytes{1} : WithoutLock(id, item.value.All());
             if (SaysSomething(id, bytes)) add(NameOfEntry(id), kNotThere);
-        } else if (WithoutLock(id, item.value.All()) != WithoutLock(id, at->second.value.All())) {
+        } else if (!SaysAll(id, at->second.value.All(), item.value.All())) {
             add(NameOfEntry(id), "what is there differs");
         }
     }
@@ -148,6 +148,24 @@ bool SaysSomething(EntryId id, const Bytes& bytes) {
     return std::any_of(meant.begin(), meant.end(), [&](std::uint8_t byte) {
         return byte != 0 && (id != EntryId::kFileDates || byte != kUnknown);
     });
+}
+
+std::optional<Bytes> JoinedDates(Bytes dates, const Bytes& others) {
+    if (dates.size() != kFileDatesSize || others.size() != kFileDatesSize) return std::nullopt;
+    for (std::size_t at = 0; at < kFileDatesSize; at += sizeof kUnknownDate) {
+        const std::uint32_t date = LoadBe32(&dates[at]);
+        const std::uint32_t other = LoadBe32(&others[at]);
+        if (date == other || other == kUnknownDate) continue;
+        if (date != kUnknownDate) return std::nullopt;
+        StoreBe32(other, &dates[at]);
+    }
+    return dates;
+}
+
+bool SaysAll(EntryId id, const Bytes& there, const Bytes& wanted) {
+    const Bytes bytes = WithoutLock(id, there);
+    if (bytes == WithoutLock(id, wanted)) return true;
+    return id == EntryId::kFileDates && JoinedDates(bytes, wanted) == bytes;
 }
 
 Bytes WithoutLock(EntryId id, Bytes bytes) {

@@ -126,6 +126,13 @@ std::string Joined(const std::vector<Missing>& missing);
 // lock, which is a state of its own.
 bool SaysSomething(EntryId id, const Bytes& bytes);
 
+// What two entries of file dates know together; none where they know different ones, or have
+// another size.
+std::optional<Bytes> JoinedDates(Bytes dates, const Bytes& others);
+// Whether an entry says all that is wanted of it, without the lock. Dates may be known there that
+// nobody has asked for.
+bool SaysAll(EntryId id, const Bytes& there, const Bytes& wanted);
+
 // An entry's bytes without the lock.
 Bytes WithoutLock(EntryId id, Bytes bytes);
 

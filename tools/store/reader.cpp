@@ -20,6 +20,7 @@ namespace mavoea::tool {
 namespace {
 
 using Found = Sidecars::Found;
+using Names = std::vector<std::string>;
 
 void AddService(const Found& found, const std::string& name, Metadata* metadata) {
     Noting(metadata, [&] {
@@ -55,14 +56,15 @@ void AddFolder(const Sidecars& sidecars, Metadata* metadata) {
 class Reader {
  public:
     virtual ~Reader() = default;
-    virtual Metadata Read(const Inode& inode, const Sidecars& sidecars) const = 0;
+    virtual Metadata Read(const Inode& inode, const Names& attributes,
+                          const Sidecars& sidecars) const = 0;
 };
 
 // ---- Volumes that keep one "._" file ------------------------------------------------------------
 
 class AppleDoubleReader final : public Reader {
  public:
-    Metadata Read(const Inode&, const Sidecars& sidecars) const override {
+    Metadata Read(const Inode&, const Names&, const Sidecars& sidecars) const override {
         Metadata metadata;
         if (sidecars.apple_double) {
             metadata.whole_apple_double = ReadFound(*sidecars.apple_double, &metadata);
@@ -77,7 +79,7 @@ class AppleDoubleReader final : public Reader {
 
 class EaDirectoryReader : public Reader {
  public:
-    Metadata Read(const Inode& inode, const Sidecars& sidecars) const override {
+    Metadata Read(const Inode& inode, const Names&, const Sidecars& sidecars) const override {
         Metadata metadata;
         ReadFirst(inode, &metadata);
         if (sidecars.resource) {
@@ -170,7 +172,8 @@ class FileEaReader final : public EaDirectoryReader {
 
 class AttributeReader final : public Reader {
  public:
-    Metadata Read(const Inode& inode, const Sidecars& sidecars) const override {
+    Metadata Read(const Inode& inode, const Names& attributes,
+                  const Sidecars& sidecars) const override {
         Metadata metadata;
         AddServices(sidecars, &metadata);
         AddFolder(sidecars, &metadata);
@@ -179,8 +182,7 @@ class AttributeReader final : public Reader {
                                        "volumes of the source's type keep no such file",
                                        file->path()});
         }
-        if (!inode.HoldsContents()) return metadata;
-        for (const std::string& name : inode.AttributeNames()) {
+        for (const std::string& name : attributes) {
             if (IsMark(name) || IsOfTheSystem(name)) continue;
             Noting(&metadata, [&] { ReadAttribute(inode, name, &metadata); });
         }
@@ -227,8 +229,8 @@ class AttributeReader final : public Reader {
 void AddUndeclared(const Inode& inode, const std::vector<std::string>& names, Metadata* metadata) {
     const auto sign = SignIn(names);
     if (!sign) return;
-    AddForeignAttributes(*sign->dialect, inode, metadata);
-    AddForeignAttributes(AnyDialect(), inode, metadata);
+    AddForeignAttributes(*sign->dialect, inode, names, metadata);
+    AddForeignAttributes(AnyDialect(), inode, names, metadata);
     TakeMarksFromWord(metadata);
 }
 
@@ -236,28 +238,35 @@ void AddUndeclared(const Inode& inode, const std::vector<std::string>& names, Me
 
 Metadata ReadMetadata(const Object& object, const Inode& inode, const Sidecars& sidecars) {
     Metadata metadata;
+    std::vector<std::string> names;
+    std::optional<Failure> unlisted;
+    if (inode.HoldsContents()) {
+        try {
+            names = inode.AttributeNames();
+        } catch (const Failure& failure) {
+            unlisted = failure;
+        }
+    }
     const auto* const reader =
         OneFor<Reader, AppleDoubleReader, EaDirectoryReader, FileEaReader, AttributeReader>(
             object.kind());
     if (const Dialect* const dialect = object.dialect()) {
-        metadata = ReadForeign(*dialect, inode, sidecars);
+        metadata = ReadForeign(*dialect, inode, names, sidecars);
         AddServices(sidecars, &metadata);
         AddFolder(sidecars, &metadata);
     } else if (reader != nullptr && !object.is_root()) {
-        metadata = reader->Read(inode, sidecars);
+        metadata = reader->Read(inode, names, sidecars);
     }
     if (sidecars.problem) metadata.problems.push_back(*sidecars.problem);
-    if (!inode.HoldsContents()) return metadata;
-    Noting(&metadata, [&] {
-        const std::vector<std::string> names = inode.AttributeNames();
-        if (const std::string depot = FindDepot(object, &inode, names); !depot.empty()) {
-            metadata.problems.push_back(DepotIsUnknown(object, depot));
-        }
-        if (reader != nullptr && !object.is_root() && !object.declared) {
-            Noting(&metadata, [&] { AddUndeclared(inode, names, &metadata); });
-        }
-        ReadMarks(object, inode, names, &metadata);
-    });
+    if (unlisted) metadata.problems.push_back(*unlisted);
+    if (!inode.HoldsContents() || unlisted) return metadata;
+    if (const std::string depot = FindDepot(object, &inode, names); !depot.empty()) {
+        metadata.problems.push_back(DepotIsUnknown(object, depot));
+    }
+    if (reader != nullptr && !object.is_root() && !object.declared) {
+        Noting(&metadata, [&] { AddUndeclared(inode, names, &metadata); });
+    }
+    Noting(&metadata, [&] { ReadMarks(object, inode, names, &metadata); });
     return metadata;
 }
 

@@ -206,6 +206,10 @@ class Comparison {
             } else if (value->second.damaged() || there->second.damaged()) {
                 continue;  // told as what cannot be read
             } else {
+                if (key == Key{Aspect::kEntry, NameOfEntry(EntryId::kFileDates)} &&
+                    SaysAll(EntryId::kFileDates, there->second.All(), value->second.All())) {
+                    continue;
+                }
                 difference.offset = FirstDifference(value->second, there->second);
                 if (!difference.offset) continue;
             }

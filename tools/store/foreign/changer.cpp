@@ -1,6 +1,7 @@
 #include "tools/store/foreign/changer.h"
 
 #include <algorithm>
+#include <initializer_list>
 
 #include "format/afp_info.h"
 #include "tools/store/apple_double_file.h"
@@ -51,7 +52,7 @@ class ForeignChanger final : public Changer {
         switch (KindOf(name)) {
             case Kind::kAttribute:
             case Kind::kLocked: {
-                const bool removed = RemoveSpellings(Datum::kAttribute, name);
+                const bool removed = RemoveSpellings({Datum::kAttribute}, name);
                 return RemoveFromFile(name) || removed;
             }
             case Kind::kFinderInfo:
@@ -59,12 +60,12 @@ class ForeignChanger final : public Changer {
             case Kind::kResourceFork:
                 break;
         }
-        const bool removed = RemoveSpellings(Datum::kFork, {});
+        const bool removed = RemoveSpellings({Datum::kFork}, {});
         return RemoveFork() || removed;
     }
 
  private:
-    void SetAttribute(const std::string& name, const Bytes& value) const {
+    void SetAttribute(const std::string& name, const Bytes& value) {
         const auto spelling = SpellAttribute(name, dialect_);
         if (!spelling) {
             throw Failure(kFailed, object_.path(),
@@ -75,25 +76,24 @@ class ForeignChanger final : public Changer {
                           "give it another name");
         }
         Store(*inode_, *spelling, value);
-        (void)RemoveSpellings(Datum::kAttribute, name, spelling->attribute);
+        (void)RemoveSpellings({Datum::kAttribute}, name, spelling->attribute);
         // From there it would be taken over what has just been stored.
         (void)RemoveFromFile(name);
     }
 
-    void SetFinderInfo(const Bytes& value) const {
+    void SetFinderInfo(const Bytes& value) {
         if (dialect_.finder_info == Dialect::FinderInfo::kRecord) {
             ForeignRecord record = ForeignRecord::Read(*inode_);
             record.Set(EntryId::kFinderInfo, value);
             record.Store(*inode_, dialect_);
-            (void)RemoveSpellings(Datum::kAfpInfo, {});
-            (void)RemoveSpellings(Datum::kFinderInfo, {});
+            (void)RemoveSpellings({Datum::kAfpInfo, Datum::kFinderInfo}, {});
         } else {
             const Spelling spelling = SpellFinderInfo(dialect_);
             if (spelling.datum == Datum::kAfpInfo) {
                 StoreAfpInfo(spelling, value);
             } else {
                 Store(*inode_, spelling, value);
-                (void)RemoveSpellings(Datum::kAfpInfo, {});
+                (void)RemoveSpellings({Datum::kAfpInfo}, {});
             }
             ClearRecord();
         }
@@ -110,9 +110,8 @@ class ForeignChanger final : public Changer {
         Store(*inode_, spelling, Bytes(bytes.begin(), bytes.end()));
     }
 
-    bool RemoveFinderInfo() const {
-        bool removed = RemoveSpellings(Datum::kAfpInfo, {});
-        removed |= RemoveSpellings(Datum::kFinderInfo, {});
+    bool RemoveFinderInfo() {
+        bool removed = RemoveSpellings({Datum::kAfpInfo, Datum::kFinderInfo}, {});
         removed |= ClearRecord();
         removed |= SetFinderInfoOfFile(Bytes(kFinderInfoSize));
         return removed;
@@ -126,26 +125,26 @@ class ForeignChanger final : public Changer {
         return true;
     }
 
-    void SetFork(const Bytes& value) const {
+    void SetFork(const Bytes& value) {
         // Samba looks for it there, too, if it is told to.
         const bool in_attribute = dialect_.fork == Dialect::Fork::kAttribute ||
                                   (dialect_.names == Dialect::Names::kStream &&
                                    inode_->Attribute(SpellFork(dialect_).attribute).has_value());
         if (in_attribute) {
             Store(*inode_, SpellFork(dialect_), value);
-            (void)RemoveSpellings(Datum::kFork, {}, SpellFork(dialect_).attribute);
+            (void)RemoveSpellings({Datum::kFork}, {}, SpellFork(dialect_).attribute);
             (void)RemoveFork();
             return;
         }
-        const auto file = OpenFile(true);
+        ChangedFile* const file = OpenFile(true);
         if (file->file().Size() == 0) file->file().Write(0, EncodeForkHead(0));
         AppleDoubleFile(*file).SetFork(value);
         file->Commit();
-        (void)RemoveSpellings(Datum::kFork, {});
+        (void)RemoveSpellings({Datum::kFork}, {});
     }
 
-    bool RemoveFork() const {
-        const auto opened = OpenFile(false);
+    bool RemoveFork() {
+        const ChangedFile* const opened = OpenFile(false);
         if (!opened) return false;
         AppleDoubleFile file(*opened);
         if (file.ForkLength() == 0) return false;
@@ -154,8 +153,8 @@ class ForeignChanger final : public Changer {
         return true;
     }
 
-    bool SetFinderInfoOfFile(const Bytes& value) const {
-        const auto opened = OpenFile(false);
+    bool SetFinderInfoOfFile(const Bytes& value) {
+        const ChangedFile* const opened = OpenFile(false);
         if (!opened) return false;
         AppleDoubleFile file(*opened);
         if (!file.HasFinderInfo()) return false;
@@ -163,31 +162,35 @@ class ForeignChanger final : public Changer {
         return true;
     }
 
-    bool RemoveFromFile(const std::string& name) const {
-        const auto opened = OpenFile(false);
+    bool RemoveFromFile(const std::string& name) {
+        const ChangedFile* const opened = OpenFile(false);
         if (!opened) return false;
         inode_->Sync();
         return StreamFile(*opened).Remove(name);
     }
 
-    // The "._" file, if there is one or it is to be made.
-    std::unique_ptr<ChangedFile> OpenFile(bool make) const {
+    // The "._" file, if there is one or it is to be made. It stays open for what is changed next.
+    ChangedFile* OpenFile(bool make) {
+        if (file_ && file_->HoldAgain()) return file_.get();
+        file_.reset();  // which lets go of all locks of that file
         const Place& place = object_.place;
         const std::string name = AppleDoubleName(place.name);
         if (object_.keeping() == Keeping::kAppleDouble && !name.empty()) {
-            return ChangedFile::Open(place, {place.directory, name}, make);
+            file_ = ChangedFile::Open(place, {place.directory, name}, make);
+            return file_.get();
         }
         if (!make) return nullptr;
         throw Failure(kFailed, object_.path(), "its name is too long for a \"._\" file",
                       "use a shorter name");
     }
 
-    // All but one.
-    bool RemoveSpellings(Datum datum, const std::string& name, const std::string& but = {}) const {
+    // All but one. Those of one name, where they are attributes.
+    bool RemoveSpellings(std::initializer_list<Datum> data, const std::string& name,
+                         const std::string& but = {}) const {
         bool removed = false;
         for (const Spelling& spelling : SpellingsOf(*inode_, dialect_)) {
-            const bool is_it =
-                spelling.datum == datum && (datum != Datum::kAttribute || spelling.name == name);
+            const bool is_it = std::find(data.begin(), data.end(), spelling.datum) != data.end() &&
+                               (spelling.datum != Datum::kAttribute || spelling.name == name);
             if (is_it && spelling.attribute != but) removed |= Drop(*inode_, spelling);
         }
         return removed;
@@ -196,6 +199,7 @@ class ForeignChanger final : public Changer {
     const Object object_;
     const Dialect& dialect_;
     std::shared_ptr<const Inode> inode_;
+    std::unique_ptr<ChangedFile> file_;
 };
 
 }  // namespace

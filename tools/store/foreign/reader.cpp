@@ -1,7 +1,5 @@
 #include "tools/store/foreign/reader.h"
 
-#include <vector>
-
 #include "format/afp_info.h"
 #include "tools/store/apple_double_reader.h"
 #include "tools/store/foreign/apple_double.h"
@@ -78,17 +76,15 @@ class ForeignReader {
 
 }  // namespace
 
-Metadata ReadForeign(const Dialect& dialect, const Inode& inode, const Sidecars& sidecars) {
+Metadata ReadForeign(const Dialect& dialect, const Inode& inode,
+                     const std::vector<std::string>& attributes, const Sidecars& sidecars) {
     Metadata metadata;
     const auto& apple_double = sidecars.apple_double;
     // Samba takes over what a Mac has put into the file whenever a client looks.
     const bool macs = apple_double && dialect.marks == Dialect::Marks::kDosAttributes &&
                       apple_double->file && IsMacs(*apple_double->file);
     if (macs) (void)ReadFound(*apple_double, &metadata);
-    std::vector<Spelling> spellings;
-    if (inode.HoldsContents()) {
-        Noting(&metadata, [&] { spellings = SpellingsOf(inode, dialect); });
-    }
+    const std::vector<Spelling> spellings = SpellingsAmong(attributes, dialect);
     ForeignReader reader(inode, &metadata);
     for (const Spelling& spelling : spellings) {
         if (spelling.datum != Datum::kFork) reader.Read(spelling);
@@ -101,9 +97,10 @@ Metadata ReadForeign(const Dialect& dialect, const Inode& inode, const Sidecars&
     return metadata;
 }
 
-void AddForeignAttributes(const Dialect& dialect, const Inode& inode, Metadata* metadata) {
+void AddForeignAttributes(const Dialect& dialect, const Inode& inode,
+                          const std::vector<std::string>& attributes, Metadata* metadata) {
     ForeignReader reader(inode, metadata);
-    for (const Spelling& spelling : SpellingsOf(inode, dialect)) {
+    for (const Spelling& spelling : SpellingsAmong(attributes, dialect)) {
         if (spelling.certain) reader.Read(spelling);
     }
 }

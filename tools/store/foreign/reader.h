@@ -2,6 +2,9 @@
 #ifndef MAVOEA_TOOLS_STORE_FOREIGN_READER_H_
 #define MAVOEA_TOOLS_STORE_FOREIGN_READER_H_
 
+#include <string>
+#include <vector>
+
 #include "tools/place/volume.h"
 #include "tools/store/metadata.h"
 #include "tools/store/sidecars.h"
@@ -9,10 +12,13 @@
 namespace mavoea::tool {
 
 // All of it, in whatever spelling; the dialect's own counts. Marks are left to ReadMarks().
-Metadata ReadForeign(const Dialect& dialect, const Inode& inode, const Sidecars& sidecars);
+// `attributes`: the names of the object's own.
+Metadata ReadForeign(const Dialect& dialect, const Inode& inode,
+                     const std::vector<std::string>& attributes, const Sidecars& sidecars);
 
 // Adds what the attributes of an object hold that no other program would have given such names.
-void AddForeignAttributes(const Dialect& dialect, const Inode& inode, Metadata* metadata);
+void AddForeignAttributes(const Dialect& dialect, const Inode& inode,
+                          const std::vector<std::string>& attributes, Metadata* metadata);
 
 }  // namespace mavoea::tool
 

@@ -1,9 +1,11 @@
 #include "tools/store/foreign/record.h"
 
 #include <algorithm>
+#include <utility>
 
 #include "format/netatalk_record.h"
 #include "tools/say/messages.h"
+#include "tools/store/foreign/marks.h"
 #include "tools/store/foreign/spelling.h"
 #include "tools/store/layout.h"
 #include "tools/store/metadata.h"
@@ -30,6 +32,57 @@ bool SmbdTakes(const Layout& layout, std::size_t size) {
         if (data.offset == 0 || data.length > room || !whole || data.end() > size) return false;
     }
     return true;
+}
+
+// The seconds of records, from 2000-01-01.
+std::uint32_t DateOf(std::int64_t unix_seconds) {
+    constexpr std::int64_t kEpoch = 946684800;
+    const std::int64_t seconds = unix_seconds - kEpoch;
+    return std::in_range<std::int32_t>(seconds) ? static_cast<std::uint32_t>(seconds)
+                                                : kUnknownDate;
+}
+
+// When it was made. Where nobody has said Samba answers with the oldest time of the file, which a
+// copy may not have yet: none of the other dates was before.
+std::uint32_t CreationDateOf(const Inode& object, std::optional<std::uint64_t> created,
+                             const Bytes& dates) {
+    if (!created) {
+        const auto dos = DosAttributesOf(object);
+        if (dos) created = dos->creation_time;
+    }
+    if (created) {
+        constexpr std::uint64_t kSecond = 10'000'000;
+        constexpr std::int64_t kBefore1970 = 11'644'473'600;
+        return DateOf(static_cast<std::int64_t>(*created / kSecond) - kBefore1970);
+    }
+    const struct stat info = object.Status();
+    auto oldest = static_cast<std::int32_t>(
+        DateOf(std::min({info.st_mtim.tv_sec, info.st_atim.tv_sec, info.st_ctim.tv_sec})));
+    for (std::size_t at = 0; at < dates.size(); at += sizeof kUnknownDate) {
+        const std::uint32_t date = LoadBe32(&dates[at]);
+        if (date != kUnknownDate) oldest = std::min(oldest, static_cast<std::int32_t>(date));
+    }
+    return static_cast<std::uint32_t>(oldest);
+}
+
+// Samba takes an unknown time of creation for one in 2068. Where nothing is known new dates have no
+// length; where any is, that one is said.
+Bytes DatesForSamba(Bytes dates, const Inode& object, std::optional<std::uint64_t> created) {
+    if (!SaysSomething(EntryId::kFileDates, dates)) return dates;
+    if (LoadBe32(dates.data()) == kUnknownDate) {
+        StoreBe32(CreationDateOf(object, created, dates), dates.data());
+    }
+    return dates;
+}
+
+// For netatalk they are unknown ones.
+Bytes DatesForNetatalk(Bytes dates) {
+    if (!dates.empty()) return dates;
+    dates.resize(kFileDatesSize);
+    for (std::size_t at = 0; at < dates.size(); at += sizeof kUnknownDate) {
+        StoreBe32(kUnknownDate, &dates[at]);
+    }
+    return dates;
 }
 
 }  // namespace
@@ -67,20 +120,11 @@ bool ForeignRecord::SaysAnything() const {
     });
 }
 
-// Dates that are not known have no length for Samba, which takes an unknown time of creation for
-// one in 2068, and are unknown ones for netatalk.
-Bytes ForeignRecord::Encode(const Dialect& dialect) const {
+Bytes ForeignRecord::Encode(const Bytes& dates) const {
     auto layout = kFreshRecord;
-    Bytes dates = Entry(EntryId::kFileDates);
-    if (dates.empty() && dialect.marks == Dialect::Marks::kDosAttributes) {
-        for (RecordEntry& entry : layout) {
-            if (static_cast<EntryId>(entry.id) == EntryId::kFileDates) entry.data.length = 0;
-        }
-    } else if (dates.empty()) {
-        dates.resize(kFileDatesSize);
-        for (std::size_t at = 0; at < dates.size(); at += sizeof kUnknownDate) {
-            StoreBe32(kUnknownDate, &dates[at]);
-        }
+    for (RecordEntry& entry : layout) {
+        const bool is_dates = static_cast<EntryId>(entry.id) == EntryId::kFileDates;
+        if (is_dates && dates.empty()) entry.data.length = 0;
     }
     Bytes block(kAttributeBlockSize);
     const auto bytes_of = [&](std::uint32_t id) -> ByteView {
@@ -91,9 +135,13 @@ Bytes ForeignRecord::Encode(const Dialect& dialect) const {
     return block;
 }
 
-void ForeignRecord::Store(const Inode& object, const Dialect& dialect) const {
+void ForeignRecord::Store(const Inode& object, const Dialect& dialect,
+                          std::optional<std::uint64_t> created) const {
     if (!there_ && !SaysAnything()) return;
-    const Bytes block = Encode(dialect);
+    const Bytes& dates = Entry(EntryId::kFileDates);
+    const Bytes block = Encode(dialect.marks == Dialect::Marks::kDosAttributes
+                                   ? DatesForSamba(dates, object, created)
+                                   : DatesForNetatalk(dates));
     if (!SmbdTakes(ReadLayout(ByteView(block)), block.size())) {
         throw Failure(kFailed, object.path(), "its netatalk record would be damaged",
                       "nothing has been written");

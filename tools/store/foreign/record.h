@@ -2,6 +2,7 @@
 #ifndef MAVOEA_TOOLS_STORE_FOREIGN_RECORD_H_
 #define MAVOEA_TOOLS_STORE_FOREIGN_RECORD_H_
 
+#include <cstdint>
 #include <map>
 #include <optional>
 
@@ -27,11 +28,13 @@ class ForeignRecord {
     bool SaysAnything() const;
 
     // Never one that smbd would remove. A record that says nothing is stored only where there is
-    // one already.
-    void Store(const Inode& object, const Dialect& dialect) const;
+    // one already. `created`: when the object was made, in 100 ns from 1601-01-01, where its DOS
+    // attributes do not say so yet.
+    void Store(const Inode& object, const Dialect& dialect,
+               std::optional<std::uint64_t> created = {}) const;
 
  private:
-    Bytes Encode(const Dialect& dialect) const;
+    Bytes Encode(const Bytes& dates) const;
 
     std::map<EntryId, Bytes> entries_;
     bool there_ = false;

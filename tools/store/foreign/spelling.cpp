@@ -86,8 +86,13 @@ std::optional<Spelling> SpellingOf(const std::string& attribute, const Dialect& 
 }
 
 std::vector<Spelling> SpellingsOf(const Inode& inode, const Dialect& dialect) {
+    return SpellingsAmong(inode.AttributeNames(), dialect);
+}
+
+std::vector<Spelling> SpellingsAmong(const std::vector<std::string>& attributes,
+                                     const Dialect& dialect) {
     std::vector<Spelling> all;
-    for (const std::string& attribute : inode.AttributeNames()) {
+    for (const std::string& attribute : attributes) {
         if (auto spelling = SpellingOf(attribute, dialect)) all.push_back(*std::move(spelling));
     }
     std::stable_partition(all.begin(), all.end(), [](const Spelling& one) { return one.own; });

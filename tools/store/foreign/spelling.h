@@ -38,7 +38,9 @@ struct Spelling {
 // continuation of another.
 std::optional<Spelling> SpellingOf(const std::string& attribute, const Dialect& dialect);
 
-// All that an object has, the dialect's own first.
+// All that an object of such attributes has, the dialect's own first.
+std::vector<Spelling> SpellingsAmong(const std::vector<std::string>& attributes,
+                                     const Dialect& dialect);
 std::vector<Spelling> SpellingsOf(const Inode& inode, const Dialect& dialect);
 
 // How the dialect spells an attribute of that name; none where it would mean something else, or is

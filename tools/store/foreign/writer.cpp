@@ -135,7 +135,7 @@ class ForeignWriter final : public Writer {
             }
             if (!record.SaysAnything()) return;
             kept_.insert(kRecordAttribute);
-            Noting("netatalk record", [&] { record.Store(inode_, dialect_); });
+            Noting("netatalk record", [&] { record.Store(inode_, dialect_, fitting.created); });
         }
 
         // Other spellings of what has been written, and what is not to be there any more. Further
