@@ -8,6 +8,7 @@ those file systems have no place for the rest. Beside each run stands one of
 so that whatever else the machine does hits both, and the table has the ratio of their medians.
 
 `list -r` stands beside what reads the same files: find alone asks the kernel nothing of an object.
+What Samba keeps of them is listed beside `getfattr -R`, and converted beside `cp -a` with attributes.
 
 All of mavoea cp, mv and convert have written to disk what they carried before they end, so
 `cp -a` is followed by `sync -f`; and where the tool moves, by `rm -r` of the source.
@@ -27,6 +28,7 @@ import tempfile
 import time
 
 KINDS = {0: '"._" files', 1: "EA directory", 2: "file EA", 7: "extended attributes"}
+SAMBA = "samba"  # whose metadata is compared with what copies and reads attributes
 PLAIN = 7  # where ext4 and tmpfs take attributes with names of "user." only, and no forks
 PER_DIRECTORY = 100
 FILE_SYSTEMS = ("ext4", "tmpfs")
@@ -269,12 +271,34 @@ def looking(kind):
         yield Work("upgrade -r", str(kind), source, ours("upgrade", "-r"), theirs("find"))
 
 
+def sharing():
+    """The work on a share of Samba's: nearly all of it is in attributes of the objects."""
+    def source(volumes, file_system):
+        return volumes.tree(file_system, SAMBA, True)
+
+    def listing(volumes, tree, target):
+        return [[*volumes.command((tree, SAMBA)), "list", "-r", tree]]
+
+    def reading(volumes, tree, target):
+        return [["getfattr", "-R", "-d", "-m", "-", tree]]
+
+    def convert(volumes, tree, target):
+        return [volumes.convert(tree, SAMBA, target, SAMBA)]
+
+    def copy(volumes, tree, target):
+        return [["cp", "-a", "--preserve=xattr", tree, target], ["sync", "-f", target]]
+
+    yield Work("list -r", SAMBA, source, listing, reading)
+    yield Work("convert", f"{SAMBA} to {SAMBA}", source, convert, copy)
+
+
 def all_work():
     for kind in KINDS:
         for to in KINDS:
             yield from carrying(kind, to)
     for kind in KINDS:
         yield from looking(kind)
+    yield from sharing()
 
 
 # ---- The table ----------------------------------------------------------------------------------
@@ -292,7 +316,7 @@ def print_result(work, ratios, counts):
 
 def print_markdown(results):
     """The table for the README: a row for each kind that is copied from, or looked at."""
-    columns = list(KINDS)
+    columns = [*KINDS, SAMBA]
     print("| Command, kind | " + " | ".join(f"to {to}" for to in columns) + " |")
     print("|---" * (len(columns) + 1) + "|")
     rows = {}
