@@ -274,6 +274,11 @@ std::vector<Look> ShowingLooks() {
          [](const World& world) {
              return Runs{{"list", "-r", world.top()}, {"list", "-l", "-r", world.top()}};
          }},
+        {"Show", [](const World& world) { return OfAll(world.objects(), {"show"}); }},
+        {"ShowOfATree",
+         [](const World& world) {
+             return Runs{{"show", "-r", world.top()}, {"--json", "show", "-r", world.top()}};
+         }},
         {"Get", Gets},
         {"Dump", [](const World& world) { return OfEach(world.MetadataFiles(), {"dump"}); }},
         {"DumpOfRecords",
@@ -703,6 +708,7 @@ class UnreadableTest : public EarlierTest {
                  {"list", "-l", object()},
                  {"--json", "list", object()},
                  {"list", "-r", volume_.path()},
+                 {"show", object()},
                  {"get", object(), name},
              }) {
             SCOPED_TRACE(::testing::PrintToString(run));

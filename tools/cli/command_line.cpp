@@ -17,6 +17,7 @@ constexpr const char* kExamples = R"(Examples:
   mavoea --volume /srv/share=eadir where /srv/share/letter.txt
   mavoea set letter.txt com.example.colour blue
   mavoea set letter.txt com.apple.ResourceFork --file letter.rsrc
+  mavoea set-info letter.txt --type TEXT --flags invisible,-stationery --tags Letters:red,Home
   mavoea get letter.txt com.apple.FinderInfo --hex
   mavoea list -l letter.txt
   mavoea show letter.txt
@@ -101,6 +102,47 @@ void AddName(CLI::App* sub, Options* options) {
                   "NAME is as list shows it: \"\\x0A\" and its like, backslashes doubled");
 }
 
+constexpr const char* kSetInfoWhat =
+    "Change Finder info, comment, tags and dates; all that is not named stays. A comment goes to "
+    "the "
+    "attribute of Macs and, where a volume keeps records, to the record, which has room for 200 "
+    "bytes. Tags without --label make the label the colour of the first one that has a colour";
+
+void AddText(CLI::App* sub, std::optional<std::string>* into, const char* option, const char* type,
+             const char* what) {
+    sub->add_option_function<std::string>(
+           option, [=](const std::string& text) { *into = text; }, what)
+        ->type_name(type);
+}
+
+void AddTexts(CLI::App* sub, std::vector<std::string>* into, const char* option, const char* type,
+              const char* what) {
+    sub->add_option(option, *into, what)
+        ->type_name(type)
+        ->expected(1)
+        ->allow_extra_args(false)
+        ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
+}
+
+void AddInfo(CLI::App* sub, Options* options) {
+    InfoOptions* const info = &options->info;
+    AddText(sub, &info->type, "--type", "TEXT4",
+            "A file's type, four letters; \"\\x00\" is a byte");
+    AddText(sub, &info->creator, "--creator", "TEXT4", "A file's creator");
+    AddText(sub, &info->label, "--label", "NAME",
+            "none, grey, green, purple, blue, yellow, red, orange, or 0 to 7; tags stay");
+    AddText(sub, &info->flags, "--flags", "LIST",
+            "Flags to set, as show has them, and with a '-' in front to clear: invisible,-shared");
+    AddText(sub, &info->comment, "--comment", "TEXT", "The Finder's comment; \"\": none");
+    AddText(sub, &info->tags, "--tags", "LIST", "All tags, as NAME or NAME:COLOUR; \"\": none");
+    AddTexts(sub, &info->added_tags, "--tag", "TAG", "One tag more; may be repeated");
+    AddTexts(sub, &info->removed_tags, "--untag", "NAME", "One tag less; may be repeated");
+    AddText(sub, &info->backed_up, "--backup-date", "DATE",
+            "When it was backed up, in UTC: 2024-05-01T09:30:00Z");
+    AddText(sub, &info->created, "--created", "DATE", "When it was made, as Macs show it");
+    AddPaths(sub, options);
+}
+
 struct Syntax {
     Command command;
     const char* name;
@@ -143,6 +185,7 @@ constexpr Syntax kCommands[] = {
                 "pairs are left out")
              ->needs(value);
      }},
+    {Command::kSetInfo, "set-info", kSetInfoWhat, AddInfo},
     {Command::kRemove, "remove", "Remove an attribute",
      [](CLI::App* sub, Options* options) {
          AddPath(sub, options, "A file or directory");
@@ -413,6 +456,11 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
     options.archive = Unguarded(std::move(options.archive));
     options.destination = Unguarded(std::move(options.destination));
     options.to = Unguarded(std::move(options.to));
+    for (std::optional<std::string>* const text : options.info.Texts()) {
+        if (*text) *text = Unguarded(**text);
+    }
+    for (std::string& tag : options.info.added_tags) tag = Unguarded(std::move(tag));
+    for (std::string& tag : options.info.removed_tags) tag = Unguarded(std::move(tag));
     if (options.value) options.value = Unguarded(*std::move(options.value));
     if (options.file) options.file = Unguarded(*std::move(options.file));
     return options;

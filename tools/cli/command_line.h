@@ -7,6 +7,7 @@
 #include <variant>
 #include <vector>
 
+#include "tools/cli/set_info.h"
 #include "tools/move/options.h"
 
 namespace mavoea::tool {
@@ -17,6 +18,7 @@ enum class Command {
     kShow,
     kGet,
     kSet,
+    kSetInfo,
     kRemove,
     kLock,
     kUnlock,
@@ -64,6 +66,7 @@ struct Options {
     std::optional<std::string> value;  // set: none of the two means standard input
     std::optional<std::string> file;
 
+    InfoOptions info;      // set-info
     CopyOptions copy;      // cp, mv
     RemoveOptions remove;  // rm
 };

@@ -9,6 +9,8 @@
 #include "tools/care/clean.h"
 #include "tools/care/repair.h"
 #include "tools/care/upgrade.h"
+#include "tools/cli/opening.h"
+#include "tools/cli/set_info.h"
 #include "tools/move/carry.h"
 #include "tools/move/convert.h"
 #include "tools/move/copy.h"
@@ -24,7 +26,6 @@
 #include "tools/show/dump.h"
 #include "tools/show/object_info.h"
 #include "tools/show/where.h"
-#include "tools/store/adoption.h"
 #include "tools/store/change.h"
 #include "tools/store/foreign/spelling.h"
 #include "tools/store/layout.h"
@@ -80,16 +81,6 @@ Bytes ValueToSet(const Options& options) {
         return ReadToEnd(file.fd(), file.path(), kStreamSizeMax);
     }
     return ReadToEnd(STDIN_FILENO, "standard input", kStreamSizeMax);
-}
-
-// Opens what is to be changed; what an earlier version kept comes along.
-std::unique_ptr<Changer> OpenToChange(const Object& object) {
-    SettleNamed(object);
-    auto changer = OpenChanger(object);
-    Notes notes;
-    AdoptForChange(object, &notes);
-    for (const std::string& note : notes) Note(note);
-    return changer;
 }
 
 ExitStatus Set(const Options& options) {
@@ -229,6 +220,8 @@ ExitStatus Run(const Options& options) {
             return GetValue(options);
         case Command::kSet:
             return Set(options);
+        case Command::kSetInfo:
+            return SetInfo(options.paths, options.info, options.json);
         case Command::kRemove:
             return Remove(options);
         case Command::kLock:

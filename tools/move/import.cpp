@@ -13,6 +13,7 @@
 #include "tools/say/text.h"
 #include "tools/store/adoption.h"
 #include "tools/store/change.h"
+#include "tools/store/entries.h"
 #include "tools/store/foreign/detection.h"
 #include "tools/store/foreign/spelling.h"
 #include "tools/store/reader.h"
@@ -146,54 +147,20 @@ class ObjectImport {
         return attribute != nullptr && same(attribute->value);
     }
 
-    // Comment, dates and the like: the files are written anew, with what they hold and with these.
+    // Comment, dates and the like.
     void AddEntries(const Metadata& imported) {
         if (imported.entries.empty()) return;
         try {
-            Metadata wanted = ReadMetadata(object_, Sidecars::Services::kFind);
-            if (!wanted.problems.empty()) throw Failure(wanted.problems.front());
-            if (!wanted.strays.empty()) {
-                throw Failure(kFailed, object_.path(),
-                              "writing them would lose " + wanted.strays.front().item,
-                              "see what it is with: mavoea list -l PATH");
-            }
-            bool changes = false;
+            EntryChange change(object_);
             for (const auto& [id, item] : imported.entries) {
-                const auto there = wanted.entries.find(id);
-                const Bytes old =
-                    there == wanted.entries.end() ? Bytes() : there->second.value.All();
-                const Bytes value = WithLockOf(id, item.value.All(), old);
-                if (value == old || !SaysSomething(id, value)) continue;
-                wanted.entries[id] = {Content(value), item.holder};
-                changes = true;
+                const Bytes old = change.Old(id);
+                Bytes value = WithLockOf(id, item.value.All(), old);
+                if (value != old && SaysSomething(id, value)) change.Set(id, std::move(value));
             }
-            if (!changes) return;
-            wanted.whole_apple_double.reset();
-            wanted.whole_resource.reset();
-            wanted.whole_record.reset();
-            std::vector<Missing> missing;
-            const Writer& writer = WriterFor(object_);
-            const Metadata fitting = writer.Fit(wanted, object_, &missing);
-            for (const Missing& one : missing) {
-                if (Brings(imported, one.item)) continue;
-                throw Failure(kFailed, object_.path(), "writing them would lose its " + one.item,
-                              "see what it is with: mavoea list -l PATH");
-            }
-            for (const Missing& one : missing) Miss(one.item, one.reason);
-            if (fitting.entries.empty()) return;
-            const Written written =
-                writer.Write(object_, *Inode::Open(object_.place), fitting, {.old = Old::kKept});
-            for (const Missing& one : written.missing) Miss(one.item, one.reason);
-            const Metadata found = ReadMetadata(object_, Sidecars::Services::kFind);
-            for (const Missing& one : WhatIsMissing(fitting, found)) Miss(one.item, one.reason);
+            for (const Missing& one : change.Write()) Miss(one.item, one.reason);
         } catch (const Failure& failure) {
             for (const auto& [id, item] : imported.entries) Miss(NameOfEntry(id), failure.cause());
         }
-    }
-
-    static bool Brings(const Metadata& imported, const std::string& item) {
-        return std::any_of(imported.entries.begin(), imported.entries.end(),
-                           [&](const auto& entry) { return NameOfEntry(entry.first) == item; });
     }
 
     const Object& object_;

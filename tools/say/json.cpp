@@ -36,6 +36,7 @@ Json Json::Array() {
 
 Json Json::Object(std::initializer_list<Member> members) {
     Json object;
+    *object.value_ = Value::object();
     for (const auto& [key, value] : members) object.Set(key, value);
     return object;
 }

@@ -118,6 +118,7 @@ Tag ParseStoredTag(std::string_view text) {
 }
 
 std::string StoredTag(const Tag& tag) {
+    if (tag.label == 0) return tag.name;
     return tag.name + '\n' + static_cast<char>('0' + tag.label);
 }
 

@@ -35,10 +35,10 @@ struct FlagChange {
 // None where a word is no flag, which is `wrong` then.
 std::optional<FlagChange> ParseFinderFlags(std::string_view list, std::string* wrong);
 
-// A tag as Macs keep it: its name and, behind a line feed, the digit of its colour.
+// A tag as Macs keep it: its name and, behind a line feed, the digit of its colour if it has one.
 struct Tag {
     std::string name;
-    std::uint8_t label = 0;
+    std::uint8_t label = 0;  // its colour
 };
 Tag ParseStoredTag(std::string_view text);
 std::string StoredTag(const Tag& tag);
