@@ -42,9 +42,10 @@ build() {
     else
         autoreconf --force --install > autoreconf.log 2>&1 || { cat autoreconf.log; exit 1; }
     fi
-    ./configure --quiet --host=$host --prefix=/usr --libdir=/usr/lib --sysconfdir=/etc \
-        --disable-static --disable-nls CPPFLAGS="-I$stage/usr/include" LDFLAGS="-L$stage/usr/lib" \
-        "$@"
+    # Named, as libplist takes clang where nobody says what compiles it.
+    ./configure --quiet --host=$host CC=$host-gcc CXX=$host-g++ --prefix=/usr --libdir=/usr/lib \
+        --sysconfdir=/etc --disable-static --disable-nls CPPFLAGS="-I$stage/usr/include" \
+        LDFLAGS="-L$stage/usr/lib" "$@"
     make -s -j 2 > make.log 2>&1 && make -s install DESTDIR="$stage" >> make.log 2>&1 ||
         { cat make.log; exit 1; }
     rm -f "$stage"/usr/lib/*.la

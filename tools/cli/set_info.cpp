@@ -88,7 +88,7 @@ FlagChange ToFlags(const std::optional<std::string>& list) {
 Tag ToTag(const char* option, const std::string& text) {
     Tag tag = {NeedText(option, text)};
     if (const std::size_t colon = text.rfind(':'); colon != std::string::npos) {
-        if (const auto label = ParseLabel(std::string_view(text).substr(colon + 1))) {
+        if (const auto label = ParseLabel(text.substr(colon + 1))) {
             tag = {text.substr(0, colon), *label};
         }
     }

@@ -75,14 +75,16 @@ std::optional<std::int64_t> ParseDate(std::string_view text) {
                               std::chrono::month(static_cast<unsigned>(*month)),
                               std::chrono::day(static_cast<unsigned>(*day)));
     if (!date.ok()) return std::nullopt;
-    const std::int64_t midnight =
-        std::int64_t{sys_days(date).time_since_epoch().count()} * kSecondsPerDay;
+    const sys_days day_count = date;
+    const std::int64_t day_number = day_count.time_since_epoch().count();
+    const std::int64_t midnight = day_number * kSecondsPerDay;
     if (text.empty()) return midnight;
     const auto hour = TakeNumber(&text, 2, ":");
     const auto minute = hour ? TakeNumber(&text, 2, ":") : std::nullopt;
     const auto second = minute ? TakeNumber(&text, 2, "") : std::nullopt;
     if (!second || !text.empty() || *hour > 23 || *minute > 59 || *second > 59) return std::nullopt;
-    return midnight + *hour * 3600 + *minute * 60 + *second;
+    const int seconds = *hour * 3600 + *minute * 60 + *second;
+    return midnight + seconds;
 }
 
 }  // namespace mavoea::tool

@@ -29,8 +29,7 @@ std::string BytesText(std::uint64_t size) {
 // One object, as lines of a label and what there is to say, and as JSON: each part adds to both.
 class Description {
  public:
-    Description(const Object& object, const Metadata& metadata)
-        : object_(object), metadata_(metadata) {
+    Description(const Object& object, const Metadata& metadata) : metadata_(metadata) {
         const auto info = object.place.Status();
         is_directory_ = info && S_ISDIR(info->st_mode);
         json_.SetText("path", object.path());
@@ -342,7 +341,6 @@ class Description {
         json->Set("undecoded", reason);
     }
 
-    const Object& object_;
     const Metadata& metadata_;
     bool is_directory_ = false;
     std::vector<InfoLine> lines_;

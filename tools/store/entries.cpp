@@ -47,7 +47,9 @@ std::vector<Missing> EntryChange::Fit() const { return MakeFit().missing; }
 
 std::vector<Missing> EntryChange::Write() const {
     if (changed_.empty() && !changes_created_) return {};
-    auto [fitting, missing] = MakeFit();
+    const Fitting fit = MakeFit();
+    const Metadata& fitting = fit.metadata;
+    std::vector<Missing> missing = fit.missing;
     const bool fits = std::any_of(changed_.begin(), changed_.end(),
                                   [&](EntryId id) { return fitting.entries.contains(id); });
     if (!fits && !changes_created_) return missing;
