@@ -26,6 +26,8 @@ constexpr const char* kExamples = R"(Examples:
   mavoea import ._letter.txt letter.txt
   mavoea import letter.hqx /srv/share
   mavoea export --format macbinary letter.txt letter.bin
+  mavoea save -r /srv/share --output share.txt
+  mavoea restore --directory / share.txt
   mavoea cp -r /srv/share/letters /mnt/share
   mavoea mv letter.txt /mnt/share
   mavoea rm -r /srv/share/letters
@@ -216,6 +218,34 @@ constexpr Syntax kCommands[] = {
          AddPath(sub, options, "A file or directory");
          sub->add_option("FILE", options->archive, "A new file; \"-\": standard output")
              ->required();
+     }},
+    {Command::kSave, "save", "Write metadata as text, as getfattr --dump does",
+     [](CLI::App* sub, Options* options) {
+         AddRecursive(sub, options);
+         sub->add_option("--encoding", options->encoding,
+                         "Of all values: text, hex or base64; for each the one that shows it best")
+             ->type_name("ENCODING");
+         sub->add_option("--output", options->output, "A new file, in place of standard output")
+             ->type_name("FILE");
+         sub->add_flag("-f,--force", options->force, "Replace a FILE that is there");
+         sub->add_flag("--absolute-names", options->absolute_names,
+                       "Leave the slashes at the beginning of paths");
+         AddPaths(sub, options);
+     }},
+    {Command::kRestore, "restore", "Give objects the metadata in a text of save or getfattr --dump",
+     [](CLI::App* sub, Options* options) {
+         sub->add_option("--directory", options->directory, "Where the paths in the text begin")
+             ->type_name("DIR")
+             ->default_val(".");
+         sub->add_option("--from", options->type,
+                         "The volume that getfattr was run on, where its attributes' names do not "
+                         "tell: netatalk-samba, xattr, ...")
+             ->type_name("TYPE");
+         sub->add_flag("--absolute-names", options->absolute_names,
+                       "Follow paths that begin with a slash from the root");
+         sub->add_flag("-v,--verbose", options->verbose, "Say what is done");
+         sub->add_option("FILE", options->archive, "The text; \"-\": standard input")
+             ->default_val("-");
      }},
     {Command::kCopy, "cp", "Copy objects with their metadata, with the options of cp", AddNothing},
     {Command::kMove, "mv", "Move or rename objects with their metadata, with the options of mv",
@@ -461,6 +491,8 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
     }
     for (std::string& tag : options.info.added_tags) tag = Unguarded(std::move(tag));
     for (std::string& tag : options.info.removed_tags) tag = Unguarded(std::move(tag));
+    options.directory = Unguarded(std::move(options.directory));
+    if (options.output) options.output = Unguarded(*std::move(options.output));
     if (options.value) options.value = Unguarded(*std::move(options.value));
     if (options.file) options.file = Unguarded(*std::move(options.file));
     return options;

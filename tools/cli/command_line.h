@@ -24,6 +24,8 @@ enum class Command {
     kUnlock,
     kImport,
     kExport,
+    kSave,
+    kRestore,
     kCopy,
     kMove,
     kDelete,
@@ -43,27 +45,32 @@ struct Options {
 
     std::vector<std::string> paths;  // one, but for list, lock, unlock, upgrade and repair
     std::string name;
-    std::string archive;         // import, export
+    std::string archive;         // import, export, restore
     std::string format;          // export
-    bool force = false;          // export
+    bool force = false;          // export, save
     bool replaces_data = false;  // import
     bool details = false;        // list -l
     bool recursive = false;
-    bool yes = false;                  // clean: what is listed is removed
-    int wait = 2;                      // clean: seconds between its two looks
-    bool all = false;                  // clean: things of other services, too
-    std::string to;                    // convert: the destination's volume type
-    std::string destination;           // convert, carry; diff: the second
-    bool verbose = false;              // carry
-    bool allow_loss = false;           // convert
-    bool data = false;                 // diff
-    bool brief = false;                // diff
-    bool itemized = false;             // diff
-    bool record = false;               // dump: the record of an object
-    bool hex = false;                  // get, set
-    bool raw = false;                  // get: to a terminal, too
-    bool escaped = false;              // get, set, remove: the name is as list shows it
-    std::optional<std::string> value;  // set: none of the two means standard input
+    bool yes = false;                     // clean: what is listed is removed
+    int wait = 2;                         // clean: seconds between its two looks
+    bool all = false;                     // clean: things of other services, too
+    std::string to;                       // convert: the destination's volume type
+    std::string destination;              // convert, carry; diff: the second
+    bool verbose = false;                 // carry, restore
+    bool absolute_names = false;          // save, restore
+    std::string directory;                // restore
+    std::optional<std::string> type;      // restore: of the volume that the text was made of
+    std::optional<std::string> encoding;  // save
+    std::optional<std::string> output;    // save
+    bool allow_loss = false;              // convert
+    bool data = false;                    // diff
+    bool brief = false;                   // diff
+    bool itemized = false;                // diff
+    bool record = false;                  // dump: the record of an object
+    bool hex = false;                     // get, set
+    bool raw = false;                     // get: to a terminal, too
+    bool escaped = false;                 // get, set, remove: the name is as list shows it
+    std::optional<std::string> value;     // set: none of the two means standard input
     std::optional<std::string> file;
 
     InfoOptions info;      // set-info

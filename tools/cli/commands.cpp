@@ -17,6 +17,8 @@
 #include "tools/move/delete.h"
 #include "tools/move/export.h"
 #include "tools/move/import.h"
+#include "tools/move/restore.h"
+#include "tools/move/save.h"
 #include "tools/place/file.h"
 #include "tools/place/volume.h"
 #include "tools/say/output.h"
@@ -239,6 +241,21 @@ ExitStatus Run(const Options& options) {
                            .format = options.format,
                            .force = options.force,
                            .json = options.json});
+        case Command::kSave:
+            return Save({.paths = options.paths,
+                         .recursive = options.recursive,
+                         .encoding = options.encoding,
+                         .absolute_names = options.absolute_names,
+                         .file = options.output,
+                         .force = options.force,
+                         .json = options.json});
+        case Command::kRestore:
+            return Restore({.file = options.archive,
+                            .directory = options.directory,
+                            .from_type = options.type,
+                            .absolute_names = options.absolute_names,
+                            .verbose = options.verbose,
+                            .json = options.json});
         case Command::kCopy:
             return Copy(options.copy);
         case Command::kMove:

@@ -9,13 +9,10 @@
 #include <memory>
 
 #include "tools/move/archive.h"
+#include "tools/move/taking_over.h"
 #include "tools/say/output.h"
 #include "tools/say/text.h"
-#include "tools/store/adoption.h"
-#include "tools/store/change.h"
-#include "tools/store/entries.h"
 #include "tools/store/foreign/detection.h"
-#include "tools/store/foreign/spelling.h"
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
@@ -24,152 +21,11 @@
 namespace mavoea::tool {
 namespace {
 
-// Finder info and fork have entries of their own; as attributes they count where those are empty.
-// The locked state is no metadata that a "._" file could bring.
-void SortOut(Metadata* metadata) {
-    std::erase_if(metadata->entries, [](const auto& entry) {
-        return !SaysSomething(entry.first, entry.second.value.All());
-    });
-    if (metadata->fork && IsBlankFork(metadata->fork->value)) metadata->fork.reset();
-    std::erase_if(metadata->attributes, [&](const Metadata::Attribute& attribute) {
-        switch (KindOf(attribute.name)) {
-            case Kind::kAttribute:
-                return false;
-            case Kind::kFinderInfo:
-                if (!metadata->finder_info && attribute.value.size() == kFinderInfoSize) {
-                    metadata->finder_info = Metadata::Item{attribute.value, attribute.holder};
-                    return true;
-                }
-                break;
-            case Kind::kResourceFork:
-                if (!metadata->fork && attribute.value.size() > 0) {
-                    metadata->fork = Metadata::Item{attribute.value, attribute.holder};
-                    return true;
-                }
-                break;
-            case Kind::kLocked:
-                break;
-        }
-        metadata->strays.push_back({"attribute " + NameOfAttribute(attribute.name),
-                                    "its name means something else", attribute.holder});
-        return true;
-    });
-}
-
-// The AFP word locks what it locked before, and nothing else.
-Bytes WithLockOf(EntryId id, Bytes bytes, const Bytes& old) {
-    bytes = WithoutLock(id, std::move(bytes));
-    if (id != EntryId::kAfpFileInfo || bytes.size() < kAfpFileInfoSize ||
-        old.size() < bytes.size()) {
-        return bytes;
-    }
-    const std::uint16_t kept = LoadBe16(&old[kAfpAttributesOffset]) &
-                               ~LoadBe16(&WithoutLock(id, old)[kAfpAttributesOffset]);
-    std::uint8_t* const word = &bytes[kAfpAttributesOffset];
-    StoreBe16(static_cast<std::uint16_t>(LoadBe16(word) | kept), word);
-    return bytes;
-}
-
 std::string Joined(const std::vector<std::string>& words) {
     std::string text;
     for (const std::string& word : words) text += (text.empty() ? "" : ", ") + word;
     return text;
 }
-
-class ObjectImport {
- public:
-    explicit ObjectImport(const Object& object) : object_(object), changer_(OpenChanger(object)) {}
-
-    void Run(const Metadata& metadata) {
-        AdoptForChange(object_, &notes_);
-        for (const Metadata::Attribute& attribute : metadata.attributes) {
-            Set(attribute.name, attribute.value);
-        }
-        if (metadata.finder_info) Set(std::string(kFinderInfoName), metadata.finder_info->value);
-        if (metadata.fork) Set(std::string(kResourceForkName), metadata.fork->value);
-        AddEntries(metadata);
-        for (const Metadata::Stray& stray : metadata.strays) Miss(stray.item, stray.reason);
-        if (metadata.locked) Lock();
-    }
-
-    const std::vector<std::string>& notes() const { return notes_; }
-    const std::vector<Missing>& missing() const { return missing_; }
-    const std::vector<std::string>& failures() const { return failures_; }
-    ExitStatus status() const { return status_; }
-
- private:
-    void Miss(const std::string& item, const std::string& reason) {
-        missing_.push_back({item, reason});
-        failures_.push_back(Printable(object_.path()) + ": " + item +
-                            " was not taken over: " + reason);
-        status_ = kFailed;
-    }
-
-    void Lock() {
-        try {
-            SetLocked(object_, true);
-        } catch (const Failure& failure) {
-            Miss("locked state", failure.cause());
-        }
-    }
-
-    void Set(const std::string& name, const Content& value) {
-        try {
-            // What is there already need not be written, and is not when it cannot be.
-            if (Has(name, value)) return;
-            changer_->Set(name, value.All());
-            if (!Has(name, value)) Miss(NameOfAttribute(name), "what is there differs");
-            if (auto note = NoteOfUnseen(object_, name, value.size())) {
-                notes_.push_back(*std::move(note));
-            }
-        } catch (const Failure& failure) {
-            failures_.push_back(Printable(object_.path()) + ": \"" + Printable(name) +
-                                "\" was not taken over: " + failure.what());
-            status_ = std::max(status_, failure.status());
-        }
-    }
-
-    bool Has(const std::string& name, const Content& value) const {
-        const Metadata now = ReadMetadata(object_, Sidecars::Services::kLeaveOut);
-        const auto same = [&](const Content& other) {
-            return !other.damaged() && other.size() == value.size() &&
-                   !FirstDifference(value, other);
-        };
-        switch (KindOf(name)) {
-            case Kind::kFinderInfo:
-                return now.finder_info && same(now.finder_info->value);
-            case Kind::kResourceFork:
-                return now.fork && same(now.fork->value);
-            default:
-                break;
-        }
-        const Metadata::Attribute* const attribute = now.Find(name);
-        return attribute != nullptr && same(attribute->value);
-    }
-
-    // Comment, dates and the like.
-    void AddEntries(const Metadata& imported) {
-        if (imported.entries.empty()) return;
-        try {
-            EntryChange change(object_);
-            for (const auto& [id, item] : imported.entries) {
-                const Bytes old = change.Old(id);
-                Bytes value = WithLockOf(id, item.value.All(), old);
-                if (value != old && SaysSomething(id, value)) change.Set(id, std::move(value));
-            }
-            for (const Missing& one : change.Write()) Miss(one.item, one.reason);
-        } catch (const Failure& failure) {
-            for (const auto& [id, item] : imported.entries) Miss(NameOfEntry(id), failure.cause());
-        }
-    }
-
-    const Object& object_;
-    std::unique_ptr<Changer> changer_;
-    std::vector<std::string> notes_;
-    std::vector<Missing> missing_;
-    std::vector<std::string> failures_;
-    ExitStatus status_ = kSuccess;
-};
 
 // ---- Data ---------------------------------------------------------------------------------------
 
@@ -307,7 +163,7 @@ void PrintText(const std::string& path, const Archive& archive, DataDone done) {
 }
 
 Json ImportJson(const std::string& source, const std::string& path, const Archive& archive,
-                DataDone done, const ObjectImport& import) {
+                DataDone done, const TakingOver& import) {
     const Metadata& metadata = archive.metadata;
     Json json;
     json.SetText("path", path);
@@ -353,14 +209,14 @@ ExitStatus Import(const ImportOptions& options) {
     const auto info = target.Status();
     if (!info && !archive.data) throw SystemFailure(options.path, ENOENT);
     const Object object = ObjectAt(target, info ? &*info : nullptr);
-    std::optional<ObjectImport> on_object;
+    std::optional<TakingOver> on_object;
     if (info) {
         SettleNamed(object);
         on_object.emplace(object);
     }
     const DataDone done = PutData(object, archive, options.replaces_data);
     if (!on_object) on_object.emplace(object);
-    ObjectImport& import = *on_object;
+    TakingOver& import = *on_object;
     import.Run(archive.metadata);
     if (options.json) {
         Print(ImportJson(options.file, object.path(), archive, done, import));

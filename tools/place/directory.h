@@ -13,6 +13,7 @@
 #include <string_view>
 #include <vector>
 
+#include "tools/place/attribute_source.h"
 #include "tools/place/file.h"
 #include "tools/say/messages.h"
 
@@ -197,7 +198,7 @@ Failure HasBecomeAnother(const Place& place);
 std::uint64_t BirthOf(const Place& place);
 
 // An object's own descriptor. It says nothing of what the name leads to later.
-class Inode {
+class Inode final : public AttributeSource {
  public:
     // Null when nothing is there. Throws Failure.
     static std::shared_ptr<const Inode> Find(const Place& place);
@@ -209,7 +210,7 @@ class Inode {
     // The same with a descriptor of its own.
     static std::shared_ptr<const Inode> Of(const File& file);
 
-    const std::string& path() const { return file_->path(); }  // for people
+    const std::string& path() const override { return file_->path(); }
     // That calls on open files take; -1 when there is none.
     int fd() const { return by_path_ ? -1 : file_->fd(); }
     // To be read; null when it has not been opened for that.
@@ -226,8 +227,8 @@ class Inode {
     std::string ProcPath() const;
 
     // Extended attributes. A file system without any has none.
-    std::vector<std::string> AttributeNames() const;
-    std::optional<Bytes> Attribute(const std::string& name) const;
+    std::vector<std::string> AttributeNames() const override;
+    std::optional<Bytes> Attribute(const std::string& name) const override;
     void SetAttribute(const std::string& name, ByteView value) const;
     bool RemoveAttribute(const std::string& name) const;  // false: there was none
 

@@ -73,12 +73,6 @@ constexpr const char* kTypes =
     "samba-all-streams, netatalk, netatalk-samba or linux; Samba's streams_depot and "
     "\"fruit:resource = xattr\" are not known";
 
-int RequireTypeName(const std::string& type_name, const std::string& option) {
-    const int type = MAVOVolumeTypeFromName(type_name.c_str());
-    if (type >= 0) return type;
-    throw Failure(kFailed, option, "unknown volume type \"" + type_name + "\"", kTypes);
-}
-
 constexpr const char* kDeclareVolume =
     "declare it with --volume PATH=TYPE or in " MAVO_VOLUME_TABLE;
 #else
@@ -197,6 +191,17 @@ std::string TypeId(int type) {
 
 Json TypeJson(int type) { return DialectOf(type) != nullptr ? Json(TypeId(type)) : Json(type); }
 
+int TypeFromName(const std::string& type_name, const std::string& option) {
+#if MAVOEA_HOST_PLATFORM
+    const int type = MAVOVolumeTypeFromName(type_name.c_str());
+    if (type >= 0) return type;
+    throw Failure(kFailed, option, "unknown volume type \"" + type_name + "\"", kTypes);
+#else
+    (void)type_name;
+    throw Failure(kFailed, option, "this system knows its volumes", "leave the option out");
+#endif
+}
+
 std::string_view TypeName(int type) {
     if (const Dialect* const dialect = DialectOf(type)) return dialect->title;
     switch (VolumeKindOf(type)) {
@@ -226,7 +231,7 @@ void DeclareVolume(std::string_view declaration) {
     }
     const std::string directory(declaration.substr(0, equals));
     const std::string type_name(declaration.substr(equals + 1));
-    RequireTypeName(type_name, option);
+    TypeFromName(type_name, option);
     struct stat info;
     if (::stat(directory.c_str(), &info) != 0) {
         throw Failure(kFailed, option, SystemFailure::Words(errno),
@@ -243,7 +248,7 @@ void DeclareVolume(std::string_view declaration) {
 
 int DeclareType(const std::string& path, const std::string& type_name, const std::string& option) {
 #if MAVOEA_HOST_PLATFORM
-    const int type = RequireTypeName(type_name, option);
+    const int type = TypeFromName(type_name, option);
     const std::string directory = Normalized(path);
     if (MAVOVolumeDeclare(directory.c_str(), type) != 0) throw SystemFailure(option, errno);
     Declared()[directory] = "--volume " + Printable(directory) + '=' + type_name;

@@ -52,6 +52,9 @@ Object ObjectAt(const Place& place, mode_t type);
 int ReadableType(int type);
 Object AsReadable(Object object);
 
+// The type that a person calls so; `option` is what a Failure is about. Throws Failure.
+int TypeFromName(const std::string& type_name, const std::string& option);
+
 std::string_view TypeName(int type);
 // "1"; "samba" for those that have no number.
 std::string TypeId(int type);

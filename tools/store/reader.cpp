@@ -229,8 +229,8 @@ class AttributeReader final : public Reader {
 void AddUndeclared(const Inode& inode, const std::vector<std::string>& names, Metadata* metadata) {
     const auto sign = SignIn(names);
     if (!sign) return;
-    AddForeignAttributes(*sign->dialect, inode, names, metadata);
-    AddForeignAttributes(AnyDialect(), inode, names, metadata);
+    AddForeignAttributes(*sign->dialect, inode, names, Certainty::kCertain, metadata);
+    AddForeignAttributes(AnyDialect(), inode, names, Certainty::kCertain, metadata);
     TakeMarksFromWord(metadata);
 }
 

@@ -72,8 +72,8 @@ std::optional<Bytes> WordWithMarks(const Metadata& metadata) {
     return bytes;
 }
 
-std::optional<DosAttributes> DosAttributesOf(const Inode& inode) {
-    const auto value = inode.Attribute(kDosAttributesName);
+std::optional<DosAttributes> DosAttributesOf(const AttributeSource& source) {
+    const auto value = source.Attribute(kDosAttributesName);
     return value ? DecodeDosAttributes(*value) : std::nullopt;
 }
 

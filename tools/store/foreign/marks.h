@@ -24,7 +24,7 @@ std::optional<Bytes> WordWithMarks(const Metadata& metadata);
 enum class LockedBy { kDosAttributes, kOthers };
 
 // None where the object has none that Samba understands.
-std::optional<DosAttributes> DosAttributesOf(const Inode& inode);
+std::optional<DosAttributes> DosAttributesOf(const AttributeSource& source);
 void TakeDosAttributes(const DosAttributes& dos, LockedBy locked_by, Metadata* metadata);
 
 // Puts marks and creation time into the DOS attributes; `into`: also where there are none, and

@@ -22,19 +22,19 @@ Bytes DatesOf(const AfpInfo& info) {
 
 class ForeignReader {
  public:
-    ForeignReader(const Inode& inode, Metadata* metadata)
-        : inode_(inode), metadata_(*metadata), gathering_(metadata) {}
+    ForeignReader(const AttributeSource& source, Metadata* metadata)
+        : source_(source), metadata_(*metadata), gathering_(metadata) {}
 
     void Read(const Spelling& spelling) {
         Noting(&metadata_, [&] {
-            auto value = spelling.Value(inode_);
+            auto value = spelling.Value(source_);
             if (value) Add(spelling, *std::move(value));
         });
     }
 
  private:
     void Add(const Spelling& spelling, Bytes value) {
-        const Origin origin = {inode_.path(), spelling.attribute};
+        const Origin origin = {source_.path(), spelling.attribute};
         switch (spelling.datum) {
             case Datum::kRecord:
                 return ReadRecord(value, origin, &metadata_);
@@ -69,7 +69,7 @@ class ForeignReader {
         }
     }
 
-    const Inode& inode_;
+    const AttributeSource& source_;
     Metadata& metadata_;
     Gathering gathering_;
 };
@@ -97,11 +97,12 @@ Metadata ReadForeign(const Dialect& dialect, const Inode& inode,
     return metadata;
 }
 
-void AddForeignAttributes(const Dialect& dialect, const Inode& inode,
-                          const std::vector<std::string>& attributes, Metadata* metadata) {
-    ForeignReader reader(inode, metadata);
+void AddForeignAttributes(const Dialect& dialect, const AttributeSource& source,
+                          const std::vector<std::string>& attributes, Certainty certainty,
+                          Metadata* metadata) {
+    ForeignReader reader(source, metadata);
     for (const Spelling& spelling : SpellingsAmong(attributes, dialect)) {
-        if (spelling.certain) reader.Read(spelling);
+        if (spelling.certain || certainty == Certainty::kAny) reader.Read(spelling);
     }
 }
 

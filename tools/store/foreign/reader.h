@@ -16,9 +16,12 @@ namespace mavoea::tool {
 Metadata ReadForeign(const Dialect& dialect, const Inode& inode,
                      const std::vector<std::string>& attributes, const Sidecars& sidecars);
 
-// Adds what the attributes of an object hold that no other program would have given such names.
-void AddForeignAttributes(const Dialect& dialect, const Inode& inode,
-                          const std::vector<std::string>& attributes, Metadata* metadata);
+// Adds what attributes hold: of whatever name, or of names that no other program would have given.
+// `attributes`: the names of those of `source`.
+enum class Certainty { kAny, kCertain };
+void AddForeignAttributes(const Dialect& dialect, const AttributeSource& source,
+                          const std::vector<std::string>& attributes, Certainty certainty,
+                          Metadata* metadata);
 
 }  // namespace mavoea::tool
 

@@ -45,12 +45,6 @@ bool IsReserved(const std::string& attribute) {
     return !attribute.starts_with(kUser) || IsMark(attribute) || attribute == kDosAttributesName;
 }
 
-std::string NameOfExtent(std::string_view attribute, unsigned extent) {
-    constexpr std::string_view kFirst = "user.DosStream.";
-    return "user.DosStreamExt." + std::to_string(extent) + '.' +
-           std::string(attribute.substr(kFirst.size()));
-}
-
 // What there is room for, in words.
 std::string Limit(const Inode& inode) {
     struct statfs info = {};
@@ -85,8 +79,8 @@ std::optional<Spelling> SpellingOf(const std::string& attribute, const Dialect& 
     return Spelling{attribute, datum, name, has_nul, true, datum != Datum::kAttribute};
 }
 
-std::vector<Spelling> SpellingsOf(const Inode& inode, const Dialect& dialect) {
-    return SpellingsAmong(inode.AttributeNames(), dialect);
+std::vector<Spelling> SpellingsOf(const AttributeSource& source, const Dialect& dialect) {
+    return SpellingsAmong(source.AttributeNames(), dialect);
 }
 
 std::vector<Spelling> SpellingsAmong(const std::vector<std::string>& attributes,
@@ -139,8 +133,14 @@ bool IsForeignInAny(const std::string& attribute) {
             DatumOf(attribute.substr(kUser.size())) != Datum::kAttribute);
 }
 
-std::optional<Bytes> Spelling::Value(const Inode& inode) const {
-    auto value = inode.Attribute(attribute);
+std::string NameOfExtent(std::string_view attribute, unsigned extent) {
+    constexpr std::string_view kFirst = "user.DosStream.";
+    return "user.DosStreamExt." + std::to_string(extent) + '.' +
+           std::string(attribute.substr(kFirst.size()));
+}
+
+std::optional<Bytes> Spelling::Value(const AttributeSource& source) const {
+    auto value = source.Attribute(attribute);
     if (!value || !has_nul) return value;
     if (!DecodeStreamAttribute(attribute)) {
         if (!value->empty() && value->back() == 0) value->pop_back();
@@ -150,11 +150,11 @@ std::optional<Bytes> Spelling::Value(const Inode& inode) const {
     if (!stream) return value;
     Bytes bytes(stream->bytes.begin(), stream->bytes.end());
     for (unsigned extent = 1; extent <= stream->extents; ++extent) {
-        const auto more = inode.Attribute(NameOfExtent(attribute, extent));
+        const auto more = source.Attribute(NameOfExtent(attribute, extent));
         // A last byte that tells of nothing is one of the value, which has been written without.
         if (!more && extent == 1) return value;
         if (!more) {
-            throw Failure(kFailed, inode.path(),
+            throw Failure(kFailed, source.path(),
                           NameOfAttribute(attribute) + " is damaged: a part of it is missing",
                           "see what there is with: getfattr -d -m - PATH");
         }

@@ -31,7 +31,7 @@ struct Spelling {
 
     // The bytes that are meant; those of larger ones go on in further attributes. None when it has
     // gone. Throws Failure.
-    std::optional<Bytes> Value(const Inode& inode) const;
+    std::optional<Bytes> Value(const AttributeSource& source) const;
 };
 
 // What an attribute of an object means in a dialect; none when it is nothing of the kind, or the
@@ -41,7 +41,7 @@ std::optional<Spelling> SpellingOf(const std::string& attribute, const Dialect& 
 // All that an object of such attributes has, the dialect's own first.
 std::vector<Spelling> SpellingsAmong(const std::vector<std::string>& attributes,
                                      const Dialect& dialect);
-std::vector<Spelling> SpellingsOf(const Inode& inode, const Dialect& dialect);
+std::vector<Spelling> SpellingsOf(const AttributeSource& source, const Dialect& dialect);
 
 // How the dialect spells an attribute of that name; none where it would mean something else, or is
 // too long.
@@ -49,6 +49,9 @@ std::optional<Spelling> SpellAttribute(const std::string& name, const Dialect& d
 // The same for the Finder info, outside of a record, and for the fork.
 Spelling SpellFinderInfo(const Dialect& dialect);
 Spelling SpellFork(const Dialect& dialect);
+
+// Where a stream's value goes on that begins in `attribute`; `extent` from 1.
+std::string NameOfExtent(std::string_view attribute, unsigned extent);
 
 // Whether another program keeps metadata in an attribute of that name, values that go on included:
 // in that dialect, or in any.
