@@ -140,6 +140,7 @@ class ObjectReader {
         bool told = false;
         while (lines_.Next(&line_)) {
             const Kind kind = ParseAttributeTextLine(line_.text).kind;
+            cut_ = !line_.ended;
             if (kind == Kind::kObject) {
                 header_ = true;
                 return true;
@@ -228,7 +229,7 @@ class ObjectReader {
 class PathFinder {
  public:
     PathFinder(const std::string& directory, bool absolute_names)
-        : top_(PlaceOf(directory, Shown::kAsGiven)), absolute_names_(absolute_names) {
+        : top_(PlaceOf(directory, Shown::kWhole)), absolute_names_(absolute_names) {
         inside_ = top_.Open();
     }
 
@@ -236,12 +237,12 @@ class PathFinder {
     Object Find(const std::string& path) {
         std::vector<std::string> names = NamesIn(path);
         const bool from_root = path.starts_with('/');
-        if (names.empty()) return At(from_root ? PlaceOf("/", Shown::kAsGiven) : top_);
+        if (names.empty()) return At(from_root ? PlaceOf("/", Shown::kWhole) : top_);
         const std::string last = names.back();
         names.pop_back();
         // Most of what a text has is in the directory of what stood before it.
         if (!last_ || last_root_ != from_root || last_names_ != names) {
-            DirectoryRef in = from_root ? PlaceOf("/", Shown::kAsGiven).Open() : inside_;
+            DirectoryRef in = from_root ? PlaceOf("/", Shown::kWhole).Open() : inside_;
             for (const std::string& name : names) in = in->OpenIn(name);
             last_ = in;
             last_root_ = from_root;

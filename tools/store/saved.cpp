@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <charconv>
+#include <utility>
 
 #include "format/ea_stream.h"
 #include "format/flush_time.h"
@@ -329,9 +330,18 @@ std::vector<SavedItem> SavedItems(const Metadata& metadata, std::vector<Missing>
 
 // ---- SavedAttributes ----------------------------------------------------------------------------
 
+void SavedAttributes::Set(const std::string& name, Bytes value, TextEncoding encoding) {
+    Value& there = values_.try_emplace(name, Value{{}, encoding, next_position_++}).first->second;
+    there.bytes = std::move(value);
+    there.encoding = encoding;
+}
+
 std::vector<std::string> SavedAttributes::AttributeNames() const {
+    std::vector<std::pair<std::size_t, std::string>> positions;
+    for (const auto& [name, value] : values_) positions.emplace_back(value.position, name);
+    std::sort(positions.begin(), positions.end());
     std::vector<std::string> names;
-    for (const auto& [name, value] : values_) names.push_back(name);
+    for (auto& [position, name] : positions) names.push_back(std::move(name));
     return names;
 }
 
@@ -379,7 +389,7 @@ ReadBack ReadSaved(SavedAttributes attributes, int type) {
     ReadBack read;
     const Dialect& dialect = DialectOf(type) != nullptr ? *DialectOf(type) : AnyDialect();
     attributes.RestoreNuls(dialect);
-    std::map<std::string, Bytes> own;
+    std::vector<std::pair<std::string, Bytes>> own;
     for (const std::string& name : attributes.AttributeNames()) {
         if (!name.starts_with(kOwn)) continue;
         Bytes value = *attributes.Take(name);
@@ -387,7 +397,7 @@ ReadBack ReadSaved(SavedAttributes attributes, int type) {
         if (IsMark(name)) {
             read.metadata.locked = true;
         } else {
-            own[name] = std::move(value);
+            own.emplace_back(name, std::move(value));
         }
     }
     AddDosAttributes(&attributes, type, &read.metadata);

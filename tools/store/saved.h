@@ -38,12 +38,10 @@ class SavedAttributes final : public AttributeSource {
     explicit SavedAttributes(std::string path) : path_(std::move(path)) {}
 
     // Of two of one name the later is meant.
-    void Set(const std::string& name, Bytes value, TextEncoding encoding) {
-        values_.insert_or_assign(name, Value{std::move(value), encoding});
-    }
-    bool empty() const { return values_.empty(); }
+    void Set(const std::string& name, Bytes value, TextEncoding encoding);
 
     const std::string& path() const override { return path_; }
+    // In the order in which they stand in the text.
     std::vector<std::string> AttributeNames() const override;
     std::optional<Bytes> Attribute(const std::string& name) const override;
 
@@ -58,10 +56,12 @@ class SavedAttributes final : public AttributeSource {
     struct Value {
         Bytes bytes;
         TextEncoding encoding;
+        std::size_t position;  // among those that have been set
     };
 
     std::string path_;
     std::map<std::string, Value> values_;
+    std::size_t next_position_ = 0;
 };
 
 // What they say of the object.
