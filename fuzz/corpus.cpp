@@ -22,6 +22,7 @@ constexpr Target kTargets[] = {
     {"resource_copy_fuzz", WriteResourceCopySeeds},
     {"upgrade_fuzz", WriteUpgradeSeeds},
     {"afp_info_fuzz", WriteAfpInfoSeeds},
+    {"attribute_text_fuzz", WriteAttributeTextSeeds},
     {"dos_attributes_fuzz", WriteDosAttributesSeeds},
     {"finder_info_fuzz", WriteFinderInfoSeeds},
     {"samba_stream_fuzz", WriteSambaStreamSeeds},

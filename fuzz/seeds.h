@@ -12,6 +12,7 @@ void WriteRecordSeeds(const std::string& directory);
 void WriteImportSeeds(const std::string& directory);
 void WriteResourceCopySeeds(const std::string& directory);
 void WriteUpgradeSeeds(const std::string& directory);
+void WriteAttributeTextSeeds(const std::string& directory);
 void WriteAfpInfoSeeds(const std::string& directory);
 void WriteDosAttributesSeeds(const std::string& directory);
 void WriteFinderInfoSeeds(const std::string& directory);

@@ -73,8 +73,9 @@ TEST(CommandLineTest, HelpAndVersionAreWrittenToStandardOutput) {
           "--json",  "Examples:", "Exit status:", "Volume types:"}) {
         EXPECT_THAT(help.out, HasSubstr(text));
     }
-    for (const char* command : {"where", "list", "get", "set", "remove", "lock", "unlock", "import",
-                                "export", "upgrade", "repair", "clean", "convert", "dump"}) {
+    for (const char* command :
+         {"where", "list", "get", "set", "remove", "lock", "unlock", "import", "export", "save",
+          "restore", "upgrade", "repair", "clean", "convert", "dump"}) {
         EXPECT_THAT(RunTool({command, "--help"}), Succeeded());
     }
     const ToolResult version = RunTool({"--version"});

@@ -118,6 +118,19 @@ void AddLegacyFolder(const Maker& maker, const std::string& parent, const std::s
     maker.File(folder + "/MAVO:Resource", maker.LegacyResource());
 }
 
+// As restore takes it, with something for each place.
+std::string TextForTree() {
+    std::string text;
+    for (const char* path : {"tree", "tree/a.txt", "tree/b.txt", "tree/sub", "tree/sub/d.txt"}) {
+        text += std::string("# file: ") + path +
+                "\nuser.user.colour=\"new\"\nuser.com.apple.ResourceFork=\"new fork\"\n"
+                "user.mavoea.comment=\"remark\"\nuser.mavoea.hidden=\"1\"\n"
+                "user.mavoea.service.@Other=\"new\"\nuser.mavoea.service./MAVO:Other=\"new\"\n"
+                "user.mavoea.locked=\"1\"\n\n";
+    }
+    return text;
+}
+
 void MakeTree(const Maker& maker, unsigned parts, int type, const std::string& parent) {
     const std::string tree = parent + "/tree";
     const std::string sub = tree + "/sub";
@@ -149,6 +162,7 @@ void MakeTree(const Maker& maker, unsigned parts, int type, const std::string& p
         maker.File(tree + "/incoming",
                    ClassicFile(maker.FinderInfo(), maker.Text("fork in")).bytes);
     }
+    if ((parts & kText) != 0) maker.File(parent + "/text", Ascii(TextForTree()));
 }
 
 // A tree of all parts, in each of its directories one name more than there is on the share.

@@ -45,6 +45,7 @@ enum TreePart : unsigned {
     kAllParts = 31,
     kLocked = 32,  // nobody may write the files
     kThere = 64,   // the same tree in "to"
+    kText = 128,   // beside the tree a text that gives its objects metadata
 };
 
 // Two volumes, "from" with the directory "tree" in it and "to" with nothing, both the attacker's.

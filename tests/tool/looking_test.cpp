@@ -279,6 +279,10 @@ std::vector<Look> ShowingLooks() {
          [](const World& world) {
              return Runs{{"show", "-r", world.top()}, {"--json", "show", "-r", world.top()}};
          }},
+        {"Save",
+         [](const World& world) {
+             return Runs{{"save", "-r", world.top()}, {"save", "--encoding", "hex", world.top()}};
+         }},
         {"Get", Gets},
         {"Dump", [](const World& world) { return OfEach(world.MetadataFiles(), {"dump"}); }},
         {"DumpOfRecords",

@@ -14,6 +14,7 @@
 #include "tests/support/process.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/holdings.h"
+#include "tests/tool/kills.h"
 #include "tests/tool/tool.h"
 #include "tests/tool/travel.h"
 
@@ -536,6 +537,47 @@ TEST_F(SaveTest, ATextThatWasCutLeavesNoWrongValue) {
         std::filesystem::remove(volume + "/._a");
     }
     EXPECT_THAT(Restore(volume, text), Succeeded());
+}
+
+// ---- Runs that are killed -----------------------------------------------------------------------
+
+class SaveKillTest : public SaveTest, public ::testing::WithParamInterface<std::string> {};
+INSTANTIATE_TEST_SUITE_P(Kinds, SaveKillTest,
+                         ::testing::Values("eadir", "appledouble", "fileea", "linux"));
+
+TEST_P(SaveKillTest, TheSameCommandBringsAKilledRunToItsEnd) {
+    MAVOEA_SKIP_UNLESS_STOPPED();
+    const bool doubles = GetParam() == "appledouble";
+    const std::string volume = Add(GetParam(), "volume");
+    WriteFile(dir_ / "text",
+              Ascii("# file: a\n"
+                    "user.user.colour=\"blue\"\nuser.com.apple.ResourceFork=\"new fork\"\n"
+                    "user.mavoea.hidden=\"1\"\n" +
+                    std::string(doubles ? "" : "user.mavoea.comment=\"remark\"\n") +
+                    "\n# file: b\nuser.user.colour=\"green\"\n\n"));
+    Arguments arguments = volumes_;
+    arguments.insert(arguments.end(), {"restore", "--directory", volume, dir_ / "text"});
+    const auto make = [&] {
+        for (const std::string& name : NamesIn(volume)) {
+            std::filesystem::remove_all(volume + '/' + name);
+        }
+        for (const char* name : {"/a", "/b"}) {
+            WriteFile(volume + name, Ascii("data"));
+            ASSERT_THAT(Run({"set", volume + name, "user.colour", "red"}), Succeeded());
+            ASSERT_THAT(Run({"set", volume + name, "user.shape", "round"}), Succeeded());
+        }
+    };
+    make();
+    ASSERT_THAT(RunTool(arguments), Succeeded());
+    const auto wanted = Everything(volume);
+    const std::string saved = Saved(volume);
+    EXPECT_THAT(saved, AllOf(HasSubstr("blue"), HasSubstr("green"), HasSubstr("round")));
+    KillAtEachChange(arguments, volume, make, [&] {
+        EXPECT_EQ("round", Get(volume + "/a", "user.shape"));
+        EXPECT_THAT(RunTool(arguments), Succeeded());
+        EXPECT_EQ(SortedLines(saved), SortedLines(Saved(volume)));
+        EXPECT_EQ(std::vector<std::string>(), Differences(wanted, Everything(volume)));
+    });
 }
 
 // ---- Options ------------------------------------------------------------------------------------

@@ -10,6 +10,7 @@
 #include <functional>
 #include <map>
 #include <memory>
+#include <set>
 #include <string_view>
 #include <utility>
 #include <vector>
@@ -244,6 +245,7 @@ class PathFinder {
         if (!last_ || last_root_ != from_root || last_names_ != names) {
             DirectoryRef in = from_root ? PlaceOf("/", Shown::kWhole).Open() : inside_;
             for (const std::string& name : names) in = in->OpenIn(name);
+            Settle(in);
             last_ = in;
             last_root_ = from_root;
             last_names_ = names;
@@ -252,6 +254,12 @@ class PathFinder {
     }
 
  private:
+    // What a run that was killed has left there, once.
+    void Settle(const DirectoryRef& directory) {
+        const struct stat info = directory->Status();
+        if (settled_.emplace(info.st_dev, info.st_ino).second) (void)SettlePending(directory);
+    }
+
     std::vector<std::string> NamesIn(const std::string& path) const {
         const auto refuse = [&](const char* cause, const char* advice) {
             throw Failure(kFailed, path, cause, advice);
@@ -294,6 +302,7 @@ class PathFinder {
     DirectoryRef last_;
     bool last_root_ = false;
     std::vector<std::string> last_names_;
+    std::set<std::pair<dev_t, ino_t>> settled_;
 };
 
 // ---- The work -----------------------------------------------------------------------------------
