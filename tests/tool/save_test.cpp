@@ -2,7 +2,9 @@
 // setfattr restores what was saved, and what getfattr wrote is restored.
 
 #include <gtest/gtest.h>
+#include <pty.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <sys/xattr.h>
 #include <unistd.h>
 
@@ -615,6 +617,37 @@ TEST_F(SaveTest, AFileIsNewAndItsOwnersOnly) {
     EXPECT_EQ(2, Run({"--json", "save", volume + "/a"}).status);
     EXPECT_EQ(2, Run({"save", "--encoding", "octal", volume + "/a"}).status);
     EXPECT_EQ(2, Run({"save", volume + "/none"}).status);
+}
+
+TEST_F(SaveTest, ATerminalIsGivenNoCommandsAndTheTextMeansTheSame) {
+    const std::string volume = AddWithFile("eadir");
+    const std::string value = "a long value with one command in it \x1B[2J";
+    ASSERT_THAT(Run({"set", volume + "/a", "na\x1Bme", value}), Succeeded());
+    Arguments arguments = volumes_;
+    arguments.insert(arguments.end(), {"save", "-r", "--absolute-names", volume});
+    ToolStart tool(arguments);
+    int terminal = -1;
+    const pid_t child = forkpty(&terminal, nullptr, nullptr, nullptr);
+    if (child < 0) GTEST_SKIP() << "there are no terminals here";
+    if (child == 0) {
+        tool.Exec();
+        _exit(127);
+    }
+    std::string shown;
+    char part[1024];
+    for (ssize_t size; (size = read(terminal, part, sizeof part)) > 0;) {
+        shown.append(part, static_cast<std::size_t>(size));
+    }
+    int status = -1;
+    waitpid(child, &status, 0);
+    close(terminal);
+    EXPECT_EQ(0, status);
+    EXPECT_EQ("# file: " + volume + "/a\r\nuser.na\\033me=\"a long value with one command in it " +
+                  "\\033[2J\"\r\n\r\n",
+              shown);
+    ASSERT_THAT(Run({"remove", volume + "/a", "na\x1Bme"}), Succeeded());
+    EXPECT_THAT(Run({"restore", "--absolute-names"}, shown), Succeeded());
+    EXPECT_EQ(value, Get(volume + "/a", "na\x1Bme"));
 }
 
 TEST_F(SaveTest, WhatCannotBeReadIsNamedAndTheRestIsSaved) {

@@ -288,7 +288,7 @@ class PathFinder {
     static Object At(const Place& place) {
         const struct stat info = StatusOf(place);
         const mode_t type = info.st_mode & S_IFMT;
-        const Object object = ObjectAt(place, type);
+        Object object = ObjectAt(place, type);
         if (!object.is_root() && IsMetadata(*place.directory, {place.name, type}, object.type)) {
             throw Failure(kFailed, object.path(), "what it leads to is metadata itself",
                           "name the object");

@@ -1,6 +1,7 @@
 #include "tools/move/save.h"
 
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <iostream>
 #include <memory>
@@ -90,6 +91,22 @@ class TextOutput {
     std::uint64_t end_ = 0;
 };
 
+// With what a terminal might take for commands as octal digits, which mean the same in names and in
+// values.
+std::string ForTerminals(const std::string& text) {
+    if (IsShownByTerminals(text)) return text;
+    std::string shown;
+    for (const char c : text) {
+        if (c == '\n' || (c >= ' ' && c <= '~')) {
+            shown += c;
+        } else {
+            const auto escape = OctalEscape(static_cast<std::uint8_t>(c));
+            shown.append(escape.data(), escape.size());
+        }
+    }
+    return shown;
+}
+
 bool HasDotDot(std::string_view path) {
     return path == ".." || path.starts_with("../") || path.ends_with("/..") ||
            path.find("/../") != path.npos;
@@ -100,7 +117,9 @@ class Saving {
     explicit Saving(const SaveOptions& options)
         : options_(options),
           encoding_(EncodingNamed(options.encoding)),
-          job_options_{options.paths, options.recursive, false, options.json},
+          to_terminal_(!options.file && ::isatty(STDOUT_FILENO) == 1),
+          // Nothing else comes where the text goes.
+          job_options_{{}, options.recursive && options.file, false, options.json},
           job_("saving", "saved", job_options_),
           output_(options) {}
 
@@ -131,6 +150,7 @@ class Saving {
 
     bool Do(const Object& object, const std::string& given) {
         if (job_.stopped()) return false;
+        if (options_.file) job_.ShowProgress(object.path());
         std::string text;
         try {
             text = TextOf(object, PathInText(object, given));
@@ -139,7 +159,7 @@ class Saving {
             return true;
         }
         // Nothing more can be said where this cannot be written.
-        if (!text.empty()) output_.Write(text);
+        if (!text.empty()) output_.Write(to_terminal_ ? ForTerminals(text) : text);
         job_.AddDone();
         return true;
     }
@@ -203,6 +223,7 @@ class Saving {
 
     const SaveOptions& options_;
     std::optional<TextEncoding> encoding_;
+    bool to_terminal_;
     JobOptions job_options_;
     Job job_;
     TextOutput output_;

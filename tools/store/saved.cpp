@@ -115,7 +115,8 @@ class OwnItems {
         : path_(path), metadata_(*metadata), gathering_(metadata) {}
 
     void Add(const std::string& attribute, Bytes value) {
-        std::string_view what = std::string_view(attribute).substr(kOwn.size());
+        std::string_view what = attribute;
+        what.remove_prefix(kOwn.size());
         const auto begins = [&](std::string_view prefix) {
             if (!what.starts_with(prefix)) return false;
             what.remove_prefix(prefix.size());
@@ -125,11 +126,13 @@ class OwnItems {
         if (begins(kFlags)) return AddFlags(attribute, std::string(what), value);
         if (begins(kService)) return AddService(attribute, std::string(what), std::move(value));
         if (begins(kEntry)) {
-            const auto id = NumberIn<std::uint32_t>(what);
-            const bool own = id == 0U || id == static_cast<std::uint32_t>(EntryId::kResourceFork) ||
-                             id == static_cast<std::uint32_t>(EntryId::kFinderInfo);
-            if (!id || own) throw Wrong(attribute, "no entry has that number");
-            return AddEntry(attribute, static_cast<EntryId>(*id), std::move(value));
+            const auto number = NumberIn<std::uint32_t>(what);
+            const auto id = static_cast<EntryId>(number.value_or(0));
+            if (id == EntryId::kNone || id == EntryId::kResourceFork ||
+                id == EntryId::kFinderInfo) {
+                throw Wrong(attribute, "no entry has that number");
+            }
+            return AddEntry(attribute, id, std::move(value));
         }
         for (const NamedEntry& entry : kNamedEntries) {
             if (entry.name == what) return AddEntry(attribute, entry.id, std::move(value));
@@ -341,6 +344,7 @@ std::vector<std::string> SavedAttributes::AttributeNames() const {
     for (const auto& [name, value] : values_) positions.emplace_back(value.position, name);
     std::sort(positions.begin(), positions.end());
     std::vector<std::string> names;
+    names.reserve(positions.size());
     for (auto& [position, name] : positions) names.push_back(std::move(name));
     return names;
 }
