@@ -54,8 +54,8 @@ class BinaryList {
     const char* WhyNot() {
         if (bytes_.size() < kBinaryMagic.size() + kTrailerSize) return kDamaged;
         const std::uint64_t end = bytes_.size() - kTrailerSize;
-        place_size_ = bytes_[end + 6];
-        number_size_ = bytes_[end + 7];
+        place_size_ = At(end + 6);
+        number_size_ = At(end + 7);
         if (!IsSize(place_size_) || !IsSize(number_size_)) return kDamaged;
         count_ = Load(end + 8, 8);
         const std::uint64_t root = Load(end + 16, 8);
@@ -70,9 +70,12 @@ class BinaryList {
 
     static bool IsSize(unsigned size) { return size == 1 || size == 2 || size == 4 || size == 8; }
 
+    // In the list.
+    std::uint8_t At(std::uint64_t at) const { return bytes_[static_cast<std::size_t>(at)]; }
+
     std::uint64_t Load(std::uint64_t at, unsigned size) const {
         std::uint64_t value = 0;
-        for (unsigned i = 0; i < size; ++i) value = value << 8 | bytes_[at + i];
+        for (unsigned i = 0; i < size; ++i) value = value << 8 | At(at + i);
         return value;
     }
 
@@ -81,13 +84,13 @@ class BinaryList {
         if (depth > kDepthMax || ++nodes_ > kNodesMax) return kTooMuch;
         std::uint64_t at = Load(table_ + number * place_size_, place_size_);
         if (at < kBinaryMagic.size() || at >= table_) return kDamaged;
-        const unsigned kind = bytes_[at] >> 4;
-        std::uint64_t size = bytes_[at] & 0xFU;
+        const unsigned kind = At(at) >> 4;
+        std::uint64_t size = At(at) & 0xFU;
         ++at;
         const bool is_long = size == 0xF && kind >= 0x4 && kind != 0x8;
         if (is_long) {
-            if (at >= table_ || bytes_[at] >> 4 != 1 || (bytes_[at] & 0xFU) > 3) return kDamaged;
-            const unsigned size_size = 1U << (bytes_[at] & 0xFU);
+            if (at >= table_ || At(at) >> 4 != 1 || (At(at) & 0xFU) > 3) return kDamaged;
+            const unsigned size_size = 1U << (At(at) & 0xFU);
             ++at;
             if (table_ - at < size_size) return kDamaged;
             size = Load(at, size_size);
