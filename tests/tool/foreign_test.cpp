@@ -20,6 +20,7 @@ namespace {
 namespace fs = std::filesystem;
 
 using ::testing::AllOf;
+using ::testing::AnyOf;
 using ::testing::HasSubstr;
 using ::testing::Not;
 
@@ -622,6 +623,97 @@ TEST_F(ForeignTest, DatesThatAreKeptInTwoPlacesAreReadTogether) {
     const ToolResult copied = samba_.Run({"--volume", volume, "cp", away, samba_.path() + "/c"});
     EXPECT_EQ(2, copied.status);
     EXPECT_THAT(copied.err, HasSubstr("a second file dates"));
+}
+
+// ---- Whatever bytes are there -------------------------------------------------------------------
+
+// Every truncation of a value, and the limits of a byte in each place of it.
+std::vector<Bytes> DamagedOnesOf(const Bytes& whole) {
+    std::vector<Bytes> all;
+    for (std::size_t size = 0; size < whole.size(); ++size) {
+        all.push_back(Stretch(whole, 0, size));
+    }
+    for (std::size_t at = 0; at < whole.size(); ++at) {
+        for (const unsigned byte : {0x00U, 0x01U, 0x7FU, 0x80U, 0xFFU}) {
+            all.push_back(whole);
+            all.back()[at] = static_cast<std::uint8_t>(byte);
+        }
+    }
+    return all;
+}
+
+// One run of the tool for all values: each is an object's.
+class HostileValueTest : public ForeignTest {
+ protected:
+    // `store` gives an object, by its directory and name, a value.
+    template <class Store>
+    static void ExpectReadable(const Share& share, const Bytes& whole, Store store) {
+        const std::string tree = share.path() + "/tree";
+        fs::create_directory(tree);
+        int count = 0;
+        for (const Bytes& value : DamagedOnesOf(whole)) {
+            const std::string name = "o" + std::to_string(count++);
+            WriteFile(tree + '/' + name, {});
+            SetAttribute(tree + '/' + name, kColourStream, Ascii("red") + Bytes{0});
+            store(tree, name, value);
+        }
+        const Arguments list = {"--json", "list", "-l", "-r", tree};
+        for (const ToolResult& result : {share.Run(list), RunTool(list)}) {
+            EXPECT_THAT(result.status, AnyOf(0, 2)) << result.err;
+            EXPECT_EQ(count, CountOf("\"com.example.colour\"", result.out));
+        }
+        // Each goes along whole, or is named.
+        const ToolResult copied = share.Run({"cp", "-r", tree, share.path() + "/copy"});
+        EXPECT_THAT(copied.status, AnyOf(0, 2)) << copied.err;
+        EXPECT_EQ(count, CountOf("\"com.example.colour\"",
+                                 share.Run({"--json", "list", "-r", share.path() + "/copy"}).out));
+        fs::remove_all(tree);
+        fs::remove_all(share.path() + "/copy");
+    }
+
+    static auto AsAttribute(const std::string& attribute) {
+        return [attribute](const std::string& tree, const std::string& name, const Bytes& value) {
+            SetAttribute(tree + '/' + name, attribute, value);
+        };
+    }
+
+    static int CountOf(const std::string& text, const std::string& in) {
+        int count = 0;
+        for (std::size_t at = 0; (at = in.find(text, at)) != std::string::npos; ++at) ++count;
+        return count;
+    }
+};
+
+TEST_F(HostileValueTest, OfARecord) {
+    ExpectReadable(samba_, Record(FinderInfo(), "a comment", 0x01A0), AsAttribute(kRecord));
+}
+
+TEST_F(HostileValueTest, OfAnAfpInfo) {
+    ExpectReadable(stream_, AfpInfo(FinderInfo()) + Bytes{0}, AsAttribute(kAfpInfo));
+}
+
+TEST_F(HostileValueTest, OfDosAttributes) {
+    ExpectReadable(samba_, Dos(0x27), AsAttribute(kDosAttributes));
+}
+
+TEST_F(HostileValueTest, OfAValueThatGoesOn) {
+    const std::string extent = "user.DosStreamExt.1.big:$DATA";
+    ExpectReadable(samba_, Ascii("begins") + Bytes{1},
+                   [&](const std::string& tree, const std::string& name, const Bytes& value) {
+                       SetAttribute(tree + '/' + name, "user.DosStream.big:$DATA", value);
+                       SetAttribute(tree + '/' + name, extent, Ascii("goes on"));
+                   });
+}
+
+TEST_F(HostileValueTest, OfAFileBesideIt) {
+    Bytes mac = ForkFile("the fork");
+    Put(mac, 8, Ascii("Mac OS X        "));
+    for (const Bytes& file : {ForkFile("the fork"), mac}) {
+        ExpectReadable(samba_, file,
+                       [](const std::string& tree, const std::string& name, const Bytes& value) {
+                           WriteFile(tree + "/._" + name, value);
+                       });
+    }
 }
 
 // ---- streams_depot ------------------------------------------------------------------------------

@@ -105,6 +105,9 @@ class Directory : public std::enable_shared_from_this<Directory> {
     };
     std::optional<VolumeType>& volume_type() const { return volume_type_; }
 
+    // Where, in or above it, Samba keeps streams as files; empty: nowhere. Kept for who asks again.
+    std::optional<std::string>& depot() const { return depot_; }
+
     // None when nothing of that name is there.
     std::optional<struct stat> StatusOf(const std::string& name) const;
     bool Has(const std::string& name) const { return StatusOf(name).has_value(); }
@@ -167,6 +170,7 @@ class Directory : public std::enable_shared_from_this<Directory> {
     mutable std::optional<bool> tells_cases_apart_;
     mutable DirectoryRef kept_;
     mutable std::optional<VolumeType> volume_type_;
+    mutable std::optional<std::string> depot_;
 };
 
 // An object, or where one is to be: an open directory and a name there.

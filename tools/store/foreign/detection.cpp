@@ -62,17 +62,14 @@ bool IsDepot(const fs::path& path) {
     return false;
 }
 
-// In a directory or one of those above it, as text: a share has one in its root. Kept for the next
-// object.
-const std::string& DepotAbove(const DirectoryRef& directory) {
-    static std::weak_ptr<const Directory> last;
-    static std::string depot;
-    if (last.lock() == directory) return depot;
-    last = directory;
-    depot.clear();
-    for (fs::path at = directory->location();; at = at.parent_path()) {
-        if (IsDepot(at / kDepotName)) depot = at / kDepotName;
-        if (!depot.empty() || at == at.parent_path()) return depot;
+// In a directory or one of those above it, as text: a share has one in its root.
+const std::string& DepotAbove(const Directory& directory) {
+    std::optional<std::string>& depot = directory.depot();
+    if (depot) return *depot;
+    depot.emplace();
+    for (fs::path at = directory.location();; at = at.parent_path()) {
+        if (IsDepot(at / kDepotName)) *depot = at / kDepotName;
+        if (!depot->empty() || at == at.parent_path()) return *depot;
     }
 }
 
@@ -83,7 +80,8 @@ std::string FindDepot(const Object& object, const Inode* inode,
     const Dialect* const dialect = object.dialect();
     const bool is_sambas = dialect != nullptr && dialect->names == Dialect::Names::kStream;
     if (object.declared && !is_sambas) return {};
-    if (const std::string& above = DepotAbove(object.place.directory); !above.empty()) return above;
+    if (const std::string& above = DepotAbove(*object.place.directory); !above.empty())
+        return above;
     if (inode != nullptr && S_ISDIR(inode->info().st_mode)) {
         const fs::path own = fs::path(object.place.location()) / kDepotName;
         if (IsDepot(own)) return own;
