@@ -80,8 +80,8 @@ std::string FindDepot(const Object& object, const Inode* inode,
     const Dialect* const dialect = object.dialect();
     const bool is_sambas = dialect != nullptr && dialect->names == Dialect::Names::kStream;
     if (object.declared && !is_sambas) return {};
-    if (const std::string& above = DepotAbove(*object.place.directory); !above.empty())
-        return above;
+    const std::string& above = DepotAbove(*object.place.directory);
+    if (!above.empty()) return above;
     if (inode != nullptr && S_ISDIR(inode->info().st_mode)) {
         const fs::path own = fs::path(object.place.location()) / kDepotName;
         if (IsDepot(own)) return own;
