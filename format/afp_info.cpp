@@ -8,16 +8,29 @@ constexpr std::uint32_t kVersion = 0x00000100;
 
 }  // namespace
 
+bool AfpInfoFields::HasSignature() const { return signature == kSignature; }
+
+bool AfpInfoFields::HasVersion() const { return version == kVersion; }
+
+std::optional<AfpInfoFields> ReadAfpInfoFields(ByteView bytes) {
+    if (bytes.size() < kAfpInfoSize) return std::nullopt;
+    BeReader in(bytes);
+    AfpInfoFields fields;
+    fields.signature = in.U32();
+    fields.version = in.U32();
+    fields.reserved = in.U32();
+    fields.info.backup_time = in.U32();
+    in.Copy(fields.info.finder_info);
+    in.Copy(fields.info.prodos_info);
+    in.Copy(fields.reserved_at_end);
+    return fields;
+}
+
 std::optional<AfpInfo> DecodeAfpInfo(ByteView bytes) {
     if (bytes.size() != kAfpInfoSize) return std::nullopt;
-    BeReader in(bytes);
-    if (in.U32() != kSignature || in.U32() != kVersion) return std::nullopt;
-    in.U32();  // reserved
-    AfpInfo info;
-    info.backup_time = in.U32();
-    in.Copy(info.finder_info);
-    in.Copy(info.prodos_info);
-    return info;
+    const auto fields = ReadAfpInfoFields(bytes);
+    if (!fields || !fields->HasSignature() || !fields->HasVersion()) return std::nullopt;
+    return fields->info;
 }
 
 std::array<std::uint8_t, kAfpInfoSize> EncodeAfpInfo(const AfpInfo& info) {

@@ -34,6 +34,20 @@ struct AfpInfo {
     std::array<std::uint8_t, 6> prodos_info{};
 };
 
+// All fields, whatever is in them.
+struct AfpInfoFields {
+    std::uint32_t signature = 0;
+    std::uint32_t version = 0;
+    std::uint32_t reserved = 0;
+    AfpInfo info;
+    std::array<std::uint8_t, 6> reserved_at_end{};
+
+    bool HasSignature() const;
+    bool HasVersion() const;
+};
+// None of fewer bytes; of more the first.
+std::optional<AfpInfoFields> ReadAfpInfoFields(ByteView bytes);
+
 // None of bytes of another size, signature or version. What is reserved may be anything.
 std::optional<AfpInfo> DecodeAfpInfo(ByteView bytes);
 std::array<std::uint8_t, kAfpInfoSize> EncodeAfpInfo(const AfpInfo& info);

@@ -8,9 +8,6 @@ namespace {
 using ByteView = std::span<const std::uint8_t>;
 using ByteSpan = std::span<std::uint8_t>;
 
-constexpr std::uint32_t kAttributesValid = 0x01;
-constexpr std::uint32_t kCreationTimeValid = 0x10;
-
 std::uint16_t LoadLe16(ByteView bytes, std::size_t at) {
     return static_cast<std::uint16_t>(bytes[at] | bytes[at + 1] << 8);
 }
@@ -54,16 +51,22 @@ struct Fields {
     std::size_t offset;  // of what the layout describes
 };
 
+std::size_t TextSize(ByteView bytes) {
+    return static_cast<std::size_t>(std::find(bytes.begin(), bytes.end(), 0) - bytes.begin());
+}
+
+// Where the two version numbers are, behind the text's NUL, and what follows them.
+std::size_t VersionsAt(ByteView bytes) { return (TextSize(bytes) + 2) & ~std::size_t{1}; }
+std::size_t BodyAt(ByteView bytes) { return (VersionsAt(bytes) + 4 + 3) & ~std::size_t{3}; }
+
 std::optional<Fields> FindFields(ByteView bytes) {
-    const auto text_end = std::find(bytes.begin(), bytes.end(), 0);
-    const auto text_size = static_cast<std::size_t>(text_end - bytes.begin());
-    const std::size_t versions = (text_size + 2) & ~std::size_t{1};  // behind the NUL
+    const std::size_t versions = VersionsAt(bytes);
     if (bytes.size() < versions + 4) return std::nullopt;
     const std::uint16_t version = LoadLe16(bytes, versions);
     if (version < 1 || version > std::size(kLayouts)) return std::nullopt;
     if (LoadLe16(bytes, versions + 2) != version) return std::nullopt;
     const Layout& layout = kLayouts[version - 1];
-    const std::size_t offset = (versions + 4 + 3) & ~std::size_t{3};
+    const std::size_t offset = BodyAt(bytes);
     if (bytes.size() < offset + layout.size) return std::nullopt;
     return Fields{&layout, offset};
 }
@@ -93,6 +96,30 @@ std::optional<std::uint32_t> DecodeText(ByteView bytes) {
 
 }  // namespace
 
+DosAttributesFields ReadDosAttributesFields(ByteView bytes) {
+    DosAttributesFields fields;
+    fields.text = {reinterpret_cast<const char*>(bytes.data()), TextSize(bytes)};
+    const std::size_t versions = VersionsAt(bytes);
+    if (bytes.size() < versions + 2) return fields;
+    fields.version = LoadLe16(bytes, versions);
+    if (bytes.size() < versions + 4) return fields;
+    fields.version_again = LoadLe16(bytes, versions + 2);
+    if (*fields.version < 1 || *fields.version > std::size(kLayouts)) return fields;
+    const Layout& layout = kLayouts[*fields.version - 1];
+    const std::size_t offset = BodyAt(bytes);
+    fields.size = offset + layout.size;
+    const auto has = [&](std::size_t at, std::size_t size) {
+        return at != kNone && offset + at + size <= bytes.size();
+    };
+    if (has(layout.valid_flags, 4))
+        fields.valid_flags = LoadLe32(bytes, offset + layout.valid_flags);
+    if (has(layout.attributes, 4)) fields.attributes = LoadLe32(bytes, offset + layout.attributes);
+    if (has(layout.creation_time, 8)) {
+        fields.creation_time = LoadLe64(bytes, offset + layout.creation_time);
+    }
+    return fields;
+}
+
 std::optional<DosAttributes> DecodeDosAttributes(ByteView bytes) {
     if (bytes.size() > kDosAttributesMax) return std::nullopt;
     const auto fields = FindFields(bytes);
@@ -106,7 +133,7 @@ std::optional<DosAttributes> DecodeDosAttributes(ByteView bytes) {
                         .creation_time = {}};
     if (layout->creation_time == kNone) return value;
     if (layout->valid_flags != kNone &&
-        (LoadLe32(bytes, offset + layout->valid_flags) & kCreationTimeValid) == 0) {
+        (LoadLe32(bytes, offset + layout->valid_flags) & kDosCreationTimeValid) == 0) {
         return value;
     }
     const std::uint64_t time = LoadLe64(bytes, offset + layout->creation_time);
@@ -121,7 +148,7 @@ bool SetDosAttributes(ByteSpan bytes, std::uint32_t attributes) {
     StoreLe32(attributes, bytes, offset + layout->attributes);
     if (layout->valid_flags != kNone) {
         const std::size_t at = offset + layout->valid_flags;
-        StoreLe32(LoadLe32(bytes, at) | kAttributesValid, bytes, at);
+        StoreLe32(LoadLe32(bytes, at) | kDosAttributesValid, bytes, at);
     }
     return true;
 }
@@ -135,7 +162,7 @@ std::array<std::uint8_t, kDosAttributesSize> EncodeDosAttributes(const DosAttrib
     std::array<std::uint8_t, kDosAttributesSize> bytes{};
     StoreLe16(5, bytes, kVersion);
     StoreLe16(5, bytes, kVersion + 2);
-    StoreLe32(kAttributesValid | (value.creation_time ? kCreationTimeValid : 0), bytes,
+    StoreLe32(kDosAttributesValid | (value.creation_time ? kDosCreationTimeValid : 0), bytes,
               kBody + kLayout.valid_flags);
     StoreLe32(value.attributes, bytes, kBody + kLayout.attributes);
     StoreLe64(value.creation_time.value_or(0), bytes, kBody + kLayout.creation_time);

@@ -28,6 +28,7 @@
 #include <cstdint>
 #include <optional>
 #include <span>
+#include <string_view>
 
 namespace mavoea {
 
@@ -46,6 +47,24 @@ struct DosAttributes {
 
 // The most bytes that Samba reads; a longer value is none to it.
 inline constexpr std::size_t kDosAttributesMax = 256;
+
+// Bits of the valid flags.
+inline constexpr std::uint32_t kDosAttributesValid = 0x01;
+inline constexpr std::uint32_t kDosCreationTimeValid = 0x10;
+
+// All fields that a value has, whatever is in them; none of those that its version does not have,
+// or that it ends before.
+struct DosAttributesFields {
+    std::string_view text;                 // without its NUL
+    std::optional<std::uint16_t> version;  // none: the value is the text alone
+    std::optional<std::uint16_t> version_again;
+    std::size_t size = 0;  // that a value of this version has at least; 0: of no known one
+    std::optional<std::uint32_t> valid_flags;
+    std::optional<std::uint32_t> attributes;
+    std::optional<std::uint64_t> creation_time;
+};
+// `bytes` outlive the fields.
+DosAttributesFields ReadDosAttributesFields(std::span<const std::uint8_t> bytes);
 
 // None of what Samba does not understand either, and takes for no attributes at all.
 std::optional<DosAttributes> DecodeDosAttributes(std::span<const std::uint8_t> bytes);

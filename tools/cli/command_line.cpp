@@ -39,6 +39,7 @@ constexpr const char* kExamples = R"(Examples:
   mavoea diff -r /srv/share /mnt/share
   mavoea dump @eaDir/letter.txt@MavoEAStream
   mavoea dump --record letter.txt
+  mavoea dump --attributes letter.txt
 
 Volume types: a number from 0 to 12, or appledouble (0), eadir (1), fileea (2), xattr (7); and what
 other programs keep: samba, samba-stream, samba-all-streams, netatalk, netatalk-samba, linux.
@@ -307,8 +308,12 @@ constexpr Syntax kCommands[] = {
      }},
     {Command::kDump, "dump", "Show and check every field of an EA stream or AppleDouble file",
      [](CLI::App* sub, Options* options) {
-         sub->add_flag("--record", options->record,
-                       "FILE is an object, whose netatalk record is shown");
+         CLI::Option* const record = sub->add_flag(
+             "--record", options->record, "FILE is an object, whose netatalk record is shown");
+         sub->add_flag("--attributes", options->attributes,
+                       "FILE is an object, and what Samba, netatalk and others keep of it in its "
+                       "extended attributes is shown")
+             ->excludes(record);
          sub->add_option_function<std::string>(
                 "FILE", [=](const std::string& path) { options->paths = {path}; },
                 "A metadata file")

@@ -67,6 +67,7 @@ struct Options {
     bool brief = false;                   // diff
     bool itemized = false;                // diff
     bool record = false;                  // dump: the record of an object
+    bool attributes = false;              // dump: what other programs keep of an object
     bool hex = false;                     // get, set
     bool raw = false;                     // get: to a terminal, too
     bool escaped = false;                 // get, set, remove: the name is as list shows it

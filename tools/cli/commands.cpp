@@ -23,6 +23,7 @@
 #include "tools/place/volume.h"
 #include "tools/say/output.h"
 #include "tools/say/text.h"
+#include "tools/show/attribute_dump.h"
 #include "tools/show/attributes.h"
 #include "tools/show/diff.h"
 #include "tools/show/dump.h"
@@ -183,8 +184,34 @@ ExitStatus DumpRecord(const Options& options) {
                   "let the AFP service write it anew, or remove it");
 }
 
+ExitStatus DumpAttributesOf(const Options& options) {
+    const std::string& path = options.paths.front();
+    const std::vector<AttributeDump> dumps = DumpAttributes(FindObject(path));
+    Json json = Json::Array();
+    std::size_t violations = 0;
+    bool first = true;
+    for (const AttributeDump& dump : dumps) {
+        violations += dump.violations;
+        json.Add(dump.json);
+        if (!options.json) std::cout << (first ? "" : "\n") << dump.text;
+        first = false;
+    }
+    if (options.json) Print(json);
+    if (dumps.empty()) {
+        throw Failure(kNotFound, path, "no attributes of users or of other programs",
+                      "mavoea where PATH has the files in which metadata may be");
+    }
+    if (violations == 0) return kSuccess;
+    throw Failure(
+        kFailed, path,
+        "its attributes are violated in " + std::to_string(violations) +
+            (violations == 1 ? " place" : " places"),
+        "let the program that keeps them write them anew, or remove them with: setfattr -x");
+}
+
 ExitStatus Dump(const Options& options) {
     if (options.record) return DumpRecord(options);
+    if (options.attributes) return DumpAttributesOf(options);
     const std::string& path = options.paths.front();
     const Layout layout = ReadLayout(File::OpenToRead(path));
     const Findings findings = CheckLayout(layout);

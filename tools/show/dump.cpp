@@ -2,6 +2,7 @@
 
 #include "tools/say/text.h"
 #include "tools/show/entry_text.h"
+#include "tools/show/fields.h"
 
 namespace mavoea::tool {
 namespace {
@@ -24,23 +25,6 @@ std::string IdText(EntryId id) {
     const auto number = static_cast<std::uint32_t>(id);
     return number > 0xFFFF ? HexNumber(number) : std::to_string(number);
 }
-
-// One field a line, its name padded to the widest.
-class Fields {
- public:
-    void Add(std::string_view name, const std::string& value) {
-        constexpr std::size_t kWidth = 16;
-        std::string padded(name);
-        padded.resize(std::max(kWidth, name.size() + 1), ' ');
-        text_ += padded + value + '\n';
-    }
-    void Line(const std::string& line) { text_ += line + '\n'; }
-
-    std::string Take() { return std::move(text_); }
-
- private:
-    std::string text_;
-};
 
 void AddHeader(const Layout& layout, Fields* out) {
     const AppleDoubleHeader& header = *layout.header;
@@ -97,8 +81,7 @@ std::string DumpText(const std::string& path, const Layout& layout, const Findin
         const Range range = layout.entries[*fork].data;
         out.Add("resource fork", range.length == 0 ? "none" : RangeText(range));
     }
-    for (const std::string& note : findings.notes) out.Line("note: " + note);
-    for (const std::string& violation : findings.violations) out.Line("violation: " + violation);
+    out.AddFindings(findings);
     return out.Take();
 }
 

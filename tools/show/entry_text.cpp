@@ -79,7 +79,24 @@ Contents ContentsOf(EntryId id, ByteView bytes) {
 
 std::string TextOf(ByteView bytes) { return {bytes.begin(), bytes.end()}; }
 
+std::string DateText(const Date& date) {
+    return date.time + " (" + std::to_string(date.seconds) + ")";
+}
+
 }  // namespace
+
+std::string IsoTime(std::int64_t unix_time) {
+    const auto time = static_cast<std::time_t>(unix_time);
+    std::tm fields{};
+    std::array<char, 32> text{};
+    if (::gmtime_r(&time, &fields) == nullptr ||
+        std::strftime(text.data(), text.size(), "%Y-%m-%dT%H:%M:%SZ", &fields) == 0) {
+        return "unknown";
+    }
+    return text.data();
+}
+
+std::string AfpDateText(std::uint32_t stored) { return DateText(DecodeDate(stored)); }
 
 std::string EntryText(EntryId id, const Bytes& bytes) {
     std::string text;
@@ -89,8 +106,8 @@ std::string EntryText(EntryId id, const Bytes& bytes) {
         case Contents::kDates: {
             const std::vector<Date> dates = DecodeDates(bytes);
             for (std::size_t i = 0; i < dates.size(); ++i) {
-                text += (i == 0 ? "" : ", ") + std::string(kDateLabels[i]) + ' ' + dates[i].time +
-                        " (" + std::to_string(dates[i].seconds) + ")";
+                text +=
+                    (i == 0 ? "" : ", ") + std::string(kDateLabels[i]) + ' ' + DateText(dates[i]);
             }
             return text;
         }
