@@ -306,6 +306,126 @@ TEST_F(InPlaceTest, WhatAKillLeavesIsWhatTheLibrarysWriteLeaves) {
                 UnorderedElementsAre("old", "old, locked"));
 }
 
+// An AppleSingle file with that data.
+Bytes SingleOf(const Bytes& data) {
+    Bytes file = AppleDoubleOf({{1, data}, {kFinderInfoEntry, kFinderInfo}});
+    PutU32(file, 0, 0x00051600);
+    return file;
+}
+
+// What there is of the old data and of the new, which differ everywhere.
+std::string MixtureOf(const Bytes& found, const Bytes& old_data, const Bytes& new_data) {
+    if (found == old_data) return "old";
+    if (found == new_data) return "new";
+    std::size_t end = 0;
+    while (end < found.size() && end < new_data.size() && found[end] == new_data[end]) ++end;
+    for (std::size_t at = end; at < found.size(); ++at) {
+        // Where nothing has been written yet there may be room.
+        const std::uint8_t wanted = at < old_data.size() ? old_data[at] : 0;
+        if (found[at] != wanted) return "DAMAGED";
+    }
+    return end == 0 ? "old, and room" : "mixed";
+}
+
+// Promise: "The tool: `import --data` over a file |"
+TEST_F(InPlaceTest, AnImportOfDataThatWasKilledLeavesAMixtureUntilItHasRunAgain) {
+    const std::string source = dir_ / "source";
+    const Bytes old_data = Repeat('o', 3000000);
+    for (const std::size_t size : {2900000u, 3100000u}) {
+        SCOPED_TRACE(size);
+        const Bytes new_data = Repeat('n', size);
+        WriteFile(source, SingleOf(new_data));
+        const Arguments arguments = {"--volume", root_ + "=1", "import",
+                                     "--data",   source,       Object()};
+        std::set<std::string> states;
+        KillAtEachChange(
+            arguments, root_,
+            [&] {
+                Make(0);
+                WriteFile(Object(), old_data);
+            },
+            [&] {
+                states.insert(MixtureOf(ReadFile(Object()), old_data, new_data));
+                EXPECT_EQ(SingleOf(new_data), ReadFile(source));
+                EXPECT_THAT(RunTool(arguments), Succeeded());
+                EXPECT_EQ(new_data, ReadFile(Object()));
+                EXPECT_TRUE(HoldingsOf(kEaDirectory, Object()).HasFinderInfo(kFinderInfo));
+            });
+        EXPECT_THAT(states, Contains("mixed"));
+        EXPECT_THAT(states, Contains("new"));
+        EXPECT_THAT(states, Not(Contains("DAMAGED")));
+    }
+}
+
+// Promise: "The tool: `import --data` syncs the data"
+TEST_F(InPlaceTest, DataIsOnDiskBeforeAnImportOfItEnds) {
+    const std::string source = dir_ / "source";
+    WriteFile(source, SingleOf(Ascii("the new data")));
+    Make(0);
+    bool synced = false;
+    const StoppedRun run = RunStopped(
+        {"--volume", root_ + "=1", "import", "--data", source, Object()}, root_,
+        [&](const FileCall& call) {
+            const bool of_object = call.open_file == Object();
+            if (of_object && call.Changes()) synced = false;
+            if (of_object && call.Syncs()) synced = true;
+            return true;
+        },
+        Stops::kAtSyncsToo);
+    EXPECT_EQ(0, run.status) << run.err;
+    EXPECT_TRUE(synced);
+}
+
+// A file that is made has all of its data or no name.
+TEST_F(InPlaceTest, AnImportOfANewFileThatWasKilledHasMadeAllOfItOrNothing) {
+    const std::string source = dir_ / "source";
+    const std::string made = root_ + "/made";
+    const Bytes data = Repeat('n', 600000);
+    WriteFile(source, SingleOf(data));
+    const Arguments arguments = {"--volume", root_ + "=1", "import", source, made};
+    KillAtEachChange(
+        arguments, root_, [&] { Make(0); },
+        [&] {
+            if (Exists(made)) {
+                EXPECT_EQ(data, ReadFile(made));
+            }
+            EXPECT_THAT(RunTool(arguments), Succeeded());
+            EXPECT_EQ(data, ReadFile(made));
+            EXPECT_TRUE(HoldingsOf(kEaDirectory, made).HasFinderInfo(kFinderInfo));
+        });
+}
+
+// The file gets its name when it is whole, in each format; what it is made of stays as it is.
+TEST_F(InPlaceTest, AnExportThatWasKilledHasMadeAllOfTheFileOrLeftTheOldOne) {
+    const auto make = [this] {
+        Make(3000);
+        fs::last_write_time(Object(), fs::file_time_type{});  // which is in some of them
+    };
+    for (const std::string format : {"appledouble", "applesingle", "macbinary", "binhex"}) {
+        SCOPED_TRACE(format);
+        const std::string target = root_ + "/exported";
+        const Arguments arguments = {"--volume", root_ + "=1", "export", "--force",
+                                     "--format", format,       Object(), target};
+        make();
+        (void)RunTool(arguments);
+        const Bytes whole = ReadFile(target);
+        const Bytes stream = ReadFile(MetadataPaths(Object()).stream);
+        int nth = 1;
+        for (bool killed = true; killed && !HasFailure(); ++nth) {
+            SCOPED_TRACE(nth);
+            make();
+            WriteFile(target, Ascii("the old one"));
+            killed = RunKilledAt(arguments, root_, nth).status == 128 + SIGKILL;
+            EXPECT_THAT((std::set<Bytes>{whole, Ascii("the old one")}), Contains(ReadFile(target)));
+            EXPECT_EQ(stream, ReadFile(MetadataPaths(Object()).stream));
+            EXPECT_EQ(Ascii("data"), ReadFile(Object()));
+            (void)RunTool(arguments);
+            EXPECT_EQ(whole, ReadFile(target));
+        }
+        EXPECT_LT(2, nth);
+    }
+}
+
 // Promise: "The tool: `set`, `remove`, `lock`, `import`"
 TEST_F(InPlaceTest, AnImportThatWasKilledIsBroughtToItsEndByAnother) {
     const std::string source = dir_ / "source";

@@ -25,6 +25,7 @@ constexpr const char* kExamples = R"(Examples:
   mavoea lock letter.txt
   mavoea import ._letter.txt letter.txt
   mavoea import letter.hqx /srv/share
+  mavoea import -r /srv/share/unpacked
   mavoea export --format macbinary letter.txt letter.bin
   mavoea save -r /srv/share --output share.txt
   mavoea restore --directory / share.txt
@@ -146,6 +147,17 @@ void AddInfo(CLI::App* sub, Options* options) {
     AddPaths(sub, options);
 }
 
+// Of one file there is one object; all arguments are directories in recursive work.
+void PlaceImport(Options* options) {
+    if (options->recursive) {
+        options->paths.insert(options->paths.begin(), options->archive);
+    } else if (options->paths.empty()) {
+        throw CLI::RequiredError("PATH");
+    } else if (options->paths.size() > 1) {
+        throw CLI::ExtrasError({Unguarded(options->paths[1])});
+    }
+}
+
 struct Syntax {
     Command command;
     const char* name;
@@ -202,11 +214,22 @@ constexpr Syntax kCommands[] = {
      [](CLI::App* sub, Options* options) {
          sub->add_option("FILE", options->archive, "The file; its content says what it is")
              ->required();
-         AddPath(sub, options,
-                 "The object. All but AppleDouble hold data as well: they make a file that is "
-                 "missing, in a directory one of their own name, and are refused where there is "
-                 "other data");
-         sub->add_flag("--data", options->replaces_data, "Replace other data by what FILE holds");
+         sub->add_option("PATH", options->paths,
+                         "The object. All but AppleDouble hold data as well: they make a file that "
+                         "is missing, in a directory one of their own name, and are refused where "
+                         "there is other data");
+         CLI::Option* const data = sub->add_flag("--data", options->replaces_data,
+                                                 "Replace other data by what FILE holds");
+         CLI::Option* const tree =
+             sub->add_flag("-r,--recursive", options->recursive,
+                           "FILE and PATH are directories: each \"._\" file below them goes onto "
+                           "the object beside it, or that a folder \"__MACOSX\" has it for, and is "
+                           "removed when it has arrived")
+                 ->excludes(data);
+         sub->add_flag("--keep", options->keep, "The \"._\" files stay")->needs(tree);
+         sub->add_flag("--keep-existing", options->keep_existing,
+                       "Values that an object has are not replaced; a file with others stays")
+             ->needs(tree);
      }},
     {Command::kExport, "export", "Write an object's metadata into a file as Macs have them",
      [](CLI::App* sub, Options* options) {
@@ -479,6 +502,7 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
         std::vector<std::string> last_first;
         for (int i = argc - 1; i > 0; --i) last_first.push_back(Guarded(argv[i]));
         app.parse(std::move(last_first));
+        if (options.command == Command::kImport) PlaceImport(&options);
     } catch (const CLI::Success& success) {
         return app.exit(success);
     } catch (const CLI::ParseError& error) {

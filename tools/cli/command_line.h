@@ -43,12 +43,14 @@ struct Options {
     std::vector<std::string> volumes;  // PATH=TYPE
     bool json = false;
 
-    std::vector<std::string> paths;  // one, but for list, lock, unlock, upgrade and repair
+    std::vector<std::string> paths;  // one, but for commands that take several
     std::string name;
     std::string archive;         // import, export, restore
     std::string format;          // export
     bool force = false;          // export, save
     bool replaces_data = false;  // import
+    bool keep = false;           // import -r: the "._" files stay
+    bool keep_existing = false;  // import -r: values that are there stay
     bool details = false;        // list -l
     bool recursive = false;
     bool yes = false;                     // clean: what is listed is removed

@@ -17,6 +17,7 @@
 #include "tools/move/delete.h"
 #include "tools/move/export.h"
 #include "tools/move/import.h"
+#include "tools/move/import_tree.h"
 #include "tools/move/restore.h"
 #include "tools/move/save.h"
 #include "tools/place/file.h"
@@ -258,6 +259,12 @@ ExitStatus Run(const Options& options) {
         case Command::kUnlock:
             return Lock(options, false);
         case Command::kImport:
+            if (options.recursive) {
+                return ImportTree({.directories = options.paths,
+                                   .keep = options.keep,
+                                   .keep_existing = options.keep_existing,
+                                   .json = options.json});
+            }
             return Import({.file = options.archive,
                            .path = options.paths.front(),
                            .replaces_data = options.replaces_data,

@@ -2,7 +2,6 @@
 
 #include <fcntl.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <ctime>
 #include <iostream>
@@ -13,7 +12,6 @@
 #include "tools/say/output.h"
 #include "tools/say/text.h"
 #include "tools/store/foreign/detection.h"
-#include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
 #include "tools/transfer/pending.h"

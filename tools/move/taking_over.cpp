@@ -12,25 +12,9 @@
 namespace mavoea::tool {
 namespace {
 
-// The AFP word locks what it locked before, and nothing else.
-Bytes WithLockOf(EntryId id, Bytes bytes, const Bytes& old) {
-    bytes = WithoutLock(id, std::move(bytes));
-    if (id != EntryId::kAfpFileInfo || bytes.size() < kAfpFileInfoSize ||
-        old.size() < bytes.size()) {
-        return bytes;
-    }
-    const std::uint16_t kept = LoadBe16(&old[kAfpAttributesOffset]) &
-                               ~LoadBe16(&WithoutLock(id, old)[kAfpAttributesOffset]);
-    std::uint8_t* const word = &bytes[kAfpAttributesOffset];
-    StoreBe16(static_cast<std::uint16_t>(LoadBe16(word) | kept), word);
-    return bytes;
-}
-
 // Whether an object has that value, byte for byte.
 bool Has(const Metadata& metadata, const std::string& name, const Content& value) {
-    const auto same = [&](const Content& other) {
-        return !other.damaged() && other.size() == value.size() && !FirstDifference(value, other);
-    };
+    const auto same = [&](const Content& other) { return SameContent(value, other); };
     switch (KindOf(name)) {
         case Kind::kFinderInfo:
             return metadata.finder_info && same(metadata.finder_info->value);
@@ -69,6 +53,24 @@ std::vector<std::string> RestOf(const Metadata& metadata) {
 }
 
 }  // namespace
+
+bool SameContent(const Content& one, const Content& other) {
+    return !one.damaged() && !other.damaged() && one.size() == other.size() &&
+           !FirstDifference(one, other);
+}
+
+Bytes WithLockOf(EntryId id, Bytes bytes, const Bytes& old) {
+    bytes = WithoutLock(id, std::move(bytes));
+    if (id != EntryId::kAfpFileInfo || bytes.size() < kAfpFileInfoSize ||
+        old.size() < bytes.size()) {
+        return bytes;
+    }
+    const std::uint16_t kept = LoadBe16(&old[kAfpAttributesOffset]) &
+                               ~LoadBe16(&WithoutLock(id, old)[kAfpAttributesOffset]);
+    std::uint8_t* const word = &bytes[kAfpAttributesOffset];
+    StoreBe16(static_cast<std::uint16_t>(LoadBe16(word) | kept), word);
+    return bytes;
+}
 
 void SortOut(Metadata* metadata) {
     std::erase_if(metadata->entries, [](const auto& entry) {

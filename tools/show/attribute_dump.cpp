@@ -4,10 +4,11 @@
 #include <optional>
 
 #include "format/afp_info.h"
-#include "platform/dos_attributes.h"
 #include "format/samba_stream.h"
+#include "platform/dos_attributes.h"
 #include "tools/place/directory.h"
 #include "tools/say/text.h"
+#include "tools/show/dates.h"
 #include "tools/show/dump.h"
 #include "tools/show/entry_text.h"
 #include "tools/show/fields.h"
@@ -78,7 +79,8 @@ std::string NtTimeText(std::uint64_t time) {
     constexpr std::int64_t kEpoch = 11644473600;
     const std::string number = " (" + std::to_string(time) + ")";
     if (time == 0) return "unknown" + number;
-    return IsoTime(static_cast<std::int64_t>(time / kPerSecond) - kEpoch) + number;
+    return DateText(static_cast<std::int64_t>(time / kPerSecond) - kEpoch).value_or("unknown") +
+           number;
 }
 
 std::string ValueText(ByteView bytes) {

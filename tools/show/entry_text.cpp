@@ -85,17 +85,6 @@ std::string DateText(const Date& date) {
 
 }  // namespace
 
-std::string IsoTime(std::int64_t unix_time) {
-    const auto time = static_cast<std::time_t>(unix_time);
-    std::tm fields{};
-    std::array<char, 32> text{};
-    if (::gmtime_r(&time, &fields) == nullptr ||
-        std::strftime(text.data(), text.size(), "%Y-%m-%dT%H:%M:%SZ", &fields) == 0) {
-        return "unknown";
-    }
-    return text.data();
-}
-
 std::string AfpDateText(std::uint32_t stored) { return DateText(DecodeDate(stored)); }
 
 std::string EntryText(EntryId id, const Bytes& bytes) {

@@ -11,10 +11,7 @@
 
 namespace mavoea::tool {
 
-// "2024-05-02T00:00:00Z", of seconds since 1970-01-01 UTC.
-std::string IsoTime(std::int64_t unix_time);
-
-// The same of a date in an AppleDouble file, with its seconds: "unknown (-2147483648)".
+// A date in an AppleDouble file, with its seconds: "unknown (-2147483648)".
 std::string AfpDateText(std::uint32_t stored);
 
 // On one line. `bytes` may be fewer than the entry should have.

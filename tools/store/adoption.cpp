@@ -42,8 +42,9 @@ std::optional<Adoption> CurrentByLists(const Object& object) {
 
 class ObjectAdoption {
  public:
-    explicit ObjectAdoption(const Object& object)
+    ObjectAdoption(const Object& object, AppleDoubleFiles files)
         : object_(object),
+          keeps_apple_double_(files == AppleDoubleFiles::kKept),
           sidecars_(Sidecars::Find(object, Sidecars::Services::kLeaveOut)),
           wanted_(ReadMetadata(object, sidecars_)) {}
 
@@ -73,8 +74,10 @@ class ObjectAdoption {
         const Writer& writer = WriterFor(object_);
         const Metadata fitting = writer.Fit(metadata, object_, &missing);
         const auto inode = Inode::Open(object_.place);
+        const auto durability = NothingGoes() ? Durability::kLater : Durability::kNow;
         const Written written =
-            writer.Write(object_, *inode, fitting, {.old = Old::kKept, .first = First::kResource});
+            writer.Write(object_, *inode, fitting,
+                         {.durability = durability, .old = Old::kKept, .first = First::kResource});
         missing.insert(missing.end(), written.missing.begin(), written.missing.end());
         const auto again = WhatIsMissing(fitting, ReadCurrent());
         missing.insert(missing.end(), again.begin(), again.end());
@@ -88,9 +91,16 @@ class ObjectAdoption {
         const std::vector<Found> going = TakeAdopted(missing, written);
         if (had_head && !sidecars_.legacy_resource) GiveMarks(*inode, fitting);
         // Record and marks are in none of the files that have been synced.
-        const bool kept_with_object = had_head || object_.kind() == VolumeKind::kFileEA;
+        const bool kept_with_object =
+            durability == Durability::kNow && (had_head || object_.kind() == VolumeKind::kFileEA);
         if (kept_with_object && inode->HoldsContents()) inode->Sync();
         RemoveFiles(going);
+    }
+
+    // Whether no file is removed or written over.
+    bool NothingGoes() const {
+        return keeps_apple_double_ && !adoption_.current && wanted_.earlier.size() == 1 &&
+               sidecars_.apple_double && sidecars_.apple_double->path() == wanted_.earlier.front();
     }
 
     // As services see it, that know nothing of earlier layouts.
@@ -126,6 +136,7 @@ class ObjectAdoption {
             return consider(file, arrived);
         });
         for (auto* one : {&sidecars_.apple_double, &sidecars_.legacy_resource}) {
+            if (keeps_apple_double_ && one == &sidecars_.apple_double) continue;
             if (*one && consider(**one, missing.empty())) one->reset();
         }
         return going;
@@ -210,6 +221,7 @@ class ObjectAdoption {
     }
 
     const Object& object_;
+    const bool keeps_apple_double_;
     Sidecars sidecars_;
     Metadata wanted_;
     Adoption adoption_;
@@ -218,9 +230,9 @@ class ObjectAdoption {
 
 }  // namespace
 
-Adoption Adopt(const Object& object) {
+Adoption Adopt(const Object& object, AppleDoubleFiles files) {
     if (const auto current = CurrentByLists(object)) return *current;
-    return ObjectAdoption(object).Run();
+    return ObjectAdoption(object, files).Run();
 }
 
 void AdoptForChange(const Object& object, std::vector<std::string>* notes) {

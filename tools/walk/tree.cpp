@@ -3,15 +3,9 @@
 #include <sys/stat.h>
 
 #include <algorithm>
-#include <array>
-#include <cerrno>
-#include <cstdint>
-#include <iostream>
+#include <cstddef>
 
 #include "include/mavoea.h"
-#include "tools/say/output.h"
-#include "tools/say/progress.h"
-#include "tools/say/text.h"
 #include "tools/store/sidecars.h"
 
 namespace mavoea::tool {
@@ -81,88 +75,40 @@ class Walk {
 
 class Work {
  public:
-    explicit Work(const Task& task) : task_(task), progress_(task.doing) {}
+    explicit Work(const Task& task)
+        : task_(task), report_({task.doing, task.done, task.current, task.nothing}) {}
 
     void Run(const TreeOptions& options) {
         VisitObjects(
             options.paths, options.recursive,
             {.work = [this](const Object& object, const std::string&) { return DoObject(object); },
              .on_failure = [this](const std::string& path,
-                                  const Failure& failure) { Add(path, failure); },
+                                  const Failure& failure) { report_.AddFailure(path, failure); },
              .on_named = task_.on_named,
              .on_directory = task_.on_directory});
     }
 
-    ExitStatus Summarize(bool json) {
-        progress_.Clear();
-        if (json) {
-            PrintJson();
-        } else {
-            PrintText();
-        }
-        return status_;
-    }
+    ExitStatus Finish(bool json) { return report_.Finish(json); }
 
  private:
     // False when what is below it would fail for the same reason.
     bool DoObject(const Object& object) {
-        progress_.Show(StatusText(), object.path());
+        report_.Show(object.path());
         bool suits = false;
         try {
             task_.check(object);
             suits = true;
-            ++counts_[static_cast<std::size_t>(task_.work(object, &notes_))];
+            report_.Add(task_.work(object, report_.notes()));
         } catch (const Failure& failure) {
-            if (!suits || !HasGone(object.place, failure)) Add(object.path(), failure);
+            if (!suits || !HasGone(object.place, failure)) {
+                report_.AddFailure(object.path(), failure);
+            }
         }
         return suits;
     }
 
-    void Add(const std::string& path, const Failure& failure) {
-        failures_.push_back({path, failure.what()});
-        status_ = std::max(status_, failure.status());
-    }
-
-    std::uint64_t Total() const { return counts_[0] + counts_[1] + counts_[2]; }
-
-    std::string StatusText() const {
-        const std::string done = std::to_string(Total()) + " done";
-        return failures_.empty() ? done
-                                 : done + ", " + std::to_string(failures_.size()) + " failed";
-    }
-
-    // The words of the outcomes that can be, in the order of Outcome.
-    std::array<const char*, 3> Words() const { return {task_.done, task_.current, task_.nothing}; }
-
-    void PrintText() const {
-        for (std::size_t i = 0; i < counts_.size(); ++i) {
-            if (Words()[i] != nullptr) std::cout << counts_[i] << ' ' << Words()[i] << ", ";
-        }
-        std::cout << failures_.size() << " failed\n";
-        for (const std::string& note : notes_) Note(note);
-        for (const FailedObject& failed : failures_) Report(failed.message);
-    }
-
-    void PrintJson() const {
-        constexpr std::array<const char*, 3> kKeys = {"done", "current", "nothing"};
-        Json json;
-        json.Set("task", task_.doing);
-        for (std::size_t i = 0; i < counts_.size(); ++i) {
-            if (Words()[i] != nullptr) json.Set(kKeys[i], counts_[i]);
-        }
-        json.Set("failed", failures_.size());
-        SetMessages(json, "notes", notes_);
-        SetFailures(json, failures_);
-        Print(json);
-        for (const FailedObject& failed : failures_) Report(failed.message);
-    }
-
     const Task& task_;
-    Progress progress_;
-    std::array<std::uint64_t, 3> counts_{};  // by Outcome
-    Notes notes_;
-    std::vector<FailedObject> failures_;
-    ExitStatus status_ = kSuccess;
+    TreeReport report_;
 };
 
 }  // namespace
@@ -179,7 +125,7 @@ void VisitObjects(const std::vector<std::string>& paths, bool recursive, const V
 ExitStatus RunOnTree(const TreeOptions& options, const Task& task) {
     Work work(task);
     work.Run(options);
-    return work.Summarize(options.json);
+    return work.Finish(options.json);
 }
 
 }  // namespace mavoea::tool

@@ -8,6 +8,7 @@
 
 #include "tools/place/volume.h"
 #include "tools/say/messages.h"
+#include "tools/walk/tree_report.h"
 
 namespace mavoea::tool {
 
@@ -31,15 +32,8 @@ void VisitObjects(const std::vector<std::string>& paths, bool recursive, const V
 // is wrong.
 bool HasGone(const Place& place, const Failure& failure);
 
-// What became of an object.
-enum class Outcome { kDone, kCurrent, kNothing };
-
-// What people should know of an object with which nothing is wrong.
-using Notes = std::vector<std::string>;
-
 struct Task {
-    // In the progress line and the summary: "upgrading", "converted", "already current", "nothing
-    // to convert". Null where an outcome cannot be.
+    // As of a report.
     const char* doing;
     const char* done;
     const char* current;

@@ -1,0 +1,59 @@
+#include "tools/walk/tree_report.h"
+
+#include <algorithm>
+#include <iostream>
+
+namespace mavoea::tool {
+
+void TreeReport::Show(const std::string& path) { progress_.Show(StatusText(), path); }
+
+void TreeReport::AddFailure(const std::string& path, const Failure& failure) {
+    failures_.push_back({path, failure.what()});
+    status_ = std::max(status_, failure.status());
+}
+
+ExitStatus TreeReport::Finish(bool json) {
+    progress_.Clear();
+    if (json) {
+        PrintJson();
+    } else {
+        PrintText();
+    }
+    return status_;
+}
+
+std::string TreeReport::StatusText() const {
+    const std::string done = std::to_string(counts_[0] + counts_[1] + counts_[2]) + " done";
+    return failures_.empty() ? done : done + ", " + std::to_string(failures_.size()) + " failed";
+}
+
+// The words of the outcomes that can be, in the order of Outcome.
+std::array<const char*, 3> TreeReport::WordsByOutcome() const {
+    return {words_.done, words_.current, words_.nothing};
+}
+
+void TreeReport::PrintText() const {
+    for (std::size_t i = 0; i < counts_.size(); ++i) {
+        const char* const word = WordsByOutcome()[i];
+        if (word != nullptr) std::cout << counts_[i] << ' ' << word << ", ";
+    }
+    std::cout << failures_.size() << " failed\n";
+    for (const std::string& note : notes_) Note(note);
+    for (const FailedObject& failed : failures_) Report(failed.message);
+}
+
+void TreeReport::PrintJson() const {
+    constexpr std::array<const char*, 3> kKeys = {"done", "current", "nothing"};
+    Json json;
+    json.Set("task", words_.doing);
+    for (std::size_t i = 0; i < counts_.size(); ++i) {
+        if (WordsByOutcome()[i] != nullptr) json.Set(kKeys[i], counts_[i]);
+    }
+    json.Set("failed", failures_.size());
+    SetMessages(json, "notes", notes_);
+    SetFailures(json, failures_);
+    Print(json);
+    for (const FailedObject& failed : failures_) Report(failed.message);
+}
+
+}  // namespace mavoea::tool

@@ -1,0 +1,61 @@
+// What became of many objects: progress, counts, notes and failures.
+#ifndef MAVOEA_TOOLS_WALK_TREE_REPORT_H_
+#define MAVOEA_TOOLS_WALK_TREE_REPORT_H_
+
+#include <array>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "tools/say/messages.h"
+#include "tools/say/output.h"
+#include "tools/say/progress.h"
+
+namespace mavoea::tool {
+
+// What became of an object.
+enum class Outcome { kDone, kCurrent, kNothing };
+
+// What people should know of an object with which nothing is wrong.
+using Notes = std::vector<std::string>;
+
+class TreeReport {
+ public:
+    // In the progress line and the summary: "upgrading", "converted", "already current", "nothing
+    // to convert". Null where an outcome cannot be.
+    struct Words {
+        const char* doing;
+        const char* done;
+        const char* current;
+        const char* nothing;
+    };
+    explicit TreeReport(const Words& words) : words_(words), progress_(words.doing) {}
+
+    // Shows how far it is on standard error, when that is a terminal.
+    void Show(const std::string& path);
+
+    void Add(Outcome outcome) { ++counts_[static_cast<std::size_t>(outcome)]; }
+    void AddFailure(const std::string& path, const Failure& failure);
+    Notes* notes() { return &notes_; }
+
+    // The counts are on standard output, and notes and failures on standard error. kSuccess when
+    // nothing failed, otherwise the gravest status.
+    ExitStatus Finish(bool json);
+
+ private:
+    std::string StatusText() const;
+    std::array<const char*, 3> WordsByOutcome() const;
+    void PrintText() const;
+    void PrintJson() const;
+
+    const Words words_;
+    Progress progress_;
+    std::array<std::uint64_t, 3> counts_{};  // by Outcome
+    Notes notes_;
+    std::vector<FailedObject> failures_;
+    ExitStatus status_ = kSuccess;
+};
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_WALK_TREE_REPORT_H_
