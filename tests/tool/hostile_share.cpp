@@ -16,6 +16,7 @@
 #include "tests/support/process.h"
 #include "tests/support/record_builder.h"
 #include "tests/support/stream_builder.h"
+#include "tests/tool/holdings.h"
 
 namespace mavoea::test {
 namespace {
@@ -90,6 +91,12 @@ struct Maker {
         fork.resize(10);
         return file + fork;
     }
+    // Data and Finder info.
+    Bytes Single() const {
+        Bytes file = AppleDoubleOf({{1, Text("data in")}, {kFinderInfoEntry, FinderInfo()}});
+        PutU32(file, 0, 0x00051600);
+        return file;
+    }
     Bytes Record() const {
         Bytes record = AttributeRecord();
         const Bytes info = FinderInfo();
@@ -163,12 +170,21 @@ void MakeTree(const Maker& maker, unsigned parts, int type, const std::string& p
                    ClassicFile(maker.FinderInfo(), maker.Text("fork in")).bytes);
     }
     if ((parts & kText) != 0) maker.File(parent + "/text", Ascii(TextForTree()));
+    if ((parts & kSingle) != 0) maker.File(tree + "/single", maker.Single());
+    if ((parts & kArchived) != 0) {
+        const std::string folder = tree + "/__MACOSX";
+        maker.Directory(folder);
+        maker.Directory(folder + "/sub");
+        maker.File(folder + "/._a.txt", maker.Stream());
+        maker.File(folder + "/._c.txt", maker.Stream());
+        maker.File(folder + "/sub/._d.txt", maker.Stream());
+    }
 }
 
 // A tree of all parts, in each of its directories one name more than there is on the share.
 void MakeSecretTree(const std::string& parent) {
     const Maker maker = {kSecret, 0700, 0600};
-    MakeTree(maker, kAllParts, 2, parent);
+    MakeTree(maker, kAllParts | kArchived | kSingle, 2, parent);
     const std::string tree = parent + "/tree";
     for (const std::string& directory :
          {parent, parent + "/@eaDir", tree, tree + "/@eaDir", tree + "/@eaDir/b.txt", tree + "/sub",

@@ -43,9 +43,11 @@ enum TreePart : unsigned {
     kMisplaced = 8,      // attributes in a resource file
     kIncoming = 16,      // an AppleDouble file "incoming"
     kAllParts = 31,
-    kLocked = 32,  // nobody may write the files
-    kThere = 64,   // the same tree in "to"
-    kText = 128,   // beside the tree a text that gives its objects metadata
+    kLocked = 32,     // nobody may write the files
+    kThere = 64,      // the same tree in "to"
+    kText = 128,      // beside the tree a text that gives its objects metadata
+    kArchived = 256,  // "__MACOSX" with AppleDouble files for what is beside it
+    kSingle = 512,    // an AppleSingle file "single", with data
 };
 
 // Two volumes, "from" with the directory "tree" in it and "to" with nothing, both the attacker's.

@@ -289,6 +289,12 @@ std::vector<Look> ShowingLooks() {
          [](const World& world) {
              return OfEach(world.objects(), {"dump", "--record"});
          }},
+        {"DumpOfAttributes",
+         [](const World& world) {
+             return OfEach(world.objects(), {"dump", "--attributes"});
+         }},
+        {"ExportToStandardOutput",
+         [](const World& world) { return OfEach(world.objects(), {"export"}, {"-"}); }},
         {"Clean",
          [](const World& world) {
              return Runs{{"clean", "-r", world.top()}, {"clean", "-r", "--all", world.top()}};
@@ -309,6 +315,15 @@ std::vector<Look> AllLooks() {
                              return Runs{{"convert", "-r", "--to", type, world.top(), "DST/copy"}};
                          },
                          type});
+    }
+    for (const char* format : {"appledouble", "applesingle", "macbinary", "binhex"}) {
+        looks.push_back({std::string("ExportAs") + format,
+                         [format](const World& world) {
+                             return OfEach(world.objects(),
+                                           {"export", "--force", "--format", format},
+                                           {"DST/exported"});
+                         },
+                         "1"});
     }
     looks.push_back({"Import",
                      [](const World& world) {
