@@ -495,9 +495,9 @@ class OntoObject {
     Metadata ReadApart() const {
         Sidecars sidecars = Sidecars::Find(object_, Sidecars::Services::kLeaveOut);
         const auto& found = sidecars.apple_double;
-        const bool imported =
-            beside_ && found && !sources_.empty() && SameFile(found->info, sources_.back().info);
-        if (imported || object_.keeping() == Keeping::kEaDirectory) sidecars.apple_double.reset();
+        if (beside_ && found && SameFile(found->info, sources_.back().info)) {
+            sidecars.apple_double.reset();
+        }
         return ReadMetadata(object_, sidecars);
     }
 

@@ -22,6 +22,7 @@ void SortOut(Metadata* metadata);
 // else.
 Bytes WithLockOf(EntryId id, Bytes bytes, const Bytes& old);
 
+// False for what is damaged. Throws Failure.
 bool SameContent(const Content& one, const Content& other);
 
 // Values replace those of the same name, and what is not among them stays on the object. A part
