@@ -561,6 +561,7 @@ TEST_P(BesideTest, MetadataOfMetadataStays) {
     EXPECT_EQ(2, result.status);
     EXPECT_EQ(Counts(1, 0, 1), result.out);
     ExpectColour("file", "red");
+    ASSERT_TRUE(Exists(At("._._file")));
     EXPECT_EQ(MacFileOf("green"), ReadFile(At("._._file")));
 }
 
