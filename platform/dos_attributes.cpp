@@ -111,8 +111,9 @@ DosAttributesFields ReadDosAttributesFields(ByteView bytes) {
     const auto has = [&](std::size_t at, std::size_t size) {
         return at != kNone && offset + at + size <= bytes.size();
     };
-    if (has(layout.valid_flags, 4))
+    if (has(layout.valid_flags, 4)) {
         fields.valid_flags = LoadLe32(bytes, offset + layout.valid_flags);
+    }
     if (has(layout.attributes, 4)) fields.attributes = LoadLe32(bytes, offset + layout.attributes);
     if (has(layout.creation_time, 8)) {
         fields.creation_time = LoadLe64(bytes, offset + layout.creation_time);
