@@ -40,6 +40,7 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
         {{"upgrade", "--record", object}, "The following argument was not expected: --record"},
         {{"repair"}, "PATH is required"},
         {{"clean", "-r"}, "DIR is required"},
+        {{"check", "-r"}, "PATH is required"},
         {{"convert", object, object}, "--to is required"},
         {{"convert", "--to", "0", object}, "DST is required"},
         {{"convert", "--to", "0", object, object, object},
@@ -67,15 +68,16 @@ TEST(CommandLineTest, HelpAndVersionAreWrittenToStandardOutput) {
     const ToolResult help = RunTool({"--help"});
     EXPECT_THAT(help, Succeeded());
     for (const char* text :
-         {"where",   "list",      "get",          "set",          "remove", "cp",
-          "mv",      "rm",        "lock",         "unlock",       "import", "export",
-          "upgrade", "repair",    "clean",        "convert",      "dump",   "--volume PATH=TYPE",
-          "--json",  "Examples:", "Exit status:", "Volume types:"}) {
+         {"where",   "list",   "get",       "set",          "remove",       "cp",
+          "mv",      "rm",     "lock",      "unlock",       "import",       "export",
+          "upgrade", "repair", "clean",     "convert",      "dump",         "--volume PATH=TYPE",
+          "check",   "--json", "Examples:", "Exit status:", "Volume types:"}) {
         EXPECT_THAT(help.out, HasSubstr(text));
     }
     for (const char* command :
-         {"where", "list", "get", "set", "remove", "lock", "unlock", "import", "export", "save",
-          "restore", "upgrade", "repair", "clean", "convert", "dump"}) {
+         {"where", "list", "show", "get", "set", "set-info", "remove", "lock", "unlock", "import",
+          "export", "save", "restore", "carry", "upgrade", "repair", "clean", "check", "convert",
+          "diff", "dump"}) {
         EXPECT_THAT(RunTool({command, "--help"}), Succeeded());
     }
     const ToolResult version = RunTool({"--version"});

@@ -299,6 +299,11 @@ std::vector<Look> ShowingLooks() {
          [](const World& world) {
              return Runs{{"clean", "-r", world.top()}, {"clean", "-r", "--all", world.top()}};
          }},
+        {"Check",
+         [](const World& world) {
+             return Runs{{"check", "-r", world.top()}, {"--json", "check", "-r", world.top()}};
+         }},
+        {"CheckOfObjects", [](const World& world) { return OfAll(world.objects(), {"check"}); }},
     };
 }
 

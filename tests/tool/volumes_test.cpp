@@ -156,6 +156,7 @@ class VolumeTableTest : public ::testing::Test {
                 {"rm", path},
                 {"convert", "--to", "1", path, dir() + "/converted"},
                 {"clean", dir()},
+                {"check", path},
                 {"lock", path},
                 {"unlock", path},
                 {"import", path, path},

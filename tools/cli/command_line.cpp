@@ -6,6 +6,7 @@
 #include <span>
 #include <string_view>
 
+#include "tools/care/finding.h"
 #include "tools/cli/habits.h"
 #include "tools/say/messages.h"
 #include "tools/say/output.h"
@@ -36,6 +37,7 @@ constexpr const char* kExamples = R"(Examples:
   mavoea upgrade -r /srv/share
   mavoea repair -r /srv/share
   mavoea clean -r /srv/share
+  mavoea check -r /srv/share
   mavoea convert -r --to appledouble /srv/share /mnt/share
   mavoea diff -r /srv/share /mnt/share
   mavoea dump @eaDir/letter.txt@MavoEAStream
@@ -48,6 +50,7 @@ Names like any other: com.apple.FinderInfo, com.apple.ResourceFork, and mavoea.l
 for a file that Macs may not write, rename or delete.
 Recursive work goes on after a failure, and tells at its end what failed.
 Exit status: 0 done; 1 not found, the object or the attribute; 2 anything else that went wrong.
+Of check: 0 sound; 1 something was found; 2 something could not be looked at.
 Of cp, mv and rm: 1 something could not be done; 2 all objects arrived, and not all metadata; 130 and
 143 interrupted, after the object in hand. Under the names cp, mv and rm the tool is that command.
 A NAME or VALUE that begins with '-' stands behind "--". Control characters in names are shown as
@@ -298,6 +301,12 @@ constexpr Syntax kCommands[] = {
          sub->add_flag("--all", options->all,
                        "With what other services keep in EA directories for objects that are gone");
          sub->add_option("DIR", options->paths, "Directories")->required();
+     }},
+    {Command::kCheck, "check", "Say whether all that is known of objects is sound; change nothing",
+     [](CLI::App* sub, Options* options) {
+         sub->add_flag("-v,--verbose", options->verbose, "Say at the end how many there were");
+         sub->footer(FindingCodes());
+         AddTree(sub, options);
      }},
     {Command::kConvert, "convert",
      "Copy an object or a tree to a volume of another type, and compare the two",

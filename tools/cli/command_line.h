@@ -33,6 +33,7 @@ enum class Command {
     kUpgrade,
     kRepair,
     kClean,
+    kCheck,
     kConvert,
     kDiff,
     kDump
@@ -58,7 +59,7 @@ struct Options {
     bool all = false;                     // clean: things of other services, too
     std::string to;                       // convert: the destination's volume type
     std::string destination;              // convert, carry; diff: the second
-    bool verbose = false;                 // carry, restore
+    bool verbose = false;                 // carry, check, restore
     bool absolute_names = false;          // save, restore
     std::string directory;                // restore
     std::optional<std::string> type;      // restore: of the volume that the text was made of

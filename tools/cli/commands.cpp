@@ -6,6 +6,7 @@
 #include <iostream>
 
 #include "format/ea_stream.h"
+#include "tools/care/check.h"
 #include "tools/care/clean.h"
 #include "tools/care/repair.h"
 #include "tools/care/upgrade.h"
@@ -310,6 +311,11 @@ ExitStatus Run(const Options& options) {
                           .others = options.all,
                           .wait = options.wait,
                           .json = options.json});
+        case Command::kCheck:
+            return CheckSoundness({.paths = options.paths,
+                                   .recursive = options.recursive,
+                                   .verbose = options.verbose,
+                                   .json = options.json});
         case Command::kConvert:
             return Convert({.source = options.paths.front(),
                             .destination = options.destination,

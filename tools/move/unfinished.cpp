@@ -31,7 +31,7 @@ ByteView AsBytes(const std::string& text) {
 Place FileFor(const Place& to) {
     constexpr int kDigits = 16;
     const std::string hash = HexNumber(HashOf(to.name), kDigits).substr(2);
-    return {to.directory, std::string(kOwnPrefix) + "moving-" + hash};
+    return {to.directory, std::string(kMovingPrefix) + hash};
 }
 
 constexpr const char* kRemoving = "removing\n";

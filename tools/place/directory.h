@@ -289,6 +289,8 @@ class TemporaryFile {
 
 // How all names begin that only this tool gives, for a time.
 inline constexpr std::string_view kOwnPrefix = ".mavoea-";
+// Of files that say which object is being moved to another file system.
+inline constexpr std::string_view kMovingPrefix = ".mavoea-moving-";
 
 // The prefix and eight random letters and digits.
 std::string TemporaryName();

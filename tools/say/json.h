@@ -55,6 +55,8 @@ class Json {
 
     // Two blanks a level, without a line feed at the end; U+FFFD for what is no UTF-8.
     std::string Text() const;
+    // The same in one line.
+    std::string Line() const;
 
     // The same on one line.
     std::string Line() const;

@@ -61,10 +61,11 @@ const char* WordsFor(int code) {
 }  // namespace
 
 Failure::Failure(ExitStatus status, std::string_view subject, std::string_view cause,
-                 std::string_view advice)
+                 std::string_view advice, Fault fault)
     : Failure(status, Printable(subject) + ": " + std::string(cause), advice) {
     subject_ = subject;
     cause_ = cause;
+    fault_ = fault;
 }
 
 Failure::Failure(ExitStatus status, const std::string& sentence, std::string_view advice)
@@ -107,7 +108,7 @@ Failure LibraryFailure(std::string_view path, LibraryError error) {
                         std::string("it could not be locked: ") + std::strerror(error.error),
                         AdviceFor(error.error)};
             }
-            return {kFailed, path, "in use by another process", "try again"};
+            return {kFailed, path, "in use by another process", "try again", Fault::kInUse};
         case MAVOEA_ERR_NOTHING_THERE:
             return {kNotFound, path, "nothing is there", "mavoea list PATH has what is"};
         case MAVOEA_ERR_READ:

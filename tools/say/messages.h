@@ -16,15 +16,23 @@ enum ExitStatus : int {
     kFailed = 2
 };
 
+// What is behind a failure, for those to whom damage that they looked for is none of theirs.
+enum class Fault {
+    kOther,
+    kDamage,  // it could be looked at, and does not hold what it should
+    kInUse    // another process has it locked
+};
+
 class Failure : public std::runtime_error {
  public:
     Failure(ExitStatus status, std::string_view subject, std::string_view cause,
-            std::string_view advice);
+            std::string_view advice, Fault fault = Fault::kOther);
 
     ExitStatus status() const { return status_; }
     const std::string& subject() const { return subject_; }
     const std::string& cause() const { return cause_; }
     const std::string& brief() const { return brief_; }  // without the advice
+    Fault fault() const { return fault_; }
 
  protected:
     Failure(ExitStatus status, const std::string& sentence, std::string_view advice);
@@ -34,6 +42,7 @@ class Failure : public std::runtime_error {
     std::string subject_;
     std::string cause_;
     std::string brief_;
+    Fault fault_ = Fault::kOther;
 };
 
 // A system call's failure, by its errno: kNotFound for ENOENT.

@@ -53,7 +53,7 @@ class FileReader {
 
  private:
     void Problem(const std::string& cause, const char* advice) {
-        metadata_.problems.emplace_back(kFailed, file_->path(), cause, advice);
+        metadata_.problems.emplace_back(kFailed, file_->path(), cause, advice, Fault::kDamage);
     }
     void Damaged(const std::string& what) {
         Problem("damaged: " + what + " the end of the file", kLook);
@@ -154,7 +154,8 @@ WholeFile ReadFound(const Sidecars::Found& found, Metadata* metadata) {
 void ReadRecord(const Bytes& block, const Origin& origin, Metadata* metadata) {
     const Layout layout = ReadLayout(ByteView(block));
     if (!CheckRecord(layout, RecordPlace::kAttribute).violations.empty()) {
-        throw Failure(kFailed, origin.holder, "its netatalk record is damaged", kLookAtRecord);
+        throw Failure(kFailed, origin.holder, "its netatalk record is damaged", kLookAtRecord,
+                      Fault::kDamage);
     }
     const auto bytes = [&](Range range) {
         const ByteView part = ByteView(block).subspan(range.offset, range.length);

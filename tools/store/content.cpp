@@ -29,7 +29,8 @@ Content Content::Damaged(std::uint64_t size, std::string problem) {
 
 Bytes Content::Read(std::uint64_t offset, std::uint64_t size) const {
     if (damaged()) {
-        throw Failure(kFailed, file_ ? file_->path() : "metadata", "damaged: " + problem_, kLook);
+        throw Failure(kFailed, file_ ? file_->path() : "metadata", "damaged: " + problem_, kLook,
+                      Fault::kDamage);
     }
     if (offset >= size_) return {};
     const std::uint64_t wanted = std::min(size, size_ - offset);

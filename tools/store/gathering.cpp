@@ -70,6 +70,7 @@ void Gathering::AddAttribute(Metadata::Attribute attribute) {
                  OtherThanIn(other->holder, other->spelling),
                  {attribute.holder, attribute.spelling});
         metadata_.strays.back().attribute = true;
+        metadata_.strays.back().second = true;
     }
 }
 
@@ -84,6 +85,7 @@ void Gathering::Take(std::optional<Metadata::Item>* item, const std::string& nam
         *item = Metadata::Item{std::move(value), origin.holder, origin.spelling};
     } else if (Differs((*item)->value, value)) {
         AddStray("a second " + name, OtherThanIn((*item)->holder, (*item)->spelling), origin);
+        metadata_.strays.back().second = true;
     }
 }
 

@@ -60,9 +60,16 @@ struct Layout {
 Layout ReadLayout(const File& file);
 Layout ReadLayout(ByteView bytes);
 
+struct Violation {
+    std::string text;
+    // Where it is, as far as one place can be named: the index of an entry or an attribute.
+    std::optional<std::size_t> entry = {};
+    std::optional<std::size_t> attribute = {};
+};
+
 struct Findings {
-    std::vector<std::string> violations;  // of the layout's invariants
-    std::vector<std::string> notes;       // unusual, but allowed
+    std::vector<Violation> violations;  // of the layout's invariants
+    std::vector<std::string> notes;     // unusual, but allowed
 };
 Findings CheckLayout(const Layout& layout);
 

@@ -36,7 +36,13 @@ class Checker {
     }
 
  private:
-    void Violation(std::string text) { findings_.violations.push_back(std::move(text)); }
+    void Violation(std::string text) { findings_.violations.push_back({std::move(text)}); }
+    void EntryViolation(std::size_t index, const std::string& text) {
+        findings_.violations.push_back({EntryText(index) + ": " + text, index});
+    }
+    void RecordViolation(std::size_t index, const std::string& text) {
+        findings_.violations.push_back({RecordText(index) + ": " + text, {}, index});
+    }
     void Note(std::string text) { findings_.notes.push_back(std::move(text)); }
 
     std::string EntryText(std::size_t index) const {
@@ -82,20 +88,20 @@ class Checker {
         for (std::size_t i = 0; i < layout_.entries.size(); ++i) {
             const EntryDescriptor& entry = layout_.entries[i];
             if (!seen.insert(entry.id).second) {
-                Violation(EntryText(i) + ": the same kind a second time, which hides the first");
+                EntryViolation(i, "the same kind a second time, which hides the first");
             }
             if (entry.id == EntryId::kFinderInfo && entry.data.length < kFinderInfoSize) {
-                Violation(EntryText(i) + ": " + Number(entry.data.length) + " bytes, fewer than " +
-                          Number(kFinderInfoSize));
+                EntryViolation(
+                    i, Number(entry.data.length) + " bytes, fewer than " + Number(kFinderInfoSize));
             }
             if (entry.data.length == 0) continue;
             if (entry.data.offset < head_end) {
-                Violation(EntryText(i) + ": " + Span(entry.data) +
-                          " begin inside the header, which ends at " + Number(head_end));
+                EntryViolation(i, Span(entry.data) + " begin inside the header, which ends at " +
+                                      Number(head_end));
             }
             if (entry.data.end() > layout_.file_size) {
-                Violation(EntryText(i) + ": " + Span(entry.data) + " pass the end of the file at " +
-                          Number(layout_.file_size));
+                EntryViolation(i, Span(entry.data) + " pass the end of the file at " +
+                                      Number(layout_.file_size));
             }
         }
         for (const EntryId id : {EntryId::kFinderInfo, EntryId::kResourceFork}) {
@@ -116,8 +122,8 @@ class Checker {
             const Range before = layout_.entries[order[furthest]].data;
             const Range range = layout_.entries[order[i]].data;
             if (range.offset < before.end()) {
-                Violation(EntryText(order[i]) + ": " + Span(range) + " overlap " +
-                          EntryText(order[furthest]) + ", " + Span(before));
+                EntryViolation(order[i], Span(range) + " overlap " + EntryText(order[furthest]) +
+                                             ", " + Span(before));
             }
             if (range.end() > before.end()) furthest = i;
         }
@@ -184,16 +190,16 @@ class Checker {
             const Layout::Record& record = layout_.records[i];
             const std::string& name = record.stored_name;
             if (name.empty() || name.back() != '\0') {
-                Violation(RecordText(i) + ": the name does not end with a NUL");
+                RecordViolation(i, "the name does not end with a NUL");
             } else if (record.name().size() + 1 != name.size()) {
-                Violation(RecordText(i) + ": a NUL inside the name");
+                RecordViolation(i, "a NUL inside the name");
             } else if (name.size() == 1) {
-                Violation(RecordText(i) + ": the name is empty");
+                RecordViolation(i, "the name is empty");
             }
             const auto [first, is_new] = seen.emplace(record.name(), i);
             if (!is_new) {
-                Violation(RecordText(i) + ": the same name as attribute " + Number(first->second) +
-                          ", which it hides");
+                RecordViolation(
+                    i, "the same name as attribute " + Number(first->second) + ", which it hides");
             }
         }
     }
@@ -205,12 +211,13 @@ class Checker {
             const Range value = layout_.records[i].fixed.value;
             if (value.length == 0) continue;  // The offset of an empty value means nothing.
             if (value.offset != next) {
-                Violation(RecordText(i) + ": the value is at " + Number(value.offset) +
-                          ", not at " + Number(next) + " behind the one before");
+                RecordViolation(i, "the value is at " + Number(value.offset) + ", not at " +
+                                       Number(next) + " behind the one before");
             }
             if (value.end() > layout_.file_size) {
-                Violation(RecordText(i) + ": the value, " + Span(value) +
-                          ", passes the end of the file at " + Number(layout_.file_size));
+                RecordViolation(i, "the value, " + Span(value) +
+                                       ", passes the end of the file at " +
+                                       Number(layout_.file_size));
             }
             next += value.length;
         }
@@ -251,25 +258,26 @@ class Checker {
 
 void CheckRecordEntries(const Layout& block, Findings* findings) {
     std::set<EntryId> seen;
+    const auto violation = [&](std::size_t index, const std::string& text) {
+        findings->violations.push_back(
+            {"entry " + Number(index) + " (" + EntryName(block.entries[index].id) + "): " + text,
+             index});
+    };
     for (std::size_t i = 0; i < block.entries.size(); ++i) {
         const EntryDescriptor& entry = block.entries[i];
-        const std::string name = "entry " + Number(i) + " (" + EntryName(entry.id) + ")";
         const Slot slot = SlotOf(static_cast<std::uint32_t>(entry.id));
         if (slot == Slot::kNone) {
-            findings->violations.push_back(name + ": the id " +
-                                           HexNumber(static_cast<std::uint32_t>(entry.id)) +
-                                           " has no place in a record");
+            violation(i, "the id " + HexNumber(static_cast<std::uint32_t>(entry.id)) +
+                             " has no place in a record");
         } else if (!AcceptableEntry(slot, entry.data)) {
-            findings->violations.push_back(name + ": it passes the record's " +
-                                           Number(kRecordDataSize) + " bytes");
+            violation(i, "it passes the record's " + Number(kRecordDataSize) + " bytes");
         }
         if (!seen.insert(entry.id).second) {
-            findings->violations.push_back(name +
-                                           ": the same kind a second time, which hides the first");
+            violation(i, "the same kind a second time, which hides the first");
         }
         if (entry.id == EntryId::kFinderInfo && entry.data.length < kFinderInfoSize) {
-            findings->violations.push_back(name + ": " + Number(entry.data.length) +
-                                           " bytes, fewer than " + Number(kFinderInfoSize));
+            violation(i,
+                      Number(entry.data.length) + " bytes, fewer than " + Number(kFinderInfoSize));
         }
     }
 }
@@ -277,14 +285,15 @@ void CheckRecordEntries(const Layout& block, Findings* findings) {
 // The record of an attribute has all entries that a fresh one has, and no other.
 void CheckComplete(const Layout& block, Findings* findings) {
     if (block.header->entry_count != kFreshRecord.size()) {
-        findings->violations.push_back(Number(block.header->entry_count) +
-                                       " entries are declared, not " + Number(kFreshRecord.size()));
+        findings->violations.push_back({Number(block.header->entry_count) +
+                                        " entries are declared, not " +
+                                        Number(kFreshRecord.size())});
     }
     for (const RecordEntry& entry : kFreshRecord) {
         const auto id = static_cast<EntryId>(entry.id);
         const auto index = block.FindEntry(id);
         if (!index || block.entries[*index].data.offset == 0) {
-            findings->violations.push_back(std::string("no ") + EntryName(id) + " entry");
+            findings->violations.push_back({std::string("no ") + EntryName(id) + " entry"});
         }
     }
 }
@@ -298,21 +307,21 @@ Findings CheckRecord(const Layout& block, RecordPlace place) {
     const std::size_t size =
         place == RecordPlace::kAttribute ? kAttributeBlockSize : kResourceHeadSize;
     if (block.file_size != size) {
-        findings.violations.push_back("it has " + Number(block.file_size) + " bytes, not " +
-                                      Number(size));
+        findings.violations.push_back(
+            {"it has " + Number(block.file_size) + " bytes, not " + Number(size)});
     }
     if (!block.IsAppleDouble()) {
-        findings.violations.push_back("no AppleDouble block");
+        findings.violations.push_back({"no AppleDouble block"});
         return findings;
     }
     if (block.header->version != kAppleDoubleVersion2) {
-        findings.violations.push_back("the version is " + HexNumber(block.header->version) +
-                                      ", not " + HexNumber(kAppleDoubleVersion2));
+        findings.violations.push_back({"the version is " + HexNumber(block.header->version) +
+                                       ", not " + HexNumber(kAppleDoubleVersion2)});
     }
     if (block.entries.size() < block.header->entry_count) {
         findings.violations.push_back(
-            "it ends inside its descriptors: " + Number(block.entries.size()) + " of " +
-            Number(block.header->entry_count) + " are there");
+            {"it ends inside its descriptors: " + Number(block.entries.size()) + " of " +
+             Number(block.header->entry_count) + " are there"});
     }
     CheckRecordEntries(block, &findings);
     if (place == RecordPlace::kAttribute) CheckComplete(block, &findings);

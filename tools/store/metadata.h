@@ -81,6 +81,7 @@ struct Metadata {
         std::string reason;
         std::string holder;
         bool attribute = false;  // of a name that has another value elsewhere
+        bool second = false;     // another value of something that is known
     };
     std::vector<Stray> strays;
     // What could not be looked at, or is damaged; the subject is the path of the file.

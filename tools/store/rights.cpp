@@ -1,5 +1,6 @@
 #include "tools/store/rights.h"
 
+#include <acl/libacl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -23,6 +24,14 @@ void DropExecution(acl_t acl) {
         (void)acl_delete_perm(permissions, ACL_EXECUTE);
         (void)acl_set_permset(entry, permissions);
     }
+}
+
+std::string Octal(mode_t mode) {
+    std::string text = "0";
+    for (unsigned shift = 9; shift > 0; shift -= 3) {
+        text += static_cast<char>('0' + (mode >> (shift - 3) & 7));
+    }
+    return text;
 }
 
 }  // namespace
@@ -61,6 +70,32 @@ void Rights::Give(const File& file) const {
         return;
     }
     if (::fchmod(file.fd(), mode) != 0) throw SystemFailure(file.path(), errno);
+}
+
+std::optional<std::string> Rights::Missing(const File& file) const {
+    constexpr mode_t kAllBits = 0777;
+    const struct stat now = file.Status();
+    const auto other = [](const char* what, std::uint64_t is, std::uint64_t wanted) {
+        return std::string(what) + std::to_string(is) + ", not " + std::to_string(wanted);
+    };
+    if (now.st_uid != owner_) return other("its owner is ", now.st_uid, owner_);
+    if (now.st_gid != group_) return other("its group is ", now.st_gid, group_);
+    const bool by_acl = acl_ && !cut_;
+    if (!by_acl && (now.st_mode & kAllBits) != mode_) {
+        return "its mode is " + Octal(now.st_mode & kAllBits) + ", not " + Octal(mode_);
+    }
+    // Of a file without one it is what the mode says.
+    const Acl found(acl_get_fd(file.fd()));
+    if (!found) {
+        if (errno == ENOTSUP || errno == ENOSYS) return std::nullopt;
+        throw SystemFailure(file.path(), errno);
+    }
+    if (by_acl) {
+        if (acl_cmp(found.get(), acl_.get()) == 0) return std::nullopt;
+        return "its ACL is another one than the object's";
+    }
+    if (cut_ || acl_equiv_mode(found.get(), nullptr) == 0) return std::nullopt;
+    return "it has an ACL, and its object has none";
 }
 
 }  // namespace mavoea::tool

@@ -5,6 +5,8 @@
 #include <sys/acl.h>
 
 #include <memory>
+#include <optional>
+#include <string>
 #include <type_traits>
 
 #include "tools/place/directory.h"
@@ -22,6 +24,9 @@ class Rights {
     // not be given away nobody gets more than the object gives him. Throws Failure.
     void Give(const File& file) const;
 
+    // What of them a file does not have, in words; none when it has all. Throws Failure.
+    std::optional<std::string> Missing(const File& file) const;
+
     mode_t mode() const { return mode_; }
 
  private:
@@ -29,11 +34,13 @@ class Rights {
         void operator()(std::remove_pointer_t<acl_t>* acl) const { acl_free(acl); }
     };
 
+    using Acl = std::unique_ptr<std::remove_pointer_t<acl_t>, FreeAcl>;
+
     uid_t owner_ = 0;
     gid_t group_ = 0;
     mode_t mode_ = 0;
-    bool cut_ = false;                                            // the mode has the last word
-    std::unique_ptr<std::remove_pointer_t<acl_t>, FreeAcl> acl_;  // null where the mode says all
+    bool cut_ = false;  // the mode has the last word
+    Acl acl_;           // null where the mode says all
 };
 
 }  // namespace mavoea::tool

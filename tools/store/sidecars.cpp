@@ -234,11 +234,13 @@ std::vector<Directory::Entry> ObjectsIn(const DirectoryRef& directory) {
     return entries;
 }
 
+bool MayShareNames(const std::string& name) { return name.size() >= kUnchangedMax; }
+
 std::optional<std::string> SharesNames(const Place& place) {
-    if (place.name.size() < kUnchangedMax) return std::nullopt;
+    if (!MayShareNames(place.name)) return std::nullopt;
     const std::string derived = NameInEaDirectory(place.name);
     for (const Directory::Entry& entry : place.directory->Entries()) {
-        if (entry.name.size() < kUnchangedMax || entry.name == place.name) continue;
+        if (!MayShareNames(entry.name) || entry.name == place.name) continue;
         if (NameInEaDirectory(entry.name) == derived) return entry.name;
     }
     return std::nullopt;

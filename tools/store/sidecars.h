@@ -80,6 +80,9 @@ bool IsMetadata(const Directory& directory, const Directory::Entry& entry, int t
 // What in a directory is an object, sorted by name, when it was listed first. Throws Failure.
 std::vector<Directory::Entry> ObjectsIn(const DirectoryRef& directory);
 
+// Whether a name is so long that its metadata may have the names of another object's.
+bool MayShareNames(const std::string& name);
+
 // Another object of the directory whose metadata would have the same names in the EA directory.
 std::optional<std::string> SharesNames(const Place& place);
 

@@ -58,9 +58,9 @@ class ForeignReader {
     void AddAfpInfo(const Bytes& value, const Origin& origin) {
         const auto info = DecodeAfpInfo(value);
         if (!info) {
-            throw Failure(kFailed, origin.holder,
-                          "its " + std::string(kAfpInfoStream) + " is damaged",
-                          "look at it with: getfattr -n " + origin.spelling + " -e hex PATH");
+            throw Failure(
+                kFailed, origin.holder, "its " + std::string(kAfpInfoStream) + " is damaged",
+                "look at it with: getfattr -n " + origin.spelling + " -e hex PATH", Fault::kDamage);
         }
         gathering_.AddFinderInfo(Content(Bytes(info->finder_info.begin(), info->finder_info.end())),
                                  origin);

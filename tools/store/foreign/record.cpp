@@ -7,32 +7,45 @@
 #include "tools/say/messages.h"
 #include "tools/store/foreign/marks.h"
 #include "tools/store/foreign/spelling.h"
-#include "tools/store/layout.h"
 #include "tools/store/metadata.h"
 
 namespace mavoea::tool {
-namespace {
 
-// smbd removes a record that it cannot parse, as the superuser.
-bool SmbdTakes(const Layout& layout, std::size_t size) {
-    if (size != kAttributeBlockSize || !layout.IsAppleDouble() ||
-        layout.header->version != kAppleDoubleVersion2 ||
-        layout.entries.size() != kFreshRecord.size()) {
-        return false;
+// Private entries may be missing or whole; a comment of any length that has room.
+std::optional<std::string> WhySmbdRefuses(const Layout& record) {
+    const auto number = [](std::uint64_t value) { return std::to_string(value); };
+    if (record.file_size != kAttributeBlockSize) {
+        return "it has " + number(record.file_size) + " bytes, not " + number(kAttributeBlockSize);
+    }
+    if (!record.IsAppleDouble() || record.header->version != kAppleDoubleVersion2) {
+        return "it is no AppleDouble block of version 2";
+    }
+    if (record.entries.size() != kFreshRecord.size() ||
+        record.header->entry_count != kFreshRecord.size()) {
+        return "it declares " + number(record.header->entry_count) + " entries, not " +
+               number(kFreshRecord.size());
     }
     for (const RecordEntry& known : kFreshRecord) {
         const auto id = static_cast<EntryId>(known.id);
-        const auto index = layout.FindEntry(id);
-        if (!index) return false;
-        const Range data = layout.entries[*index].data;
-        const std::uint32_t room = id == EntryId::kFinderInfo
-                                       ? std::uint32_t{kFinderInfoSize}
-                                       : RoomFor(kFreshRecord, known.id, kAttributeBlockSize);
-        const bool whole = data.length == 0 || id == EntryId::kComment || data.length == room;
-        if (data.offset == 0 || data.length > room || !whole || data.end() > size) return false;
+        const auto index = record.FindEntry(id);
+        if (!index) return std::string("it has no ") + EntryName(id) + " entry";
+        const Range data = record.entries[*index].data;
+        const std::string name = std::string("its ") + EntryName(id) + " entry ";
+        if (data.offset == 0) return name + "has no offset";
+        if (data.end() > record.file_size) return name + "passes its end";
+        if (data.length == 0) continue;
+        if (id == EntryId::kFinderInfo) {
+            if (data.length < kFinderInfoSize) return name + "is too short";
+            continue;
+        }
+        const std::uint32_t room = RoomFor(kFreshRecord, known.id, kAttributeBlockSize);
+        const bool fits = id == EntryId::kComment ? data.length <= room : data.length == room;
+        if (!fits) return name + "has " + number(data.length) + " bytes, not " + number(room);
     }
-    return true;
+    return std::nullopt;
 }
+
+namespace {
 
 // The seconds of records, from 2000-01-01.
 std::uint32_t DateOf(std::int64_t unix_seconds) {
@@ -92,7 +105,8 @@ ForeignRecord ForeignRecord::Read(const Inode& object) {
     const auto block = object.Attribute(kRecordAttribute);
     if (!block) return record;
     const Layout layout = ReadLayout(ByteView(*block));
-    if (!SmbdTakes(layout, block->size())) {
+    const auto info = layout.FindEntry(EntryId::kFinderInfo);
+    if (WhySmbdRefuses(layout) || layout.entries[*info].data.length > kFinderInfoSize) {
         throw Failure(kFailed, object.path(), "its netatalk record is damaged",
                       "look at it with: mavoea dump --record PATH");
     }
@@ -142,7 +156,7 @@ void ForeignRecord::Store(const Inode& object, const Dialect& dialect,
     const Bytes block = Encode(dialect.marks == Dialect::Marks::kDosAttributes
                                    ? DatesForSamba(dates, object, created)
                                    : DatesForNetatalk(dates));
-    if (!SmbdTakes(ReadLayout(ByteView(block)), block.size())) {
+    if (WhySmbdRefuses(ReadLayout(ByteView(block)))) {
         throw Failure(kFailed, object.path(), "its netatalk record would be damaged",
                       "nothing has been written");
     }

@@ -5,12 +5,18 @@
 #include <cstdint>
 #include <map>
 #include <optional>
+#include <string>
 
 #include "format/apple_double.h"
 #include "tools/place/dialect.h"
 #include "tools/place/directory.h"
+#include "tools/store/layout.h"
 
 namespace mavoea::tool {
+
+// Why smbd does not take the block for a record, in words; none when it does. Of what it cannot
+// parse it removes, as the superuser, what is no longer than a record, and ignores the rest.
+std::optional<std::string> WhySmbdRefuses(const Layout& record);
 
 // What is changed is stored by Store() only. All members throw Failure.
 class ForeignRecord {

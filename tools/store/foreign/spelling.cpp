@@ -123,6 +123,12 @@ Spelling SpellFork(const Dialect& dialect) {
     return {std::string(kUser) + std::string(kResourceForkName), Datum::kFork, {}, false, true};
 }
 
+std::string NameOfExtent(std::string_view attribute, unsigned extent) {
+    constexpr std::string_view kFirst = "user.DosStream.";
+    return "user.DosStreamExt." + std::to_string(extent) + '.' +
+           std::string(attribute.substr(kFirst.size()));
+}
+
 bool IsForeign(const std::string& attribute, const Dialect& dialect) {
     return SpellingOf(attribute, dialect) || DecodeStreamAttribute(attribute);
 }
@@ -156,7 +162,7 @@ std::optional<Bytes> Spelling::Value(const AttributeSource& source) const {
         if (!more) {
             throw Failure(kFailed, source.path(),
                           NameOfAttribute(attribute) + " is damaged: a part of it is missing",
-                          "see what there is with: getfattr -d -m - PATH");
+                          "see what there is with: getfattr -d -m - PATH", Fault::kDamage);
         }
         bytes.insert(bytes.end(), more->begin(), more->end());
     }

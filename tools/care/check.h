@@ -1,0 +1,25 @@
+// mavoea check: whether all that is known of objects is sound.
+#ifndef MAVOEA_TOOLS_CARE_CHECK_H_
+#define MAVOEA_TOOLS_CARE_CHECK_H_
+
+#include <string>
+#include <vector>
+
+#include "tools/say/messages.h"
+
+namespace mavoea::tool {
+
+struct CheckOptions {
+    std::vector<std::string> paths;
+    bool recursive = false;
+    bool verbose = false;  // says at the end how many there were
+    bool json = false;     // an object a line
+};
+
+// Reads all of it and changes nothing. A line for each finding, as it is found. 0: there is none;
+// 1: there are; 2: something could not be looked at.
+ExitStatus CheckSoundness(const CheckOptions& options);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_CARE_CHECK_H_
