@@ -18,6 +18,7 @@
 #include "tests/support/snapshot.h"
 #include "tests/tool/habits.h"
 #include "tests/tool/holdings.h"
+#include "tests/tool/stopped_tool.h"
 #include "tests/tool/tool.h"
 
 namespace mavoea::test {
@@ -630,6 +631,54 @@ TEST_F(CheckTest, WhatAServiceHasLockedIsNoFault) {
               result.err);
     EXPECT_EQ(dir_ / "@eaDir/a@MavoEAStream", First()["path"]);
     EXPECT_THAT(First()["inUse"].get<std::string>(), HasSubstr("in use by another process"));
+}
+
+// A fork of 3 MiB is read in pieces; what has become of it in between shows that it is.
+TEST_F(CheckTest, LargeValuesAreReadToTheirEnd) {
+    MAVOEA_SKIP_UNLESS_STOPPED();
+    const std::string object = Add("a");
+    PutResource(object, ClassicFile(Pattern(32), Pattern(std::size_t{3} << 20)).bytes);
+    const std::string file = dir_ / "@eaDir/a@MavoResource";
+    const Bytes bytes = BytesIn(file);
+    // A first run counts the reads; in the others the file is cut before one of them.
+    int count = 0;
+    for (int nth = 0; nth <= count; ++nth) {
+        WriteFile(file, bytes);
+        int reads = 0;
+        const StoppedRun run = RunStopped(
+            {"--volume", dir_.path() + "=1", "check", object}, dir_.path(),
+            [&](const FileCall& call) {
+                if (call.open_file != file || !call.name.starts_with("pread")) return true;
+                if (++reads == nth) {
+                    EXPECT_EQ(0, truncate(file.c_str(), 1 << 20));
+                }
+                return true;
+            },
+            Stops::kAtDataToo);
+        if (nth == 0) count = reads;
+        EXPECT_EQ(nth == 0, run.status == 0) << nth << ": " << run.out << run.err;
+    }
+    EXPECT_LT(5, count);
+}
+
+TEST_F(CheckTest, NoCallThatItMakesCouldChangeAnything) {
+    MAVOEA_SKIP_UNLESS_STOPPED();
+    const std::string object = Add("a");
+    PutStream(object, ColourStream());
+    PutStream(dir_ / "gone", ColourStream());
+    PutResource(object, Ascii("no resource file"));
+    PutLegacy(object, "size", Ascii("big"));
+    Add(".mavoea-0123abcd");
+    MakeDir(dir_ / ".mavoea-12345-0123456789abcdef");
+    const StoppedRun run = RunStopped(
+        {"--volume", dir_.path() + "=1", "check", "-r", dir_.path()}, dir_.path(),
+        [](const FileCall& call) {
+            EXPECT_FALSE(call.Changes()) << ::testing::PrintToString(call);
+            return true;
+        },
+        Stops::kAtSyncsToo);
+    EXPECT_EQ(1, run.status) << run.err;
+    EXPECT_LT(20, run.calls);
 }
 
 // ---- What is said -------------------------------------------------------------------------------

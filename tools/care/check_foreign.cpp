@@ -33,11 +33,12 @@ class AttributesCheck {
           names_(names),
           sink_(*sink) {}
 
-    void Run() const {
+    bool Run() {
         for (const std::string& name : names_) {
             if (name == record_) CheckRecordIn(name);
             if (IsSambas(program_)) CheckStream(name);
         }
+        return damaged_;
     }
 
  private:
@@ -49,7 +50,7 @@ class AttributesCheck {
         sink_.Add(finding);
     }
 
-    void CheckRecordIn(const std::string& name) const {
+    void CheckRecordIn(const std::string& name) {
         const auto block = inode_.Attribute(name);
         if (!block) return;
         const Layout layout = ReadLayout(ByteView(*block));
@@ -59,6 +60,7 @@ class AttributesCheck {
             finding.detail = name + ": " + finding.detail;
             if (finding.attribute.empty()) finding.attribute = name;
             sink_.Add(finding);
+            damaged_ = true;
         }
         const bool smbds =
             IsSambas(program_) && program_->finder_info == Dialect::FinderInfo::kRecord;
@@ -76,13 +78,14 @@ class AttributesCheck {
     }
 
     // A stream, with what it goes on in.
-    void CheckStream(const std::string& name) const {
+    void CheckStream(const std::string& name) {
         const auto stream = DecodeStreamAttribute(name);
         if (!stream || stream->extent > 0) return;
         const auto value = inode_.Attribute(name);
         if (!value) return;
         const auto damaged = [&](const std::string& what) {
             Add(FindingKind::kDamagedAttribute, name, what, value->size());
+            damaged_ = true;
         };
         const auto decoded = DecodeStreamValue(*value);
         if (!decoded) return damaged("it has no bytes, with which Samba cannot open it");
@@ -107,6 +110,7 @@ class AttributesCheck {
     const Inode& inode_;
     const std::vector<std::string>& names_;
     FindingSink& sink_;
+    bool damaged_ = false;
 };
 
 // Of a file with attributes, or a fork that stands for none, smbd makes one of its own.
@@ -120,9 +124,9 @@ bool OverridesFinderInfo(const File& file, const Layout& layout) {
 
 }  // namespace
 
-void CheckAttributes(const Object& object, const Dialect* program, const Inode& inode,
+bool CheckAttributes(const Object& object, const Dialect* program, const Inode& inode,
                      const std::vector<std::string>& names, FindingSink* sink) {
-    AttributesCheck(object, program, inode, names, sink).Run();
+    return AttributesCheck(object, program, inode, names, sink).Run();
 }
 
 void CheckAcceptance(const Dialect* program, const std::string& path, const File& file,

@@ -11,12 +11,12 @@
 
 namespace mavoea::tool {
 
-// `program` keeps the object's metadata, null: the platform does; `names`: of its attributes. Both
-// throw Failure.
-void CheckAttributes(const Object& object, const Dialect* program, const Inode& inode,
+// `program` keeps the object's metadata, null: the platform does; `names`: of its attributes.
+// Whether any is damaged. Throws Failure.
+bool CheckAttributes(const Object& object, const Dialect* program, const Inode& inode,
                      const std::vector<std::string>& names, FindingSink* sink);
 
-// A "._" file of the object at `path`.
+// A "._" file of the object at `path`. Throws Failure.
 void CheckAcceptance(const Dialect* program, const std::string& path, const File& file,
                      const Layout& layout, FindingSink* sink);
 

@@ -35,11 +35,14 @@ class Check {
         FindProgram(undeclared);
         CheckFiles();
         if (in_use_) return sink_.AddFailure(*in_use_);
-        CheckAttributes(object_, program_, *inode_, names_, &sink_);
+        if (CheckAttributes(object_, program_, *inode_, names_, &sink_)) {
+            told_.insert(inode_->path());
+        }
         const Metadata metadata = ReadMetadata(object_, *inode_, sidecars_);
         CheckPlaces(metadata);
         CheckStrays(metadata);
         for (const Failure& problem : metadata.problems) AddProblem(problem);
+        ReadValues(metadata);
     }
 
  private:
@@ -47,10 +50,31 @@ class Check {
         sink_.Add({kind, object_.path(), detail, file});
     }
 
-    // Damage has its findings already.
     void AddProblem(const Failure& problem) {
-        if (problem.fault() == Fault::kDamage || told_.contains(problem.subject())) return;
-        sink_.AddFailure(problem);
+        if (told_.contains(problem.subject())) return;
+        if (problem.fault() == Fault::kDamage && problem.subject() == inode_->path()) {
+            Add(FindingKind::kDamagedAttribute, problem.cause());
+        } else {  // also damage that was none a moment ago
+            sink_.AddFailure(problem);
+        }
+    }
+
+    // What lies in large files has not been read yet.
+    void ReadValues(const Metadata& metadata) {
+        const auto read = [this](const Content& value) {
+            constexpr std::uint64_t kPiece = std::uint64_t{1} << 20;
+            try {
+                for (std::uint64_t at = 0; at < value.size() && !value.damaged(); at += kPiece) {
+                    (void)value.Read(at, kPiece);
+                }
+            } catch (const Failure& failure) {
+                AddProblem(failure);
+            }
+        };
+        for (const Metadata::Attribute& attribute : metadata.attributes) read(attribute.value);
+        if (metadata.finder_info) read(metadata.finder_info->value);
+        if (metadata.fork) read(metadata.fork->value);
+        for (const auto& [id, item] : metadata.entries) read(item.value);
     }
 
     // One that is a link, or closed to this process, is in the way of all objects beside it.
@@ -134,9 +158,11 @@ class Check {
         const auto violations = CheckLayout(layout).violations;
         for (const Violation& one : violations) {
             sink_.Add(FindingOf(damage, object_.path(), file->path(), layout, one));
+            told_.insert(file->path());
         }
-        if (damage == FindingKind::kDamagedResourceFile && violations.empty())
+        if (damage == FindingKind::kDamagedResourceFile && violations.empty()) {
             CheckHead(*file, layout);
+        }
         if (damage == FindingKind::kDamagedAppleDouble) {
             CheckAcceptance(program_, object_.path(), *file, layout, &sink_);
         }

@@ -76,8 +76,9 @@ const char* CodeOf(FindingKind kind) { return kKindTexts[static_cast<std::size_t
 
 std::string FindingCodes() {
     std::size_t width = 0;
-    for (const KindText& one : kKindTexts)
+    for (const KindText& one : kKindTexts) {
         width = std::max(width, std::string_view(one.code).size());
+    }
     std::string text = "Findings, a line each: \"PATH: KIND: DETAIL\". Their kinds:\n";
     for (const KindText& one : kKindTexts) {
         std::string code = one.code;
