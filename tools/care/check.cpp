@@ -18,8 +18,6 @@
 namespace mavoea::tool {
 namespace {
 
-constexpr ExitStatus kUnsound = static_cast<ExitStatus>(1);
-
 // Says everything at once: there may be as many findings as objects.
 class Soundness final : public FindingSink {
  public:

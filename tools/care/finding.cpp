@@ -98,7 +98,7 @@ std::string Finding::Text() const {
     const auto add = [&](const std::string& part) { place += (place.empty() ? "" : ", ") + part; };
     if (id) add("id " + (*id > 0xFFFF ? HexNumber(*id) : Number(*id)));
     if (range) add("offset " + Number(range->offset) + ", length " + Number(range->length));
-    if (size) add("size of the file " + Number(*size));
+    if (size) add("size " + Number(*size));
     return place.empty() ? text : text + " (" + place + ')';
 }
 

@@ -61,7 +61,7 @@ struct Finding {
     std::optional<std::uint32_t> id = {};     // of that entry
     std::string attribute = {};               // the name of an attribute in the file
     std::optional<Range> range = {};          // of the entry or the attribute's value
-    std::optional<std::uint64_t> size = {};   // of the file
+    std::optional<std::uint64_t> size = {};   // of the file, or another program's attribute
 
     // "PATH: CODE: DETAIL", one line whatever is in them.
     std::string Text() const;

@@ -13,6 +13,7 @@ enum ExitStatus : int {
     kSuccess = 0,
     kNotFound = 1,
     kRefused = 1,  // cp, mv and rm: anything that they could not do
+    kUnsound = 1,  // check: something was found
     kFailed = 2
 };
 
