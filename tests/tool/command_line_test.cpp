@@ -41,6 +41,7 @@ TEST(CommandLineTest, WhatIsWrongWithTheCommandLineIsToldInALine) {
         {{"repair"}, "PATH is required"},
         {{"clean", "-r"}, "DIR is required"},
         {{"check", "-r"}, "PATH is required"},
+        {{"salvage", object}, "DIR is required"},
         {{"convert", object, object}, "--to is required"},
         {{"convert", "--to", "0", object}, "DST is required"},
         {{"convert", "--to", "0", object, object, object},
@@ -77,7 +78,7 @@ TEST(CommandLineTest, HelpAndVersionAreWrittenToStandardOutput) {
     for (const char* command :
          {"where", "list", "show", "get", "set", "set-info", "remove", "lock", "unlock", "import",
           "export", "save", "restore", "carry", "upgrade", "repair", "clean", "check", "convert",
-          "diff", "dump"}) {
+          "diff", "dump", "salvage"}) {
         EXPECT_THAT(RunTool({command, "--help"}), Succeeded());
     }
     const ToolResult version = RunTool({"--version"});

@@ -43,6 +43,7 @@ constexpr const char* kExamples = R"(Examples:
   mavoea dump @eaDir/letter.txt@MavoEAStream
   mavoea dump --record letter.txt
   mavoea dump --attributes letter.txt
+  mavoea salvage letter.txt /tmp/salvaged
 
 Volume types: a number from 0 to 12, or appledouble (0), eadir (1), fileea (2), xattr (7); and what
 other programs keep: samba, samba-stream, samba-all-streams, netatalk, netatalk-samba, linux.
@@ -350,6 +351,12 @@ constexpr Syntax kCommands[] = {
                 "FILE", [=](const std::string& path) { options->paths = {path}; },
                 "A metadata file")
              ->required();
+     }},
+    {Command::kSalvage, "salvage",
+     "Write what can still be read of an object's metadata into files of their own",
+     [](CLI::App* sub, Options* options) {
+         AddPath(sub, options, "A file or directory");
+         sub->add_option("DIR", options->destination, "A new directory")->required();
      }},
 };
 

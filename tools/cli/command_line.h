@@ -36,7 +36,8 @@ enum class Command {
     kCheck,
     kConvert,
     kDiff,
-    kDump
+    kDump,
+    kSalvage
 };
 
 struct Options {
@@ -58,7 +59,7 @@ struct Options {
     int wait = 2;                         // clean: seconds between its two looks
     bool all = false;                     // clean: things of other services, too
     std::string to;                       // convert: the destination's volume type
-    std::string destination;              // convert, carry; diff: the second
+    std::string destination;              // convert, carry, salvage; diff: the second
     bool verbose = false;                 // carry, check, restore
     bool absolute_names = false;          // save, restore
     std::string directory;                // restore

@@ -21,6 +21,7 @@
 #include "tools/move/import_tree.h"
 #include "tools/move/restore.h"
 #include "tools/move/save.h"
+#include "tools/move/salvage.h"
 #include "tools/place/file.h"
 #include "tools/place/volume.h"
 #include "tools/say/output.h"
@@ -330,6 +331,10 @@ ExitStatus Run(const Options& options) {
                          .brief = options.brief,
                          .itemized = options.itemized,
                          .json = options.json});
+        case Command::kSalvage:
+            return Salvage({.path = options.paths.front(),
+                            .directory = options.destination,
+                            .json = options.json});
         case Command::kDump:
             break;
     }

@@ -22,7 +22,7 @@ class Fields {
     void Line(const std::string& line) { text_ += line + '\n'; }
     void AddFindings(const Findings& findings) {
         for (const std::string& note : findings.notes) Line("note: " + note);
-        for (const std::string& violation : findings.violations) Line("violation: " + violation);
+        for (const Violation& violation : findings.violations) Line("violation: " + violation.text);
     }
 
     std::string Take() { return std::move(text_); }

@@ -27,6 +27,13 @@ Content Content::Damaged(std::uint64_t size, std::string problem) {
     return content;
 }
 
+Content Content::Readable() const {
+    if (!damaged()) return *this;
+    const std::uint64_t file_size = file_ ? file_->Size() : 0;
+    if (offset_ >= file_size) return {};
+    return {file_, offset_, std::min(size_, file_size - offset_)};
+}
+
 Bytes Content::Read(std::uint64_t offset, std::uint64_t size) const {
     if (damaged()) {
         throw Failure(kFailed, file_ ? file_->path() : "metadata", "damaged: " + problem_, kLook,

@@ -32,6 +32,9 @@ class Content {
     bool damaged() const { return !problem_.empty(); }
     const std::string& problem() const { return problem_; }
 
+    // What of it is there: all of it, unless it is damaged.
+    Content Readable() const;
+
     // Both throw Failure, for what is damaged too. Up to `size` bytes at `offset`, fewer only at
     // the end.
     Bytes Read(std::uint64_t offset, std::uint64_t size) const;
