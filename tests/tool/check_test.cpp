@@ -424,6 +424,8 @@ TEST_F(CheckTest, WhatRunsHaveLeftIsTold) {
     Add(".mavoea-0123abcd");
     Add(".mavoea-moving-0123456789ABCDEF");
     MakeDir(dir_ / ".mavoea-12345-0123456789abcdef");
+    // What waits in there is looked at when the rename comes to its end.
+    PutAppleDouble(dir_ / ".mavoea-12345-0123456789abcdef/a", ClassicFile(Pattern(32), {}).bytes);
     PutResource(object, ClassicFile(Pattern(32), {}).bytes);
     PutKind(object, "MavoResourceTmp", ClassicFile(Pattern(32), {}).bytes);
     WriteFile(dir_ / "@eaDir/.mavoea-0123abcd", {});
