@@ -58,9 +58,6 @@ class Json {
     // The same in one line.
     std::string Line() const;
 
-    // The same on one line.
-    std::string Line() const;
-
  private:
     Json(std::in_place_t, std::uint64_t number);
     Json(std::in_place_t, std::int64_t number);

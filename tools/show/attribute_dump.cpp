@@ -111,7 +111,7 @@ class Dumping {
         }
         fields_.AddFindings(findings_);
         json_.Set("notes", findings_.notes);
-        json_.Set("violations", findings_.violations);
+        json_.Set("violations", Fields::ViolationsJson(findings_));
         return AttributeDump{fields_.Take(), std::move(json_), findings_.violations.size()};
     }
 
@@ -124,7 +124,7 @@ class Dumping {
         json_.Set("kind", kind);
         json_.Set("size", value.size());
     }
-    void Violate(const std::string& what) { findings_.violations.push_back(what); }
+    void Violate(const std::string& what) { findings_.violations.push_back({what}); }
     void AddNote(const std::string& what) { findings_.notes.push_back(what); }
 
     // ---- Samba's DOS attributes -----------------------------------------------------------------

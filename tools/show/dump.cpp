@@ -139,9 +139,7 @@ Json DumpJson(const std::string& path, const Layout& layout, const Findings& fin
         json.Set("resourceFork", RangeJson(layout.entries[*fork].data));
     }
     json.Set("notes", findings.notes);
-    Json violations = Json::Array();
-    for (const Violation& violation : findings.violations) violations.Add(violation.text);
-    json.Set("violations", std::move(violations));
+    json.Set("violations", Fields::ViolationsJson(findings));
     return json;
 }
 

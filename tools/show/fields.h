@@ -6,6 +6,7 @@
 #include <string>
 #include <string_view>
 
+#include "tools/say/json.h"
 #include "tools/store/layout.h"
 
 namespace mavoea::tool {
@@ -26,6 +27,12 @@ class Fields {
     }
 
     std::string Take() { return std::move(text_); }
+
+    static Json ViolationsJson(const Findings& findings) {
+        Json list = Json::Array();
+        for (const Violation& violation : findings.violations) list.Add(violation.text);
+        return list;
+    }
 
  private:
     std::string text_;

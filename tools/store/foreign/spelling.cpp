@@ -139,12 +139,6 @@ bool IsForeignInAny(const std::string& attribute) {
             DatumOf(attribute.substr(kUser.size())) != Datum::kAttribute);
 }
 
-std::string NameOfExtent(std::string_view attribute, unsigned extent) {
-    constexpr std::string_view kFirst = "user.DosStream.";
-    return "user.DosStreamExt." + std::to_string(extent) + '.' +
-           std::string(attribute.substr(kFirst.size()));
-}
-
 std::optional<Bytes> Spelling::Value(const AttributeSource& source) const {
     auto value = source.Attribute(attribute);
     if (!value || !has_nul) return value;
