@@ -84,7 +84,7 @@ class ToolTest(layouts_test.ShareTest):
         return result.stdout
 
     def listed(self, path=None):
-        (found,) = json.loads(self.tool("list", "--json", "-l", path or self.path))
+        found = json.loads(self.tool("list", "--json", "-l", path or self.path))
         return found["attributes"]
 
     def set(self, name, value):

@@ -93,7 +93,7 @@ TEST_P(AttributesTest, ControlCharactersInANameCannotForgeALine) {
     ASSERT_THAT(volume_->Set("user.a\nuser.b\\\x1B[2J", Ascii("x")), Succeeded());
     EXPECT_EQ("user.a\\x0Auser.b\\\\\\x1B[2J\n", volume_->List().out);
     const auto json = volume_->Run({"--json", "list", volume_->object()}).json();
-    EXPECT_EQ("user.a\nuser.b\\\x1B[2J", json[0]["attributes"][0]["name"]);
+    EXPECT_EQ("user.a\nuser.b\\\x1B[2J", json["attributes"][0]["name"]);
 }
 
 TEST_P(AttributesTest, ARemovedAttributeIsGoneAndTheOthersStay) {
@@ -274,15 +274,14 @@ TEST_P(AttributesTest, JsonSaysWhatTheCommandsDid) {
     EXPECT_EQ(2, json["size"]);
 
     json = volume_->Run({"list", object, "--json"}).json();
-    ASSERT_EQ(1U, json.size());
-    EXPECT_EQ(object, json[0]["path"]);
-    EXPECT_EQ(GetParam(), json[0]["type"]);
-    ASSERT_EQ(1U, json[0]["attributes"].size());
-    EXPECT_EQ("757365722eff6e616d65", json[0]["attributes"][0]["nameHex"]);
-    EXPECT_EQ(2, json[0]["attributes"][0]["size"]);
-    EXPECT_EQ("attribute", json[0]["attributes"][0]["kind"]);
+    EXPECT_EQ(object, json["path"]);
+    EXPECT_EQ(GetParam(), json["type"]);
+    ASSERT_EQ(1U, json["attributes"].size());
+    EXPECT_EQ("757365722eff6e616d65", json["attributes"][0]["nameHex"]);
+    EXPECT_EQ(2, json["attributes"][0]["size"]);
+    EXPECT_EQ("attribute", json["attributes"][0]["kind"]);
     EXPECT_EQ(GetParam() == 7 ? object : volume_->attribute_file(),
-              json[0]["attributes"][0]["file"]);
+              json["attributes"][0]["file"]);
 
     json = volume_->Run({"--json", "remove", object, name}).json();
     EXPECT_EQ(true, json["removed"]);

@@ -142,9 +142,9 @@ TEST_P(FinderAndForkTest, ALongListSaysWhatTheyAre) {
             "\n      4321  resource fork  com.apple.ResourceFork  " + volume_->finder_file() + "\n",
         volume_->Run({"list", "-l", volume_->object()}).out);
     const auto json = volume_->Run({"list", "--json", volume_->object()}).json();
-    EXPECT_EQ("Finder info", json[0]["attributes"][1]["kind"]);
-    EXPECT_EQ("resource fork", json[0]["attributes"][2]["kind"]);
-    EXPECT_EQ(4321, json[0]["attributes"][2]["size"]);
+    EXPECT_EQ("Finder info", json["attributes"][1]["kind"]);
+    EXPECT_EQ("resource fork", json["attributes"][2]["kind"]);
+    EXPECT_EQ(4321, json["attributes"][2]["size"]);
 }
 
 // ---- Files that others wrote --------------------------------------------------------------------

@@ -376,8 +376,8 @@ TEST_F(ForeignTest, ListTellsWhereAndUnderWhatNameItLies) {
     EXPECT_THAT(out, HasSubstr(kColour + "    " + samba_.file() + " (" + kColourStream + ")\n"));
     EXPECT_THAT(out, HasSubstr(kFinderInfoName + "  " + samba_.file() + " (" + kRecord + ")\n"));
     const auto json = samba_.Run({"list", "--json", samba_.file()}).json();
-    EXPECT_EQ("samba", json[0]["type"]);
-    EXPECT_EQ(kColourStream, json[0]["attributes"][0]["attribute"]);
+    EXPECT_EQ("samba", json["type"]);
+    EXPECT_EQ(kColourStream, json["attributes"][0]["attribute"]);
 }
 
 TEST_F(ForeignTest, TwoSpellingsThatDifferAreBothTold) {

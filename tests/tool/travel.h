@@ -127,7 +127,9 @@ inline std::vector<std::string> DifficultNames() {
 // The tool as a process that has not ended, with its questions to be answered.
 class RunningTool {
  public:
-    explicit RunningTool(const Arguments& arguments) {
+    // What it writes to standard output is lost, or comes with what it says.
+    enum class Output { kLost, kSaid };
+    explicit RunningTool(const Arguments& arguments, Output output = Output::kLost) {
         int in[2];
         int err[2];
         if (pipe(in) != 0 || pipe(err) != 0) abort();
@@ -137,7 +139,7 @@ class RunningTool {
         if (child_ == 0) {
             alarm(60);
             dup2(in[0], 0);
-            dup2(open("/dev/null", O_WRONLY), 1);
+            dup2(output == Output::kSaid ? err[1] : open("/dev/null", O_WRONLY), 1);
             dup2(err[1], 2);
             for (const int fd : {in[0], in[1], err[0], err[1]}) close(fd);
             tool.Exec();
@@ -149,7 +151,7 @@ class RunningTool {
         err_ = err[0];
     }
     ~RunningTool() {
-        close(in_);
+        EndInput();
         close(err_);
     }
     RunningTool(const RunningTool&) = delete;
@@ -167,6 +169,10 @@ class RunningTool {
     }
     void Answer(const std::string& text) const {
         EXPECT_EQ(static_cast<ssize_t>(text.size()), write(in_, text.data(), text.size()));
+    }
+    void EndInput() {
+        if (in_ >= 0) close(in_);
+        in_ = -1;
     }
     void Signal(int number) const { kill(child_, number); }
 

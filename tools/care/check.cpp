@@ -24,7 +24,7 @@ class Soundness final : public FindingSink {
     explicit Soundness(const CheckOptions& options) : options_(options) {}
 
     ExitStatus Run() {
-        VisitObjects(options_.paths, options_.recursive,
+        VisitObjects(options_.tree,
                      {.work = [this](const Object& object,
                                      const std::string&) { return CheckObject(object); },
                       .on_failure = [this](const std::string&,
@@ -43,7 +43,7 @@ class Soundness final : public FindingSink {
         ++found_;
         ++by_kind_[static_cast<std::size_t>(finding.kind)];
         progress_.Clear();
-        std::cout << (options_.json ? finding.AsJson().Line() : finding.Text()) << '\n';
+        std::cout << (options_.tree.json ? finding.AsJson().Line() : finding.Text()) << '\n';
     }
 
     void AddFailure(const Failure& failure) override {
@@ -55,7 +55,7 @@ class Soundness final : public FindingSink {
         } else {
             Report(failure);
         }
-        if (!options_.json) return;
+        if (!options_.tree.json) return;
         Json json;
         json.SetText("path", failure.subject());
         json.SetText(in_use ? "inUse" : "failure", failure.what());
@@ -100,9 +100,9 @@ class Soundness final : public FindingSink {
     }
 
     void Summarize() const {
-        const bool counts =
-            (options_.recursive || options_.paths.size() > 1) && ::isatty(STDOUT_FILENO) == 1;
-        if (options_.json) {
+        const bool counts = (options_.tree.recursive || options_.tree.paths.several()) &&
+                            ::isatty(STDOUT_FILENO) == 1;
+        if (options_.tree.json) {
             std::cout << SummaryJson().Line() << '\n';
         } else if (counts || options_.verbose) {
             std::cout << Counts() << '\n';

@@ -2,18 +2,14 @@
 #ifndef MAVOEA_TOOLS_CARE_CHECK_H_
 #define MAVOEA_TOOLS_CARE_CHECK_H_
 
-#include <string>
-#include <vector>
-
 #include "tools/say/messages.h"
+#include "tools/walk/tree.h"
 
 namespace mavoea::tool {
 
 struct CheckOptions {
-    std::vector<std::string> paths;
-    bool recursive = false;
+    TreeOptions tree;      // JSON is an object a line
     bool verbose = false;  // says at the end how many there were
-    bool json = false;     // an object a line
 };
 
 // Reads all of it and changes nothing. A line for each finding, as it is found. 0: there is none;

@@ -154,6 +154,8 @@ class Cleaning {
         pending_.clear();
     }
 
+    void Fail(const Failure& failure) { Add(failure.subject(), failure); }
+
     ExitStatus Finish() {
         if (!looked_.empty() && Interrupted() == 0) LookAgain();
         if (options_.json) {
@@ -182,6 +184,7 @@ class Cleaning {
     }
 
     void DoDirectory(const Place& place) {
+        if (progress_.wanted()) ShowProgress(place.path());
         const DirectoryRef directory = place.directory->OpenIn(place.name);
         Looked looked = Look(directory);
         if (options_.remove && GiveBack(looked)) looked = Look(directory);
@@ -194,6 +197,7 @@ class Cleaning {
             looked_.push_back(std::move(looked));
             if (waiting_ >= kMostWaiting || looked_.size() >= MostOpen()) LookAgain();
         }
+        ++directories_;
         if (!options_.recursive) return;
         const std::size_t first = pending_.size();
         for (const Directory::Entry& entry : directory->Entries()) {
@@ -203,6 +207,14 @@ class Cleaning {
             }
         }
         std::reverse(pending_.begin() + static_cast<std::ptrdiff_t>(first), pending_.end());
+    }
+
+    void ShowProgress(const std::string& path) {
+        progress_.Show(std::to_string(directories_) + " directories, " +
+                           std::to_string(dangling_ + waiting_) + " found, " +
+                           std::to_string(removed_) + " removed, " +
+                           std::to_string(failures_.size()) + " failed",
+                       path, directories_);
     }
 
     // ---- Looking --------------------------------------------------------------------------------
@@ -351,9 +363,11 @@ class Cleaning {
     }
 
     const CleanOptions& options_;
-    std::vector<Place> pending_;  // directories
-    std::vector<Looked> looked_;  // of which something waits for the second look
-    std::size_t waiting_ = 0;     // how many things that is
+    Progress progress_{"looking for metadata", Progress::Lines::kOnRequest};
+    std::vector<Place> pending_;   // directories
+    std::size_t directories_ = 0;  // that have been looked through
+    std::vector<Looked> looked_;   // of which something waits for the second look
+    std::size_t waiting_ = 0;      // how many things that is
     Json list_ = Json::Array();
     std::size_t dangling_ = 0;  // neither removed nor kept
     std::size_t removed_ = 0;
@@ -368,8 +382,10 @@ ExitStatus Clean(const CleanOptions& options) {
     if (options.recursive) RequireDescriptorPaths();
     WatchForInterrupts();
     Cleaning cleaning(options);
-    for (const std::string& directory : options.directories) {
-        if (Interrupted() == 0) cleaning.Do(directory);
+    PathReader directories(options.directories,
+                           [&](const Failure& failure) { cleaning.Fail(failure); });
+    while (const auto directory = Interrupted() == 0 ? directories.Next() : std::nullopt) {
+        cleaning.Do(*directory);
     }
     return cleaning.Finish();
 }

@@ -2,15 +2,13 @@
 #ifndef MAVOEA_TOOLS_CARE_CLEAN_H_
 #define MAVOEA_TOOLS_CARE_CLEAN_H_
 
-#include <string>
-#include <vector>
-
+#include "tools/place/paths.h"
 #include "tools/say/messages.h"
 
 namespace mavoea::tool {
 
 struct CleanOptions {
-    std::vector<std::string> directories;
+    NamedPaths directories;
     bool recursive = false;
     bool remove = false;  // only listed otherwise
     bool others = false;  // what other services left as well

@@ -72,27 +72,56 @@ std::string Unguarded(std::string argument) {
 
 void AddPath(CLI::App* sub, Options* options, const char* what) {
     sub->add_option_function<std::string>(
-           "PATH", [=](const std::string& path) { options->paths = {path}; }, what)
+           "PATH", [=](const std::string& path) { options->paths.arguments = {path}; }, what)
         ->required();
 }
 
-void AddPaths(CLI::App* sub, Options* options) {
-    sub->add_option("PATH", options->paths, "Files and directories")->required();
+// Any number of them, for a PathReader.
+void AddPaths(CLI::App* sub, Options* options, const char* name, const char* what) {
+    CLI::Option* const paths = sub->add_option(name, options->paths.arguments, what)->required();
+    sub->add_option_function<std::string>(
+           "--files0-from",
+           [=](const std::string& file) {
+               options->paths.list = Unguarded(file);
+               paths->required(false);
+           },
+           std::string("Take each ") + name +
+               " from a file that has a NUL behind each; \"-\": standard input")
+        ->type_name("FILE")
+        ->excludes(paths);
 }
 
 void AddRecursive(CLI::App* sub, Options* options) {
     sub->add_flag("-r,--recursive", options->recursive,
                   "With all that is below directories; symbolic links are not followed");
+    // A flag's value stands behind "=" only: a PATH is never taken for it.
+    constexpr int kDay = 86400;
+    sub->add_flag(
+           "--progress{30}", options->progress,
+           "Tell how far it is each 30 s, or \"--progress=SECONDS\" each so many, 0 with each "
+           "object, where no terminal shows it; SIGUSR1 asks for it at any time")
+        ->check(CLI::Range(0, kDay));
 }
 
+// Objects for the walk through trees, or a part of them.
 void AddTree(CLI::App* sub, Options* options) {
     AddRecursive(sub, options);
-    AddPaths(sub, options);
+    sub->add_option_function<std::string>(
+           "--shard",
+           [=](const std::string& text) {
+               const auto shard = ParseShard(text);
+               if (!shard) throw CLI::ValidationError("--shard", text + " is no I/N");
+               options->shard = *shard;
+           },
+           "Only the objects of the I-th of N parts, for N processes that share the work")
+        ->type_name("I/N");
+    AddPaths(sub, options, "PATH", "Files and directories");
 }
 
 void AddSource(CLI::App* sub, Options* options) {
     sub->add_option_function<std::string>(
-           "SRC", [=](const std::string& path) { options->paths = {path}; }, "The original")
+           "SRC", [=](const std::string& path) { options->paths.arguments = {path}; },
+           "The original")
         ->required();
 }
 
@@ -148,17 +177,18 @@ void AddInfo(CLI::App* sub, Options* options) {
     AddText(sub, &info->backed_up, "--backup-date", "DATE",
             "When it was backed up, in UTC: 2024-05-01T09:30:00Z");
     AddText(sub, &info->created, "--created", "DATE", "When it was made, as Macs show it");
-    AddPaths(sub, options);
+    AddPaths(sub, options, "PATH", "Files and directories");
 }
 
 // Of one file there is one object; all arguments are directories in recursive work.
 void PlaceImport(Options* options) {
+    std::vector<std::string>& paths = options->paths.arguments;
     if (options->recursive) {
-        options->paths.insert(options->paths.begin(), options->archive);
-    } else if (options->paths.empty()) {
+        paths.insert(paths.begin(), options->archive);
+    } else if (paths.empty()) {
         throw CLI::RequiredError("PATH");
-    } else if (options->paths.size() > 1) {
-        throw CLI::ExtrasError({Unguarded(options->paths[1])});
+    } else if (paths.size() > 1) {
+        throw CLI::ExtrasError({Unguarded(paths[1])});
     }
 }
 
@@ -174,9 +204,14 @@ constexpr Syntax kCommands[] = {
      [](CLI::App* sub, Options* options) { AddPath(sub, options, "A file or directory"); }},
     {Command::kList, "list", "List attribute names, one a line",
      [](CLI::App* sub, Options* options) {
-         sub->add_flag("-l", options->details, "With size, kind and the file that holds it");
-         AddRecursive(sub, options);
-         AddPaths(sub, options);
+         CLI::Option* const details =
+             sub->add_flag("-l", options->details, "With size, kind and the file that holds it");
+         sub->add_flag("-0,--null", options->null,
+                       "For each attribute the object's path and the name, as they are, with a NUL "
+                       "behind each")
+             ->excludes(details);
+         sub->add_flag("--values", options->values, "With --json: values, too, as base64");
+         AddTree(sub, options);
      }},
     {Command::kShow, "show",
      "Show in words what is known: Finder info, comment, tags, dates, marks, attributes", AddTree},
@@ -218,7 +253,7 @@ constexpr Syntax kCommands[] = {
      [](CLI::App* sub, Options* options) {
          sub->add_option("FILE", options->archive, "The file; its content says what it is")
              ->required();
-         sub->add_option("PATH", options->paths,
+         sub->add_option("PATH", options->paths.arguments,
                          "The object. All but AppleDouble hold data as well: they make a file that "
                          "is missing, in a directory one of their own name, and are refused where "
                          "there is other data");
@@ -258,7 +293,7 @@ constexpr Syntax kCommands[] = {
          sub->add_flag("-f,--force", options->force, "Replace a FILE that is there");
          sub->add_flag("--absolute-names", options->absolute_names,
                        "Leave the slashes at the beginning of paths");
-         AddPaths(sub, options);
+         AddPaths(sub, options, "PATH", "Files and directories");
      }},
     {Command::kRestore, "restore", "Give objects the metadata in a text of save or getfattr --dump",
      [](CLI::App* sub, Options* options) {
@@ -301,13 +336,14 @@ constexpr Syntax kCommands[] = {
              ->capture_default_str();
          sub->add_flag("--all", options->all,
                        "With what other services keep in EA directories for objects that are gone");
-         sub->add_option("DIR", options->paths, "Directories")->required();
+         AddPaths(sub, options, "DIR", "Directories");
      }},
     {Command::kCheck, "check", "Say whether all that is known of objects is sound; change nothing",
      [](CLI::App* sub, Options* options) {
          sub->add_flag("-v,--verbose", options->verbose, "Say at the end how many there were");
          sub->footer(FindingCodes());
-         AddTree(sub, options);
+         AddRecursive(sub, options);
+         AddPaths(sub, options, "PATH", "Files and directories");
      }},
     {Command::kConvert, "convert",
      "Copy an object or a tree to a volume of another type, and compare the two",
@@ -334,7 +370,8 @@ constexpr Syntax kCommands[] = {
                        "entries such as comments and dates, marks, what services keep")
              ->excludes(brief);
          sub->add_option_function<std::string>(
-                "A", [=](const std::string& path) { options->paths = {path}; }, "The first")
+                "A", [=](const std::string& path) { options->paths.arguments = {path}; },
+                "The first")
              ->required();
          sub->add_option("B", options->destination, "The second")->required();
          sub->footer("Exit status: 0 equal; 1 different; 2 something could not be compared.");
@@ -348,7 +385,7 @@ constexpr Syntax kCommands[] = {
                        "extended attributes is shown")
              ->excludes(record);
          sub->add_option_function<std::string>(
-                "FILE", [=](const std::string& path) { options->paths = {path}; },
+                "FILE", [=](const std::string& path) { options->paths.arguments = {path}; },
                 "A metadata file")
              ->required();
      }},
@@ -440,6 +477,7 @@ std::variant<Options, int> ParseAs(Command command, Habit habit, std::span<const
     options.volumes.insert(options.volumes.end(), read.volumes.begin(), read.volumes.end());
     options.copy = std::move(read.copy);
     options.remove = std::move(read.remove);
+    options.progress = std::move(read.progress);
     options.json = before.json || read.json;
     options.copy.job.json = options.remove.job.json = options.json;
     return options;
@@ -525,7 +563,7 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
         std::cerr << "mavoea: " << error.what() << "; mavoea --help has the usage\n";
         return static_cast<int>(kFailed);
     }
-    for (std::string& path : options.paths) path = Unguarded(std::move(path));
+    for (std::string& path : options.paths.arguments) path = Unguarded(std::move(path));
     for (std::string& volume : options.volumes) volume = Unguarded(std::move(volume));
     options.name = Unguarded(std::move(options.name));
     options.archive = Unguarded(std::move(options.archive));

@@ -9,6 +9,8 @@
 
 #include "tools/cli/set_info.h"
 #include "tools/move/options.h"
+#include "tools/place/paths.h"
+#include "tools/walk/shard.h"
 
 namespace mavoea::tool {
 
@@ -45,7 +47,9 @@ struct Options {
     std::vector<std::string> volumes;  // PATH=TYPE
     bool json = false;
 
-    std::vector<std::string> paths;  // one, but for commands that take several
+    NamedPaths paths;      // one argument, but for commands that take any number
+    Shard shard;           // of the objects that those lead to
+    std::string progress;  // seconds between two lines of it, empty: none
     std::string name;
     std::string archive;         // import, export, restore
     std::string format;          // export
@@ -54,6 +58,8 @@ struct Options {
     bool keep = false;           // import -r: the "._" files stay
     bool keep_existing = false;  // import -r: values that are there stay
     bool details = false;        // list -l
+    bool null = false;           // list
+    bool values = false;         // list
     bool recursive = false;
     bool yes = false;                     // clean: what is listed is removed
     int wait = 2;                         // clean: seconds between its two looks

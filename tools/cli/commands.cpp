@@ -3,6 +3,8 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <chrono>
+#include <cstdint>
 #include <iostream>
 
 #include "format/ea_stream.h"
@@ -20,11 +22,13 @@
 #include "tools/move/import.h"
 #include "tools/move/import_tree.h"
 #include "tools/move/restore.h"
-#include "tools/move/save.h"
 #include "tools/move/salvage.h"
+#include "tools/move/save.h"
 #include "tools/place/file.h"
 #include "tools/place/volume.h"
+#include "tools/say/interrupt.h"
 #include "tools/say/output.h"
+#include "tools/say/progress.h"
 #include "tools/say/text.h"
 #include "tools/show/attribute_dump.h"
 #include "tools/show/attributes.h"
@@ -123,16 +127,26 @@ ExitStatus Remove(const Options& options) {
 
 // ---- lock, unlock -------------------------------------------------------------------------------
 
-ExitStatus Lock(const Options& options, bool locked) {
+ExitStatus Lock(const TreeOptions& options, bool locked) {
     ExitStatus status = kSuccess;
     Json json = Json::Array();
+    Progress progress(locked ? "locking" : "unlocking");
+    std::uint64_t done = 0;
+    std::uint64_t failed = 0;
     const auto fail = [&](const Failure& failure) {
+        progress.Clear();
         Report(failure);
+        ++failed;
         status = std::max(status, failure.status());
     };
     const auto work = [&](const Object& object, const std::string&) {
+        if (progress.wanted()) {
+            progress.Show(std::to_string(done) + " done, " + std::to_string(failed) + " failed",
+                          object.path(), done + failed);
+        }
         try {
             SetLocked(object, locked);
+            ++done;
             Json entry;
             entry.SetText("path", object.path());
             entry.Set("locked", locked);
@@ -142,11 +156,12 @@ ExitStatus Lock(const Options& options, bool locked) {
         }
         return true;
     };
-    VisitObjects(options.paths, options.recursive,
+    VisitObjects(options,
                  {.work = work,
                   .on_failure = [&](const std::string&, const Failure& failure) { fail(failure); },
                   .on_named = SettleNamed,
                   .on_directory = [](const DirectoryRef& inside) { (void)SettlePending(inside); }});
+    progress.Clear();
     if (options.json) Print(json);
     return status;
 }
@@ -236,18 +251,21 @@ ExitStatus Dump(const Options& options) {
 ExitStatus Run(const Options& options) {
     RequireVolumeTable();
     for (const std::string& volume : options.volumes) DeclareVolume(volume);
-    const TreeOptions tree = {options.paths, options.recursive, options.json};
+    WatchForProgressRequests();
+    if (!options.progress.empty()) {
+        ReportProgressEach(std::chrono::seconds(std::stoi(options.progress)));
+    }
+    const TreeOptions tree = {options.paths, options.recursive, options.json, options.shard};
     switch (options.command) {
         case Command::kWhere:
             return Where(options.paths.front(), options.json);
         case Command::kList:
-            return List({.paths = options.paths,
+            return List({.tree = tree,
                          .details = options.details,
-                         .recursive = options.recursive,
-                         .json = options.json});
+                         .null = options.null,
+                         .values = options.values});
         case Command::kShow:
-            return Show(
-                {.paths = options.paths, .recursive = options.recursive, .json = options.json});
+            return Show(tree);
         case Command::kGet:
             return GetValue(options);
         case Command::kSet:
@@ -257,12 +275,12 @@ ExitStatus Run(const Options& options) {
         case Command::kRemove:
             return Remove(options);
         case Command::kLock:
-            return Lock(options, true);
+            return Lock(tree, true);
         case Command::kUnlock:
-            return Lock(options, false);
+            return Lock(tree, false);
         case Command::kImport:
             if (options.recursive) {
-                return ImportTree({.directories = options.paths,
+                return ImportTree({.directories = options.paths.arguments,
                                    .keep = options.keep,
                                    .keep_existing = options.keep_existing,
                                    .json = options.json});
@@ -299,7 +317,10 @@ ExitStatus Run(const Options& options) {
         case Command::kDelete:
             return Delete(options.remove);
         case Command::kCarry:
-            return Carry({{options.paths, options.recursive, options.verbose, options.json},
+            return Carry({{.paths = options.paths.arguments,
+                           .recursive = options.recursive,
+                           .verbose = options.verbose,
+                           .json = options.json},
                           options.destination});
         case Command::kUpgrade:
             return Upgrade(tree);
@@ -313,10 +334,7 @@ ExitStatus Run(const Options& options) {
                           .wait = options.wait,
                           .json = options.json});
         case Command::kCheck:
-            return CheckSoundness({.paths = options.paths,
-                                   .recursive = options.recursive,
-                                   .verbose = options.verbose,
-                                   .json = options.json});
+            return CheckSoundness({.tree = tree, .verbose = options.verbose});
         case Command::kConvert:
             return Convert({.source = options.paths.front(),
                             .destination = options.destination,

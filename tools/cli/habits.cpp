@@ -52,6 +52,8 @@ enum Long : int {
     kPreserveRoot,
     kNoPreserveRoot,
     kPresumeTty,
+    kFiles0From,
+    kProgress,
     kVolume,
     kJson,
     kHelp,
@@ -130,6 +132,12 @@ constexpr Syntax kSyntax[] = {
      "Do not remove '/'; with \"all\" nothing that is on another file system than its parent"},
     {kRm, kNoPreserveRoot, "no-preserve-root", no_argument, nullptr, "Remove '/' like any other"},
     {kRm, kPresumeTty, "-presume-input-tty", no_argument, nullptr, nullptr},
+    {kCp | kMv, kFiles0From, "files0-from", required_argument, "FILE",
+     "Take each SRC from a file that has a NUL behind each; \"-\": standard input"},
+    {kRm, kFiles0From, "files0-from", required_argument, "FILE",
+     "Take each PATH from a file that has a NUL behind each; \"-\": standard input"},
+    {kCp | kMv | kRm, kProgress, "progress", optional_argument, "SECONDS",
+     "Tell how far it is each 30 s, or so many, where no terminal shows it; SIGUSR1 asks for it"},
     {kCp | kMv | kRm, kVolume, "volume", required_argument, "PATH=TYPE",
      "Declare a directory's volume type for this run; may be repeated"},
     {kCp | kMv | kRm, kJson, "json", no_argument, nullptr, "Write JSON"},
@@ -215,6 +223,12 @@ class Line {
             case 'v':
                 job.verbose = true;
                 break;
+            case kFiles0From:
+                job.list = value;
+                break;
+            case kProgress:
+                options_.progress = SecondsIn(argument == nullptr ? "30" : value);
+                break;
             case kVolume:
                 options_.volumes.push_back(value);
                 break;
@@ -229,7 +243,15 @@ class Line {
 
     HabitOptions Finish(std::vector<std::string> operands) {
         if (habit_ == Habit::kDelete) {
-            if (operands.empty() && !options_.remove.force) Misuse(habit_, "missing operand");
+            const auto& list = options_.remove.job.list;
+            if (list && !operands.empty()) MisuseWithList(operands.front());
+            if (list == "-" && (options_.remove.ask == AskToRemove::kAlways ||
+                                options_.remove.ask == AskToRemove::kOnce)) {
+                MisuseInput();
+            }
+            if (operands.empty() && !list && !options_.remove.force) {
+                Misuse(habit_, "missing operand");
+            }
             options_.remove.job.paths = std::move(operands);
             options_.remove.job.json = options_.json;
             return std::move(options_);
@@ -256,11 +278,42 @@ class Line {
     }
 
  private:
+    [[noreturn]] void MisuseWithList(const std::string& operand) const {
+        Misuse(habit_, "extra operand " + Quoted(operand) +
+                           "\nfile operands cannot be combined with --files0-from");
+    }
+
+    // Nobody can answer questions where the list is.
+    [[noreturn]] void MisuseInput() const {
+        Misuse(habit_, "standard input cannot both have the files and answer questions");
+    }
+
+    std::string SecondsIn(const std::string& value) const {
+        constexpr std::size_t kMostDigits = 5;
+        const bool digits = value.find_first_not_of("0123456789") == std::string::npos;
+        if (value.empty() || value.size() > kMostDigits || !digits) {
+            Misuse(habit_, "invalid argument " + Quoted(value) + " for " + Quoted("--progress"));
+        }
+        return value;
+    }
+
+    void CheckSourcesInList(const std::vector<std::string>& operands) const {
+        const CopyOptions& copy = options_.copy;
+        const std::size_t most = copy.target_directory ? 0 : 1;  // the destination
+        if (copy.no_target_directory) {
+            Misuse(habit_, "cannot combine --files0-from and --no-target-directory (-T)");
+        }
+        if (operands.size() < most) Misuse(habit_, "missing destination file operand");
+        if (operands.size() > most) MisuseWithList(operands[most]);
+        if (copy.job.list == "-" && copy.overwrite == Overwrite::kAsk) MisuseInput();
+    }
+
     void CheckOperands(const std::vector<std::string>& operands) const {
         const CopyOptions& copy = options_.copy;
         if (copy.no_target_directory && copy.target_directory) {
             Misuse(habit_, "cannot combine --target-directory (-t) and --no-target-directory (-T)");
         }
+        if (copy.job.list) return CheckSourcesInList(operands);
         if (operands.empty()) Misuse(habit_, "missing file operand");
         if (operands.size() == 1 && !copy.target_directory) {
             Misuse(habit_, "missing destination file operand after " + Quoted(operands.front()));

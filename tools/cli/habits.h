@@ -17,6 +17,7 @@ struct HabitOptions {
     CopyOptions copy;  // cp and mv
     RemoveOptions remove;
     std::vector<std::string> volumes;  // PATH=TYPE
+    std::string progress;              // seconds, empty: none
     bool json = false;
 };
 

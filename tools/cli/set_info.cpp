@@ -434,21 +434,25 @@ class InfoSetting {
 
 }  // namespace
 
-ExitStatus SetInfo(const std::vector<std::string>& paths, const InfoOptions& options, bool json) {
+ExitStatus SetInfo(const NamedPaths& paths, const InfoOptions& options, bool json) {
     const InfoChange change = ToChange(options);
     ExitStatus status = kSuccess;
+    const auto fail = [&](const Failure& failure) {
+        Report(failure);
+        status = std::max(status, failure.status());
+    };
     Json list = Json::Array();
-    for (const std::string& path : paths) {
+    PathReader reader(paths, fail);
+    while (const auto path = reader.Next()) {
         try {
-            const Object object = FindObject(path);
+            const Object object = FindObject(*path);
             const std::vector<std::string> changed = InfoSetting(object, change).Run();
             Json entry;
             entry.SetText("path", object.path());
             entry.Set("changed", Json(changed));
             list.Add(std::move(entry));
         } catch (const Failure& failure) {
-            Report(failure);
-            status = std::max(status, failure.status());
+            fail(failure);
         }
     }
     if (json) Print(list);

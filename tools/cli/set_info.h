@@ -7,6 +7,7 @@
 #include <string>
 #include <vector>
 
+#include "tools/place/paths.h"
 #include "tools/say/messages.h"
 
 namespace mavoea::tool {
@@ -24,7 +25,7 @@ struct InfoOptions {
 // Changes one object after the other and goes on after a failure. kSuccess when all that was asked
 // for has been read back from all of them; otherwise the gravest status. Words that mean nothing,
 // and nothing to change, are a Failure before anything is looked at.
-ExitStatus SetInfo(const std::vector<std::string>& paths, const InfoOptions& options, bool json);
+ExitStatus SetInfo(const NamedPaths& paths, const InfoOptions& options, bool json);
 
 }  // namespace mavoea::tool
 

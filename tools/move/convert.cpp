@@ -142,7 +142,7 @@ class Conversion final : private TreeCopy {
         in_hand_ = path;
         progress_.Show(std::to_string(converted_) + " converted, " + std::to_string(compared_) +
                            " compared, " + std::to_string(failures_.size()) + " failed",
-                       path);
+                       path, converted_ + compared_ + failures_.size());
     }
 
     void PrintJson() const {

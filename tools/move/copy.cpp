@@ -15,6 +15,7 @@
 #include "tools/move/parents.h"
 #include "tools/move/same_file.h"
 #include "tools/move/unfinished.h"
+#include "tools/place/paths.h"
 #include "tools/place/volume.h"
 #include "tools/say/interrupt.h"
 #include "tools/say/text.h"
@@ -32,7 +33,7 @@ constexpr const char* kElsewhere = "name another destination";
 
 JobOptions WithSourcesOnly(const CopyOptions& options) {
     JobOptions job = options.job;
-    if (!options.target_directory) job.paths.pop_back();
+    if (!options.target_directory) job.paths.pop_back();  // of a list, nothing is left
     return job;
 }
 
@@ -72,9 +73,12 @@ class Placement final : private TreeCopy {
     ExitStatus Run() {
         if (job_options_.recursive) RequireDescriptorPaths();
         FindDestination();
-        for (const std::string& source : job_options_.paths) {
-            if (job_.stopped()) break;
-            (void)Try(source, [&] { PlaceNamed(source); });
+        const NamedPaths sources = {job_options_.paths, job_options_.list};
+        PathReader reader(sources, [this](const Failure& failure) {
+            job_.AddFailure(failure.subject(), failure);
+        });
+        while (const auto source = job_.stopped() ? std::nullopt : reader.Next()) {
+            (void)Try(*source, [&] { PlaceNamed(*source); });
         }
         FinishMoves();
         if (Copies()) (void)MakeDurable();
@@ -123,7 +127,7 @@ class Placement final : private TreeCopy {
             return;
         }
         const std::string& path = options_.job.paths.back();
-        const bool several = job_options_.paths.size() > 1;
+        const bool several = job_options_.several();
         const auto info =
             options_.no_target_directory
                 ? std::nullopt
@@ -313,7 +317,7 @@ class Placement final : private TreeCopy {
 
     // A name that was given twice, and goes to one place.
     bool IsNamedAgain(const Source& source, const Place& to) {
-        if (job_options_.paths.size() < 2) return false;
+        if (!job_options_.several()) return false;
         const bool first = named_.insert({EntryOf(source.named), EntryOf(to)}).second;
         if (first || (options_.backup != Backup::kNone && !source.is_directory())) return false;
         job_.AddWarning(std::string("source ") + (source.is_directory() ? "directory " : "file ") +

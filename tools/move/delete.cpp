@@ -8,6 +8,7 @@
 #include <string>
 
 #include "tools/move/ends.h"
+#include "tools/place/paths.h"
 #include "tools/place/volume.h"
 #include "tools/say/job.h"
 #include "tools/say/output.h"
@@ -66,10 +67,9 @@ class Deletion final : private TreeRemoval {
     ExitStatus Run() {
         if (options_.job.recursive) RequireDescriptorPaths();
         if (options_.ask == AskToRemove::kOnce && !AgreesToAll()) return job_.Finish();
-        for (const std::string& path : options_.job.paths) {
-            if (job_.stopped()) break;
-            RemoveNamed(path);
-        }
+        const NamedPaths named = {options_.job.paths, options_.job.list};
+        PathReader paths(named, [this](const Failure& failure) { FailToRead(failure); });
+        while (const auto path = job_.stopped() ? std::nullopt : paths.Next()) RemoveNamed(*path);
         Tidy();
         return job_.Finish();
     }
@@ -81,11 +81,15 @@ class Deletion final : private TreeRemoval {
         constexpr std::size_t kMany = 3;
         const std::size_t count = options_.job.paths.size();
         const bool recursive = options_.job.recursive;
-        if (count == 0 || (!recursive && count <= kMany)) return true;
-        return job_.Ask("remove " + std::to_string(count) +
-                        (count == 1 ? " argument" : " arguments") +
-                        (recursive ? " recursively?" : "?"));
+        const auto& list = options_.job.list;
+        if (!list && (count == 0 || (!recursive && count <= kMany))) return true;
+        const std::string what =
+            list ? "all that is named in " + Quoted(*list)
+                 : std::to_string(count) + (count == 1 ? " argument" : " arguments");
+        return job_.Ask("remove " + what + (recursive ? " recursively?" : "?"));
     }
+
+    void FailToRead(const Failure& failure) { job_.AddFailure(failure.subject(), failure); }
 
     void RemoveNamed(const std::string& path) {
         try {
@@ -153,6 +157,7 @@ class Deletion final : private TreeRemoval {
 
     void Removed(const Place& place, mode_t type) override {
         job_.AddDone();
+        if (job_.wants_progress()) job_.ShowProgress(place.path());
         if (!options_.job.verbose) return;
         job_.Say((S_ISDIR(type) ? "removed directory " : "removed ") + Quoted(place.path()));
     }

@@ -17,7 +17,9 @@ enum class Follow { kUsual, kNever, kNamed, kAlways };  // symbolic links of sou
 enum class Overwrite { kUsual, kAsk, kAlways, kNever };
 
 struct CopyOptions {
-    JobOptions job;  // sources, and the destination as the last path when target_directory is unset
+    // Sources, unless a list has them, and the destination as the last path when target_directory
+    // is unset.
+    JobOptions job;
     std::optional<std::string> target_directory;
     bool no_target_directory = false;  // the destination is the new object itself
     bool strip_slashes = false;

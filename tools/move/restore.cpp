@@ -311,7 +311,10 @@ class Restoring {
  public:
     explicit Restoring(const RestoreOptions& options)
         : type_(options.from_type ? TypeFromName(*options.from_type, "--from") : -1),
-          job_options_{{options.file}, true, options.verbose, options.json},
+          job_options_{.paths = {options.file},
+                       .recursive = true,
+                       .verbose = options.verbose,
+                       .json = options.json},
           job_("restoring", "restored", job_options_),
           objects_(options.file),
           places_(options.directory, options.absolute_names) {}

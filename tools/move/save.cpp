@@ -119,19 +119,22 @@ class Saving {
           encoding_(EncodingNamed(options.encoding)),
           to_terminal_(!options.file && ::isatty(STDOUT_FILENO) == 1),
           // Nothing else comes where the text goes.
-          job_options_{{}, options.recursive && options.file, false, options.json},
+          job_options_{
+              .paths = {}, .recursive = options.recursive && options.file, .json = options.json},
           job_("saving", "saved", job_options_),
           output_(options) {}
 
     ExitStatus Run() {
-        for (const std::string& path : options_.paths) {
+        PathReader reader(options_.paths, [this](const Failure& failure) { AddFailure(failure); });
+        while (const auto next = reader.Next()) {
+            const std::string& path = *next;
             if (HasDotDot(path)) {
                 AddFailure(Failure(kFailed, path, "nothing that a text says of \"..\" is restored",
                                    "give the command in another directory"));
                 continue;
             }
             VisitObjects(
-                {path}, options_.recursive,
+                {.paths = {{path}}, .recursive = options_.recursive},
                 {.work = [&](const Object& object, const std::string&) { return Do(object, path); },
                  .on_failure = [this](const std::string&,
                                       const Failure& failure) { AddFailure(failure); },

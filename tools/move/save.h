@@ -6,12 +6,13 @@
 #include <string>
 #include <vector>
 
+#include "tools/place/paths.h"
 #include "tools/say/messages.h"
 
 namespace mavoea::tool {
 
 struct SaveOptions {
-    std::vector<std::string> paths;
+    NamedPaths paths;
     bool recursive = false;
     std::optional<std::string> encoding;  // "text", "hex" or "base64"; for each value the best
     bool absolute_names = false;          // slashes at the beginning of paths stay

@@ -1,4 +1,5 @@
-// Ctrl-C and its like: noticed between objects, not in the middle of one.
+// Ctrl-C and its like, and who asks how far it is: noticed between objects, not in the middle of
+// one.
 #ifndef MAVOEA_TOOLS_SAY_INTERRUPT_H_
 #define MAVOEA_TOOLS_SAY_INTERRUPT_H_
 
@@ -12,6 +13,13 @@ int Interrupted();
 
 // Whether another one came after it: not even the object in hand is to be finished.
 bool InterruptedAgain();
+
+// From here on SIGUSR1 asks for a line of progress, unless it is ignored.
+void WatchForProgressRequests();
+
+// Whether somebody waits for one; taken, it has been answered.
+bool ProgressRequested();
+bool TakeProgressRequest();
 
 }  // namespace mavoea::tool
 

@@ -25,7 +25,7 @@ bool Job::Ask(const std::string& question) {
     std::cout.flush();
     std::cerr << Speaker() << ": " << question << ' ' << std::flush;
     std::string answer;
-    while (!stopped()) {
+    while (!stopped() && !options_.lists_on_input()) {
         pollfd input = {STDIN_FILENO, POLLIN, 0};
         const int ready = ::poll(&input, 1, kWait);
         if (ready == 0 || (ready < 0 && errno == EINTR)) continue;
@@ -76,7 +76,7 @@ void Job::AddWarning(const std::string& warning) {
 
 void Job::ShowProgress(const std::string& path) {
     path_ = path;
-    progress_.Show(Counts(), path);
+    if (wants_progress()) progress_.Show(Counts(), path, done_ + skipped_ + failures_);
 }
 
 bool Job::stopped() const { return Interrupted() != 0; }
@@ -91,7 +91,7 @@ std::string Job::Counts() const {
 ExitStatus Job::Finish() {
     progress_.Clear();
     // Scripts that read standard output have not asked for counts.
-    const bool counts = (options_.recursive || options_.paths.size() > 1) && !SpeaksAsAnother() &&
+    const bool counts = (options_.recursive || options_.several()) && !SpeaksAsAnother() &&
                         (options_.verbose || ::isatty(STDOUT_FILENO) == 1);
     if (options_.json) {
         PrintJson();

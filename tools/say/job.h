@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -16,9 +17,14 @@ namespace mavoea::tool {
 
 struct JobOptions {
     std::vector<std::string> paths;
+    std::optional<std::string> list = {};  // that has the paths, or the sources, besides
     bool recursive = false;
     bool verbose = false;
     bool json = false;
+
+    bool several() const { return list.has_value() || paths.size() > 1; }
+    // Then it answers no questions.
+    bool lists_on_input() const { return list == "-"; }
 };
 
 class Job {
@@ -27,7 +33,7 @@ class Job {
     Job(const char* doing, const char* done, const JobOptions& options);
 
     // Whether standard input says yes, to a question on standard error. False when it ends, or
-    // when the work is interrupted.
+    // when the work is interrupted, or when it has the paths.
     bool Ask(const std::string& question);
 
     // A line for those who want to see what is done.
@@ -42,6 +48,8 @@ class Job {
     // A note that the commands of coreutils have as well, in their words.
     void AddWarning(const std::string& warning);
 
+    // Whether ShowProgress() may have something to say now.
+    bool wants_progress() const { return progress_.wanted(); }
     void ShowProgress(const std::string& path);
 
     bool stopped() const;  // nothing more is to be begun

@@ -59,4 +59,9 @@ void Json::Add(Json value) { value_->push_back(std::move(*value.value_)); }
 std::string Json::Text() const { return Dump(*value_, 2); }
 std::string Json::Line() const { return Dump(*value_, -1); }
 
+std::string Json::Members() const {
+    const std::string line = Line();
+    return line.substr(1, line.size() - 2);
+}
+
 }  // namespace mavoea::tool

@@ -57,6 +57,8 @@ class Json {
     std::string Text() const;
     // The same in one line.
     std::string Line() const;
+    // An object's line without the braces, for one that is written piece by piece.
+    std::string Members() const;
 
  private:
     Json(std::in_place_t, std::uint64_t number);

@@ -3,8 +3,12 @@
 #include <sys/ioctl.h>
 #include <unistd.h>
 
+#include <array>
+#include <cstdio>
 #include <iostream>
 
+#include "tools/say/interrupt.h"
+#include "tools/say/output.h"
 #include "tools/say/text.h"
 
 namespace mavoea::tool {
@@ -26,19 +30,49 @@ std::string Cut(std::string line) {
 
 void Write(const std::string& text) { std::cerr << text << std::flush; }
 
+std::optional<std::chrono::seconds>& Interval() {
+    static std::optional<std::chrono::seconds> interval;
+    return interval;
+}
+
+// "12.5/s".
+std::string Rate(std::uint64_t done, std::chrono::duration<double> time) {
+    std::array<char, 64> text;
+    const double rate = time.count() > 0 ? static_cast<double>(done) / time.count() : 0;
+    (void)std::snprintf(text.data(), text.size(), "%.1f/s", rate);
+    return text.data();
+}
+
 }  // namespace
 
-Progress::Progress(const char* doing) : doing_(doing), on_(::isatty(STDERR_FILENO) == 1) {}
+void ReportProgressEach(std::chrono::seconds interval) { Interval() = interval; }
 
-void Progress::Show(const std::string& status, const std::string& path) {
-    using std::chrono::steady_clock;
+Progress::Progress(const char* doing, Lines lines)
+    : doing_(doing), on_(lines == Lines::kOnTerminal && ::isatty(STDERR_FILENO) == 1) {}
+
+bool Progress::wanted() const { return on_ || Interval() || ProgressRequested(); }
+
+void Progress::Show(const std::string& status, const std::string& path,
+                    std::optional<std::uint64_t> done) {
     constexpr std::chrono::milliseconds kInterval(100);
-    if (!on_) return;
-    const auto now = steady_clock::now();
-    if (shown_ && now - last_ < kInterval) return;
+    if (!wanted()) return;
+    const auto now = Clock::now();
+    const bool due = !on_ && Interval() && now - told_ >= *Interval();
+    if (TakeProgressRequest() || due) {
+        told_ = now;
+        Tell(status, path, done);
+    }
+    if (!on_ || (shown_ && now - last_ < kInterval)) return;
     last_ = now;
     shown_ = true;
     Write('\r' + Cut(std::string(doing_) + ": " + status + ", " + Printable(path)) + kEraseRest);
+}
+
+void Progress::Tell(const std::string& status, const std::string& path,
+                    std::optional<std::uint64_t> done) {
+    Clear();
+    const std::string rate = done ? ", " + Rate(*done, told_ - begin_) : std::string();
+    Report(std::string(doing_) + ": " + status + rate + ", " + Printable(path));
 }
 
 void Progress::Clear() {

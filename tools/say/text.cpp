@@ -63,6 +63,25 @@ std::optional<Bytes> ParseHex(std::string_view text) {
     return bytes;
 }
 
+std::string Base64(ByteView bytes) {
+    constexpr std::string_view kLetters =
+        "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
+    constexpr std::size_t kGroup = 3;
+    std::string text;
+    text.reserve((bytes.size() + kGroup - 1) / kGroup * 4);
+    for (std::size_t at = 0; at < bytes.size(); at += kGroup) {
+        const ByteView group = bytes.subspan(at, std::min(kGroup, bytes.size() - at));
+        std::uint32_t bits = 0;
+        for (std::size_t i = 0; i < kGroup; ++i) {
+            bits = bits << 8 | (i < group.size() ? group[i] : 0U);
+        }
+        for (std::size_t i = 0; i <= kGroup; ++i) {
+            text += i <= group.size() ? kLetters[bits >> (18 - 6 * i) & 0x3F] : '=';
+        }
+    }
+    return text;
+}
+
 std::string HexDump(ByteView bytes) {
     constexpr std::size_t kPerLine = 16;
     std::string text;

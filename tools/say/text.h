@@ -24,6 +24,10 @@ std::string HexDigits(ByteView bytes);
 // between pairs are ignored. None when it is anything else.
 std::optional<Bytes> ParseHex(std::string_view text);
 
+// Four characters for each three bytes, the last ones filled up by '='. What is encoded in pieces
+// of a multiple of three bytes is the same as in one.
+std::string Base64(ByteView bytes);
+
 // 16 bytes a line: offset, digits, text.
 std::string HexDump(ByteView bytes);
 

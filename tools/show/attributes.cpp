@@ -7,9 +7,11 @@
 #include <iomanip>
 #include <iostream>
 #include <optional>
+#include <utility>
 
 #include "tools/place/volume.h"
 #include "tools/say/output.h"
+#include "tools/say/progress.h"
 #include "tools/say/text.h"
 #include "tools/store/gathering.h"
 #include "tools/store/reader.h"
@@ -25,24 +27,26 @@ struct Line {
     const char* kind;
     std::string file;           // that holds it
     std::string spelling = {};  // the attribute of that file, where it is not its name there
+    const Content* value = nullptr;
 };
 
 std::vector<Line> LinesOf(const Object& object, const Metadata& metadata) {
     std::vector<Line> lines;
     for (const Metadata::Attribute& attribute : metadata.attributes) {
         lines.push_back({attribute.name, attribute.value.size(), "attribute", attribute.holder,
-                         attribute.spelling});
+                         attribute.spelling, &attribute.value});
     }
     if (const auto& info = metadata.finder_info) {
         lines.push_back({std::string(kFinderInfoName), info->value.size(), "Finder info",
-                         info->holder, info->spelling});
+                         info->holder, info->spelling, &info->value});
     }
     if (const auto& fork = metadata.fork) {
         lines.push_back({std::string(kResourceForkName), fork->value.size(), "resource fork",
-                         fork->holder, fork->spelling});
+                         fork->holder, fork->spelling, &fork->value});
     }
     if (metadata.locked) {
-        lines.push_back({std::string(kLockedName), 1, "locked state", object.path()});
+        static const Content kValue(Bytes{'1'});
+        lines.push_back({std::string(kLockedName), 1, "locked state", object.path(), {}, &kValue});
     }
     return lines;
 }
@@ -76,24 +80,31 @@ class Listing {
     explicit Listing(const ListOptions& options) : options_(options) {}
 
     ExitStatus Run() {
-        const ExitStatus status =
-            LookAtObjects(options_.paths, options_.recursive,
-                          [this](const Object& object, const std::string& shown,
-                                 const Metadata& metadata) { Show(object, shown, metadata); });
-        if (options_.json) Print(json_);
-        return status;
+        if (options_.values && !options_.tree.json) Misuse("--values takes --json");
+        if (options_.null && options_.tree.json) Misuse("--json and --null exclude each other");
+        return LookAtObjects("listing", options_.tree,
+                             [this](const Object& object, const std::string& shown,
+                                    const Metadata& metadata) { Show(object, shown, metadata); });
     }
 
  private:
+    [[noreturn]] static void Misuse(const char* what) {
+        throw Failure(kFailed, "list", what, "mavoea list --help has the usage");
+    }
+
     void Show(const Object& object, const std::string& shown, const Metadata& metadata) {
         const std::vector<Line> lines = LinesOf(object, metadata);
-        if (options_.json) return AddJson(object, metadata, lines);
-        if (!lines.empty() || !options_.recursive) AddText(shown, lines);
+        if (options_.tree.json) return PrintJson(object, metadata, lines);
+        if (options_.null) {
+            PrintNull(object, lines);
+        } else if (!lines.empty() || !options_.tree.recursive) {
+            AddText(shown, lines);
+        }
         TellStrays(object, metadata);
     }
 
     void AddText(const std::string& path, const std::vector<Line>& lines) {
-        if (options_.recursive || options_.paths.size() > 1) {
+        if (options_.tree.recursive || options_.tree.paths.several()) {
             std::cout << (first_ ? "" : "\n") << Printable(path) << ":\n";
         }
         first_ = false;
@@ -111,8 +122,18 @@ class Listing {
         }
     }
 
-    void AddJson(const Object& object, const Metadata& metadata, const std::vector<Line>& lines) {
-        Json attributes = Json::Array();
+    static void PrintNull(const Object& object, const std::vector<Line>& lines) {
+        for (const Line& line : lines) std::cout << object.path() << '\0' << line.name << '\0';
+    }
+
+    // Piece by piece: a value need not fit into memory.
+    void PrintJson(const Object& object, const Metadata& metadata, const std::vector<Line>& lines) {
+        Json head;
+        head.SetText("path", object.path());
+        head.Set("type", TypeJson(object.type));
+        std::cout << '{' << head.Members() << ",\"attributes\":[";
+        const char* separator = "";
+        std::optional<Failure> unread;
         for (const Line& line : lines) {
             Json entry;
             entry.SetText("name", line.name);
@@ -120,18 +141,40 @@ class Listing {
             entry.Set("kind", line.kind);
             entry.SetText("file", line.file);
             if (!line.spelling.empty()) entry.SetText("attribute", line.spelling);
-            attributes.Add(std::move(entry));
+            std::cout << std::exchange(separator, ",") << '{' << entry.Members();
+            if (const auto problem = options_.values ? PrintValue(*line.value) : std::nullopt) {
+                // Of what was found damaged that is told with the object's other problems.
+                if (!line.value->damaged() || metadata.problems.empty()) unread = problem;
+            }
+            std::cout << '}';
         }
-        Json entry;
-        entry.SetText("path", object.path());
-        entry.Set("type", TypeJson(object.type));
-        entry.Set("attributes", std::move(attributes));
-        SetStrays(object, metadata, &entry);
-        json_.Add(std::move(entry));
+        std::cout << ']';
+        Json tail;
+        SetStrays(object, metadata, &tail);
+        if (const std::string members = tail.Members(); !members.empty()) {
+            std::cout << ',' << members;
+        }
+        std::cout << "}\n";
+        if (unread) throw Failure(*unread);
+    }
+
+    // What cannot be read to its end has a "problem", and the line stays whole.
+    static std::optional<Failure> PrintValue(const Content& value) {
+        constexpr std::uint64_t kPiece = std::uint64_t{3} << 18;
+        std::cout << ",\"base64\":\"";
+        try {
+            for (std::uint64_t at = 0; at < value.size(); at += kPiece) {
+                std::cout << Base64(value.Read(at, kPiece));
+            }
+            std::cout << '"';
+            return std::nullopt;
+        } catch (const Failure& failure) {
+            std::cout << "\",\"problem\":" << Json(failure.what()).Line();
+            return failure;
+        }
     }
 
     const ListOptions& options_;
-    Json json_ = Json::Array();
     bool first_ = true;
 };
 
@@ -178,23 +221,36 @@ bool MayHaveStrays(const Object& object) { return object.dialect() != nullptr ||
 
 }  // namespace
 
-ExitStatus LookAtObjects(const std::vector<std::string>& paths, bool recursive, const Look& look) {
+ExitStatus LookAtObjects(const char* doing, const TreeOptions& options, const Look& look) {
+    Progress progress(doing, Progress::Lines::kOnRequest);
+    std::uint64_t done = 0;
+    std::uint64_t failures = 0;
     ExitStatus status = kSuccess;
     const auto add = [&](const Failure& failure) {
+        ++failures;
         Report(failure.what());
         status = std::max(status, failure.status());
     };
     const auto work = [&](const Object& object, const std::string& shown) {
+        if (progress.wanted()) {
+            progress.Show(std::to_string(done) + " done, " + std::to_string(failures) + " failed",
+                          object.path(), done);
+        }
         try {
             const Metadata metadata = ReadAll(object);
-            look(object, shown, metadata);
+            try {
+                look(object, shown, metadata);
+            } catch (const Failure& failure) {
+                add(failure);
+            }
+            ++done;
             for (const Failure& problem : metadata.problems) add(problem);
         } catch (const Failure& failure) {
-            if (!recursive || !HasGone(object.place, failure)) add(failure);
+            if (!options.recursive || !HasGone(object.place, failure)) add(failure);
         }
         return true;
     };
-    VisitObjects(paths, recursive,
+    VisitObjects(options,
                  {.work = work,
                   .on_failure = [&](const std::string&, const Failure& failure) { add(failure); }});
     return status;

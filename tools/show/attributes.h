@@ -4,33 +4,33 @@
 
 #include <functional>
 #include <string>
-#include <vector>
 
 #include "tools/place/volume.h"
 #include "tools/say/json.h"
 #include "tools/say/messages.h"
 #include "tools/store/metadata.h"
+#include "tools/walk/tree.h"
 
 namespace mavoea::tool {
 
-// Hands out what each object has. What cannot be looked at is told, and is a failure; `look` may
-// throw one, too. Returns the gravest status.
+// Hands out what each object has; "listing", for those who ask how far it is. What cannot be looked
+// at is told, and is a failure; `look` may throw one, too. Returns the gravest status.
 using Look = std::function<void(const Object&, const std::string& shown, const Metadata&)>;
-ExitStatus LookAtObjects(const std::vector<std::string>& paths, bool recursive, const Look& look);
+ExitStatus LookAtObjects(const char* doing, const TreeOptions& options, const Look& look);
 
 // What an object has twice, where other programs may have kept it, told and as "strays".
 void TellStrays(const Object& object, const Metadata& metadata);
 void SetStrays(const Object& object, const Metadata& metadata, Json* entry);
 
 struct ListOptions {
-    std::vector<std::string> paths;
+    TreeOptions tree;
     bool details = false;
-    bool recursive = false;
-    bool json = false;
+    bool null = false;    // the path and the name of each attribute, a NUL behind either
+    bool values = false;  // in JSON, as base64
 };
 
-// In recursive work, objects that have nothing are left out. What cannot be looked at is told, and
-// is a failure.
+// JSON is a line for each object. In recursive work, text leaves out objects that have nothing.
+// What cannot be looked at is told, and is a failure.
 ExitStatus List(const ListOptions& options);
 
 // `kPlain`: as it is, but nothing that a terminal would take for more than text goes to one.

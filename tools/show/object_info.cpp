@@ -364,24 +364,24 @@ void PrintLines(const std::vector<Description::InfoLine>& lines) {
 
 }  // namespace
 
-ExitStatus Show(const ShowOptions& options) {
-    Json json = Json::Array();
+ExitStatus Show(const TreeOptions& options) {
     bool first = true;
     const auto look = [&](const Object& object, const std::string& shown,
                           const Metadata& metadata) {
         const Description description(object, metadata);
-        if (options.json) return json.Add(description.json());
+        if (options.json) {
+            std::cout << description.json().Line() << '\n';
+            return;
+        }
         if (description.lines().empty() && options.recursive) return;
-        if (options.recursive || options.paths.size() > 1) {
+        if (options.recursive || options.paths.several()) {
             std::cout << (first ? "" : "\n") << Printable(shown) << ":\n";
         }
         first = false;
         PrintLines(description.lines());
         TellStrays(object, metadata);
     };
-    const ExitStatus status = LookAtObjects(options.paths, options.recursive, look);
-    if (options.json) Print(json);
-    return status;
+    return LookAtObjects("showing", options, look);
 }
 
 }  // namespace mavoea::tool

@@ -2,22 +2,14 @@
 #ifndef MAVOEA_TOOLS_SHOW_OBJECT_INFO_H_
 #define MAVOEA_TOOLS_SHOW_OBJECT_INFO_H_
 
-#include <string>
-#include <vector>
-
 #include "tools/say/messages.h"
+#include "tools/walk/tree.h"
 
 namespace mavoea::tool {
 
-struct ShowOptions {
-    std::vector<std::string> paths;
-    bool recursive = false;
-    bool json = false;
-};
-
-// In recursive work, objects that have nothing are left out. What cannot be decoded is shown by its
-// size, with the reason; that is no failure.
-ExitStatus Show(const ShowOptions& options);
+// JSON is a line for each object. In recursive work, text leaves out objects that have nothing.
+// What cannot be decoded is shown by its size, with the reason; that is no failure.
+ExitStatus Show(const TreeOptions& options);
 
 }  // namespace mavoea::tool
 

@@ -6,15 +6,29 @@
 #include <string>
 #include <vector>
 
+#include "tools/place/paths.h"
 #include "tools/place/volume.h"
 #include "tools/say/messages.h"
+#include "tools/walk/shard.h"
 #include "tools/walk/tree_report.h"
 
 namespace mavoea::tool {
 
+// Which objects, and how what became of them is told.
+struct TreeOptions {
+    NamedPaths paths;
+    bool recursive = false;
+    bool json = false;
+    Shard shard = {};  // only its objects
+};
+
 // Calls `work` for each object that was named and, in recursive work, for all below it, and goes on
 // after what it throws. Directories are objects as well, and come before what is in them. Below a
 // directory, symbolic links are left out, hidden directories, and metadata of objects.
+//
+// Of several shards each walks through all directories and does its own objects only. What goes
+// wrong with a directory is told by the shard that it belongs to; others, whose objects may be in
+// there, fail with one line for all of those.
 struct Visit {
     // `shown` is the path as it was given, or the object's own. False: nothing below it is to be
     // looked at.
@@ -25,8 +39,12 @@ struct Visit {
     // change things bring to its end what others began there.
     std::function<void(const Object&)> on_named = [](const Object&) {};
     std::function<void(const DirectoryRef&)> on_directory = [](const DirectoryRef&) {};
+
+    // Called for directories of other shards in place of `work`. Throws Failure for one below which
+    // nothing is to be looked at.
+    std::function<void(const Object&)> on_other = [](const Object&) {};
 };
-void VisitObjects(const std::vector<std::string>& paths, bool recursive, const Visit& visit);
+void VisitObjects(const TreeOptions& options, const Visit& visit);
 
 // Whether it failed because the object has gone since its directory was listed, with which nothing
 // is wrong.
@@ -48,12 +66,6 @@ struct Task {
     // As of a visit.
     std::function<void(const Object&)> on_named = [](const Object&) {};
     std::function<void(const DirectoryRef&)> on_directory = [](const DirectoryRef&) {};
-};
-
-struct TreeOptions {
-    std::vector<std::string> paths;
-    bool recursive = false;
-    bool json = false;
 };
 
 // Does the task to one object after the other, and goes on after a failure.

@@ -5,7 +5,9 @@
 
 namespace mavoea::tool {
 
-void TreeReport::Show(const std::string& path) { progress_.Show(StatusText(), path); }
+void TreeReport::Show(const std::string& path) {
+    if (progress_.wanted()) progress_.Show(StatusText(), path, Total() + failures_.size());
+}
 
 void TreeReport::AddFailure(const std::string& path, const Failure& failure) {
     failures_.push_back({path, failure.what()});
@@ -23,7 +25,7 @@ ExitStatus TreeReport::Finish(bool json) {
 }
 
 std::string TreeReport::StatusText() const {
-    const std::string done = std::to_string(counts_[0] + counts_[1] + counts_[2]) + " done";
+    const std::string done = std::to_string(Total()) + " done";
     return failures_.empty() ? done : done + ", " + std::to_string(failures_.size()) + " failed";
 }
 

@@ -43,6 +43,7 @@ class TreeReport {
     ExitStatus Finish(bool json);
 
  private:
+    std::uint64_t Total() const { return counts_[0] + counts_[1] + counts_[2]; }
     std::string StatusText() const;
     std::array<const char*, 3> WordsByOutcome() const;
     void PrintText() const;
