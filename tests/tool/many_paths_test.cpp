@@ -8,6 +8,7 @@
 
 #include <algorithm>
 #include <filesystem>
+#include <memory>
 #include <set>
 
 #include "tests/support/process.h"
@@ -24,7 +25,6 @@ using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::Not;
 using ::testing::StartsWith;
-using ::testing::UnorderedElementsAreArray;
 
 constexpr int kAppleDouble = 0;
 
@@ -514,6 +514,41 @@ TEST_F(ShardTest, AllCommandsForTreesTakeShards) {
         }
         EXPECT_EQ(102, sum);  // with the directory and a file of its own
     }
+}
+
+// All of them make EA directories in the same directories.
+TEST_F(ShardTest, ShardsThatRunAtATimeDoEachObjectOnce) {
+    MAVOEA_SKIP_UNLESS_ROOT();
+    MAVOEA_SKIP_WITHOUT_ATTRIBUTES(share_.path());
+    const Volume other(1);
+    constexpr int kDirectories = 20;
+    constexpr int kObjects = 10;
+    for (int i = 0; i < kDirectories; ++i) {
+        const std::string directory = other.path() + '/' + std::to_string(i);
+        std::filesystem::create_directory(directory);
+        for (int j = 0; j < kObjects; ++j) WriteFile(directory + '/' + std::to_string(j), {});
+    }
+    constexpr int kCount = 4;
+    std::vector<std::unique_ptr<RunningTool>> tools;
+    for (int i = 1; i <= kCount; ++i) {
+        tools.push_back(std::make_unique<RunningTool>(
+            Arguments{"--volume", other.path() + "=1", "lock", "-r", "--json", "--shard",
+                      std::to_string(i) + '/' + std::to_string(kCount), other.path()},
+            RunningTool::Output::kSaid));
+    }
+    std::multiset<std::string> locked;
+    for (const auto& tool : tools) {
+        EXPECT_EQ(0, tool->Wait());
+        for (const auto& entry : nlohmann::json::parse(tool->said())) locked.insert(entry["path"]);
+    }
+    EXPECT_EQ(2U + kDirectories * (1 + kObjects), locked.size());
+    std::multiset<std::string> listed;
+    const auto words = Split(other.Run({"list", "-r0", other.path()}).out, '\0');
+    for (std::size_t i = 0; i + 1 < words.size(); i += 2) {
+        EXPECT_EQ("mavoea.locked", words[i + 1]);
+        listed.insert(words[i]);
+    }
+    EXPECT_EQ(listed, locked);
 }
 
 // The values are those of docs/sharding.md.

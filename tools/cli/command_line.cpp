@@ -21,6 +21,7 @@ constexpr const char* kExamples = R"(Examples:
   mavoea set-info letter.txt --type TEXT --flags invisible,-stationery --tags Letters:red,Home
   mavoea get letter.txt com.apple.FinderInfo --hex
   mavoea list -l letter.txt
+  mavoea list -r --json --values /srv/share
   mavoea show letter.txt
   mavoea remove letter.txt com.example.colour
   mavoea lock letter.txt
@@ -34,7 +35,8 @@ constexpr const char* kExamples = R"(Examples:
   mavoea mv letter.txt /mnt/share
   mavoea rm -r /srv/share/letters
   mavoea carry -r /srv/share/letters /mnt/restored/letters
-  mavoea upgrade -r /srv/share
+  mavoea upgrade -r --shard 3/16 /srv/share
+  find /srv/share -name '*.psd' -print0 | mavoea lock --files0-from -
   mavoea repair -r /srv/share
   mavoea clean -r /srv/share
   mavoea check -r /srv/share

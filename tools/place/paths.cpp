@@ -51,7 +51,7 @@ std::optional<std::string> PathReader::NextInList() {
         bool fits = true;
         bool has_end = false;
         while (!has_end && (at_ < buffer_.size() || Fill())) {
-            const std::string_view rest = std::string_view(buffer_).substr(at_);
+            const std::string_view rest = {buffer_.data() + at_, buffer_.size() - at_};
             const std::string_view part = rest.substr(0, rest.find('\0'));
             has_end = part.size() < rest.size();
             fits = fits && part.size() <= kLongest - name.size();
