@@ -204,13 +204,19 @@ TEST_F(ManyPathsTest, AListComesInPlaceOfPaths) {
     EXPECT_EQ(Ascii("data"), ReadFile(object));
 }
 
-TEST_F(ManyPathsTest, ThePromptOfATerminalIsNotAnsweredByTheList) {
+TEST_F(ManyPathsTest, APromptIsNotAnsweredByTheList) {
     MAVOEA_SKIP_WITHOUT_OTHER_USERS();
     ASSERT_EQ(0, chmod(share_.path().c_str(), 0777));
     ASSERT_EQ(0, chmod(share_.object().c_str(), 0444));
-    const ToolResult result = share_.Run({"rm", "---presume-input-tty", "--files0-from=-"},
-                                         share_.object() + '\0' + "y\n" + '\0', {.user = 1234});
-    EXPECT_THAT(result.err, HasSubstr("remove write-protected regular file"));
+    AsUser(1234, Root::kGivenUp, [&] {
+        RunningTool tool(With({"rm", "---presume-input-tty", "--files0-from=-"}));
+        tool.Answer(share_.object() + '\0');
+        ASSERT_TRUE(tool.WaitFor("remove write-protected regular file"));
+        tool.Answer("y\n");
+        tool.EndInput();
+        EXPECT_EQ(1, tool.Wait());
+        EXPECT_THAT(tool.said(), HasSubstr("cannot remove 'y\\x0A': No such file or directory"));
+    });
     EXPECT_TRUE(Exists(share_.object()));
 }
 
@@ -228,15 +234,25 @@ TEST_F(ManyPathsTest, PathsAreTakenAsTheyCome) {
     EXPECT_EQ(0, tool.Wait());
 }
 
+// Of the last path, the end has not come.
 TEST_F(ManyPathsTest, CtrlCEndsWaitingForMorePaths) {
     const std::string one = Make("one");
     const std::string two = Make("two");
     RunningTool tool(With({"rm", "-v", "--files0-from=-"}), RunningTool::Output::kSaid);
-    tool.Answer(one + '\0' + two);  // of which the end has not come
+    tool.Answer(one + '\0' + two);
     ASSERT_TRUE(tool.WaitFor("removed '" + one + "'\n"));
     tool.Signal(SIGINT);
     EXPECT_EQ(130, tool.Wait());
     EXPECT_TRUE(Exists(two));
+
+    (void)MakeWithAttribute("a/gone");
+    ASSERT_EQ(0, unlink(At("a/gone").c_str()));
+    RunningTool clean(With({"clean", "--files0-from=-"}), RunningTool::Output::kSaid);
+    clean.Answer(At("a") + '\0' + At("half a na"));
+    ASSERT_TRUE(clean.WaitFor("its object is gone")) << clean.said();
+    clean.Signal(SIGINT);
+    EXPECT_EQ(130, clean.Wait());
+    EXPECT_THAT(clean.said(), Not(HasSubstr("half")));
 }
 
 TEST_F(ManyPathsTest, AListMayBeLargerThanMemory) {

@@ -17,7 +17,7 @@ namespace mavoea::tool {
 
 struct JobOptions {
     std::vector<std::string> paths;
-    std::optional<std::string> list = {};  // that has the paths, or the sources, besides
+    std::optional<std::string> list = {};  // names them in place of `paths`, but for a destination
     bool recursive = false;
     bool verbose = false;
     bool json = false;
