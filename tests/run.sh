@@ -36,6 +36,9 @@ sh tests/coreutils/run.sh -v || [ $? -eq 77 ] # nothing can be mounted here
 tool_tests=-DMAVOEA_TOOL_TESTS="$root/build/release/bin"
 build_and_test sanitize "$tool_tests"
 
+step "Debian's packages"
+sh tests/packages/run.sh || [ $? -eq 77 ] # nothing can be mounted here
+
 step "libraries: powerpc"
 sh tests/powerpc/libraries.sh
 build_and_test powerpc "$tool_tests"
