@@ -85,6 +85,13 @@ install() {
     quietly inside apt-get install -q -y --no-install-recommends "$@"
 }
 
+# deb PACKAGE...: their files, as they are called inside.
+deb() {
+    for package in "$@"; do
+        (cd "$root" && echo ./packages/"${package}"_*.deb)
+    done
+}
+
 # installed PACKAGE
 installed() {
     [ "$(inside dpkg-query -W -f '${db:Status-Status}' "$1" 2> /dev/null || true)" = installed ]
@@ -113,7 +120,7 @@ cp -r tests/abi/installed "$root/tmp/source/tests/abi"
 
 say "the tool alone"
 files > "$work/before"
-install ./packages/mavoea_*.deb
+install "$(deb mavoea)"
 ! installed libmavoea5 || fail "the tool takes the library along"
 passes tool
 quietly inside apt-get purge -q -y mavoea
@@ -122,9 +129,10 @@ diff "$work/before" "$work/after" || fail "the tool has left something"
 
 say "programs"
 # What they are compiled with comes first, so that what is left of it does not count.
-install cmake gcc libc6-dev pkgconf libacl1-dev
+install cmake gcc libacl1-dev libc6-dev make pkgconf
 files > "$work/before"
-install ./packages/libmavoea*.deb
+# shellcheck disable=SC2046: a list of words
+install $(deb libmavoea5 libmavoea-host1 libmavoea-dev)
 passes program
 
 say "the platform's own libraries"
