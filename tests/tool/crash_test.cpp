@@ -201,14 +201,17 @@ TEST_P(NewFilesTest, NoOtherProgramIsRun) {
 // What the tool asks of the library is nothing that takes several files.
 // Promise: "The tool: `cp`, `mv`, `convert`, `upgrade` and `repair` of the tool"
 TEST(OperationsTest, OfTheLibraryAreNotCalledByTheTool) {
+    // The tool has the library within itself: what its own units ask for is in those.
+    const std::string units =
+        fs::path(Tested().path).parent_path() / "../tools/CMakeFiles/mavoea_tool.dir";
     const ProgramResult symbols =
-        RunProgram("readelf --dyn-syms -W " + Quoted(Tested().path) + " 2>/dev/null");
-    if (symbols.status != 0) GTEST_SKIP() << "there is no readelf";
-    ASSERT_THAT(symbols.output, ::testing::HasSubstr(" MAVOEASWrite@"));
+        RunProgram("find " + Quoted(units) + " -name '*.o' -exec readelf -sW {} + 2>/dev/null");
+    if (symbols.status != 0) GTEST_SKIP() << "there is no readelf, or there are no such units";
+    ASSERT_THAT(symbols.output, ::testing::HasSubstr(" UND MAVOEASWrite\n"));
     for (const std::string operation :
          {"MAVOEACopy", "MAVOEACopyEx", "MAVOEAUpgrade", "MAVOEARename", "MAVOEARemove",
           "MAVOEARemoveWithoutEAStream", "MAVOEARemoveDanglingEADir", "MAVOEAFixErrorAD"}) {
-        EXPECT_THAT(symbols.output, Not(::testing::HasSubstr(' ' + operation + '@')));
+        EXPECT_THAT(symbols.output, Not(::testing::HasSubstr(" UND " + operation + '\n')));
     }
 }
 

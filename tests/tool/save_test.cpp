@@ -174,7 +174,7 @@ TEST_P(SaveBetweenTest, ATreeThatIsRestoredOntoItsDataSaysTheSame) {
     EXPECT_THAT(Restore(copy, saved), Succeeded());
     EXPECT_EQ(SortedLines(saved), SortedLines(Saved(copy)));
     // The eyes of another command.
-    EXPECT_THAT(Run({"convert", "-r", "--compare-only", "--to", to, source, copy}).status, 0);
+    EXPECT_THAT(Run({"diff", "-r", "--data", source, copy}).status, 0);
     EXPECT_EQ(Ascii("blue \"\\\n"), Run({"get", copy + "/a", "user.colour"}).bytes());
     EXPECT_EQ(Hex("00 FF 00 41"), Run({"get", copy + "/a", "user.odd=n\\ame"}).bytes());
     EXPECT_EQ(Hex("41 00 00"), Run({"get", copy + "/a", "user.zeros"}).bytes());
@@ -295,8 +295,8 @@ TEST_F(SaveTest, SetfattrRestoresWhatWasSaved) {
         ASSERT_EQ(0, unlink((plain + "/a").c_str()));
         WriteFile(plain + "/a", Ascii("data"));
         ASSERT_EQ(0, RunProgram("cd " + Quoted(plain) + " && setfattr --restore=../text").status);
-        EXPECT_THAT(Run({"convert", "-r", "--compare-only", "--to", "linux", volume, plain}).status,
-                    0)
+        EXPECT_THAT(
+            Run({"--volume", plain + "=linux", "diff", "-r", "--data", volume, plain}).status, 0)
             << encoding;
         EXPECT_EQ(Hex("41 00 00"), FileAttribute(plain + "/a", "user.zeros")) << encoding;
     }
@@ -327,8 +327,7 @@ TEST_P(DumpOfTest, WhatGetfattrWroteIsRestoredInEveryEncoding) {
         const std::string copy = AddWithFile("eadir", "copy" + std::to_string(number++));
         const ToolResult result = Restore(copy, Getfattr(source, options), {"--from", GetParam()});
         EXPECT_EQ(0, result.status) << result.err;
-        EXPECT_EQ(0,
-                  Run({"convert", "-r", "--compare-only", "--to", "eadir", source, copy}).status);
+        EXPECT_EQ(0, Run({"diff", "-r", "--data", source, copy}).status);
         EXPECT_EQ("blue", Get(copy + "/a", "colour"));
         EXPECT_EQ(Hex("00 FF 00 41"), Run({"get", copy + "/a", "bytes"}).bytes());
         EXPECT_EQ("1", Get(copy + "/a", "mavoea.locked"));

@@ -79,7 +79,7 @@ class InfoShare {
         if (result.status != 0) return std::nullopt;
         return result.bytes();
     }
-    json Described() const { return Run({"--json", "show", file()}).json().at(0); }
+    json Described() const { return Run({"--json", "show", file()}).json(); }
 
  private:
     TempDir dir_;

@@ -87,7 +87,7 @@ class ShowCommandTest : public ::testing::TestWithParam<int> {
     json Described() const {
         const ToolResult result = volume_->Run({"--json", "show", volume_->object()});
         EXPECT_THAT(result, Succeeded());
-        return result.json().at(0);
+        return result.json();
     }
     void Set(const std::string& name, const Bytes& value) const {
         ASSERT_THAT(volume_->Set(name, value), Succeeded()) << name;
@@ -176,7 +176,7 @@ TEST_P(ShowCommandTest, AFolderHasAWindowAndNoType) {
         "location        100 across, -1 down\n"
         "extended flags  0x0080\n",
         WithoutMarks(Show(folder).out));
-    const json shown = volume_->Run({"--json", "show", folder}).json().at(0);
+    const json shown = volume_->Run({"--json", "show", folder}).json();
     EXPECT_EQ("directory", shown.at("kind"));
     EXPECT_EQ(R"({"from":{"across":-60,"down":40},"to":{"across":600,"down":400}})",
               shown.at("finderInfo").at("window").dump());

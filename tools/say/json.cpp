@@ -60,6 +60,7 @@ std::string Json::Text() const { return Dump(*value_, 2); }
 std::string Json::Line() const { return Dump(*value_, -1); }
 
 std::string Json::Members() const {
+    if (value_->is_null()) return {};
     const std::string line = Line();
     return line.substr(1, line.size() - 2);
 }

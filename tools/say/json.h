@@ -57,7 +57,8 @@ class Json {
     std::string Text() const;
     // The same in one line.
     std::string Line() const;
-    // An object's line without the braces, for one that is written piece by piece.
+    // An object's line without the braces, for one that is written piece by piece; of a null
+    // nothing.
     std::string Members() const;
 
  private:
