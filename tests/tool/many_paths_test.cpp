@@ -660,9 +660,9 @@ TEST_F(ManyPathsTest, ProgressIsALineInTheIntervalWhereThereIsNoTerminal) {
     EXPECT_EQ(0, result.status);
     const auto lines = Split(result.err, '\n');
     ASSERT_EQ(2U, lines.size());
-    EXPECT_THAT(lines[0], AllOf(StartsWith("mavoea: listing: 0 listed, 0 failed, "),
+    EXPECT_THAT(lines[0], AllOf(StartsWith("mavoea: listing: 0 done, 0 failed, "),
                                 EndsWith("/s, " + tree)));
-    EXPECT_THAT(lines[1], AllOf(StartsWith("mavoea: listing: 1 listed, 0 failed, "),
+    EXPECT_THAT(lines[1], AllOf(StartsWith("mavoea: listing: 1 done, 0 failed, "),
                                 EndsWith("/s, " + file)));
     // Nobody waits for half a minute, or an hour.
     EXPECT_THAT(share_.Run({"list", "-r", "--progress", tree}), Succeeded());
@@ -689,7 +689,7 @@ TEST_F(ManyPathsTest, AllRecursiveCommandsHaveProgress) {
         Arguments arguments;
         std::string said;
     } cases[] = {
-        {share_, {"list", "-r", tree}, "listing: 1 listed, 0 failed, "},
+        {share_, {"list", "-r", tree}, "listing: 1 done, 0 failed, "},
         {share_, {"lock", "-r", tree}, "locking: 1 done, 0 failed, "},
         {share_, {"unlock", "-r", tree}, "unlocking: 1 done, 0 failed, "},
         {other, {"upgrade", "-r", other.path()}, "upgrading: 1 done, "},
@@ -722,7 +722,7 @@ TEST_F(ManyPathsTest, AProgressLineComesOnRequest) {
         std::string heard;  // when the first path is done
         std::string said;
     } cases[] = {
-        {{"list"}, "user.k\n", "listing: 1 listed, 0 failed, "},
+        {{"list"}, "user.k\n", "listing: 1 done, 0 failed, "},
         {{"cp", "-v", "-t", target}, "one'\n", "copying: 1 copied"},
         {{"rm", "-v"}, "one'\n", "removing: 2 removed, 0 failed, "},
     };

@@ -156,7 +156,7 @@ TEST_P(SaveBetweenTest, ATreeThatIsRestoredOntoItsDataSaysTheSame) {
         attributes_only ? ""
                         : std::string("# file: c\n") + kFinderInfoLine +
                               "user.mavoea.comment=\"remark\"\n"
-                              "user.mavoea.dates=0x80000000800000000000000380000000\n\n";
+                              "user.mavoea.dates=0x00000002800000000000000380000000\n\n";
     const std::string written =
         "# file: a\n"
         "user.user.colour=\"blue \\\"\\\\\\012\"\n"
