@@ -1,8 +1,8 @@
 #!/bin/sh
 # Includes point one way: ops -> adouble, stream, xattr -> path -> format -> util -> platform.
 # A folder includes itself, what stands below it and the public header; nothing beside it. The same
-# holds for the rooms of the tool: cli -> care, show, move -> transfer -> walk -> store -> place ->
-# say, below which is the library.
+# holds for the rooms of the tool: cli -> care, exchange, show, move -> transfer -> walk -> store ->
+# place -> say, below which is the library.
 set -eu
 cd "$(dirname "$0")/../.."
 status=0
@@ -34,9 +34,9 @@ for room in say place store walk transfer; do
     below="$below tools/$room"
 done
 # shellcheck disable=SC2086: lists of words
-for room in care show move; do check tools/$room $below; done
+for room in care exchange show move; do check tools/$room $below; done
 # shellcheck disable=SC2086: lists of words
-check tools/cli $below tools/care tools/show tools/move
+check tools/cli $below tools/care tools/exchange tools/show tools/move
 [ -z "$(find tools -maxdepth 1 -name '*.cpp' -o -maxdepth 1 -name '*.h')" ] ||
     { echo "tools/ has rooms for its files" >&2; status=1; }
 exit $status

@@ -1,7 +1,7 @@
 // mavoea import -r: the "._" files that Macs have left in a tree, onto the objects that they belong
 // to.
-#ifndef MAVOEA_TOOLS_MOVE_IMPORT_TREE_H_
-#define MAVOEA_TOOLS_MOVE_IMPORT_TREE_H_
+#ifndef MAVOEA_TOOLS_EXCHANGE_IMPORT_TREE_H_
+#define MAVOEA_TOOLS_EXCHANGE_IMPORT_TREE_H_
 
 #include <string>
 #include <vector>
@@ -26,4 +26,4 @@ ExitStatus ImportTree(const ImportTreeOptions& options);
 
 }  // namespace mavoea::tool
 
-#endif  // MAVOEA_TOOLS_MOVE_IMPORT_TREE_H_
+#endif  // MAVOEA_TOOLS_EXCHANGE_IMPORT_TREE_H_

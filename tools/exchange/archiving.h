@@ -1,11 +1,11 @@
 // The same files as they are written.
-#ifndef MAVOEA_TOOLS_MOVE_ARCHIVING_H_
-#define MAVOEA_TOOLS_MOVE_ARCHIVING_H_
+#ifndef MAVOEA_TOOLS_EXCHANGE_ARCHIVING_H_
+#define MAVOEA_TOOLS_EXCHANGE_ARCHIVING_H_
 
 #include <functional>
 #include <vector>
 
-#include "tools/move/archive.h"
+#include "tools/exchange/archive.h"
 
 namespace mavoea::tool {
 
@@ -20,4 +20,4 @@ void WriteArchive(const Archive& archive, const std::function<void(ByteView)>& p
 
 }  // namespace mavoea::tool
 
-#endif  // MAVOEA_TOOLS_MOVE_ARCHIVING_H_
+#endif  // MAVOEA_TOOLS_EXCHANGE_ARCHIVING_H_

@@ -1,6 +1,6 @@
 // mavoea export: what is known of an object, and its data, in one file.
-#ifndef MAVOEA_TOOLS_MOVE_EXPORT_H_
-#define MAVOEA_TOOLS_MOVE_EXPORT_H_
+#ifndef MAVOEA_TOOLS_EXCHANGE_EXPORT_H_
+#define MAVOEA_TOOLS_EXCHANGE_EXPORT_H_
 
 #include <string>
 
@@ -22,4 +22,4 @@ ExitStatus Export(const ExportOptions& options);
 
 }  // namespace mavoea::tool
 
-#endif  // MAVOEA_TOOLS_MOVE_EXPORT_H_
+#endif  // MAVOEA_TOOLS_EXCHANGE_EXPORT_H_

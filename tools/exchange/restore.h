@@ -1,6 +1,6 @@
 // mavoea restore: metadata from a text, as getfattr --dump and mavoea save have it, onto objects.
-#ifndef MAVOEA_TOOLS_MOVE_RESTORE_H_
-#define MAVOEA_TOOLS_MOVE_RESTORE_H_
+#ifndef MAVOEA_TOOLS_EXCHANGE_RESTORE_H_
+#define MAVOEA_TOOLS_EXCHANGE_RESTORE_H_
 
 #include <optional>
 #include <string>
@@ -25,4 +25,4 @@ ExitStatus Restore(const RestoreOptions& options);
 
 }  // namespace mavoea::tool
 
-#endif  // MAVOEA_TOOLS_MOVE_RESTORE_H_
+#endif  // MAVOEA_TOOLS_EXCHANGE_RESTORE_H_

@@ -1,4 +1,4 @@
-#include "tools/move/save.h"
+#include "tools/exchange/save.h"
 
 #include <sys/stat.h>
 #include <unistd.h>

@@ -1,4 +1,4 @@
-#include "tools/move/import_tree.h"
+#include "tools/exchange/import_tree.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -12,7 +12,7 @@
 #include <set>
 
 #include "include/mavoea.h"
-#include "tools/move/taking_over.h"
+#include "tools/exchange/taking_over.h"
 #include "tools/place/directory.h"
 #include "tools/place/volume.h"
 #include "tools/say/text.h"

@@ -1,4 +1,4 @@
-#include "tools/move/salvage.h"
+#include "tools/exchange/salvage.h"
 
 #include <sys/stat.h>
 

@@ -1,4 +1,4 @@
-#include "tools/move/restore.h"
+#include "tools/exchange/restore.h"
 
 #include <fcntl.h>
 #include <poll.h>
@@ -17,7 +17,7 @@
 
 #include "format/attribute_text.h"
 #include "format/ea_stream.h"
-#include "tools/move/taking_over.h"
+#include "tools/exchange/taking_over.h"
 #include "tools/place/volume.h"
 #include "tools/say/interrupt.h"
 #include "tools/say/job.h"

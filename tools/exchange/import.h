@@ -1,6 +1,6 @@
 // mavoea import: what a "._" file or an archive of a Mac holds, onto an object.
-#ifndef MAVOEA_TOOLS_MOVE_IMPORT_H_
-#define MAVOEA_TOOLS_MOVE_IMPORT_H_
+#ifndef MAVOEA_TOOLS_EXCHANGE_IMPORT_H_
+#define MAVOEA_TOOLS_EXCHANGE_IMPORT_H_
 
 #include <string>
 
@@ -23,4 +23,4 @@ ExitStatus Import(const ImportOptions& options);
 
 }  // namespace mavoea::tool
 
-#endif  // MAVOEA_TOOLS_MOVE_IMPORT_H_
+#endif  // MAVOEA_TOOLS_EXCHANGE_IMPORT_H_

@@ -1,7 +1,7 @@
 // Files that hold what a Mac's file has beside its data, or all of it: AppleDouble, AppleSingle,
 // MacBinary and BinHex, as they are read.
-#ifndef MAVOEA_TOOLS_MOVE_ARCHIVE_H_
-#define MAVOEA_TOOLS_MOVE_ARCHIVE_H_
+#ifndef MAVOEA_TOOLS_EXCHANGE_ARCHIVE_H_
+#define MAVOEA_TOOLS_EXCHANGE_ARCHIVE_H_
 
 #include <cstdint>
 #include <memory>
@@ -40,4 +40,4 @@ Archive ReadArchive(const std::shared_ptr<const File>& file, const DirectoryRef&
 
 }  // namespace mavoea::tool
 
-#endif  // MAVOEA_TOOLS_MOVE_ARCHIVE_H_
+#endif  // MAVOEA_TOOLS_EXCHANGE_ARCHIVE_H_

@@ -1,6 +1,6 @@
 // mavoea salvage: what can still be read of an object's metadata, in files of its own.
-#ifndef MAVOEA_TOOLS_MOVE_SALVAGE_H_
-#define MAVOEA_TOOLS_MOVE_SALVAGE_H_
+#ifndef MAVOEA_TOOLS_EXCHANGE_SALVAGE_H_
+#define MAVOEA_TOOLS_EXCHANGE_SALVAGE_H_
 
 #include <string>
 
@@ -23,4 +23,4 @@ ExitStatus Salvage(const SalvageOptions& options);
 
 }  // namespace mavoea::tool
 
-#endif  // MAVOEA_TOOLS_MOVE_SALVAGE_H_
+#endif  // MAVOEA_TOOLS_EXCHANGE_SALVAGE_H_

@@ -1,4 +1,4 @@
-#include "tools/move/export.h"
+#include "tools/exchange/export.h"
 
 #include <unistd.h>
 
@@ -7,7 +7,7 @@
 #include <cerrno>
 #include <iostream>
 
-#include "tools/move/archiving.h"
+#include "tools/exchange/archiving.h"
 #include "tools/say/output.h"
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"

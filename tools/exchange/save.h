@@ -1,6 +1,6 @@
 // mavoea save: metadata of objects as text, as getfattr --dump has it.
-#ifndef MAVOEA_TOOLS_MOVE_SAVE_H_
-#define MAVOEA_TOOLS_MOVE_SAVE_H_
+#ifndef MAVOEA_TOOLS_EXCHANGE_SAVE_H_
+#define MAVOEA_TOOLS_EXCHANGE_SAVE_H_
 
 #include <optional>
 #include <string>
@@ -27,4 +27,4 @@ ExitStatus Save(const SaveOptions& options);
 
 }  // namespace mavoea::tool
 
-#endif  // MAVOEA_TOOLS_MOVE_SAVE_H_
+#endif  // MAVOEA_TOOLS_EXCHANGE_SAVE_H_

@@ -1,6 +1,6 @@
 // Metadata from elsewhere onto an object that is there.
-#ifndef MAVOEA_TOOLS_MOVE_TAKING_OVER_H_
-#define MAVOEA_TOOLS_MOVE_TAKING_OVER_H_
+#ifndef MAVOEA_TOOLS_EXCHANGE_TAKING_OVER_H_
+#define MAVOEA_TOOLS_EXCHANGE_TAKING_OVER_H_
 
 #include <memory>
 #include <string>
@@ -69,4 +69,4 @@ class TakingOver {
 
 }  // namespace mavoea::tool
 
-#endif  // MAVOEA_TOOLS_MOVE_TAKING_OVER_H_
+#endif  // MAVOEA_TOOLS_EXCHANGE_TAKING_OVER_H_

@@ -1,4 +1,4 @@
-#include "tools/move/taking_over.h"
+#include "tools/exchange/taking_over.h"
 
 #include <algorithm>
 

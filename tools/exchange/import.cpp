@@ -1,4 +1,4 @@
-#include "tools/move/import.h"
+#include "tools/exchange/import.h"
 
 #include <fcntl.h>
 
@@ -7,8 +7,8 @@
 #include <iostream>
 #include <memory>
 
-#include "tools/move/archive.h"
-#include "tools/move/taking_over.h"
+#include "tools/exchange/archive.h"
+#include "tools/exchange/taking_over.h"
 #include "tools/say/output.h"
 #include "tools/say/text.h"
 #include "tools/store/foreign/detection.h"

@@ -1,4 +1,4 @@
-#include "tools/move/archive.h"
+#include "tools/exchange/archive.h"
 
 #include <algorithm>
 

@@ -1,4 +1,4 @@
-#include "tools/move/archiving.h"
+#include "tools/exchange/archiving.h"
 
 #include <algorithm>
 #include <array>
