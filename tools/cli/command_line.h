@@ -44,49 +44,50 @@ enum class Command {
 
 struct Options {
     Command command = Command::kWhere;
+    int wait = 2;                      // clean: seconds between its two looks
     std::vector<std::string> volumes;  // PATH=TYPE
-    bool json = false;
 
-    NamedPaths paths;      // one argument, but for commands that take any number
-    Shard shard;           // of the objects that those lead to
-    std::string progress;  // seconds between two lines of it, empty: none
+    NamedPaths paths;         // one argument, but for commands that take any number
+    Shard shard;              // of the objects that those lead to
+    std::string destination;  // convert, carry, salvage; diff: the second
+    std::string directory;    // restore
+    std::string archive;      // import, export, restore
     std::string name;
-    std::string archive;         // import, export, restore
-    std::string format;          // export
-    bool force = false;          // export, save
-    bool replaces_data = false;  // import
-    bool keep = false;           // import -r: the "._" files stay
-    bool keep_existing = false;  // import -r: values that are there stay
-    bool details = false;        // list -l
-    bool null = false;           // list
-    bool values = false;         // list
-    bool recursive = false;
-    bool yes = false;                     // clean: what is listed is removed
-    int wait = 2;                         // clean: seconds between its two looks
-    bool all = false;                     // clean: things of other services, too
+    std::string format;                   // export
     std::string to;                       // convert: the destination's volume type
-    std::string destination;              // convert, carry, salvage; diff: the second
-    bool verbose = false;                 // carry, check, restore
-    bool absolute_names = false;          // save, restore
-    std::string directory;                // restore
+    std::string progress;                 // seconds between two lines of it, empty: none
+    std::optional<std::string> value;     // set: none of the two means standard input
+    std::optional<std::string> file;      // the same
     std::optional<std::string> type;      // restore: of the volume that the text was made of
     std::optional<std::string> encoding;  // save
     std::optional<std::string> output;    // save
-    bool allow_loss = false;              // convert
-    bool data = false;                    // diff
-    bool brief = false;                   // diff
-    bool itemized = false;                // diff
-    bool record = false;                  // dump: the record of an object
-    bool attributes = false;              // dump: what other programs keep of an object
-    bool hex = false;                     // get, set
-    bool raw = false;                     // get: to a terminal, too
-    bool escaped = false;                 // get, set, remove: the name is as list shows it
-    std::optional<std::string> value;     // set: none of the two means standard input
-    std::optional<std::string> file;
 
     InfoOptions info;      // set-info
     CopyOptions copy;      // cp, mv
     RemoveOptions remove;  // rm
+
+    bool json = false;
+    bool recursive = false;
+    bool verbose = false;         // carry, check, restore
+    bool force = false;           // export, save
+    bool replaces_data = false;   // import
+    bool keep = false;            // import -r: the "._" files stay
+    bool keep_existing = false;   // import -r: values that are there stay
+    bool details = false;         // list -l
+    bool null = false;            // list
+    bool values = false;          // list
+    bool yes = false;             // clean: what is listed is removed
+    bool all = false;             // clean: things of other services, too
+    bool absolute_names = false;  // save, restore
+    bool allow_loss = false;      // convert
+    bool data = false;            // diff
+    bool brief = false;           // diff
+    bool itemized = false;        // diff
+    bool record = false;          // dump: the record of an object
+    bool attributes = false;      // dump: what other programs keep of an object
+    bool hex = false;             // get, set
+    bool raw = false;             // get: to a terminal, too
+    bool escaped = false;         // get, set, remove: the name is as list shows it
 };
 
 // What to do, or the exit status when everything has been said: help, version, or what is wrong
