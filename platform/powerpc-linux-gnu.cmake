@@ -12,7 +12,9 @@ list(APPEND CMAKE_TRY_COMPILE_PLATFORM_VARIABLES MAVOEA_POWERPC_LIBRARIES)
 
 set(CMAKE_C_COMPILER powerpc-linux-gnu-gcc)
 set(CMAKE_CXX_COMPILER powerpc-linux-gnu-g++)
-set(CMAKE_CROSSCOMPILING_EMULATOR qemu-ppc -L /usr/powerpc-linux-gnu)
+# Not qemu's -L, with which "/" is another directory for what runs in it.
+set(CMAKE_CROSSCOMPILING_EMULATOR qemu-ppc /usr/powerpc-linux-gnu/lib/ld.so.1
+                                  --library-path /usr/powerpc-linux-gnu/lib)
 
 set(CMAKE_FIND_ROOT_PATH ${MAVOEA_POWERPC_LIBRARIES} /usr/powerpc-linux-gnu)
 set(CMAKE_FIND_ROOT_PATH_MODE_PROGRAM NEVER)

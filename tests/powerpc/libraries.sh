@@ -42,9 +42,11 @@ build() {
     else
         autoreconf --force --install > autoreconf.log 2>&1 || { cat autoreconf.log; exit 1; }
     fi
-    # Named, as libplist takes clang where nobody says what compiles it.
+    # Compilers are named, as libplist takes clang where nobody does. libacl looks at files, and
+    # refuses those with dates after 2038 unless its times are like those of what calls it.
     ./configure --quiet --host=$host CC=$host-gcc CXX=$host-g++ --prefix=/usr --libdir=/usr/lib \
-        --sysconfdir=/etc --disable-static --disable-nls CPPFLAGS="-I$stage/usr/include" \
+        --sysconfdir=/etc --disable-static --disable-nls \
+        CPPFLAGS="-I$stage/usr/include -D_FILE_OFFSET_BITS=64 -D_TIME_BITS=64" \
         LDFLAGS="-L$stage/usr/lib" "$@"
     make -s -j 2 > make.log 2>&1 && make -s install DESTDIR="$stage" >> make.log 2>&1 ||
         { cat make.log; exit 1; }

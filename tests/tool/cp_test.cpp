@@ -122,6 +122,22 @@ TEST_P(CpPairTest, ModeAndTimesAreKept) {
     }
 }
 
+// They need more than 32 bits.
+TEST_P(CpPairTest, TimesOfAnotherCenturyAreKept) {
+    const Travel travel(GetParam().from, GetParam().to);
+    travel.MakeFile(travel.From("a"));
+    travel.GiveMetadata(travel.From("a"));
+    constexpr long long kIn2174 = 6437664000;
+    const timespec times[] = {{kIn2174, 0}, {kIn2174 + 1, 0}};
+    ASSERT_EQ(0, utimensat(AT_FDCWD, travel.From("a").c_str(), times, 0));
+    ASSERT_EQ(kIn2174, StatusOf(travel.From("a")).st_atim.tv_sec);
+    EXPECT_THAT(travel.Run({"cp", "-p", travel.From("a"), travel.To("a")}), Succeeded());
+    const struct stat there = StatusOf(travel.To("a"));
+    EXPECT_EQ(kIn2174, there.st_atim.tv_sec);
+    EXPECT_EQ(kIn2174 + 1, there.st_mtim.tv_sec);
+    travel.ExpectMetadata(travel.To("a"));
+}
+
 TEST_P(CpPairTest, TheLockedStateGoesAlong) {
     const Travel travel(GetParam().from, GetParam().to);
     travel.MakeFile(travel.From("a"));

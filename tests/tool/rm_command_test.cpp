@@ -55,6 +55,13 @@ class RmCommandTest : public ::testing::TestWithParam<Name> {
                   RunTool({"--volume", At("") + "=1", "set", At(path), Colour(), "blue"}).status);
     }
 
+    // In an emulator the loader is told the name: started through a link it would look beside that
+    // for what the tool needs.
+    static std::string StartedAs(const std::string& link) {
+        if (!Tested().emulated()) return InShell(link);
+        return Tested().emulator + " --argv0 " + InShell(link) + ' ' + InShell(Tested().path);
+    }
+
     // The tool in the working directory, or where these commands lead from there.
     ToolResult Rm(const Arguments& arguments, const std::string& input = {},
                   const std::string& commands = "true") const {
@@ -65,7 +72,7 @@ class RmCommandTest : public ::testing::TestWithParam<Name> {
         EXPECT_EQ(0, symlink(Tested().path.c_str(), program.c_str()));
         WriteFile(files / "in", Ascii(input));
         std::string line = "cd " + InShell(At("")) + " && " + commands + " && exec ";
-        line += as_rm ? Tested().emulator + ' ' + InShell(program) : Tested().Command() + " rm";
+        line += as_rm ? StartedAs(program) : Tested().Command() + " rm";
         line += " --volume " + InShell(At("") + "=1");
         for (const std::string& argument : arguments) line += ' ' + InShell(argument);
         line += " <" + InShell(files / "in") + " >" + InShell(files / "out") + " 2>" +
@@ -134,7 +141,6 @@ TEST_P(RmCommandTest, TheDirectoryAndTheOneAboveAreNeverRemoved) {
 
 TEST_P(RmCommandTest, TheRootIsNotRemovedUnderAnyName) {
     MAVOEA_SKIP_WITHOUT_OTHER_USERS();
-    if (Tested().emulated()) GTEST_SKIP() << "an emulator may have a root of its own";
     MakeLink("root", "/");
     const std::string danger = "it is dangerous to operate recursively on ";
     const std::string failsafe = "use --no-preserve-root to override this failsafe";
