@@ -280,8 +280,7 @@ TEST_P(AttributesTest, JsonSaysWhatTheCommandsDid) {
     EXPECT_EQ("757365722eff6e616d65", json["attributes"][0]["nameHex"]);
     EXPECT_EQ(2, json["attributes"][0]["size"]);
     EXPECT_EQ("attribute", json["attributes"][0]["kind"]);
-    EXPECT_EQ(GetParam() == 7 ? object : volume_->attribute_file(),
-              json["attributes"][0]["file"]);
+    EXPECT_EQ(GetParam() == 7 ? object : volume_->attribute_file(), json["attributes"][0]["file"]);
 
     json = volume_->Run({"--json", "remove", object, name}).json();
     EXPECT_EQ(true, json["removed"]);

@@ -76,9 +76,9 @@ TEST(CommandLineTest, HelpAndVersionAreWrittenToStandardOutput) {
         EXPECT_THAT(help.out, HasSubstr(text));
     }
     for (const char* command :
-         {"where", "list", "show", "get", "set", "set-info", "remove", "lock", "unlock", "import",
-          "export", "save", "restore", "carry", "upgrade", "repair", "clean", "check", "convert",
-          "diff", "dump", "salvage"}) {
+         {"where",  "list",   "show",    "get",  "set",     "set-info", "remove",  "lock",
+          "unlock", "import", "export",  "save", "restore", "carry",    "upgrade", "repair",
+          "clean",  "check",  "convert", "diff", "dump",    "salvage"}) {
         EXPECT_THAT(RunTool({command, "--help"}), Succeeded());
     }
     const ToolResult version = RunTool({"--version"});

@@ -660,10 +660,10 @@ TEST_F(ManyPathsTest, ProgressIsALineInTheIntervalWhereThereIsNoTerminal) {
     EXPECT_EQ(0, result.status);
     const auto lines = Split(result.err, '\n');
     ASSERT_EQ(2U, lines.size());
-    EXPECT_THAT(lines[0], AllOf(StartsWith("mavoea: listing: 0 done, 0 failed, "),
-                                EndsWith("/s, " + tree)));
-    EXPECT_THAT(lines[1], AllOf(StartsWith("mavoea: listing: 1 done, 0 failed, "),
-                                EndsWith("/s, " + file)));
+    EXPECT_THAT(lines[0],
+                AllOf(StartsWith("mavoea: listing: 0 done, 0 failed, "), EndsWith("/s, " + tree)));
+    EXPECT_THAT(lines[1],
+                AllOf(StartsWith("mavoea: listing: 1 done, 0 failed, "), EndsWith("/s, " + file)));
     // Nobody waits for half a minute, or an hour.
     EXPECT_THAT(share_.Run({"list", "-r", "--progress", tree}), Succeeded());
     EXPECT_THAT(share_.Run({"list", "-r", "--progress=3600", tree}), Succeeded());
