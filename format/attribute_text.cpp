@@ -7,17 +7,17 @@ namespace {
 
 constexpr TextProblem kNulByte = "a NUL byte stands in it";
 
-constexpr bool IsOctal(char c) { return c >= '0' && c <= '7'; }
-constexpr bool IsBlank(char c) { return c == ' ' || (c >= '\t' && c <= '\r'); }
+bool IsOctal(char c) { return c >= '0' && c <= '7'; }
+bool IsBlank(char c) { return c == ' ' || (c >= '\t' && c <= '\r'); }
 
-constexpr int HexDigit(char c) {
+int HexDigit(char c) {
     if (c >= '0' && c <= '9') return c - '0';
     if (c >= 'a' && c <= 'f') return c - 'a' + 10;
     if (c >= 'A' && c <= 'F') return c - 'A' + 10;
     return -1;
 }
 
-constexpr int Base64Digit(char c) {
+int Base64Digit(char c) {
     if (c >= 'A' && c <= 'Z') return c - 'A';
     if (c >= 'a' && c <= 'z') return c - 'a' + 26;
     if (c >= '0' && c <= '9') return c - '0' + 52;
