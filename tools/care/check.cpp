@@ -5,7 +5,9 @@
 #include <algorithm>
 #include <array>
 #include <cstdint>
+#include <functional>
 #include <iostream>
+#include <utility>
 
 #include "tools/care/check_directory.h"
 #include "tools/care/check_object.h"
@@ -13,10 +15,28 @@
 #include "tools/say/output.h"
 #include "tools/say/progress.h"
 #include "tools/store/sidecars.h"
+#include "tools/walk/packing.h"
 #include "tools/walk/tree.h"
 
 namespace mavoea::tool {
 namespace {
+
+struct Tally {
+    std::uint64_t checked;
+    std::uint64_t found;
+    std::uint64_t in_use;
+    std::uint64_t failed;
+    std::array<std::uint64_t, kFindingKinds> by_kind;
+
+    void Add(const Tally& more) {
+        checked += more.checked;
+        found += more.found;
+        in_use += more.in_use;
+        failed += more.failed;
+        std::transform(by_kind.begin(), by_kind.end(), more.by_kind.begin(), by_kind.begin(),
+                       std::plus<>());
+    }
+};
 
 // Says everything at once: there may be as many findings as objects.
 class Soundness final : public FindingSink {
@@ -24,24 +44,37 @@ class Soundness final : public FindingSink {
     explicit Soundness(const CheckOptions& options) : options_(options) {}
 
     ExitStatus Run() {
-        VisitObjects(options_.tree,
-                     {.work = [this](const Object& object,
-                                     const std::string&) { return CheckObject(object); },
-                      .on_failure = [this](const std::string&,
-                                           const Failure& failure) { AddFailure(failure); },
-                      .on_named = [this](const Object& object) { CheckName(object); },
-                      .on_directory =
-                          [this](const DirectoryRef& directory) {
-                              Guard([&] { CheckDirectory(directory, this); });
-                          }});
+        VisitObjects(
+            options_.tree,
+            {.work = [this](const Object& object, const std::string&,
+                            const Tell& tell) { Look(tell, [&] { CheckObject(object); }); },
+             .on_failure = [this](const std::string&,
+                                  const Failure& failure) { AddFailure(failure); },
+             .enters =
+                 [](const Object& object) {
+                     return object.keeping() != Keeping::kNone &&
+                            !IsOfTool({object.place.name, S_IFDIR});
+                 },
+             .hear = [this](std::string_view told) { tally_.Add(Unpacker(told).Take<Tally>()); },
+             .look_at_named = [this](const Object& object,
+                                     const Tell& tell) { Look(tell, [&] { CheckName(object); }); },
+             .look_into =
+                 [this](const DirectoryRef& directory, const Tell& tell) {
+                     Look(tell, [&] { CheckDirectory(directory, this); });
+                 },
+             .clear_progress = [this] { progress_.Clear(); },
+             .show_progress =
+                 [this](const Object& object) {
+                     if (progress_.wanted()) progress_.Show(Counts(), object.path());
+                 }});
         progress_.Clear();
         Summarize();
-        return failed_ > 0 ? kFailed : found_ > 0 ? kUnsound : kSuccess;
+        return tally_.failed > 0 ? kFailed : tally_.found > 0 ? kUnsound : kSuccess;
     }
 
     void Add(const Finding& finding) override {
-        ++found_;
-        ++by_kind_[static_cast<std::size_t>(finding.kind)];
+        ++tally_.found;
+        ++tally_.by_kind[static_cast<std::size_t>(finding.kind)];
         progress_.Clear();
         std::cout << (options_.tree.json ? finding.AsJson().Line() : finding.Text()) << '\n';
     }
@@ -49,7 +82,7 @@ class Soundness final : public FindingSink {
     void AddFailure(const Failure& failure) override {
         progress_.Clear();
         const bool in_use = failure.fault() == Fault::kInUse;
-        ++(in_use ? in_use_ : failed_);
+        ++(in_use ? tally_.in_use : tally_.failed);
         if (in_use) {
             Note(failure.brief() + ": not looked into");
         } else {
@@ -63,13 +96,17 @@ class Soundness final : public FindingSink {
     }
 
  private:
+    // What it adds to the tally is told, in whatever process this is.
     template <class Work>
-    void Guard(Work work) {
+    void Look(const Tell& tell, Work work) {
+        const Tally before = std::exchange(tally_, {});
         try {
             work();
         } catch (const Failure& failure) {
             AddFailure(failure);
         }
+        const Tally more = std::exchange(tally_, before);
+        tell(Packed(more));
     }
 
     // Of an object in a directory that is looked at as a whole this is found there.
@@ -78,25 +115,22 @@ class Soundness final : public FindingSink {
         if (const auto other = SharesNames(object.place)) Add(SharedNames(object.place, *other));
     }
 
-    bool CheckObject(const Object& object) {
+    void CheckObject(const Object& object) {
         const auto info = object.place.Status();
-        if (info && IsOfTool({object.place.name, info->st_mode & S_IFMT})) return false;
-        progress_.Show(Counts(), object.path());
-        const bool keeps = object.keeping() != Keeping::kNone;
+        if (info && IsOfTool({object.place.name, info->st_mode & S_IFMT})) return;
         try {
             check_.Run(object);
-            ++checked_;
+            ++tally_.checked;
         } catch (const Failure& failure) {
             if (!HasGone(object.place, failure)) AddFailure(failure);
         }
-        return keeps;
     }
 
     std::string Counts() const {
-        return std::to_string(checked_) + " checked, " + std::to_string(found_) +
-               (found_ == 1 ? " finding, " : " findings, ") +
-               (in_use_ > 0 ? std::to_string(in_use_) + " in use, " : "") +
-               std::to_string(failed_) + " failed";
+        return std::to_string(tally_.checked) + " checked, " + std::to_string(tally_.found) +
+               (tally_.found == 1 ? " finding, " : " findings, ") +
+               (tally_.in_use > 0 ? std::to_string(tally_.in_use) + " in use, " : "") +
+               std::to_string(tally_.failed) + " failed";
     }
 
     void Summarize() const {
@@ -112,23 +146,20 @@ class Soundness final : public FindingSink {
     Json SummaryJson() const {
         Json kinds = Json::Object({});
         for (std::size_t i = 0; i < kFindingKinds; ++i) {
-            if (by_kind_[i] > 0) kinds.Set(CodeOf(static_cast<FindingKind>(i)), by_kind_[i]);
+            const std::uint64_t count = tally_.by_kind[i];
+            if (count > 0) kinds.Set(CodeOf(static_cast<FindingKind>(i)), count);
         }
-        return Json::Object({{"checked", checked_},
-                             {"findings", found_},
-                             {"inUse", in_use_},
-                             {"failed", failed_},
+        return Json::Object({{"checked", tally_.checked},
+                             {"findings", tally_.found},
+                             {"inUse", tally_.in_use},
+                             {"failed", tally_.failed},
                              {"kinds", std::move(kinds)}});
     }
 
     const CheckOptions& options_;
     Progress progress_{"checking"};
     ObjectCheck check_{this};
-    std::uint64_t checked_ = 0;
-    std::uint64_t found_ = 0;
-    std::uint64_t in_use_ = 0;
-    std::uint64_t failed_ = 0;
-    std::array<std::uint64_t, kFindingKinds> by_kind_{};
+    Tally tally_ = {};
 };
 
 }  // namespace

@@ -120,6 +120,21 @@ void AddTree(CLI::App* sub, Options* options) {
     AddPaths(sub, options, "PATH", "Files and directories");
 }
 
+// For what several processes can look at.
+void AddJobs(CLI::App* sub, Options* options) {
+    constexpr unsigned kMost = 256;
+    sub->add_option("-j,--jobs", options->jobs,
+                    "By so many processes; without it one for each processor, at most 8, where "
+                    "there is enough to do")
+        ->type_name("N")
+        ->check(CLI::Range(1U, kMost));
+}
+
+void AddTreeToLookAt(CLI::App* sub, Options* options) {
+    AddJobs(sub, options);
+    AddTree(sub, options);
+}
+
 void AddSource(CLI::App* sub, Options* options) {
     sub->add_option_function<std::string>(
            "SRC", [=](const std::string& path) { options->paths.arguments = {path}; },
@@ -213,10 +228,11 @@ constexpr Syntax kCommands[] = {
                        "behind each")
              ->excludes(details);
          sub->add_flag("--values", options->values, "With --json: values, too, as base64");
-         AddTree(sub, options);
+         AddTreeToLookAt(sub, options);
      }},
     {Command::kShow, "show",
-     "Show in words what is known: Finder info, comment, tags, dates, marks, attributes", AddTree},
+     "Show in words what is known: Finder info, comment, tags, dates, marks, attributes",
+     AddTreeToLookAt},
     {Command::kGet, "get", "Write a value to standard output",
      [](CLI::App* sub, Options* options) {
          CLI::Option* const hex = sub->add_flag("--hex", options->hex, "As a hex dump");
@@ -344,6 +360,7 @@ constexpr Syntax kCommands[] = {
      [](CLI::App* sub, Options* options) {
          sub->add_flag("-v,--verbose", options->verbose, "Say at the end how many there were");
          sub->footer(FindingCodes());
+         AddJobs(sub, options);
          AddRecursive(sub, options);
          AddPaths(sub, options, "PATH", "Files and directories");
      }},

@@ -49,6 +49,7 @@ struct Options {
 
     NamedPaths paths;         // one argument, but for commands that take any number
     Shard shard;              // of the objects that those lead to
+    unsigned jobs = 0;        // list, show, check: processes, 0 as many as is usual
     std::string destination;  // convert, carry, salvage; diff: the second
     std::string directory;    // restore
     std::string archive;      // import, export, restore

@@ -139,7 +139,7 @@ ExitStatus Lock(const TreeOptions& options, bool locked) {
         ++failed;
         status = std::max(status, failure.status());
     };
-    const auto work = [&](const Object& object, const std::string&) {
+    const auto work = [&](const Object& object, const std::string&, const Tell&) {
         if (progress.wanted()) {
             progress.Show(std::to_string(done) + " done, " + std::to_string(failed) + " failed",
                           object.path(), done + failed);
@@ -154,7 +154,6 @@ ExitStatus Lock(const TreeOptions& options, bool locked) {
         } catch (const Failure& failure) {
             fail(failure);
         }
-        return true;
     };
     VisitObjects(options,
                  {.work = work,
@@ -255,7 +254,8 @@ ExitStatus Run(const Options& options) {
     if (!options.progress.empty()) {
         ReportProgressEach(std::chrono::seconds(std::stoi(options.progress)));
     }
-    const TreeOptions tree = {options.paths, options.recursive, options.json, options.shard};
+    const CrewSize crew = options.jobs > 0 ? CrewSize{.workers = options.jobs} : UsualCrew();
+    const TreeOptions tree = {options.paths, options.recursive, options.json, options.shard, crew};
     switch (options.command) {
         case Command::kWhere:
             return Where(options.paths.front(), options.json);

@@ -133,12 +133,13 @@ class Saving {
                                    "give the command in another directory"));
                 continue;
             }
-            VisitObjects(
-                {.paths = {{path}}, .recursive = options_.recursive},
-                {.work = [&](const Object& object, const std::string&) { return Do(object, path); },
-                 .on_failure = [this](const std::string&,
-                                      const Failure& failure) { AddFailure(failure); },
-                 .on_named = [this](const Object& object) { named_ = object.path(); }});
+            VisitObjects({.paths = {{path}}, .recursive = options_.recursive},
+                         {.work = [&](const Object& object, const std::string&,
+                                      const Tell&) { Do(object, path); },
+                          .on_failure = [this](const std::string&,
+                                               const Failure& failure) { AddFailure(failure); },
+                          .enters = [this](const Object&) { return !job_.stopped(); },
+                          .on_named = [this](const Object& object) { named_ = object.path(); }});
         }
         if (!job_.stopped()) output_.Finish();
         return job_.Finish();
@@ -151,20 +152,19 @@ class Saving {
                                                       "what else there is has been saved"));
     }
 
-    bool Do(const Object& object, const std::string& given) {
-        if (job_.stopped()) return false;
+    void Do(const Object& object, const std::string& given) {
+        if (job_.stopped()) return;
         if (options_.file) job_.ShowProgress(object.path());
         std::string text;
         try {
             text = TextOf(object, PathInText(object, given));
         } catch (const Failure& failure) {
             if (!options_.recursive || !HasGone(object.place, failure)) AddFailure(failure);
-            return true;
+            return;
         }
         // Nothing more can be said where this cannot be written.
         if (!text.empty()) output_.Write(to_terminal_ ? ForTerminals(text) : text);
         job_.AddDone();
-        return true;
     }
 
     // As it was given, and below that; as getfattr has it, without what makes it absolute.

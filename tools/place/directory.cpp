@@ -74,6 +74,13 @@ DirectoryRef Directory::Open(const std::string& path, const std::string& shown,
     return DirectoryRef(new Directory(fd, std::make_shared<Names>(names)));
 }
 
+DirectoryRef Directory::Adopt(int fd, const std::string& shown, const std::string& location,
+                              bool has_location) {
+    const Names names = {
+        nullptr, {}, shown, std::make_shared<const std::string>(location), has_location};
+    return DirectoryRef(new Directory(fd, std::make_shared<Names>(names)));
+}
+
 // One after the other: those of a deep tree would take the whole stack.
 Directory::Names::~Names() {
     std::shared_ptr<Names> next = std::move(above);

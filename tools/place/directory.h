@@ -31,6 +31,11 @@ class Directory : public std::enable_shared_from_this<Directory> {
     static DirectoryRef Open(const std::string& path, const std::string& shown,
                              const std::string& location);
 
+    // One that another process has handed over with its descriptor, which is this one's from here
+    // on. `location` is less than its own where that could not be named.
+    static DirectoryRef Adopt(int fd, const std::string& shown, const std::string& location,
+                              bool has_location);
+
     // A directory in this one. Null when nothing is there; a Failure when it is something else, a
     // symbolic link too.
     DirectoryRef FindIn(const std::string& name) const;
@@ -66,6 +71,7 @@ class Directory : public std::enable_shared_from_this<Directory> {
     const std::string& location() const { return *names_->location; }
     std::string LocationOf(const std::string& name) const;
     bool HasLocation(const std::string& name) const;
+    bool has_location() const { return names_->has_location; }
     struct stat Status() const;
 
     // For calls that take a path: it leads through this descriptor, whatever has become of the

@@ -78,7 +78,10 @@ bool PathReader::Fill() {
     if (!file_) file_.emplace(OpenList(*paths_.list));
     pollfd input = {file_->fd(), POLLIN, 0};
     // Whoever reads what has been found need not wait until there is more.
-    if (::poll(&input, 1, 0) == 0) std::cout.flush();
+    if (::poll(&input, 1, 0) == 0) {
+        wait_();
+        std::cout.flush();
+    }
     buffer_.resize(kBufferSize);
     at_ = 0;
     while (Interrupted() == 0) {

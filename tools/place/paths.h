@@ -28,9 +28,12 @@ struct NamedPaths {
 class PathReader {
  public:
     // `fail` is told of each name that is no path, which is left out, and of a list that cannot be
-    // read, which ends there. Both must outlive this.
-    PathReader(const NamedPaths& paths, std::function<void(const Failure&)> fail)
-        : paths_(paths), fail_(std::move(fail)) {}
+    // read, which ends there. `wait` is called before a list is waited for: whoever writes it may
+    // do so as well, for what came of the paths so far. `paths` must outlive this.
+    PathReader(
+        const NamedPaths& paths, std::function<void(const Failure&)> fail,
+        std::function<void()> wait = [] {})
+        : paths_(paths), fail_(std::move(fail)), wait_(std::move(wait)) {}
 
     // None at the end, and as soon as the work is interrupted while a list is waited for.
     std::optional<std::string> Next();
@@ -42,6 +45,7 @@ class PathReader {
 
     const NamedPaths& paths_;
     std::function<void(const Failure&)> fail_;
+    std::function<void()> wait_;
     std::size_t next_ = 0;  // of the arguments
     std::optional<File> file_;
     std::string buffer_;

@@ -35,6 +35,11 @@ std::optional<std::chrono::seconds>& Interval() {
     return interval;
 }
 
+bool& Silent() {
+    static bool silent = false;
+    return silent;
+}
+
 // "12.5/s".
 std::string Rate(std::uint64_t done, std::chrono::duration<double> time) {
     std::array<char, 64> text;
@@ -47,10 +52,12 @@ std::string Rate(std::uint64_t done, std::chrono::duration<double> time) {
 
 void ReportProgressEach(std::chrono::seconds interval) { Interval() = interval; }
 
+void SilenceProgress() { Silent() = true; }
+
 Progress::Progress(const char* doing, Lines lines)
     : doing_(doing), on_(lines == Lines::kOnTerminal && ::isatty(STDERR_FILENO) == 1) {}
 
-bool Progress::wanted() const { return on_ || Interval() || ProgressRequested(); }
+bool Progress::wanted() const { return !Silent() && (on_ || Interval() || ProgressRequested()); }
 
 void Progress::Show(const std::string& status, const std::string& path,
                     std::optional<std::uint64_t> done) {

@@ -13,6 +13,9 @@ namespace mavoea::tool {
 // terminal has the one that is rewritten. 0: with each object.
 void ReportProgressEach(std::chrono::seconds interval);
 
+// From here on nobody is told anything: another process does that.
+void SilenceProgress();
+
 // One line on standard error, rewritten now and then, when that is a terminal. It goes away at the
 // end of the scope. Lines that stay come when somebody asks for one by SIGUSR1, and in the interval
 // that was asked for.

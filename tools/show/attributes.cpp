@@ -16,6 +16,7 @@
 #include "tools/store/gathering.h"
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
+#include "tools/walk/packing.h"
 #include "tools/walk/tree.h"
 
 namespace mavoea::tool {
@@ -82,9 +83,10 @@ class Listing {
     ExitStatus Run() {
         if (options_.values && !options_.tree.json) Misuse("--values takes --json");
         if (options_.null && options_.tree.json) Misuse("--json and --null exclude each other");
-        return LookAtObjects("listing", options_.tree,
-                             [this](const Object& object, const std::string& shown,
-                                    const Metadata& metadata) { Show(object, shown, metadata); });
+        return LookAtObjects(
+            "listing", options_.tree,
+            [this](const Object& object, const std::string& shown, const Metadata& metadata,
+                   const auto& separate) { Show(object, shown, metadata, separate); });
     }
 
  private:
@@ -92,22 +94,23 @@ class Listing {
         throw Failure(kFailed, "list", what, "mavoea list --help has the usage");
     }
 
-    void Show(const Object& object, const std::string& shown, const Metadata& metadata) {
+    void Show(const Object& object, const std::string& shown, const Metadata& metadata,
+              const std::function<void()>& separate) const {
         const std::vector<Line> lines = LinesOf(object, metadata);
         if (options_.tree.json) return PrintJson(object, metadata, lines);
         if (options_.null) {
             PrintNull(object, lines);
         } else if (!lines.empty() || !options_.tree.recursive) {
-            AddText(shown, lines);
+            if (options_.tree.recursive || options_.tree.paths.several()) {
+                separate();
+                std::cout << Printable(shown) << ":\n";
+            }
+            PrintText(lines);
         }
         TellStrays(object, metadata);
     }
 
-    void AddText(const std::string& path, const std::vector<Line>& lines) {
-        if (options_.tree.recursive || options_.tree.paths.several()) {
-            std::cout << (first_ ? "" : "\n") << Printable(path) << ":\n";
-        }
-        first_ = false;
+    void PrintText(const std::vector<Line>& lines) const {
         std::size_t width = 0;
         for (const Line& line : lines) width = std::max(width, Printable(line.name).size());
         for (const Line& line : lines) {
@@ -127,7 +130,8 @@ class Listing {
     }
 
     // Piece by piece: a value need not fit into memory.
-    void PrintJson(const Object& object, const Metadata& metadata, const std::vector<Line>& lines) {
+    void PrintJson(const Object& object, const Metadata& metadata,
+                   const std::vector<Line>& lines) const {
         Json head;
         head.SetText("path", object.path());
         head.Set("type", TypeJson(object.type));
@@ -175,7 +179,6 @@ class Listing {
     }
 
     const ListOptions& options_;
-    bool first_ = true;
 };
 
 std::optional<Content> Find(const Metadata& metadata, const std::string& name) {
@@ -222,38 +225,58 @@ bool MayHaveStrays(const Object& object) { return object.dialect() != nullptr ||
 }  // namespace
 
 ExitStatus LookAtObjects(const char* doing, const TreeOptions& options, const Look& look) {
-    Progress progress(doing, Progress::Lines::kOnRequest);
-    std::uint64_t done = 0;
-    std::uint64_t failures = 0;
-    ExitStatus status = kSuccess;
-    const auto add = [&](const Failure& failure) {
-        ++failures;
-        Report(failure.what());
-        status = std::max(status, failure.status());
+    struct Counts {
+        std::uint64_t done;
+        std::uint64_t failures;
+        ExitStatus status;
     };
-    const auto work = [&](const Object& object, const std::string& shown) {
-        if (progress.wanted()) {
-            progress.Show(std::to_string(done) + " done, " + std::to_string(failures) + " failed",
-                          object.path(), done);
+    Progress progress(doing, Progress::Lines::kOnRequest);
+    Counts all = {};
+    bool first = true;
+    const auto hear = [&](std::string_view message) {
+        if (message.empty()) {
+            if (!std::exchange(first, false)) std::cout << '\n';
+            return;
         }
+        const auto more = Unpacker(message).Take<Counts>();
+        all.done += more.done;
+        all.failures += more.failures;
+        all.status = std::max(all.status, more.status);
+    };
+    const auto work = [&](const Object& object, const std::string& shown, const Tell& tell) {
+        Counts counts = {};
+        const auto add = [&](const Failure& failure) {
+            ++counts.failures;
+            Report(failure.what());
+            counts.status = std::max(counts.status, failure.status());
+        };
         try {
             const Metadata metadata = ReadAll(object);
             try {
-                look(object, shown, metadata);
+                look(object, shown, metadata, [&] { tell({}); });
             } catch (const Failure& failure) {
                 add(failure);
             }
-            ++done;
+            ++counts.done;
             for (const Failure& problem : metadata.problems) add(problem);
         } catch (const Failure& failure) {
             if (!options.recursive || !HasGone(object.place, failure)) add(failure);
         }
-        return true;
+        tell(Packed(counts));
     };
-    VisitObjects(options,
-                 {.work = work,
-                  .on_failure = [&](const std::string&, const Failure& failure) { add(failure); }});
-    return status;
+    const auto fail = [&](const std::string&, const Failure& failure) {
+        ++all.failures;
+        Report(failure.what());
+        all.status = std::max(all.status, failure.status());
+    };
+    const auto show = [&](const Object& object) {
+        if (!progress.wanted()) return;
+        progress.Show(
+            std::to_string(all.done) + " done, " + std::to_string(all.failures) + " failed",
+            object.path(), all.done);
+    };
+    VisitObjects(options, {.work = work, .on_failure = fail, .hear = hear, .show_progress = show});
+    return all.status;
 }
 
 void TellStrays(const Object& object, const Metadata& metadata) {

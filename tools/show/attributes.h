@@ -15,7 +15,10 @@ namespace mavoea::tool {
 
 // Hands out what each object has; "listing", for those who ask how far it is. What cannot be looked
 // at is told, and is a failure; `look` may throw one, too. Returns the gravest status.
-using Look = std::function<void(const Object&, const std::string& shown, const Metadata&)>;
+// `separate` puts an empty line before all but the first that calls it. The work is shared out to
+// processes: what `look` changes does not count.
+using Look = std::function<void(const Object&, const std::string& shown, const Metadata&,
+                                const std::function<void()>& separate)>;
 ExitStatus LookAtObjects(const char* doing, const TreeOptions& options, const Look& look);
 
 // What an object has twice, where other programs may have kept it, told and as "strays".

@@ -365,9 +365,8 @@ void PrintLines(const std::vector<Description::InfoLine>& lines) {
 }  // namespace
 
 ExitStatus Show(const TreeOptions& options) {
-    bool first = true;
-    const auto look = [&](const Object& object, const std::string& shown,
-                          const Metadata& metadata) {
+    const auto look = [&](const Object& object, const std::string& shown, const Metadata& metadata,
+                          const std::function<void()>& separate) {
         const Description description(object, metadata);
         if (options.json) {
             std::cout << description.json().Line() << '\n';
@@ -375,9 +374,9 @@ ExitStatus Show(const TreeOptions& options) {
         }
         if (description.lines().empty() && options.recursive) return;
         if (options.recursive || options.paths.several()) {
-            std::cout << (first ? "" : "\n") << Printable(shown) << ":\n";
+            separate();
+            std::cout << Printable(shown) << ":\n";
         }
-        first = false;
         PrintLines(description.lines());
         TellStrays(object, metadata);
     };

@@ -11,27 +11,37 @@
 namespace mavoea::tool {
 namespace {
 
-bool IsDirectory(const Place& place) {
+mode_t TypeOf(const Place& place) {
     const auto info = place.Status();
-    return info && S_ISDIR(info->st_mode);
+    return info ? info->st_mode & S_IFMT : 0;
 }
 
 // One tree after the other.
 class Walk {
  public:
     Walk(const TreeOptions& options, const Visit& visit)
-        : recursive_(options.recursive), shard_(options.shard), visit_(visit) {}
+        : recursive_(options.recursive),
+          shard_(options.shard),
+          visit_(visit),
+          crew_(visit.hear ? options.crew : CrewSize{},
+                {.work = [this](const Errand& errand, const Tell& tell) { Work(errand, tell); },
+                 .hear = visit.hear ? visit.hear : [](std::string_view) {},
+                 .on_failure = visit.on_failure,
+                 .clear_progress = visit.clear_progress,
+                 .show_progress = visit.show_progress}) {}
 
     void Run(const std::string& path) {
         const PathHash hash = PathHash::OfNamed(path);
         if (!recursive_ && !shard_.Has(hash)) return;
         try {
             const Object object = FindObject(path);
-            const bool descends = recursive_ && IsDirectory(object.place);
+            const mode_t type = TypeOf(object.place);
+            const bool descends = recursive_ && S_ISDIR(type);
             if (!descends && !shard_.Has(hash)) return;
             visit_.on_named(object);
             // The root has no directory to keep metadata in.
-            const bool enters = (descends && object.is_root()) || Do(object, hash, path);
+            const bool is_top = descends && object.is_root();
+            const bool enters = is_top || Do(Errand::Kind::kNamed, object, type, hash, path);
             if (enters && descends) pending_.push_back({object.place, hash});
         } catch (const Failure& failure) {
             Fail(path, hash, failure);
@@ -43,8 +53,16 @@ class Walk {
         }
     }
 
+    void Fail(const Failure& failure) {
+        crew_.Then([=, this] { visit_.on_failure(failure.subject(), failure); });
+    }
+
+    // All that came of what has been visited is out.
+    void Settle() { crew_.Finish(); }
+
     // What has kept this shard from objects that may be its own.
-    void Finish() const {
+    void Finish() {
+        crew_.Finish();
         if (others_ == 0) return;
         visit_.on_failure({},
                           {gravest_, "shard " + ShardText(shard_),
@@ -60,14 +78,27 @@ class Walk {
     };
 
     // Whether what is in it, if it is a directory, is to be looked at.
-    bool Do(const Object& object, PathHash hash, const std::string& shown) {
-        if (shard_.Has(hash)) return visit_.work(object, shown);
-        visit_.on_other(object);
-        return true;
+    bool Do(Errand::Kind kind, const Object& object, mode_t type, PathHash hash,
+            const std::string& shown) {
+        if (!shard_.Has(hash)) {
+            visit_.on_other(object);
+            return true;
+        }
+        crew_.Do({kind, object, type, shown});
+        return !S_ISDIR(type) || visit_.enters(object);
+    }
+
+    void Work(const Errand& errand, const Tell& tell) const {
+        const Object& object = errand.object;
+        if (errand.kind == Errand::Kind::kDirectory) {
+            return visit_.look_into(object.place.directory, tell);
+        }
+        if (errand.kind == Errand::Kind::kNamed) visit_.look_at_named(object, tell);
+        visit_.work(object, errand.shown.empty() ? object.path() : errand.shown, tell);
     }
 
     void Fail(const std::string& path, PathHash hash, const Failure& failure) {
-        if (shard_.Has(hash)) return visit_.on_failure(path, failure);
+        if (shard_.Has(hash)) return crew_.Then([=, this] { visit_.on_failure(path, failure); });
         ++others_;
         gravest_ = std::max(gravest_, failure.status());
     }
@@ -86,6 +117,9 @@ class Walk {
     void DoDirectory(const Inner& outer) {
         const DirectoryRef directory = outer.place.directory->OpenIn(outer.place.name);
         visit_.on_directory(directory);
+        if (visit_.look_into) {
+            crew_.Do({Errand::Kind::kDirectory, {{directory, "."}}, S_IFDIR, {}});
+        }
         const std::size_t first = pending_.size();
         for (const Directory::Entry& entry : ObjectsIn(directory)) {
             if (S_ISLNK(entry.type) || MAVOEAIsHiddenDirName(entry.name.c_str()) != 0) continue;
@@ -93,7 +127,7 @@ class Walk {
             if (!S_ISDIR(entry.type) && !shard_.Has(inner.hash)) continue;
             Guard(inner, [&] {
                 const Object object = ObjectAt(inner.place, entry.type);
-                const bool enters = Do(object, inner.hash, inner.place.path());
+                const bool enters = Do(Errand::Kind::kFound, object, entry.type, inner.hash, {});
                 if (enters && S_ISDIR(entry.type)) pending_.push_back(inner);
             });
         }
@@ -103,6 +137,7 @@ class Walk {
     bool recursive_;
     Shard shard_;
     const Visit& visit_;
+    Crew crew_;
     std::vector<Inner> pending_;     // directories
     std::uint64_t others_ = 0;       // failures, with what belongs to other shards
     ExitStatus gravest_ = kSuccess;  // of those
@@ -116,21 +151,32 @@ class Work {
         : task_(task), report_({task.doing, task.done, task.current, task.nothing}) {}
 
     void Run(const TreeOptions& options) {
-        VisitObjects(
-            options,
-            {.work = [this](const Object& object, const std::string&) { return DoObject(object); },
-             .on_failure = [this](const std::string& path,
-                                  const Failure& failure) { report_.AddFailure(path, failure); },
-             .on_named = task_.on_named,
-             .on_directory = task_.on_directory,
-             .on_other = task_.check});
+        VisitObjects(options, {.work = [this](const Object& object, const std::string&,
+                                              const Tell&) { DoObject(object); },
+                               .on_failure =
+                                   [this](const std::string& path, const Failure& failure) {
+                                       report_.AddFailure(path, failure);
+                                   },
+                               .enters = [this](const Object& object) { return Suits(object); },
+                               .on_named = task_.on_named,
+                               .on_directory = task_.on_directory,
+                               .on_other = task_.check});
     }
 
     ExitStatus Finish(bool json) { return report_.Finish(json); }
 
  private:
-    // False when what is below it would fail for the same reason.
-    bool DoObject(const Object& object) {
+    // What is below what does not would fail for the same reason.
+    bool Suits(const Object& object) const {
+        try {
+            task_.check(object);
+            return true;
+        } catch (const Failure&) {
+            return false;
+        }
+    }
+
+    void DoObject(const Object& object) {
         report_.Show(object.path());
         bool suits = false;
         try {
@@ -142,7 +188,6 @@ class Work {
                 report_.AddFailure(object.path(), failure);
             }
         }
-        return suits;
     }
 
     const Task& task_;
@@ -158,8 +203,8 @@ bool HasGone(const Place& place, const Failure& failure) {
 void VisitObjects(const TreeOptions& options, const Visit& visit) {
     if (options.recursive) RequireDescriptorPaths();
     Walk walk(options, visit);
-    PathReader paths(options.paths,
-                     [&](const Failure& failure) { visit.on_failure(failure.subject(), failure); });
+    PathReader paths(
+        options.paths, [&](const Failure& failure) { walk.Fail(failure); }, [&] { walk.Settle(); });
     while (const auto path = paths.Next()) walk.Run(*path);
     walk.Finish();
 }

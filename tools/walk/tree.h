@@ -4,11 +4,13 @@
 
 #include <functional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "tools/place/paths.h"
 #include "tools/place/volume.h"
 #include "tools/say/messages.h"
+#include "tools/walk/crew.h"
 #include "tools/walk/shard.h"
 #include "tools/walk/tree_report.h"
 
@@ -19,7 +21,8 @@ struct TreeOptions {
     NamedPaths paths;
     bool recursive = false;
     bool json = false;
-    Shard shard = {};  // only its objects
+    Shard shard = {};             // only its objects
+    CrewSize crew = UsualCrew();  // of work that can be shared out
 };
 
 // Calls `work` for each object that was named and, in recursive work, for all below it, and goes on
@@ -30,15 +33,27 @@ struct TreeOptions {
 // wrong with a directory is told by the shard that it belongs to; others, whose objects may be in
 // there, fail with one line for all of those.
 struct Visit {
-    // `shown` is the path as it was given, or the object's own. False: nothing below it is to be
-    // looked at.
-    std::function<bool(const Object&, const std::string& shown)> work;
+    // `shown` is the path as it was given, or the object's own. Tells `hear` what came of it.
+    std::function<void(const Object&, const std::string& shown, const Tell&)> work;
     std::function<void(const std::string& path, const Failure&)> on_failure;
+
+    // False: nothing below it is to be looked at.
+    std::function<bool(const Object&)> enters = [](const Object&) { return true; };
 
     // Called for what was named, and for each directory before what is in it is listed: those who
     // change things bring to its end what others began there.
     std::function<void(const Object&)> on_named = [](const Object&) {};
     std::function<void(const DirectoryRef&)> on_directory = [](const DirectoryRef&) {};
+
+    // With this, the work is shared out to processes, as a crew has it: `work` and these two may
+    // change nothing of this one, and call `hear` in it by what they tell.
+    std::function<void(std::string_view)> hear = {};
+    std::function<void(const Object&, const Tell&)> look_at_named = [](const Object&, const Tell&) {
+    };
+    // Of all shards.
+    std::function<void(const DirectoryRef&, const Tell&)> look_into = {};
+    std::function<void()> clear_progress = [] {};
+    std::function<void(const Object&)> show_progress = [](const Object&) {};
 
     // Called for directories of other shards in place of `work`. Throws Failure for one below which
     // nothing is to be looked at.

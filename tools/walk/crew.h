@@ -1,0 +1,108 @@
+// Work on many objects that is shared out to processes, and looks as if one of them had done it.
+// Processes, since the library keeps state of its own in each.
+#ifndef MAVOEA_TOOLS_WALK_CREW_H_
+#define MAVOEA_TOOLS_WALK_CREW_H_
+
+#include <sys/types.h>
+
+#include <cstdint>
+#include <deque>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "tools/place/volume.h"
+#include "tools/say/messages.h"
+
+namespace mavoea::tool {
+
+// How many processes work on what there is to do.
+struct CrewSize {
+    unsigned workers = 1;
+    // So many objects are begun with: what is soon done takes no other process.
+    std::uint64_t alone = 0;
+};
+// One for each processor that this process may run on, at most 8, once there is enough to do.
+CrewSize UsualCrew();
+
+// What somebody of the crew is to do.
+struct Errand {
+    enum class Kind : std::uint8_t { kNamed, kFound, kDirectory };
+
+    Kind kind;
+    Object object;      // kDirectory: only its directory counts
+    mode_t type;        // S_IFREG, ...
+    std::string shown;  // empty: the object's own path
+};
+
+// Tells the process that began the work what came of it. That gets it in the order of the errands.
+using Tell = std::function<void(std::string_view)>;
+
+struct Duties {
+    // In any of the processes. What it writes to std::cout and std::cerr, and what it tells, comes
+    // out of the first process, in the order of the errands. Throws nothing.
+    std::function<void(const Errand&, const Tell&)> work;
+
+    // All else in the first process.
+    std::function<void(std::string_view)> hear;
+    std::function<void(const std::string& path, const Failure&)> on_failure;
+    // Before anything is written, and now and then with an object in hand.
+    std::function<void()> clear_progress;
+    std::function<void(const Object&)> show_progress;
+};
+
+// Errands are done in any order, a bounded number at a time: what came of each waits until all that
+// stand before it are done. An errand whose process dies is one failure; the rest is done by
+// others.
+class Crew {
+ public:
+    Crew(CrewSize size, Duties duties);
+    ~Crew();
+    Crew(const Crew&) = delete;
+    Crew& operator=(const Crew&) = delete;
+
+    void Do(Errand errand);
+    // Called in this process, after all that came of the errands before it is out.
+    void Then(std::function<void()> step);
+    // Returns when everything is done, and out.
+    void Finish();
+
+ private:
+    struct Area;
+    struct Slot;
+    struct Batch;
+    struct Worker;
+
+    bool Begin();
+    bool StartWorker();
+    void CloseBatch();
+    void Assign();
+    static bool Give(Worker* worker, const std::shared_ptr<Batch>& batch);
+    void DoHere(const Batch& batch);
+    void Wait();
+    void Hear(Worker* worker);
+    void Bury(Worker* worker);
+    static void Collect(Worker* worker);
+    void Output();
+    void Say(const Slot& slot);
+    static void LetGoOn(Worker* worker);
+    bool MayCollect(const Worker& worker) const;
+
+    CrewSize size_;
+    Duties duties_;
+    std::uint64_t begun_ = 0;  // errands, before there were workers
+    bool shared_out_ = false;
+    std::uint64_t batches_ = 0;
+    std::vector<std::unique_ptr<Worker>> workers_;
+    std::shared_ptr<Batch> open_;                // that further errands come to
+    std::deque<std::shared_ptr<Batch>> ready_;   // that nobody has taken yet
+    std::deque<std::shared_ptr<Slot>> outputs_;  // in the order in which they come out
+    bool in_line_ = false;                       // what has come out ends in the middle of one
+};
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_WALK_CREW_H_

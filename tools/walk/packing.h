@@ -1,0 +1,61 @@
+// Numbers and texts on their way from one of this tool's processes to another on the same machine.
+#ifndef MAVOEA_TOOLS_WALK_PACKING_H_
+#define MAVOEA_TOOLS_WALK_PACKING_H_
+
+#include <cstdint>
+#include <cstring>
+#include <string>
+#include <string_view>
+#include <type_traits>
+
+namespace mavoea::tool {
+
+// Of what is nothing but its bytes.
+template <class Value>
+std::string Packed(const Value& value) {
+    static_assert(std::is_trivially_copyable_v<Value>);
+    return {reinterpret_cast<const char*>(&value), sizeof value};
+}
+
+class Packer {
+ public:
+    void AddNumber(std::uint64_t number) { bytes_ += Packed(number); }
+    void AddText(std::string_view text) {
+        AddNumber(text.size());
+        bytes_ += text;
+    }
+    const std::string& bytes() const { return bytes_; }
+
+ private:
+    std::string bytes_;
+};
+
+// Takes off what a Packer has put there, in the same order.
+class Unpacker {
+ public:
+    explicit Unpacker(std::string_view bytes) : bytes_(bytes) {}
+
+    template <class Value>
+    Value Take() {
+        static_assert(std::is_trivially_copyable_v<Value>);
+        Value value;
+        std::memcpy(&value, bytes_.data(), sizeof value);
+        bytes_.remove_prefix(sizeof value);
+        return value;
+    }
+    std::uint64_t TakeNumber() { return Take<std::uint64_t>(); }
+    std::string_view TakeText() {
+        const std::size_t size = TakeNumber();
+        const std::string_view text = bytes_.substr(0, size);
+        bytes_.remove_prefix(size);
+        return text;
+    }
+    bool empty() const { return bytes_.empty(); }
+
+ private:
+    std::string_view bytes_;
+};
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_WALK_PACKING_H_

@@ -1,0 +1,59 @@
+// One of the processes of a crew, and what lies between it and the first one: a socket on which
+// each tells the other that it is its turn, and memory that both see. What is there outlives a
+// worker that dies.
+#ifndef MAVOEA_TOOLS_WALK_WORKER_H_
+#define MAVOEA_TOOLS_WALK_WORKER_H_
+
+#include <array>
+#include <atomic>
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "tools/walk/crew.h"
+
+namespace mavoea::tool {
+
+struct WorkArea {
+    // How far it is: errands that are done, and bytes of `results` that count.
+    struct State {
+        std::uint32_t done = 0;
+        std::uint32_t size = 0;
+    };
+    std::atomic<State> state;
+    static_assert(std::atomic<State>::is_always_lock_free);
+
+    std::array<char, std::size_t{1} << 20> request;
+    std::array<char, std::size_t{1} << 18> results;
+};
+
+// What comes of errands.
+enum class ResultKind : std::uint8_t { kOutput, kError, kTold, kFailure };
+
+// A turn, with descriptors of directories when errands come along.
+enum class Turn : char { kWork = 'W', kGoOn = 'G', kEnd = 'E', kDone = 'D', kFull = 'F' };
+bool SendTurn(int socket, Turn turn, const std::vector<int>& descriptors = {});
+// None when the other one has gone.
+std::optional<Turn> ReceiveTurn(int socket, std::vector<int>* descriptors = nullptr);
+// As many as come along with one turn.
+inline constexpr std::size_t kDescriptorsMost = 16;
+
+// Errands in bytes. A directory is named by a number: one that the worker has last had is not sent
+// once more.
+struct Request {
+    std::string bytes;
+    std::vector<int> descriptors = {};
+};
+Request RequestOf(const std::vector<Errand>& errands, std::size_t first, const Directory* former);
+
+// Works until it is told that this is the end, or the first process has gone.
+[[noreturn]] void WorkAsTold(int socket, WorkArea* area,
+                             const std::function<void(const Errand&, const Tell&)>& work);
+
+}  // namespace mavoea::tool
+
+#endif  // MAVOEA_TOOLS_WALK_WORKER_H_
