@@ -407,6 +407,21 @@ def compare_start(options, room):
         print(f"{name.ljust(5)} {mine / others:5.2f} ({mine * 1e6:.0f} / {others * 1e6:.0f} us)")
 
 
+def compare_jobs(options, room):
+    """The same trees, looked at by one process and by two."""
+    volumes = Volumes(options.tool, make_room(room, "jobs"), 2 * options.objects)
+    for kind in (*KINDS, SAMBA):
+        for file_system in FILE_SYSTEMS:
+            tree = volumes.tree(file_system, kind, kind != PLAIN)
+            command = volumes.command((tree, kind))
+            for name in ("check", "list"):
+                times = [[seconds([*command, name, "-r", "-j", jobs, tree]) for jobs in "12"]
+                         for _ in range(2 * options.rounds)]
+                one, two = (statistics.median(column) for column in zip(*times))
+                print(f"{name.ljust(5)} {str(kind).ljust(5)} {file_system.ljust(5)} {two / one:5.2f}"
+                      f" ({two:.2f} / {one:.2f} s)")
+
+
 def make_room(room, name):
     path = f"{room}/{name}"
     os.mkdir(path)
@@ -424,6 +439,7 @@ def main():
                         help='rows such as "cp -r 1 to 0", "list -r 7"')
     parser.add_argument("--memory", action="store_true", help="how much memory it takes, instead")
     parser.add_argument("--start", action="store_true", help="the tool's start, instead")
+    parser.add_argument("--jobs", action="store_true", help="two processes beside one, instead")
     parser.add_argument("--markdown", action="store_true", help="print the table for the README")
     parser.add_argument("--tool", default=f"{here}/../build/release/bin/mavoea", metavar="FILE")
     options = parser.parse_args()
@@ -435,7 +451,8 @@ def main():
         os.execvp("unshare", ["unshare", "-m", sys.executable, *sys.argv])
     room = tempfile.mkdtemp(prefix="mavoea-bench-")
     try:
-        measure = compare_memory if options.memory else compare_start if options.start else compare
+        measure = (compare_memory if options.memory else compare_start if options.start
+                   else compare_jobs if options.jobs else compare)
         measure(options, room)
     finally:
         subprocess.run(["umount", "-q", "-R", room], stderr=subprocess.DEVNULL, check=False)

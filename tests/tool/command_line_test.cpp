@@ -78,7 +78,7 @@ TEST(CommandLineTest, HelpAndVersionAreWrittenToStandardOutput) {
     for (const char* command :
          {"where",  "list",   "show",    "get",  "set",     "set-info", "remove",  "lock",
           "unlock", "import", "export",  "save", "restore", "carry",    "upgrade", "repair",
-          "clean",  "check",  "convert", "diff", "dump",    "salvage"}) {
+          "clean",  "check",  "convert", "diff", "dump",    "salvage",  "plan"}) {
         EXPECT_THAT(RunTool({command, "--help"}), Succeeded());
     }
     const ToolResult version = RunTool({"--version"});

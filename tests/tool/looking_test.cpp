@@ -303,6 +303,12 @@ std::vector<Look> ShowingLooks() {
          [](const World& world) {
              return Runs{{"check", "-r", world.top()}, {"--json", "check", "-r", world.top()}};
          }},
+        {"Plan",
+         [](const World& world) {
+             return Runs{
+                 {"plan", "-r", "--to", "samba", world.top(), world.top() + "-copy"},
+                 {"--json", "plan", "-r", "--to", "eadir", world.top(), world.top() + "-copy"}};
+         }},
         {"CheckOfObjects", [](const World& world) { return OfAll(world.objects(), {"check"}); }},
     };
 }

@@ -2,6 +2,7 @@
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
+#include <array>
 #include <iostream>
 #include <span>
 #include <string_view>
@@ -135,16 +136,20 @@ void AddTreeToLookAt(CLI::App* sub, Options* options) {
     AddTree(sub, options);
 }
 
-void AddSource(CLI::App* sub, Options* options) {
-    sub->add_option_function<std::string>(
-           "SRC", [=](const std::string& path) { options->paths.arguments = {path}; },
-           "The original")
-        ->required();
+CLI::Option* AddSource(CLI::App* sub, Options* options) {
+    return sub->add_option_function<std::string>(
+        "SRC", [=](const std::string& path) { options->paths.arguments = {path}; }, "The original");
 }
 
-void AddAllowLoss(CLI::App* sub, Options* options) {
-    sub->add_flag("--allow-loss", options->allow_loss,
-                  "What cannot be kept at the destination is named, and may be lost");
+// What a conversion takes: the type, the source and the copy.
+std::array<CLI::Option*, 3> AddConversion(CLI::App* sub, Options* options) {
+    AddRecursive(sub, options);
+    CLI::Option* const type = sub->add_option("--to", options->to, "The type of DST's volume");
+    type->type_name("TYPE");
+    CLI::Option* const source = AddSource(sub, options);
+    CLI::Option* const copy = sub->add_option(
+        "DST", options->destination, "The copy's own path, not that of the directory around it");
+    return {type, source, copy};
 }
 
 // Their arguments are read elsewhere.
@@ -337,7 +342,7 @@ constexpr Syntax kCommands[] = {
      [](CLI::App* sub, Options* options) {
          AddRecursive(sub, options);
          sub->add_flag("-v,--verbose", options->verbose, "Say what is done");
-         AddSource(sub, options);
+         AddSource(sub, options)->required();
          sub->add_option("DST", options->destination, "The copy's own path")->required();
      }},
     {Command::kUpgrade, "upgrade", "Convert what earlier versions kept into the current layout",
@@ -367,15 +372,29 @@ constexpr Syntax kCommands[] = {
     {Command::kConvert, "convert",
      "Copy an object or a tree to a volume of another type, and compare the two",
      [](CLI::App* sub, Options* options) {
-         AddRecursive(sub, options);
-         sub->add_option("--to", options->to, "The type of DST's volume")
-             ->type_name("TYPE")
-             ->required();
-         AddAllowLoss(sub, options);
-         AddSource(sub, options);
-         sub->add_option("DST", options->destination,
-                         "The copy's own path, not that of the directory around it")
-             ->required();
+         const auto arguments = AddConversion(sub, options);
+         CLI::Option* const plan = sub->add_option_function<std::string>(
+             "--plan", [=](const std::string& file) { options->plan = file; },
+             "Do what plan --output has written, if the source is still what it was");
+         plan->type_name("FILE");
+         sub->get_option("--recursive")->excludes(plan);
+         for (CLI::Option* const argument : arguments) argument->excludes(plan);
+         sub->parse_complete_callback([=] {
+             for (const CLI::Option* const argument : arguments) {
+                 if (plan->empty() && argument->empty()) {
+                     throw CLI::RequiredError(argument->get_name());
+                 }
+             }
+         });
+     }},
+    {Command::kPlan, "plan", "Say what convert would meet, and what it would lose; change nothing",
+     [](CLI::App* sub, Options* options) {
+         for (CLI::Option* const argument : AddConversion(sub, options)) argument->required();
+         CLI::Option* const output = sub->add_option_function<std::string>(
+             "--output", [=](const std::string& file) { options->output = file; },
+             "A new file, for convert --plan");
+         output->type_name("FILE");
+         sub->add_flag("-f,--force", options->force, "Replace a FILE that is there")->needs(output);
      }},
     {Command::kDiff, "diff", "Compare the metadata of two objects or trees on volumes of any kinds",
      [](CLI::App* sub, Options* options) {

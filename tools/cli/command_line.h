@@ -37,6 +37,7 @@ enum class Command {
     kClean,
     kCheck,
     kConvert,
+    kPlan,
     kDiff,
     kDump,
     kSalvage
@@ -61,7 +62,8 @@ struct Options {
     std::optional<std::string> file;      // the same
     std::optional<std::string> type;      // restore: of the volume that the text was made of
     std::optional<std::string> encoding;  // save
-    std::optional<std::string> output;    // save
+    std::optional<std::string> output;    // save, plan
+    std::optional<std::string> plan;  // convert: does what it says, and takes no other arguments
 
     InfoOptions info;      // set-info
     CopyOptions copy;      // cp, mv
@@ -70,7 +72,7 @@ struct Options {
     bool json = false;
     bool recursive = false;
     bool verbose = false;         // carry, check, restore
-    bool force = false;           // export, save
+    bool force = false;           // export, save, plan
     bool replaces_data = false;   // import
     bool keep = false;            // import -r: the "._" files stay
     bool keep_existing = false;   // import -r: values that are there stay
@@ -80,7 +82,6 @@ struct Options {
     bool yes = false;             // clean: what is listed is removed
     bool all = false;             // clean: things of other services, too
     bool absolute_names = false;  // save, restore
-    bool allow_loss = false;      // convert
     bool data = false;            // diff
     bool brief = false;           // diff
     bool itemized = false;        // diff

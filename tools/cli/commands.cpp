@@ -24,6 +24,7 @@
 #include "tools/move/convert.h"
 #include "tools/move/copy.h"
 #include "tools/move/delete.h"
+#include "tools/move/plan.h"
 #include "tools/place/file.h"
 #include "tools/place/volume.h"
 #include "tools/say/interrupt.h"
@@ -245,6 +246,14 @@ ExitStatus Dump(const Options& options) {
         "restore the file from a copy, or leave it alone");
 }
 
+ConvertOptions ConversionOf(const Options& options) {
+    return {.source = options.paths.front(),
+            .destination = options.destination,
+            .type = options.to,
+            .recursive = options.recursive,
+            .json = options.json};
+}
+
 }  // namespace
 
 ExitStatus Run(const Options& options) {
@@ -336,11 +345,12 @@ ExitStatus Run(const Options& options) {
         case Command::kCheck:
             return CheckSoundness({.tree = tree, .verbose = options.verbose});
         case Command::kConvert:
-            return Convert({.source = options.paths.front(),
-                            .destination = options.destination,
-                            .type = options.to,
-                            .recursive = options.recursive,
-                            .json = options.json});
+            if (options.plan) return ConvertAsPlanned(*options.plan, options.json);
+            return Convert(ConversionOf(options));
+        case Command::kPlan:
+            return PlanConversion({.conversion = ConversionOf(options),
+                                   .file = options.output,
+                                   .force = options.force});
         case Command::kDiff:
             return Diff({.first = options.paths.front(),
                          .second = options.destination,

@@ -186,8 +186,7 @@ bool IsWithin(const std::filesystem::path& inner, const std::filesystem::path& o
 
 }  // namespace
 
-ExitStatus Convert(const ConvertOptions& options) {
-    if (options.recursive) RequireDescriptorPaths();
+ConversionEnds EndsOf(const ConvertOptions& options) {
     const Object source = FindObject(options.source);
     RequireParent(source);
     if (options.destination.empty()) {
@@ -204,10 +203,16 @@ ExitStatus Convert(const ConvertOptions& options) {
     }
     const Object target = ObjectAt(destination, nullptr);
     if (source.keeping() == Keeping::kNone) throw NoStore(source);
-    if (AsReadable(target).keeping() == Keeping::kNone) throw NoStore(target);
+    const Object readable = AsReadable(target);
+    if (readable.keeping() == Keeping::kNone) throw NoStore(target);
+    return {source, destination, readable.type};
+}
 
+ExitStatus Convert(const ConvertOptions& options) {
+    if (options.recursive) RequireDescriptorPaths();
+    const ConversionEnds ends = EndsOf(options);
     WatchForInterrupts();
-    Conversion conversion(options, {source.place, destination});
+    Conversion conversion(options, {ends.source.place, ends.destination});
     conversion.CopyAndCompare();
     return conversion.Summarize();
 }

@@ -4,6 +4,7 @@
 
 #include <string>
 
+#include "tools/place/volume.h"
 #include "tools/say/messages.h"
 
 namespace mavoea::tool {
@@ -15,6 +16,15 @@ struct ConvertOptions {
     bool recursive = false;
     bool json = false;
 };
+
+// What is copied, and to where.
+struct ConversionEnds {
+    Object source;
+    Place destination;
+    int type = -1;  // of the destination's volume, as it is read
+};
+// Declares the destination's type. Throws Failure where there can be no conversion.
+ConversionEnds EndsOf(const ConvertOptions& options);
 
 // Nothing is removed from the source. Goes on after a failure; kSuccess when nothing failed and
 // nothing differs, otherwise the gravest status; 128 and the signal's number when interrupted.
