@@ -45,10 +45,10 @@ class JobsTest : public ::testing::Test {
     // A large directory, a deep narrow tree, many small ones, damage in each; what cannot be
     // entered.
     void MakeTree() const {
-        for (int i = 0; i < 1000; ++i) Make("tree/large/" + std::to_string(i), i % 97 == 0);
+        for (int i = 0; i < 400; ++i) Make("tree/large/" + std::to_string(i), i % 97 == 0);
         std::string deep = "tree/deep";
-        for (int i = 0; i < 200; ++i) Make((deep += "/d") + "/f", i % 61 == 0);
-        for (int i = 0; i < 400; ++i) Make("tree/small" + std::to_string(i) + "/f", i % 89 == 0);
+        for (int i = 0; i < 80; ++i) Make((deep += "/d") + "/f", i % 61 == 0);
+        for (int i = 0; i < 150; ++i) Make("tree/small" + std::to_string(i) + "/f", i % 89 == 0);
     }
 
     ToolResult RunWith(unsigned jobs, Arguments arguments) const {
@@ -60,7 +60,7 @@ class JobsTest : public ::testing::Test {
     void ExpectSame(const Arguments& arguments, int status) const {
         const ToolResult one = RunWith(1, arguments);
         EXPECT_EQ(status, one.status);
-        for (const unsigned jobs : {2U, 3U, 8U}) {
+        for (const unsigned jobs : {2U, 5U}) {
             const ToolResult more = RunWith(jobs, arguments);
             EXPECT_EQ(one.status, more.status);
             EXPECT_EQ(one.out, more.out);
@@ -217,6 +217,9 @@ TEST_F(JobsTest, AProcessThatDiesIsOneFailureAndTheRestIsDone) {
 // As many processes as the user may have are running.
 TEST_F(JobsTest, WithoutFurtherProcessesOneDoesEverything) {
     MAVOEA_SKIP_WITHOUT_OTHER_USERS();
+    if (Tested().sanitized() || Tested().emulated()) {
+        GTEST_SKIP() << "what the tool runs in takes processes of its own";
+    }
     for (int i = 0; i < 100; ++i) Make("tree/" + std::to_string(i));
     const ToolResult one = RunWith(1, {"list", "-r", At("tree")});
     fs::permissions(share_.path(), fs::perms::all);

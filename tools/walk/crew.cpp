@@ -23,7 +23,7 @@ namespace mavoea::tool {
 namespace {
 
 // Of one batch: large enough that turns cost little, small enough that none waits long at the end.
-constexpr std::size_t kErrands = 64;
+constexpr std::size_t kErrands = WorkArea::kErrandsMost;
 // Their descriptors are open while it waits.
 constexpr std::size_t kDirectories = 8;
 static_assert(kDirectories <= kDescriptorsMost);
@@ -240,7 +240,7 @@ void Crew::Hear(Worker* worker) {
 
 // With all the room that there is for results.
 void Crew::LetGoOn(Worker* worker) {
-    worker->area->state.store({worker->area->state.load().done, 0});
+    worker->area->state.store({worker->area->state.load().done(), 0});
     (void)SendTurn(worker->socket, Turn::kGoOn);
 }
 
@@ -251,7 +251,7 @@ void Crew::Bury(Worker* worker) {
     const std::shared_ptr<Batch> batch = worker->batch;
     if (batch) {
         Collect(worker);
-        batch->next += worker->area->state.load(std::memory_order_acquire).done;
+        batch->next += worker->area->state.load(std::memory_order_acquire).done();
     }
     workers_.erase(std::find_if(workers_.begin(), workers_.end(),
                                 [&](const auto& one) { return one.get() == worker; }));
@@ -275,7 +275,7 @@ void Crew::Bury(Worker* worker) {
 
 // What it has found so far.
 void Crew::Collect(Worker* worker) {
-    const auto size = worker->area->state.load(std::memory_order_acquire).size;
+    const auto size = worker->area->state.load(std::memory_order_acquire).size();
     worker->batch->slot->results.append(worker->area->results.data(), size);
 }
 

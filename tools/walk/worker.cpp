@@ -49,13 +49,11 @@ class Results {
     }
 
  private:
-    void Publish() {
-        area_->state.store({done_, static_cast<std::uint32_t>(size_)}, std::memory_order_release);
-    }
+    void Publish() { area_->state.store({done_, size_}, std::memory_order_release); }
 
     void Post() {
         // A large one comes in pieces.
-        constexpr std::size_t kMost = std::tuple_size_v<decltype(WorkArea::results)> / 2;
+        constexpr std::size_t kMost = WorkArea::kResultsSize / 2;
         for (std::size_t at = 0; at < pending_.size(); at += kMost) {
             Add(kind_, {pending_.data() + at, std::min(kMost, pending_.size() - at)});
         }
@@ -82,7 +80,7 @@ class Results {
     ResultKind kind_ = ResultKind::kOutput;
     std::string pending_;
     std::size_t size_ = 0;
-    std::uint32_t done_ = 0;
+    std::size_t done_ = 0;
 };
 
 class ResultStream final : public std::streambuf {

@@ -19,16 +19,30 @@
 namespace mavoea::tool {
 
 struct WorkArea {
-    // How far it is: errands that are done, and bytes of `results` that count.
-    struct State {
-        std::uint32_t done = 0;
-        std::uint32_t size = 0;
+    static constexpr std::size_t kErrandsMost = 64;  // at a time
+    static constexpr std::size_t kResultsSize = std::size_t{1} << 18;
+
+    // How far it is: errands that are done, and bytes of `results` that count. One word, which all
+    // processors write in one step.
+    class State {
+     public:
+        constexpr State() = default;
+        constexpr State(std::size_t done, std::size_t size)
+            : word_(static_cast<std::uint32_t>(done << kSizeBits | size)) {}
+        constexpr std::size_t done() const { return word_ >> kSizeBits; }
+        constexpr std::size_t size() const { return word_ & ((1U << kSizeBits) - 1); }
+
+     private:
+        static constexpr unsigned kSizeBits = 20;
+        static_assert(kResultsSize < (1U << kSizeBits) && kErrandsMost < (1U << (32 - kSizeBits)));
+
+        std::uint32_t word_ = 0;
     };
     std::atomic<State> state;
     static_assert(std::atomic<State>::is_always_lock_free);
 
     std::array<char, std::size_t{1} << 20> request;
-    std::array<char, std::size_t{1} << 18> results;
+    std::array<char, kResultsSize> results;
 };
 
 // What comes of errands.
