@@ -8,6 +8,8 @@
 
 #include "tests/support/mac_files.h"
 #include "tests/support/stream_builder.h"
+#include "tests/tool/holdings.h"
+#include "tests/tool/kills.h"
 #include "tests/tool/tool.h"
 
 namespace mavoea::test {
@@ -226,6 +228,35 @@ TEST_P(RepairTest, ATreeIsRepairedThoughSomeOfItFails) {
     EXPECT_EQ("1", volume_.Run({"get", sub + "/good", "a"}).out);
     EXPECT_EQ("1", volume_.Run({"get", sub, "a"}).out);
     EXPECT_EQ("1", volume_.Get("a").out);
+}
+
+// Each of the two files has something that goes into the other.
+TEST_P(RepairTest, ARunThatIsKilledLosesNeitherTheStreamsForkNorTheResourcesAttributes) {
+    MAVOEA_SKIP_UNLESS_STOPPED();
+    const Attribute one = {"one", Ascii("1")};
+    const Attribute other = {"other", Ascii("2")};
+    const int type = volume_.type();
+    const Arguments arguments = {"--volume", volume_.path() + '=' + std::to_string(type), "repair",
+                                 volume_.object()};
+    const auto whole = [&] {
+        const Holdings held = HoldingsOf(type, volume_.object());
+        EXPECT_TRUE(held.HasAttribute(one));
+        EXPECT_TRUE(held.HasAttribute(other));
+        EXPECT_TRUE(held.HasFork(Ascii("fork")));
+    };
+    const auto make = [&] {
+        PutResource(volume_.object(), StreamImage{.attributes = {one}}.Build());
+        PutStream(volume_.object(),
+                  StreamImage{.attributes = {other}, .fork = Ascii("fork")}.Build());
+    };
+    KillAtEachChange(arguments, volume_.path(), make, [&] {
+        whole();
+        EXPECT_EQ(0, RunTool(arguments).status);
+        whole();
+        EXPECT_THAT(RunTool({"--volume", volume_.path() + '=' + std::to_string(type), "check",
+                             volume_.object()}),
+                    Succeeded());
+    });
 }
 
 TEST(RepairElsewhereTest, OtherVolumesAreToldSo) {

@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "tools/care/dangling.h"
+#include "tools/care/kept.h"
 #include "tools/say/text.h"
 #include "tools/store/sidecars.h"
 #include "tools/transfer/pending.h"
@@ -72,6 +73,7 @@ void FindSharedNames(const DirectoryRef& directory, FindingSink* sink) {
 void CheckDirectory(const DirectoryRef& directory, FindingSink* sink) {
     FindWhatDangles(directory, sink);
     FindMoves(*directory, sink);
+    for (const Place& kept : FindKeptOfNobody(directory)) sink->AddKept({}, kept.path());
     const Object inside = ObjectAt({directory, kEaDirName}, nullptr);
     if (inside.keeping() == Keeping::kEaDirectory) FindSharedNames(directory, sink);
 }
@@ -84,7 +86,8 @@ Finding SharedNames(const Place& object, const std::string& other) {
 
 bool IsOfTool(const Directory::Entry& entry) {
     if (S_ISDIR(entry.type)) return PendingOwner::Parse(entry.name).has_value();
-    return IsTemporaryName(entry.name) || entry.name.starts_with(kMovingPrefix);
+    return IsTemporaryName(entry.name) || entry.name.starts_with(kMovingPrefix) ||
+           IsKeptName(entry.name);
 }
 
 }  // namespace mavoea::tool

@@ -9,6 +9,7 @@
 
 #include "include/mavoea.h"
 #include "tools/care/check_foreign.h"
+#include "tools/care/kept.h"
 #include "tools/say/text.h"
 #include "tools/store/foreign/detection.h"
 #include "tools/store/locking.h"
@@ -33,6 +34,7 @@ class Check {
         if (sidecars_.problem) CheckEaDirectory(ea_directory);
         if (inode_->HoldsContents()) names_ = inode_->AttributeNames();
         FindProgram(undeclared);
+        for (const Place& kept : FindKept(object_)) sink_.AddKept(object_.path(), kept.path());
         CheckFiles();
         if (in_use_) return sink_.AddFailure(*in_use_);
         if (CheckAttributes(object_, program_, *inode_, names_, &sink_)) {

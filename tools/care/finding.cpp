@@ -87,7 +87,7 @@ std::string FindingCodes() {
     }
     return text +
            "Exit status: 0 sound; 1 something was found; 2 something could not be looked at.\n"
-           "Nothing is changed.";
+           "Without --repair nothing is changed.";
 }
 
 std::string Finding::Text() const {

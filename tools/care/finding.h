@@ -80,6 +80,8 @@ class FindingSink {
     virtual void Add(const Finding& finding) = 0;
     // A Failure of Fault::kInUse is no fault of anybody.
     virtual void AddFailure(const Failure& failure) = 0;
+    // What a repair has replaced is kept there, with which nothing is wrong either.
+    virtual void AddKept(const std::string& path, const std::string& file) = 0;
 };
 
 }  // namespace mavoea::tool

@@ -6,6 +6,7 @@
 
 #include "include/mavoea.h"
 #include "tools/care/upgrade.h"
+#include "tools/care/whole_file.h"
 #include "tools/say/messages.h"
 #include "tools/store/foreign/detection.h"
 #include "tools/store/reader.h"
@@ -39,6 +40,32 @@ void RefuseToLose(const Metadata& metadata) {
     if (!metadata.problems.empty()) throw Failure(metadata.problems.front());
 }
 
+bool Holds(const WholeFile& file, const std::optional<Metadata::Item>& item) {
+    return file && item && item->holder == file->path();
+}
+
+// What of the stream goes into the resource file.
+bool HoldsMore(const WholeFile& stream, const Metadata& metadata) {
+    return Holds(stream, metadata.finder_info) || Holds(stream, metadata.fork) ||
+           std::any_of(metadata.entries.begin(), metadata.entries.end(),
+                       [&](const auto& entry) { return Holds(stream, entry.second); });
+}
+
+// Of two files that are written one after the other each has something that the other gets. So the
+// stream first gets what is in the resource file, and keeps what it has: whichever then is written
+// first, nothing is in neither.
+void JoinInStream(const Object& object, const Sidecars& sidecars, const Metadata& metadata) {
+    Metadata more;
+    for (const Metadata::Attribute& attribute : metadata.attributes) {
+        if (attribute.holder == metadata.whole_resource->path()) {
+            more.attributes.push_back(attribute);
+        }
+    }
+    AddToStream(object, {sidecars.stream->directory, sidecars.stream->name}, more);
+}
+
+}  // namespace
+
 Outcome RepairObject(const Object& volume_object) {
     // The record of a file-EA volume has no part in it.
     constexpr int kEaDirectoryType = 1;
@@ -61,6 +88,8 @@ Outcome RepairObject(const Object& volume_object) {
     RefuseToLose(metadata);
     RequireDeclared(object);
     RequireOwnNames(object);
+    const bool joins = HoldsMore(metadata.whole_stream, metadata);
+    const Metadata found = metadata;
     metadata.whole_resource.reset();
     metadata.whole_stream.reset();
     metadata.strays.clear();
@@ -73,8 +102,10 @@ Outcome RepairObject(const Object& volume_object) {
             "a repair would lose its " + missing.front().item + ": " + missing.front().reason,
             "move the file away if that is no loss");
     }
+    if (joins) JoinInStream(object, sidecars, found);
     const Written written =
-        writer.Write(object, *Inode::Open(object.place), fitting, {.old = Old::kKept});
+        writer.Write(object, *Inode::Open(object.place), fitting,
+                     {.old = Old::kKept, .first = joins ? First::kResource : First::kStream});
     auto lost = WhatIsMissing(fitting, ReadMetadata(object, Sidecars::Services::kFind));
     lost.insert(lost.end(), written.missing.begin(), written.missing.end());
     if (lost.empty()) return Outcome::kDone;
@@ -82,8 +113,6 @@ Outcome RepairObject(const Object& volume_object) {
                   "not all of it arrived: " + lost.front().item + " (" + lost.front().reason + ')',
                   "look at it with: mavoea dump FILE");
 }
-
-}  // namespace
 
 ExitStatus Repair(const TreeOptions& options) {
     return RunOnTree(

@@ -8,6 +8,9 @@ namespace mavoea::tool {
 
 ExitStatus Repair(const TreeOptions& options);
 
+// The same for one object. Throws Failure.
+Outcome RepairObject(const Object& volume_object);
+
 }  // namespace mavoea::tool
 
 #endif  // MAVOEA_TOOLS_CARE_REPAIR_H_

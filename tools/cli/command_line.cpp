@@ -8,6 +8,7 @@
 #include <string_view>
 
 #include "tools/care/finding.h"
+#include "tools/care/mending.h"
 #include "tools/cli/habits.h"
 #include "tools/say/messages.h"
 #include "tools/say/output.h"
@@ -41,6 +42,7 @@ constexpr const char* kExamples = R"(Examples:
   mavoea repair -r /srv/share
   mavoea clean -r /srv/share
   mavoea check -r /srv/share
+  mavoea check -r --repair /srv/share
   mavoea convert -r --to appledouble /srv/share /mnt/share
   mavoea diff -r /srv/share /mnt/share
   mavoea dump @eaDir/letter.txt@MavoEAStream
@@ -361,10 +363,18 @@ constexpr Syntax kCommands[] = {
                        "With what other services keep in EA directories for objects that are gone");
          AddPaths(sub, options, "DIR", "Directories");
      }},
-    {Command::kCheck, "check", "Say whether all that is known of objects is sound; change nothing",
+    {Command::kCheck, "check",
+     "Say whether all that is known of objects is sound; change nothing, but with --repair",
      [](CLI::App* sub, Options* options) {
          sub->add_flag("-v,--verbose", options->verbose, "Say at the end how many there were");
-         sub->footer(FindingCodes());
+         CLI::Option* const repair =
+             sub->add_flag("--repair", options->repair,
+                           "Mend what can be mended without loss; what is replaced is kept beside "
+                           "it");
+         sub->add_flag("--yes", options->yes,
+                       "What repairs have replaced goes, where the object has all that it holds")
+             ->needs(repair);
+         sub->footer(MendingText() + '\n' + FindingCodes());
          AddJobs(sub, options);
          AddRecursive(sub, options);
          AddPaths(sub, options, "PATH", "Files and directories");

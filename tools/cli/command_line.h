@@ -79,7 +79,8 @@ struct Options {
     bool details = false;         // list -l
     bool null = false;            // list
     bool values = false;          // list
-    bool yes = false;             // clean: what is listed is removed
+    bool yes = false;             // clean: what is listed is removed; check: what was replaced
+    bool repair = false;          // check
     bool all = false;             // clean: things of other services, too
     bool absolute_names = false;  // save, restore
     bool data = false;            // diff

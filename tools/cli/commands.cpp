@@ -343,7 +343,10 @@ ExitStatus Run(const Options& options) {
                           .wait = options.wait,
                           .json = options.json});
         case Command::kCheck:
-            return CheckSoundness({.tree = tree, .verbose = options.verbose});
+            return CheckSoundness({.tree = tree,
+                                   .verbose = options.verbose,
+                                   .repair = options.repair,
+                                   .remove = options.yes});
         case Command::kConvert:
             if (options.plan) return ConvertAsPlanned(*options.plan, options.json);
             return Convert(ConversionOf(options));

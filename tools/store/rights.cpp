@@ -2,6 +2,7 @@
 
 #include <acl/libacl.h>
 #include <sys/stat.h>
+#include <sys/xattr.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -70,6 +71,13 @@ void Rights::Give(const File& file) const {
         return;
     }
     if (::fchmod(file.fd(), mode) != 0) throw SystemFailure(file.path(), errno);
+}
+
+void Rights::GiveAgain(const File& file) const {
+    const bool none = ::fremovexattr(file.fd(), kAcl) == 0 || errno == ENODATA ||
+                      errno == ENOTSUP || errno == ENOSYS;
+    if (!none) throw SystemFailure(file.path(), errno);
+    Give(file);
 }
 
 std::optional<std::string> Rights::Missing(const File& file) const {

@@ -23,6 +23,8 @@ class Rights {
     // Gives them to a file that nobody but this process may use yet. Where the owner or group may
     // not be given away nobody gets more than the object gives him. Throws Failure.
     void Give(const File& file) const;
+    // The same to one that others may use: an ACL that it has, and its object has not, goes.
+    void GiveAgain(const File& file) const;
 
     // What of them a file does not have, in words; none when it has all. Throws Failure.
     std::optional<std::string> Missing(const File& file) const;
