@@ -381,7 +381,10 @@ TEST_F(MendTest, WhatAThirdUserHasKeptToHimselfIsNotGivenAway) {
     MAVOEA_SKIP_UNLESS_ANYONE_OWNS(dir_.path());
     PutStream(Add("private"), Image().Build());
     PutStream(Add("text"), Ascii("no stream, but a secret"));
-    for (const char* name : {"private", "text"}) {
+    Bytes damaged = Image().Build();
+    PutU32(damaged, kTotalSizeAt, 130);
+    PutStream(Add("perhaps"), damaged);
+    for (const char* name : {"private", "text", "perhaps"}) {
         const std::string file = dir_ / "@eaDir/" + name + "@MavoEAStream";
         ASSERT_EQ(0, lchown((dir_ / name).c_str(), 1111, 1111));
         ASSERT_EQ(0, chown(file.c_str(), 2222, 2222));

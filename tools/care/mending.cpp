@@ -177,20 +177,6 @@ class Account {
 
 // ---- Rights -------------------------------------------------------------------------------------
 
-// What a third person has kept to himself is not given away by its name alone.
-void RequireShared(const struct stat& file, const struct stat& object, const std::string& path) {
-    constexpr uid_t kRoot = 0;
-    const bool third = file.st_uid != object.st_uid && file.st_uid != kRoot;
-    if (third && (file.st_mode & S_IROTH) == 0) {
-        throw Failure(kFailed, path, "it belongs to another user, who has kept it from others",
-                      "chown it if it is the object's");
-    }
-    if (file.st_uid != object.st_uid && ::geteuid() != kRoot) {
-        throw Failure(kFailed, path, "only the superuser may give it to the object's owner",
-                      "give the command as root");
-    }
-}
-
 void MendRights(const Object& object, const Place& place) {
     const auto inode = Inode::Open(object.place);
     const auto file = place.directory->FindFile(place.name, O_RDONLY);
@@ -205,7 +191,11 @@ void MendRights(const Object& object, const Place& place) {
         throw Failure(kFailed, place.path(), "it is damaged: whose it is cannot be told",
                       "mend that first");
     }
-    RequireShared(info, inode->info(), place.path());
+    RequireShared(*inode, *file);
+    if (info.st_uid != inode->info().st_uid && ::geteuid() != 0) {
+        throw Failure(kFailed, place.path(), "only the superuser may give it to the object's owner",
+                      "give the command as root");
+    }
     Rights::Of(*inode).GiveAgain(*file);
 }
 
@@ -369,6 +359,11 @@ class ObjectMending {
         const auto own = OwnFile(path);
         if (!own) {
             result.why = "files of earlier layouts are not written anew";
+            const auto legacy =
+                Sidecars::Find(object_, Sidecars::Services::kLeaveOut).legacy_resource;
+            if (!legacy || legacy->path() != path) return result;
+            const auto file = legacy->directory->FindFile(legacy->name, O_RDONLY);
+            if (file) result.readable = WhatCanBeRead(file);
             return result;
         }
         try {
@@ -392,7 +387,7 @@ class ObjectMending {
             // Of one that has been written anew just now the old one is kept.
             const auto anew = anew_.find(own->file.path());
             if (anew != anew_.end() && !anew->second.kept.empty()) continue;
-            const auto file = OpenOwn(own->file);
+            const auto file = OpenOwn(object_, own->file);
             if (!file) continue;
             const Place kept = {own->file.directory, KeptName(object_.place.name, own->which)};
             account_.SetKept(finding, KeepOnce(*file, kept, rights));
@@ -402,7 +397,7 @@ class ObjectMending {
 
     // A run that was killed may have kept what was there before it, and written the file already.
     std::string KeepOnce(const File& file, const Place& kept, const Rights& rights) const {
-        const auto before = kept.Status() ? OpenOwn(kept) : nullptr;
+        const auto before = kept.Status() ? OpenOwn(object_, kept) : nullptr;
         if (!before) return Keep(file, kept, rights);
         RequireAllOf(object_, ReadWhole(before));
         return kept.path();
@@ -426,7 +421,7 @@ class ObjectMending {
                           "the resource file is sound; --yes removes the copy", "give --yes");
         }
         const auto& copy = *sidecars.resource_copy;
-        if (!OpenOwn({copy.directory, copy.name})) return;
+        if (!OpenOwn(object_, {copy.directory, copy.name})) return;
         RemoveFiles({copy});
     }
 
@@ -459,7 +454,7 @@ class ObjectMending {
     }
 
     void RemoveKept(const Place& kept) const {
-        const auto file = OpenOwn(kept);
+        const auto file = OpenOwn(object_, kept);
         if (!file) return;
         RequireAllOf(object_, ReadWhole(file));
         // What has been compared is on disk before anything goes.
@@ -522,6 +517,7 @@ void MendDirectory(const DirectoryRef& directory, MendingSink* sink) {
         if (WayOf(one.kind) == Way::kCopy) account.SetWhy(one, "mavoea clean removes it");
     }
     directory->ForgetEntries();
+    directory->Forget(kEaDirName);
     Collector after;
     CheckDirectory(directory, &after);
     account.Say(before.findings, after.findings, true, sink);

@@ -51,7 +51,7 @@ std::optional<StrayFile> FindStray(const Object& object, const std::string& path
     const auto found =
         std::find_if(all.begin(), all.end(), [&](const Found& one) { return one.path() == path; });
     if (found == all.end()) return std::nullopt;
-    StrayFile stray = {*found, OpenOwn({found->directory, found->name}), {}, false};
+    StrayFile stray = {*found, OpenOwn(object, {found->directory, found->name}), {}, false};
     if (!stray.file) return std::nullopt;
     stray.is_value = std::any_of(sidecars.attribute_files.begin(), sidecars.attribute_files.end(),
                                  [&](const Found& one) { return one.path() == path; });

@@ -277,7 +277,15 @@ std::string WhatCanBeRead(const std::shared_ptr<const File>& file) {
     return more == 0 ? text : text + " and " + std::to_string(more) + " more";
 }
 
-std::shared_ptr<const File> OpenOwn(const Place& place) {
+void RequireShared(const Inode& object, const File& file) {
+    const struct stat info = file.Status();
+    const bool third = info.st_uid != object.info().st_uid && info.st_uid != 0;
+    if (!third || (info.st_mode & S_IROTH) != 0) return;
+    throw Failure(kFailed, file.path(), "it belongs to another user, who has kept it from others",
+                  "chown it if it is the object's");
+}
+
+std::shared_ptr<const File> OpenOwn(const Object& object, const Place& place) {
     const auto file = place.directory->FindFile(place.name, O_RDWR);
     if (!file) return nullptr;
     LockFile(*file, Access::kWrite);
@@ -285,13 +293,14 @@ std::shared_ptr<const File> OpenOwn(const Place& place) {
         throw Failure(kFailed, file->path(), "it has several names",
                       "make it a file of its own: copy it, and put the copy in its place");
     }
+    RequireShared(*Inode::Open(object.place), *file);
     return file;
 }
 
 std::string WriteAnew(const Object& object, const FileOfObject& own) {
     RequireDeclared(object);
     if (own.which != KeptOf::kAppleDouble) RequireOwnNames(object);
-    const auto file = OpenOwn(own.file);
+    const auto file = OpenOwn(object, own.file);
     if (!file) throw SystemFailure(own.file.path(), ENOENT);
     RequireNothingPrivate(ReadLayout(*file), *file);
     std::string kept;
@@ -303,7 +312,7 @@ std::string WriteAnew(const Object& object, const FileOfObject& own) {
 }
 
 void AddToStream(const Object& object, const Place& stream, const Metadata& more) {
-    const auto file = OpenOwn(stream);
+    const auto file = OpenOwn(object, stream);
     if (!file) throw SystemFailure(stream.path(), ENOENT);
     Metadata all = ReadWhole(file);
     for (const Metadata::Attribute& attribute : more.attributes) {

@@ -31,9 +31,13 @@ struct FileOfObject {
 };
 
 // Opens it to be changed, locked against others until it is closed. Null when it has gone. Failure
-// for one that is in use, or has other names: somebody may have led here what is none of the
-// object's.
-std::shared_ptr<const File> OpenOwn(const Place& file);
+// for one that is in use, or has other names, or RequireShared(): somebody may have led here what
+// is none of the object's.
+std::shared_ptr<const File> OpenOwn(const Object& object, const Place& file);
+
+// Failure for a file of a third user's, who has kept it from others: that it lies under a name of
+// the object's does not give it to the object's owner.
+void RequireShared(const Inode& object, const File& file);
 
 // Writes it anew with all that it holds, reads that back, and puts it in the place of the old one,
 // whose bytes are kept. Returns the path where they are. Failure, and nothing has changed, where
