@@ -12,6 +12,7 @@
 #include "tools/care/check_directory.h"
 #include "tools/care/check_object.h"
 #include "tools/care/mending.h"
+#include "tools/say/colour.h"
 #include "tools/say/json.h"
 #include "tools/say/output.h"
 #include "tools/say/progress.h"
@@ -101,7 +102,9 @@ class Soundness final : public MendingSink {
             std::cout << json.Line() << '\n';
             return;
         }
-        std::cout << finding.Text() << (mended.done ? "; mended" : "; left: " + mended.why);
+        std::cout << finding.Text() << "; "
+                  << (mended.done ? Coloured(Colour::kGreen, "mended")
+                                  : Coloured(Colour::kYellow, "left") + ": " + mended.why);
         if (!mended.kept.empty()) {
             std::cout << "; the old one is kept in " << Printable(mended.kept);
         }

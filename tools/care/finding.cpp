@@ -4,6 +4,7 @@
 #include <array>
 #include <string_view>
 
+#include "tools/say/colour.h"
 #include "tools/say/text.h"
 
 namespace mavoea::tool {
@@ -91,7 +92,7 @@ std::string FindingCodes() {
 }
 
 std::string Finding::Text() const {
-    std::string text = Printable(path) + ": " + CodeOf(kind) + ": ";
+    std::string text = Printable(path) + ": " + Coloured(Colour::kRed, CodeOf(kind)) + ": ";
     if (!file.empty() && file != path) text += Printable(file) + ": ";
     text += detail;
     std::string place;

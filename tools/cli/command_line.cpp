@@ -492,6 +492,8 @@ std::optional<Word> FindCommand(std::span<const char* const> arguments) {
             return found;
         } else if (word == "--json") {
             found.json = true;
+        } else if (word.starts_with("--color")) {
+            continue;
         } else if (word.starts_with("--volume=")) {
             found.volumes.emplace_back(word.substr(kVolume.size() + 1));
         } else {
@@ -580,6 +582,10 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
     app.fallthrough();
     app.set_version_flag("--version", "mavoea " MAVOEA_TOOL_VERSION, "Show the version");
     app.add_flag("--json", options.json, "Write JSON; bytes are hexadecimal digits");
+    app.add_flag("--color{always}", options.color,
+                 "Of findings and differences: --color=auto, always or never; auto: on a terminal, "
+                 "unless NO_COLOR is set")
+        ->check(CLI::IsMember({"auto", "always", "never"}));
     app.add_option("--volume", options.volumes,
                    "Declare a directory's volume type for this run; may be repeated")
         ->type_name("PATH=TYPE")

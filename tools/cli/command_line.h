@@ -57,6 +57,7 @@ struct Options {
     std::string name;
     std::string format;                   // export
     std::string to;                       // convert: the destination's volume type
+    std::string color = "auto";           // check, diff
     std::string progress;                 // seconds between two lines of it, empty: none
     std::optional<std::string> value;     // set: none of the two means standard input
     std::optional<std::string> file;      // the same

@@ -27,6 +27,7 @@
 #include "tools/move/plan.h"
 #include "tools/place/file.h"
 #include "tools/place/volume.h"
+#include "tools/say/colour.h"
 #include "tools/say/interrupt.h"
 #include "tools/say/output.h"
 #include "tools/say/progress.h"
@@ -259,6 +260,7 @@ ConvertOptions ConversionOf(const Options& options) {
 ExitStatus Run(const Options& options) {
     RequireVolumeTable();
     for (const std::string& volume : options.volumes) DeclareVolume(volume);
+    UseColour(options.color);
     WatchForProgressRequests();
     if (!options.progress.empty()) {
         ReportProgressEach(std::chrono::seconds(std::stoi(options.progress)));

@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "tools/place/volume.h"
+#include "tools/say/colour.h"
 #include "tools/say/interrupt.h"
 #include "tools/say/job.h"
 #include "tools/say/json.h"
@@ -38,6 +39,18 @@ std::string AmountText(const Difference& difference) {
     return difference.offset ? " at byte " + std::to_string(*difference.offset) : "";
 }
 
+// As patches have it: from the first to the second.
+Colour ColourOf(What what) {
+    switch (what) {
+        case What::kMissing:
+            return Colour::kRed;
+        case What::kExtra:
+            return Colour::kGreen;
+        default:
+            return Colour::kYellow;
+    }
+}
+
 std::string PairText(const Pair& pair, const std::vector<Difference>& differences, bool brief) {
     const std::string first = Printable(pair.first.path());
     const std::string second = Printable(pair.second.path());
@@ -49,14 +62,16 @@ std::string PairText(const Pair& pair, const std::vector<Difference>& difference
     if (brief) return text;
     const char* before = ": ";
     for (const Difference& difference : differences) {
-        text += before + ItemText(difference) + AmountText(difference);
+        text += before +
+                Coloured(ColourOf(difference.what), ItemText(difference) + AmountText(difference));
         before = ", ";
     }
     return text;
 }
 
-std::string AloneText(const Place& place) {
-    return "Only in " + Printable(place.directory->path()) + ": " + Printable(place.name);
+std::string AloneText(const Place& place, Side side) {
+    return Coloured(ColourOf(side == Side::kFirst ? What::kMissing : What::kExtra), "Only in") +
+           ' ' + Printable(place.directory->path()) + ": " + Printable(place.name);
 }
 
 // ---- As rsync says it ---------------------------------------------------------------------------
@@ -175,7 +190,8 @@ class Diffing {
             Say(json.Line());
         } else if (options_.itemized) {
             const mode_t mode = StatusOf(pair.first).st_mode;
-            Say(ChangeText(differences, mode) + ' ' + Relative(pair.first, top_.first, mode));
+            Say(Coloured(Colour::kYellow, ChangeText(differences, mode)) + ' ' +
+                Relative(pair.first, top_.first, mode));
         } else {
             Say(PairText(pair, differences, options_.brief));
         }
@@ -195,13 +211,14 @@ class Diffing {
         } else if (options_.itemized) {
             const mode_t mode = StatusOf(place).st_mode;
             if (side == Side::kFirst) {
-                Say(std::string{'>', KindLetter(mode)} + std::string(kLetters.size(), '+') + ' ' +
-                    Relative(place, top_.first, mode));
+                const std::string change =
+                    std::string{'>', KindLetter(mode)} + std::string(kLetters.size(), '+');
+                Say(Coloured(Colour::kGreen, change) + ' ' + Relative(place, top_.first, mode));
             } else {
-                Say("*deleting " + Relative(place, top_.second, mode));
+                Say(Coloured(Colour::kRed, "*deleting") + ' ' + Relative(place, top_.second, mode));
             }
         } else {
-            Say(AloneText(place));
+            Say(AloneText(place, side));
         }
     }
 
