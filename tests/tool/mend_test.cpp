@@ -243,6 +243,62 @@ TEST_F(MendTest, AResourceFileIsWrittenAnewWithItsRecord) {
     EXPECT_EQ("", Check().out);
 }
 
+// Who has written a "._" file counts for Samba, and stays.
+TEST_F(MendTest, AFileBesideAnObjectOfSambasIsWrittenAnewInItsWay) {
+    const Bytes filler = Ascii("Netatalk        ");
+    for (const char* type : {"samba", "netatalk"}) {
+        SCOPED_TRACE(type);
+        type_ = type;
+        const std::string object = Add(type);
+        Bytes damaged =
+            StreamImage{.attributes = {Blue()}, .fork = Ascii("fork"), .filler = filler}.Build();
+        PutU32(damaged, kTotalSizeAt, 130);
+        PutAppleDouble(object, damaged);
+        const std::string file = dir_ / ("._" + std::string(type));
+        EXPECT_EQ(0, Run({"check", "--repair", object}).status)
+            << Run({"check", "--repair", object}).out;
+        EXPECT_EQ("", Run({"check", object}).out);
+        const Bytes mended = BytesIn(file);
+        EXPECT_EQ(filler, Bytes(mended.begin() + 8, mended.begin() + 24));
+        EXPECT_EQ("fork", Run({"get", object, kForkName}).out);
+        EXPECT_EQ(damaged, BytesIn(dir_ / (".mavoea-kept-._" + std::string(type))));
+    }
+}
+
+TEST_F(MendTest, AFullDiskLeavesEverythingAsItWas) {
+    Bytes damaged = Image().Build();
+    PutU32(damaged, kTotalSizeAt, 130);
+    PutStream(Add("a"), damaged);
+    PutLegacy(Add("b"), "large", Pattern(20000));
+    PutStream(dir_ / "b", Image().Build());
+    const Snapshot before = TakeSnapshot(dir_.path());
+    const ToolResult result =
+        Run({"check", "-r", "--repair", "--yes", dir_.path()}, {.file_size = 2000});
+    EXPECT_EQ(1, result.status);
+    EXPECT_THAT(result.out, HasSubstr("; left: "));
+    EXPECT_THAT(
+        Differences(before, TakeSnapshot(dir_.path()), {"mtime of directories", "mtime", "ctime"}),
+        IsEmpty());
+}
+
+TEST_F(MendTest, WhoeverOwnsTheObjectsMayRepairThem) {
+    MAVOEA_SKIP_UNLESS_ROOT();
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
+    Bytes damaged = Image().Build();
+    PutU32(damaged, kTotalSizeAt, 130);
+    PutStream(Add("a"), damaged);
+    PutStream(Add("other"), Image().Build());
+    ASSERT_EQ(0, RunProgram("chown -R 54321:54321 " + Quoted(dir_.path())).status);
+    // Given away by nobody but the superuser.
+    ASSERT_EQ(0, chown((dir_ / "@eaDir/other@MavoEAStream").c_str(), 0, 54321));
+    const ToolResult result =
+        Run({"check", "-r", "--repair", "--yes", dir_.path()}, {.user = 54321});
+    EXPECT_THAT(result.out, HasSubstr("; mended; the old one is kept in "));
+    EXPECT_THAT(result.out, HasSubstr("; left: only the superuser may give it"));
+    EXPECT_THAT(NamesIn(dir_ / "@eaDir"), ElementsAre("a@MavoEAStream", "other@MavoEAStream"));
+    EXPECT_TRUE(Held(dir_ / "a").HasAttribute(Size()));
+}
+
 // ---- Damage of which something has gone ---------------------------------------------------------
 
 // A stream cut at each length, and each field of its header with other values: what is changed is

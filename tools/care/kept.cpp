@@ -92,7 +92,7 @@ std::vector<Place> FindKeptOfNobody(const DirectoryRef& directory) {
 }
 
 std::string Keep(const File& file, const Place& kept, const Rights& rights) {
-    const std::string path = kept.path();
+    std::string path = kept.path();
     if (const auto before = kept.directory->FindFile(kept.name, O_RDONLY)) {
         const bool same = before->Status().st_nlink == 1 && before->Size() == file.Size() &&
                           !FirstDifference(All(file), All(*before));

@@ -286,7 +286,7 @@ void RequireShared(const Inode& object, const File& file) {
 }
 
 std::shared_ptr<const File> OpenOwn(const Object& object, const Place& place) {
-    const auto file = place.directory->FindFile(place.name, O_RDWR);
+    auto file = place.directory->FindFile(place.name, O_RDWR);
     if (!file) return nullptr;
     LockFile(*file, Access::kWrite);
     if (file->Status().st_nlink > 1) {

@@ -74,9 +74,13 @@ void Rights::Give(const File& file) const {
 }
 
 void Rights::GiveAgain(const File& file) const {
-    const bool none = ::fremovexattr(file.fd(), kAcl) == 0 || errno == ENODATA ||
-                      errno == ENOTSUP || errno == ENOSYS;
-    if (!none) throw SystemFailure(file.path(), errno);
+    constexpr mode_t kOwnerBits = 0700;
+    const bool goes = !acl_ && ::fgetxattr(file.fd(), kAcl, nullptr, 0) > 0;
+    // Without it the group would have what the list granted at most to anybody.
+    if (goes && (::fchmod(file.fd(), file.Status().st_mode & kOwnerBits) != 0 ||
+                 ::fremovexattr(file.fd(), kAcl) != 0)) {
+        throw SystemFailure(file.path(), errno);
+    }
     Give(file);
 }
 
