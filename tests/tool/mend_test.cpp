@@ -569,6 +569,28 @@ TEST_F(MendTest, WhatMacsIgnoreIsWrittenAnew) {
     EXPECT_EQ(file, BytesIn(dir_ / ".mavoea-kept-._a"));
 }
 
+TEST_F(MendTest, WhatSmbdIgnoresIsWrittenAnewIfThatHelps) {
+    type_ = "samba";
+    const Bytes three = PlainAppleDouble(Pattern(32), Ascii("fork"), 3);  // the third is empty
+    PutAppleDouble(Add("three"), three);
+    const Bytes comment = AppleDoubleOf(
+        {{kFinderInfoEntry, Pattern(32)}, {kCommentEntry, Ascii("a")}, {kForkEntry, Ascii("f")}});
+    PutAppleDouble(Add("comment"), comment);
+    const Bytes large = StreamImage{.attributes = {{"a", Pattern(65536)}}}.Build();
+    PutAppleDouble(Add("large"), large);
+    EXPECT_EQ((std::set<std::string>{"smbd-ignores-file mended", "smbd-ignores-file left"}),
+              Became());
+    EXPECT_EQ("", Run({"check", dir_ / "three"}).out);
+    EXPECT_EQ("fork", Run({"get", dir_ / "three", kForkName}).out);
+    EXPECT_EQ(three, BytesIn(dir_ / ".mavoea-kept-._three"));
+    EXPECT_EQ(comment, BytesIn(dir_ / "._comment"));
+    EXPECT_EQ(large, BytesIn(dir_ / "._large"));
+    EXPECT_FALSE(Exists(dir_ / ".mavoea-kept-._large"));
+    EXPECT_THAT(Repair().out,
+                HasSubstr("; left: a new one would be ignored as well: its attributes "
+                          "take "));
+}
+
 // ---- Every kind ---------------------------------------------------------------------------------
 
 // What only a person can decide is said, and is as it was.
@@ -932,6 +954,40 @@ TEST_F(MendTest, KilledAtAnyChangeNothingIsLostAndTheSameCommandFinishes) {
             EXPECT_EQ("", RunTool({"--volume", volume, "check", "-r", share}).out);
         },
         {}, Says::kNotes);
+}
+
+TEST_F(MendTest, KilledAtAnyChangeAnAppleDoubleFileIsTheOldOrTheNewOne) {
+    MAVOEA_SKIP_UNLESS_STOPPED();
+    Bytes damaged = Image().Build();
+    PutU32(damaged, kTotalSizeAt, 130);
+    const std::string share = dir_ / "share";
+    const std::string volume = share + "=0";
+    const auto make = [&] {
+        ASSERT_EQ(0, RunProgram("rm -rf " + Quoted(share)).status);
+        MakeDir(share);
+        WriteFile(share + "/a", Ascii("data"));
+        PutAppleDouble(share + "/a", damaged);
+    };
+    for (const bool yes : {false, true}) {
+        Arguments arguments = {"--volume", volume, "check", "-r", "--repair", share};
+        if (yes) arguments.emplace_back("--yes");
+        KillAtEachChange(
+            arguments, dir_.path(), make,
+            [&] {
+                const bool has_new = HoldingsOf(0, share + "/a").HasAttribute(Size());
+                EXPECT_TRUE(BytesIn(share + "/._a") == damaged || has_new);
+                const ToolResult again = RunTool(arguments);
+                EXPECT_EQ(0, again.status) << again.out << again.err;
+                const Holdings held = HoldingsOf(0, share + "/a");
+                for (const Attribute& one : Image().attributes) {
+                    EXPECT_TRUE(held.HasAttribute(one)) << one.name;
+                }
+                EXPECT_TRUE(held.HasFork(Image().fork));
+                EXPECT_EQ(yes ? Bytes() : damaged, BytesIn(share + "/.mavoea-kept-._a"));
+                EXPECT_EQ("", RunTool({"--volume", volume, "check", "-r", share}).out);
+            },
+            {}, Says::kNotes);
+    }
 }
 
 }  // namespace

@@ -20,6 +20,7 @@
 #include "tools/care/strays.h"
 #include "tools/care/whole_file.h"
 #include "tools/say/text.h"
+#include "tools/store/acceptance.h"
 #include "tools/store/adoption.h"
 #include "tools/store/foreign/detection.h"
 #include "tools/store/locking.h"
@@ -174,6 +175,12 @@ class Account {
     std::map<Key, std::string> why_;
     std::map<Key, std::string> readable_;
 };
+
+WhyIgnored WhyIgnoredBy(FindingKind kind) {
+    return kind == FindingKind::kSmbdIgnoresFile  ? WhySmbdIgnores
+           : kind == FindingKind::kMacIgnoresFile ? WhyMacIgnores
+                                                  : nullptr;
+}
 
 // ---- Rights -------------------------------------------------------------------------------------
 
@@ -347,14 +354,15 @@ class ObjectMending {
     // Once for all findings of a file.
     void WriteFileAnew(const Finding& finding, const std::string& path) {
         auto known = anew_.find(path);
-        if (known == anew_.end()) known = anew_.emplace(path, TryToWriteAnew(path)).first;
+        if (known == anew_.end())
+            known = anew_.emplace(path, TryToWriteAnew(finding.kind, path)).first;
         const Mended& result = known->second;
         if (!result.why.empty()) account_.SetWhy(finding, result.why);
         if (!result.kept.empty()) account_.SetKept(finding, result.kept);
         if (!result.readable.empty()) account_.SetReadable(finding, result.readable);
     }
 
-    Mended TryToWriteAnew(const std::string& path) const {
+    Mended TryToWriteAnew(FindingKind kind, const std::string& path) const {
         Mended result;
         const auto own = OwnFile(path);
         if (!own) {
@@ -367,7 +375,7 @@ class ObjectMending {
             return result;
         }
         try {
-            result.kept = WriteAnew(object_, *own);
+            result.kept = WriteAnew(object_, *own, WhyIgnoredBy(kind));
         } catch (const Failure& failure) {
             result.why = failure.cause();
             const auto file = own->file.directory->FindFile(own->file.name, O_RDONLY);

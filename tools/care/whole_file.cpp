@@ -219,7 +219,7 @@ void Replace(const Object& object, const FileOfObject& own, const std::shared_pt
     Fill(written.shared_file(), all, ReadLayout(*file), own.which);
     rights.Give(written.file());
     written.file().Sync();
-    before_it_goes(rights);
+    before_it_goes(written.file(), rights);
     const auto now = own.file.Status();
     if (!now || !IsUnchanged(before, *now)) {
         throw Failure(kFailed, own.file.path(), "somebody has changed it meanwhile",
@@ -297,14 +297,18 @@ std::shared_ptr<const File> OpenOwn(const Object& object, const Place& place) {
     return file;
 }
 
-std::string WriteAnew(const Object& object, const FileOfObject& own) {
+std::string WriteAnew(const Object& object, const FileOfObject& own, WhyIgnored why_ignored) {
     RequireDeclared(object);
     if (own.which != KeptOf::kAppleDouble) RequireOwnNames(object);
     const auto file = OpenOwn(object, own.file);
     if (!file) throw SystemFailure(own.file.path(), ENOENT);
     RequireNothingPrivate(ReadLayout(*file), *file);
     std::string kept;
-    Replace(object, own, file, ReadWhole(file), [&](const Rights& rights) {
+    Replace(object, own, file, ReadWhole(file), [&](const File& written, const Rights& rights) {
+        const auto why = why_ignored != nullptr ? why_ignored(ReadLayout(written)) : std::nullopt;
+        if (why)
+            throw Failure(kFailed, own.file.path(), "a new one would be ignored as well: " + *why,
+                          kSalvage);
         const Place place = {own.file.directory, KeptName(object.place.name, own.which)};
         kept = Keep(*file, place, rights);
     });
@@ -320,7 +324,7 @@ void AddToStream(const Object& object, const Place& stream, const Metadata& more
                       [&](const auto& known) { return known.name == attribute.name; });
         all.attributes.push_back(attribute);
     }
-    Replace(object, {stream, KeptOf::kStream}, file, all, [](const Rights&) {});
+    Replace(object, {stream, KeptOf::kStream}, file, all, [](const File&, const Rights&) {});
 }
 
 }  // namespace mavoea::tool

@@ -39,10 +39,14 @@ std::shared_ptr<const File> OpenOwn(const Object& object, const Place& file);
 // the object's does not give it to the object's owner.
 void RequireShared(const Inode& object, const File& file);
 
+// Why a program would not read a file; none: it would.
+using WhyIgnored = std::optional<std::string> (*)(const Layout&);
+
 // Writes it anew with all that it holds, reads that back, and puts it in the place of the old one,
 // whose bytes are kept. Returns the path where they are. Failure, and nothing has changed, where
-// something of it would not arrive.
-std::string WriteAnew(const Object& object, const FileOfObject& own);
+// something of it would not arrive, or the new one would be ignored as well; `why_ignored` is null
+// where that does not matter.
+std::string WriteAnew(const Object& object, const FileOfObject& own, WhyIgnored why_ignored);
 
 // Writes an EA stream anew with these attributes besides all that it holds; of the same names the
 // new ones count. Failure, and nothing has changed, where something of it would not arrive.
