@@ -354,8 +354,9 @@ class ObjectMending {
     // Once for all findings of a file.
     void WriteFileAnew(const Finding& finding, const std::string& path) {
         auto known = anew_.find(path);
-        if (known == anew_.end())
+        if (known == anew_.end()) {
             known = anew_.emplace(path, TryToWriteAnew(finding.kind, path)).first;
+        }
         const Mended& result = known->second;
         if (!result.why.empty()) account_.SetWhy(finding, result.why);
         if (!result.kept.empty()) account_.SetKept(finding, result.kept);

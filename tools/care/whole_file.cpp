@@ -306,9 +306,10 @@ std::string WriteAnew(const Object& object, const FileOfObject& own, WhyIgnored 
     std::string kept;
     Replace(object, own, file, ReadWhole(file), [&](const File& written, const Rights& rights) {
         const auto why = why_ignored != nullptr ? why_ignored(ReadLayout(written)) : std::nullopt;
-        if (why)
+        if (why) {
             throw Failure(kFailed, own.file.path(), "a new one would be ignored as well: " + *why,
                           kSalvage);
+        }
         const Place place = {own.file.directory, KeptName(object.place.name, own.which)};
         kept = Keep(*file, place, rights);
     });
