@@ -679,6 +679,54 @@ TEST_F(MendTest, EveryKindSaysInTheHelpAndTheManualHowItIsMended) {
     EXPECT_EQ(26, count);
 }
 
+// All that can be mended in one tree; what the tool reads of it is the same before and behind.
+TEST_F(MendTest, AWholeTreeIsSoundAfterwardsAndHasAllThatCouldBeRead) {
+    MakeDir(dir_ / "sub");
+    Bytes damaged = Image().Build();
+    PutU32(damaged, kTotalSizeAt, 130);
+    for (const char* name : {"stream", "sub/stream", "both"}) PutStream(Add(name), damaged);
+    PutStream(dir_ / "sub", damaged);
+    for (const char* name : {"resource", "both"}) {
+        Add(name);
+        Bytes other = StreamImage{.attributes = {{"weight", Ascii("1")}},
+                                  .fork = Image().fork,
+                                  .finder_info = Pattern(32, 9)}
+                          .Build();
+        PutU32(other, kDataLengthAt, 3);
+        PutResource(dir_ / name, other);
+    }
+    PutLegacy(Add("legacy"), "colour", Ascii("blue"));
+    PutAppleDouble(Add("mac"), MacSidecar({{{"a", Ascii("1")}}, Pattern(32), {}}).bytes);
+    PutStream(Add("stranded"), Image().Build());
+    PutLegacy(dir_ / "stranded", "colour", Ascii("blue"));
+    PutStream(Add("misplaced"), Image().Build());
+    PutAppleDouble(dir_ / "misplaced", Image().Build());
+    PutStream(Add("rights"), Image().Build());
+    ASSERT_EQ(0, chmod((dir_ / "@eaDir/rights@MavoEAStream").c_str(), 0606));
+    Add(".mavoea-0123abcd");
+    const auto values = [&] {
+        std::map<std::string, std::string> all;  // by path and name
+        for (const nlohmann::json& line :
+             JsonLines(Run({"--json", "list", "-r", "--values", dir_.path()}))) {
+            if (!line.contains("attributes")) continue;
+            for (const nlohmann::json& one : line["attributes"]) {
+                all[line["path"].get<std::string>() + ' ' + one["name"].get<std::string>()] =
+                    one.at("base64").dump();
+            }
+        }
+        return all;
+    };
+    const auto before = values();
+    EXPECT_LT(30U, before.size());
+    EXPECT_EQ((std::set<std::string>{"damaged-stream mended", "damaged-resource-file mended",
+                                     "misplaced-attributes mended", "earlier-layout mended",
+                                     "stranded-metadata mended", "misplaced-metadata mended",
+                                     "other-rights mended", "left-temporary-file mended"}),
+              Became({"--yes"}));
+    EXPECT_THAT(Check(), Succeeded());
+    EXPECT_EQ(before, values());
+}
+
 // ---- What is kept -------------------------------------------------------------------------------
 
 class KeptTest : public MendTest {
