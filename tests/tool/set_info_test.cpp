@@ -107,6 +107,14 @@ INSTANTIATE_TEST_SUITE_P(Kinds, SetInfoTest,
 
 // ---- Finder info --------------------------------------------------------------------------------
 
+TEST_P(SetInfoTest, WhatIsLockedIsChangedAndStaysLocked) {
+    ASSERT_THAT(share_.Run({"lock", share_.file()}), Succeeded());
+    EXPECT_THAT(share_.SetInfo({"--type", "TEXT", "--comment", "Dear diary"}), Succeeded());
+    EXPECT_EQ(Hex("'TEXT' 00*28"), share_.Get(kFinderInfo));
+    EXPECT_EQ(DearDiary(), share_.Get(kComment));
+    EXPECT_EQ(Ascii("1"), share_.Get("mavoea.locked"));
+}
+
 TEST_P(SetInfoTest, FinderInfoIsChangedWhereItIsAskedForAndStaysElsewhere) {
     share_.Set(kFinderInfo, Hex("'OLD!' 'made' 88 41 00 14 FF F0 01 02") + Pattern(16, 1));
     share_.Set(kFork, Ascii("fork"));

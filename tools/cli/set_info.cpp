@@ -394,6 +394,7 @@ class InfoSetting {
     void Compare(std::vector<Missing>* missing) const {
         const Metadata found = ReadMetadata(object_, Sidecars::Services::kLeaveOut);
         Metadata wanted;
+        wanted.locked = before_.locked;
         const auto gone = [&](bool is_there, const std::string& item) {
             if (is_there) missing->push_back({item, "it is there still"});
         };
