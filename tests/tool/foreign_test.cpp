@@ -480,6 +480,35 @@ TEST_F(ForeignTest, WhatIsDamagedIsToldAndTheRestIsShown) {
                       HasSubstr("AFP_AfpInfo is damaged"), HasSubstr("a part of it is missing")));
 }
 
+TEST_F(ForeignTest, TheBackupTimeOfAStreamOutlivesItsFinderInfo) {
+    Bytes info = AfpInfo(FinderInfo(2)) + Bytes{0};
+    Put(info, 12, FromHex("11223344"));
+    // The time of creation is that of the DOS attributes, 2026-11-20.
+    Bytes kept = Record(Bytes(32));
+    Put(kept, 354, FromHex("32933d59"));
+    Put(kept, 362, FromHex("11223344"));
+    const std::vector<Arguments> ways = {
+        {"remove", stream_.file(), kFinderInfoName},
+        {"set-info", stream_.file(), "--type", "\\x00\\x00\\x00\\x00", "--creator",
+         "\\x00\\x00\\x00\\x00", "--label", "none"}};
+    for (const Arguments& way : ways) {
+        SCOPED_TRACE(way[0]);
+        SetAttribute(stream_.file(), kDosAttributes, Dos(0x20));
+        SetAttribute(stream_.file(), kAfpInfo, info);
+        EXPECT_THAT(stream_.Run(way), Succeeded());
+        EXPECT_EQ(std::nullopt, Attribute(stream_.file(), kAfpInfo));
+        EXPECT_EQ(kept, Attribute(stream_.file(), kRecord));
+        ASSERT_EQ(0, removexattr(stream_.file().c_str(), kRecord.c_str()));
+    }
+    // So does the one that another setting has left there.
+    SetAttribute(samba_.file(), kDosAttributes, Dos(0x20));
+    SetAttribute(samba_.file(), kAfpInfo, info);
+    EXPECT_THAT(samba_.Set(kFinderInfoName, FinderInfo(4)), Succeeded());
+    EXPECT_EQ(std::nullopt, Attribute(samba_.file(), kAfpInfo));
+    Put(kept, 122, FinderInfo(4));
+    EXPECT_EQ(kept, Attribute(samba_.file(), kRecord));
+}
+
 // ---- Marks --------------------------------------------------------------------------------------
 
 TEST_F(ForeignTest, TheLockIsWhatClientsHonour) {

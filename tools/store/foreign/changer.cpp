@@ -82,6 +82,7 @@ class ForeignChanger final : public Changer {
     }
 
     void SetFinderInfo(const Bytes& value) {
+        if (SpellFinderInfo(dialect_).datum != Datum::kAfpInfo) KeepBackupTime();
         if (dialect_.finder_info == Dialect::FinderInfo::kRecord) {
             ForeignRecord record = ForeignRecord::Read(*inode_);
             record.Set(EntryId::kFinderInfo, value);
@@ -110,7 +111,29 @@ class ForeignChanger final : public Changer {
         Store(*inode_, spelling, Bytes(bytes.begin(), bytes.end()));
     }
 
+    // A stream that is to go has the backup time as well, which is no part of the Finder info: the
+    // record takes it, if it has none.
+    void KeepBackupTime() const {
+        for (const Spelling& spelling : SpellingsOf(*inode_, dialect_)) {
+            if (spelling.datum != Datum::kAfpInfo) continue;
+            const auto value = spelling.Value(*inode_);
+            const auto info = value ? DecodeAfpInfo(*value) : std::nullopt;
+            if (!info || info->backup_time == kNoBackupTime) continue;
+            ForeignRecord record = ForeignRecord::Read(*inode_);
+            Bytes dates = record.Entry(EntryId::kFileDates);
+            for (std::size_t at = dates.size(); at < kFileDatesSize; at += sizeof kUnknownDate) {
+                dates.resize(at + sizeof kUnknownDate);
+                StoreBe32(kUnknownDate, &dates[at]);
+            }
+            if (LoadBe32(&dates[kBackupDateOffset]) != kUnknownDate) return;
+            StoreBe32(info->backup_time, &dates[kBackupDateOffset]);
+            record.Set(EntryId::kFileDates, std::move(dates));
+            record.Store(*inode_, dialect_);
+        }
+    }
+
     bool RemoveFinderInfo() {
+        KeepBackupTime();
         bool removed = RemoveSpellings({Datum::kAfpInfo, Datum::kFinderInfo}, {});
         removed |= ClearRecord();
         removed |= SetFinderInfoOfFile(Bytes(kFinderInfoSize));
