@@ -293,12 +293,14 @@ TEST_F(CheckTest, ADirectoryInThePlaceOfAnAppleDoubleFileIsTold) {
 TEST_F(CheckTest, MetadataOfOtherRightsThanItsObjectIsTold) {
     MAVOEA_SKIP_UNLESS_ROOT();
     MAVOEA_SKIP_UNLESS_ANYONE_OWNS(dir_.path());
-    for (const char* name : {"mode", "owner", "group", "acl", "program", "same"}) {
+    for (const char* name : {"mode", "owner", "group", "acl", "program", "run", "same"}) {
         ASSERT_EQ(0, chmod(Add(name).c_str(), 0640));
         PutStream(dir_ / name, ColourStream());
         ASSERT_EQ(0, chmod((dir_ / "@eaDir/" + name + "@MavoEAStream").c_str(), 0640));
     }
     ASSERT_EQ(0, chmod((dir_ / "program").c_str(), 0750));
+    ASSERT_EQ(0, chmod((dir_ / "@eaDir/program@MavoEAStream").c_str(), 0740));
+    ASSERT_EQ(0, chmod((dir_ / "@eaDir/run@MavoEAStream").c_str(), 0740));
     ASSERT_EQ(0, chmod((dir_ / "@eaDir/mode@MavoEAStream").c_str(), 0644));
     ASSERT_EQ(0, chown((dir_ / "@eaDir/owner@MavoEAStream").c_str(), 4321, 0));
     ASSERT_EQ(0, chown((dir_ / "@eaDir/group@MavoEAStream").c_str(), 0, 4321));
@@ -310,7 +312,8 @@ TEST_F(CheckTest, MetadataOfOtherRightsThanItsObjectIsTold) {
     EXPECT_THAT(Found(), ElementsAre("other-rights acl @eaDir/acl@MavoEAStream",
                                      "other-rights group @eaDir/group@MavoEAStream",
                                      "other-rights mode @eaDir/mode@MavoEAStream",
-                                     "other-rights owner @eaDir/owner@MavoEAStream"));
+                                     "other-rights owner @eaDir/owner@MavoEAStream",
+                                     "other-rights run @eaDir/run@MavoEAStream"));
     EXPECT_THAT(Check().out, AllOf(HasSubstr("its mode is 0644, not 0640\n"),
                                    HasSubstr("its owner is 4321, not 0\n"),
                                    HasSubstr("its group is 4321, not 0\n")));

@@ -13,6 +13,7 @@ namespace mavoea::tool {
 namespace {
 
 constexpr mode_t kReadWrite = 0666;
+constexpr mode_t kExecute = 0111;
 constexpr mode_t kGroupBits = 0070;
 constexpr const char* kAcl = "system.posix_acl_access";
 
@@ -43,6 +44,7 @@ Rights Rights::Of(const Inode& object) {
     rights.owner_ = info.st_uid;
     rights.group_ = info.st_gid;
     rights.mode_ = info.st_mode & kReadWrite;
+    rights.may_have_ = info.st_mode & kExecute;
     // One that says no more than the mode is not kept.
     if (object.HoldsContents() && object.Attribute(kAcl)) {
         rights.acl_.reset(acl_get_file(object.ProcPath().c_str(), ACL_TYPE_ACCESS));
@@ -93,7 +95,7 @@ std::optional<std::string> Rights::Missing(const File& file) const {
     if (now.st_uid != owner_) return other("its owner is ", now.st_uid, owner_);
     if (now.st_gid != group_) return other("its group is ", now.st_gid, group_);
     const bool by_acl = acl_ && !cut_;
-    if (!by_acl && (now.st_mode & kAllBits) != mode_) {
+    if (!by_acl && (now.st_mode & kAllBits & ~may_have_) != mode_) {
         return "its mode is " + Octal(now.st_mode & kAllBits) + ", not " + Octal(mode_);
     }
     // Of a file without one it is what the mode says.

@@ -41,6 +41,8 @@ class Rights {
     uid_t owner_ = 0;
     gid_t group_ = 0;
     mode_t mode_ = 0;
+    mode_t may_have_ =
+        0;              // the object's bits of execution: Samba gives its "._" files the same mode
     bool cut_ = false;  // the mode has the last word
     Acl acl_;           // null where the mode says all
 };
