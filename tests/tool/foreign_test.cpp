@@ -305,7 +305,7 @@ TEST_F(ForeignTest, AValueThatHasNoRoomIsNamedWithItsSizeAndTheLimit) {
     EXPECT_FALSE(linux_.Has(kForkName));
     // With the NUL behind it, Samba's have one less.
     EXPECT_THAT(samba_.Set(kColour, Bytes(65536, 'x')).err,
-                HasSubstr("no room for its 65536 bytes"));
+                HasSubstr("no room for its 65536 bytes: a value has 65535 bytes at most;"));
 }
 
 TEST_F(ForeignTest, AnAttributeWithoutAValueIsKeptAndThatClientsDoNotSeeItIsTold) {

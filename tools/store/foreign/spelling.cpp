@@ -46,13 +46,15 @@ bool IsReserved(const std::string& attribute) {
 }
 
 // What there is room for, in words.
-std::string Limit(const Inode& inode) {
+std::string Limit(const Inode& inode, const Spelling& spelling, std::size_t size) {
+    const std::size_t most = kValueMax - (spelling.has_nul ? 1 : 0);
     struct statfs info = {};
-    if (inode.fd() >= 0 && ::fstatfs(inode.fd(), &info) == 0 && info.f_type == EXT4_SUPER_MAGIC) {
+    if (size <= most && inode.fd() >= 0 && ::fstatfs(inode.fd(), &info) == 0 &&
+        info.f_type == EXT4_SUPER_MAGIC) {
         return "the file system has " + std::to_string(info.f_bsize) +
                " bytes for all attributes of an object";
     }
-    return "an attribute has " + std::to_string(kValueMax) + " bytes at most";
+    return "a value has " + std::to_string(most) + " bytes at most";
 }
 
 }  // namespace
@@ -167,9 +169,10 @@ void Store(const Inode& inode, const Spelling& spelling, Bytes value) {
     const std::size_t size = value.size();
     if (spelling.has_nul) value.push_back(0);
     const auto no_room = [&] {
-        return Failure(kFailed, inode.path(),
-                       "no room for its " + std::to_string(size) + " bytes: " + Limit(inode),
-                       "make it smaller, or use a file system with more room for attributes");
+        return Failure(
+            kFailed, inode.path(),
+            "no room for its " + std::to_string(size) + " bytes: " + Limit(inode, spelling, size),
+            "make it smaller, or use a file system with more room for attributes");
     };
     if (value.size() > kValueMax) throw no_room();
     try {
