@@ -21,7 +21,7 @@ if __name__ == "__main__":
 import tool_test
 from layouts_test import FINDER_INFO, OTHER_FINDER_INFO, RECORD, afp_info, mac_file
 from mac_client import ARCHIVE, HIDDEN, NORMAL, READ_ONLY, SYSTEM, Mac
-from tool_test import FINDER_INFO_NAME, FORK_NAME, NAMES, TYPES
+from tool_test import FINDER_INFO_NAME, FORK_NAME, NAMES, TYPES, on_each_share
 
 TAGS_NAME = "com.apple.metadata:_kMDItemUserTags"
 TAGS_STREAM = TAGS_NAME.replace(":", "\uf022")
@@ -438,6 +438,43 @@ class RecordTest(ItemTest):
                         (found[154:354], found[354:370], found[370:374]),
                         step.__name__,
                     )
+
+
+class HostVolumeTest(ItemTest):
+    """A volume of the library's own, which is a share: clients' marks are the library's."""
+
+    @on_each_share
+    def test_either_changes_the_marks_that_the_other_has_set(self):
+        self.volume = f"--volume={self.folder}=eadir"
+        for make in (self.make, self.make_directory):
+            make()
+            both = HIDDEN | ARCHIVE
+            for client, restored in (
+                (HIDDEN, 0),
+                (ARCHIVE, HIDDEN),
+                (0, HIDDEN),
+                (SYSTEM, HIDDEN),
+                (SYSTEM | HIDDEN | ARCHIVE, 0),
+                (0, 0),
+            ):
+                with self.subTest(make=make.__name__, client=client, restored=restored):
+                    self.mac.set_attributes(self.name, client or NORMAL, tool_test.TIME)
+                    self.expect_marks(client)
+                    text = [f"# file: {self.name}", 'user.colour="red"']
+                    text += ['user.mavoea.hidden="1"'] if restored else []
+                    text = "\n".join((*text, "", "")).encode()
+                    self.tool(self.volume, "restore", "--directory", self.folder, value=text)
+                    self.expect_marks(client | restored)
+
+    def expect_marks(self, marks):
+        """At the second and at the third open, too."""
+        for _ in range(2):
+            with Mac(tool_test.server, self.share) as mac:
+                attributes, created, _ = mac.look(self.name)
+            self.assertEqual((marks, tool_test.TIME), (attributes & sum(MARKS), created))
+            shown = json.loads(self.tool(self.volume, "show", "--json", self.path))
+            known = {MARKS[mark] for mark in MARKS if marks & mark}
+            self.assertEqual(known, {*shown["marks"]})
 
 
 class SizeTest(ItemTest):
