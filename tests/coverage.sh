@@ -4,7 +4,7 @@
 set -eu
 cd "$(dirname "$0")/.."
 sh tests/packages.sh g++ cmake ninja-build pkg-config libacl1-dev libattr1-dev libcli11-dev \
-    nlohmann-json3-dev libgtest-dev libgmock-dev acl attr e2fsprogs xfsprogs btrfs-progs gcovr
+    nlohmann-json3-dev libgtest-dev libgmock-dev acl attr scdoc e2fsprogs xfsprogs btrfs-progs gcovr
 cmake --preset coverage
 cmake --build --preset coverage
 find build/coverage -name '*.gcda' -delete

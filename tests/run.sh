@@ -27,7 +27,7 @@ sh tests/packages.sh g++ cmake ninja-build pkg-config libacl1-dev libattr1-dev l
     e2fsprogs xfsprogs btrfs-progs clang-format clang-tidy clang libclang-rt-14-dev cppcheck git \
     python3 abigail-tools util-linux g++-powerpc-linux-gnu gcc-powerpc-linux-gnu qemu-user \
     googletest dpkg-dev make autoconf automake libtool libplist-dev samba samba-vfs-modules \
-    smbclient python3-impacket
+    smbclient python3-impacket scdoc man-db mandoc bash-completion zsh fish
 
 build_and_test release
 step "coreutils' tests of cp, mv and rm"
