@@ -5,10 +5,12 @@
 #include <array>
 #include <iostream>
 #include <span>
+#include <sstream>
 #include <string_view>
 
 #include "tools/care/finding.h"
 #include "tools/care/mending.h"
+#include "tools/cli/completion.h"
 #include "tools/cli/habits.h"
 #include "tools/say/messages.h"
 #include "tools/say/output.h"
@@ -27,6 +29,7 @@ constexpr const char* kExamples = R"(Examples:
   mavoea show letter.txt
   mavoea remove letter.txt com.example.colour
   mavoea lock letter.txt
+  mavoea unlock -r /srv/share
   mavoea import ._letter.txt letter.txt
   mavoea import letter.hqx /srv/share
   mavoea import -r /srv/share/unpacked
@@ -61,6 +64,21 @@ Of cp, mv and rm: 1 something could not be done; 2 all objects arrived, and not 
 143 interrupted, after the object in hand. Under the names cp, mv and rm the tool is that command.
 A NAME or VALUE that begins with '-' stands behind "--". Control characters in names are shown as
 "\x0A", backslashes doubled, and --escaped takes them so; --json has names as they are.)";
+
+// Those of the examples that call a command, under their title.
+std::string ExamplesOf(std::string_view command) {
+    std::string found;
+    std::istringstream lines(kExamples);
+    for (std::string line; std::getline(lines, line) && !line.empty();) {
+        std::istringstream words(line);
+        std::string word;
+        while (words >> word && word != "mavoea") {
+        }
+        while (words >> word && word == "--volume") words >> word;
+        if (words && word == command) found += '\n' + line;
+    }
+    return found.empty() ? found : "Examples:" + found;
+}
 
 // CLI11 takes "[a,b]" apart where an option has several values. A byte in front keeps it whole.
 constexpr char kGuard = '\x01';
@@ -518,7 +536,10 @@ std::optional<Habit> HabitOf(Command command) {
 
 std::variant<Options, int> ParseAs(Command command, Habit habit, std::span<const char* const> words,
                                    Word before = {}) {
-    auto parsed = ParseHabit(habit, words);
+    const auto* const syntax =
+        std::find_if(std::begin(kCommands), std::end(kCommands),
+                     [&](const Syntax& one) { return one.command == command; });
+    auto parsed = ParseHabit(habit, words, ExamplesOf(syntax->name));
     if (const int* const status = std::get_if<int>(&parsed)) return *status;
     auto& read = std::get<HabitOptions>(parsed);
     Options options;
@@ -553,7 +574,83 @@ Failure NoCommand(const std::string& word) {
     return {kFailed, word, cause, "mavoea --help has all of them"};
 }
 
+constexpr const char* kHelp = "help";
+constexpr const char* kHelpWhat = "Show the usage, or a command's";
+
+// Of every command.
+void AddGeneral(CLI::App* app, Options* options) {
+    app->add_flag("--json", options->json, "Write JSON; bytes are hexadecimal digits");
+    app->add_flag("--color{always}", options->color,
+                  "Of findings and differences: --color=auto, always or never; auto: on a terminal, "
+                  "unless NO_COLOR is set")
+        ->check(CLI::IsMember({"auto", "always", "never"}));
+    app->add_option("--volume", options->volumes,
+                    "Declare a directory's volume type for this run; may be repeated")
+        ->type_name("PATH=TYPE")
+        ->expected(1)
+        ->allow_extra_args(false)
+        ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
+}
+
+void AddVersion(CLI::App* app) {
+    app->set_version_flag("-V,--version", "mavoea " MAVOEA_TOOL_VERSION, "Show the version");
+}
+
+// "help COMMAND" is "COMMAND --help". `words` are those of the command line.
+std::variant<Options, int> Help(const char* program, std::span<const char* const> words) {
+    std::vector<const char*> line = {program};
+    line.insert(line.end(), words.begin(), words.end());
+    line.push_back("--help");
+    return ParseCommandLine(static_cast<int>(line.size()), line.data());
+}
+
+void AddWords(const CLI::App& app, CommandWords* words) {
+    for (const CLI::Option* const option : app.get_options()) {
+        if (option->get_positional()) {
+            words->operands.push_back(option->get_name(true));
+            continue;
+        }
+        OptionWords one = {{}, option->get_description(), {}, OptionWords::Value::kNone};
+        for (const std::string& letter : option->get_snames())
+            one.spellings.push_back('-' + letter);
+        for (const std::string& name : option->get_lnames()) one.spellings.push_back("--" + name);
+        if (option->get_items_expected_max() > 0) {
+            one.value = option->get_type_name();
+            one.takes = OptionWords::Value::kNext;
+        }
+        words->options.push_back(std::move(one));
+    }
+}
+
 }  // namespace
+
+std::vector<CommandWords> AllCommands() {
+    std::vector<CommandWords> all;
+    for (const Syntax& one : kCommands) all.push_back({one.name, one.what, {}, {}});
+    all.push_back({kHelp, kHelpWhat, {}, {"COMMAND"}});
+    return all;
+}
+
+CommandWords WordsOf(std::string_view command) {
+    CommandWords words;
+    Options options;
+    CLI::App app;
+    if (command.empty()) AddVersion(&app);
+    for (const Syntax& one : kCommands) {
+        if (one.name != command) continue;
+        words.name = one.name;
+        words.what = one.what;
+        if (const auto habit = HabitOf(one.command)) {
+            words.options = OptionsOf(*habit);
+            words.operands = {*habit == Habit::kDelete ? "PATH" : "SRC"};
+            return words;
+        }
+        one.add_arguments(&app, &options);
+    }
+    AddGeneral(&app, &options);
+    AddWords(app, &words);
+    return words;
+}
 
 std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
     const std::span<const char* const> arguments(argv + 1, argv + std::max(argc, 1));
@@ -565,7 +662,13 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
         SpeakAs(own_name);
         return ParseAs(one.command, *habit, arguments);
     }
+    if (!arguments.empty() && std::string_view(arguments.front()) == "--complete") {
+        return Complete(arguments.subspan(1));
+    }
     const auto word = FindCommand(arguments);
+    if (word && std::string_view(arguments[word->index]) == kHelp) {
+        return Help(argv[0], arguments.subspan(word->index + 1));
+    }
     if (word) {
         if (word->syntax == nullptr) throw NoCommand(arguments[word->index]);
         const Command command = word->syntax->command;
@@ -580,18 +683,8 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
         "mavoea");
     app.require_subcommand(1);
     app.fallthrough();
-    app.set_version_flag("--version", "mavoea " MAVOEA_TOOL_VERSION, "Show the version");
-    app.add_flag("--json", options.json, "Write JSON; bytes are hexadecimal digits");
-    app.add_flag("--color{always}", options.color,
-                 "Of findings and differences: --color=auto, always or never; auto: on a terminal, "
-                 "unless NO_COLOR is set")
-        ->check(CLI::IsMember({"auto", "always", "never"}));
-    app.add_option("--volume", options.volumes,
-                   "Declare a directory's volume type for this run; may be repeated")
-        ->type_name("PATH=TYPE")
-        ->expected(1)
-        ->allow_extra_args(false)
-        ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
+    AddVersion(&app);
+    AddGeneral(&app, &options);
 
     // Commands and their arguments take longer to set up than many a command to run: there is only
     // the one that is named, or may be.
@@ -602,8 +695,11 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
         const std::string_view name = syntax.name;
         if (std::find(arguments.begin(), arguments.end(), name) != arguments.end()) {
             syntax.add_arguments(sub, &options);
+            const std::string before = sub->get_footer();
+            sub->footer(before + (before.empty() ? "" : "\n\n") + ExamplesOf(name));
         }
     }
+    if (!word) app.add_subcommand(kHelp, kHelpWhat);
 
     app.footer(kExamples);
     try {

@@ -4,10 +4,12 @@
 
 #include <optional>
 #include <string>
+#include <string_view>
 #include <variant>
 #include <vector>
 
 #include "tools/cli/set_info.h"
+#include "tools/cli/words.h"
 #include "tools/move/options.h"
 #include "tools/place/paths.h"
 #include "tools/walk/shard.h"
@@ -98,6 +100,11 @@ struct Options {
 // with the command line. A program that is called cp, mv or rm is that command. Throws Failure for
 // a command that is none.
 std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv);
+
+// Names of commands, and what they do.
+std::vector<CommandWords> AllCommands();
+// With the options and operands of one; without a name, the options that stand before it.
+CommandWords WordsOf(std::string_view command);
 
 }  // namespace mavoea::tool
 

@@ -581,7 +581,7 @@ class Line {
     std::string suffix_;
 };
 
-void PrintHelp(Habit habit) {
+void PrintHelp(Habit habit, const std::string& examples) {
     constexpr std::size_t kColumn = 32;
     std::cout << "Usage: " << Program(habit)
               << (habit == Habit::kDelete ? " [OPTION]... PATH...\n"
@@ -602,11 +602,29 @@ void PrintHelp(Habit habit) {
         text.resize(std::max(text.size() + 2, kColumn), ' ');
         std::cout << text << one.what << '\n';
     }
+    if (!SpeaksAsAnother()) std::cout << '\n' << examples << '\n';
 }
 
 }  // namespace
 
-std::variant<HabitOptions, int> ParseHabit(Habit habit, std::span<const char* const> words) {
+std::vector<OptionWords> OptionsOf(Habit habit) {
+    std::vector<OptionWords> options;
+    for (const Syntax& one : kSyntax) {
+        if ((one.commands & MaskOf(habit)) == 0) continue;
+        OptionWords words = {
+            {}, one.what == nullptr ? "" : one.what, {}, OptionWords::Value::kNone};
+        if (one.letter < 256) words.spellings.push_back({'-', static_cast<char>(one.letter)});
+        if (one.name != nullptr) words.spellings.push_back(std::string("--") + one.name);
+        if (one.value != nullptr) words.value = one.value;
+        if (one.argument == required_argument) words.takes = OptionWords::Value::kNext;
+        if (one.argument == optional_argument) words.takes = OptionWords::Value::kBehindEquals;
+        options.push_back(std::move(words));
+    }
+    return options;
+}
+
+std::variant<HabitOptions, int> ParseHabit(Habit habit, std::span<const char* const> words,
+                                           const std::string& examples) {
     std::string letters;
     std::vector<option> longs;
     for (const Syntax& one : kSyntax) {
@@ -637,7 +655,7 @@ std::variant<HabitOptions, int> ParseHabit(Habit habit, std::span<const char* co
                 case '?':
                     Misuse(habit, {});
                 case kHelp:
-                    PrintHelp(habit);
+                    PrintHelp(habit, examples);
                     return 0;
                 case kVersion:
                     std::cout << Speaker() << " (mavoea) " MAVOEA_TOOL_VERSION "\n";

@@ -7,6 +7,7 @@
 #include <variant>
 #include <vector>
 
+#include "tools/cli/words.h"
 #include "tools/move/options.h"
 
 namespace mavoea::tool {
@@ -21,8 +22,12 @@ struct HabitOptions {
     bool json = false;
 };
 
-// What the words behind the command's say, or the exit status when everything has been said.
-std::variant<HabitOptions, int> ParseHabit(Habit habit, std::span<const char* const> words);
+// What the words behind the command's say, or the exit status when everything has been said. The
+// tool's own help ends with `examples`.
+std::variant<HabitOptions, int> ParseHabit(Habit habit, std::span<const char* const> words,
+                                           const std::string& examples);
+
+std::vector<OptionWords> OptionsOf(Habit habit);
 
 }  // namespace mavoea::tool
 

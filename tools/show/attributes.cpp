@@ -295,6 +295,14 @@ void SetStrays(const Object& object, const Metadata& metadata, Json* entry) {
 
 ExitStatus List(const ListOptions& options) { return Listing(options).Run(); }
 
+std::vector<std::string> AttributeNames(const std::string& path) {
+    std::vector<std::string> names;
+    const Object object = FindObject(path);
+    const Metadata metadata = ReadAll(object);
+    for (const Line& line : LinesOf(object, metadata)) names.push_back(line.name);
+    return names;
+}
+
 ExitStatus Get(const std::string& path, const std::string& name, Format format) {
     const Object object = FindObject(path);
     const Metadata metadata = ReadAll(object);

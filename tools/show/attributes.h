@@ -4,6 +4,7 @@
 
 #include <functional>
 #include <string>
+#include <vector>
 
 #include "tools/place/volume.h"
 #include "tools/say/json.h"
@@ -40,6 +41,9 @@ ExitStatus List(const ListOptions& options);
 enum class Format { kPlain, kRaw, kHexDump, kJson };
 
 ExitStatus Get(const std::string& path, const std::string& name, Format format);
+
+// As list has them; what cannot be read has none.
+std::vector<std::string> AttributeNames(const std::string& path);
 
 // What there is to say of an attribute that an object does not have.
 Failure NoAttribute(const std::string& path, const std::string& name);
