@@ -236,7 +236,11 @@ TEST_P(ShellTest, MakesWholeWordsOfWhatIsTyped) {
     EXPECT_THAT(Typed(shell, declared + "get --escaped let\t esc\t"),
                 ElementsAre(Declaration(), "get", "--escaped", object, "esc\\x1B[31mape"));
     // What stands on the line is not run. ^U takes it away.
-    Typed(shell, "mavoea get \"$(touch ran)\" $(touch ran) `touch ran` x\t\x15");
+    for (const char* word : {"'$(touch ran)'", "\"$(touch ran)\"", "$(touch ran)", "`touch ran`"}) {
+        Typed(shell, std::string("mavoea get ") + word + " x\t\x15");
+    }
+    // With others zsh does: its Tab expands the word that it is pressed in.
+    Typed(shell, "mavoea get '$(touch ran)'\t\x15");
     EXPECT_FALSE(Exists(volume() + "/ran"));
 }
 
