@@ -611,8 +611,9 @@ void AddWords(const CLI::App& app, CommandWords* words) {
             continue;
         }
         OptionWords one = {{}, option->get_description(), {}, OptionWords::Value::kNone};
-        for (const std::string& letter : option->get_snames())
+        for (const std::string& letter : option->get_snames()) {
             one.spellings.push_back('-' + letter);
+        }
         for (const std::string& name : option->get_lnames()) one.spellings.push_back("--" + name);
         if (option->get_items_expected_max() > 0) {
             one.value = option->get_type_name();
