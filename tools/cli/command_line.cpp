@@ -536,10 +536,7 @@ std::optional<Habit> HabitOf(Command command) {
 
 std::variant<Options, int> ParseAs(Command command, Habit habit, std::span<const char* const> words,
                                    Word before = {}) {
-    const auto* const syntax =
-        std::find_if(std::begin(kCommands), std::end(kCommands),
-                     [&](const Syntax& one) { return one.command == command; });
-    auto parsed = ParseHabit(habit, words, ExamplesOf(syntax->name));
+    auto parsed = ParseHabit(habit, words, ExamplesOf);
     if (const int* const status = std::get_if<int>(&parsed)) return *status;
     auto& read = std::get<HabitOptions>(parsed);
     Options options;
@@ -696,8 +693,9 @@ std::variant<Options, int> ParseCommandLine(int argc, const char* const* argv) {
         const std::string_view name = syntax.name;
         if (std::find(arguments.begin(), arguments.end(), name) != arguments.end()) {
             syntax.add_arguments(sub, &options);
-            const std::string before = sub->get_footer();
-            sub->footer(before + (before.empty() ? "" : "\n\n") + ExamplesOf(name));
+            // Before what else there is to say, and looked for when somebody asks.
+            const bool last = sub->get_footer().empty();
+            sub->footer([name, last] { return ExamplesOf(name) + (last ? "" : "\n"); });
         }
     }
     if (!word) app.add_subcommand(kHelp, kHelpWhat);

@@ -624,7 +624,7 @@ std::vector<OptionWords> OptionsOf(Habit habit) {
 }
 
 std::variant<HabitOptions, int> ParseHabit(Habit habit, std::span<const char* const> words,
-                                           const std::string& examples) {
+                                           std::string (*examples)(std::string_view command)) {
     std::string letters;
     std::vector<option> longs;
     for (const Syntax& one : kSyntax) {
@@ -655,7 +655,7 @@ std::variant<HabitOptions, int> ParseHabit(Habit habit, std::span<const char* co
                 case '?':
                     Misuse(habit, {});
                 case kHelp:
-                    PrintHelp(habit, examples);
+                    PrintHelp(habit, examples(NameOf(habit)));
                     return 0;
                 case kVersion:
                     std::cout << Speaker() << " (mavoea) " MAVOEA_TOOL_VERSION "\n";

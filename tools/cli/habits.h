@@ -4,6 +4,7 @@
 
 #include <span>
 #include <string>
+#include <string_view>
 #include <variant>
 #include <vector>
 
@@ -23,9 +24,9 @@ struct HabitOptions {
 };
 
 // What the words behind the command's say, or the exit status when everything has been said. The
-// tool's own help ends with `examples`.
+// tool's own help ends with the command's `examples`.
 std::variant<HabitOptions, int> ParseHabit(Habit habit, std::span<const char* const> words,
-                                           const std::string& examples);
+                                           std::string (*examples)(std::string_view command));
 
 std::vector<OptionWords> OptionsOf(Habit habit);
 
