@@ -114,6 +114,8 @@ TEST(HelpTest, EachExampleDoesWhatItSays) {
         {"export", "mavoea remove letter.txt com.example.colour"},
         {"restore", "mavoea save -r /srv/share --output share.txt"},
         {"carry", "cp -r letters /mnt/restored/letters"},
+        {"convert --plan",
+         "mavoea plan -r --to samba --output share.plan letters /mnt/share/letters"},
         {"diff", "mavoea cp -a . /mnt/share"},
         {"dump --record", "mavoea set-info letter.txt --comment words"},
         {"dump --attributes", "setfattr -n user.other -v 1 letter.txt"},

@@ -108,15 +108,16 @@ TEST_F(ManualTest, APageOfACommandHasAllOfItsOptionsAndNoOther) {
         std::set<std::string> has = OptionsIn(Section(Text(page), "OPTIONS"));
         std::set<std::string> wanted = OptionsIn(RunTool({command, "--help"}).out);
         // mavoea(1) has those of every command.
-        for (const char* general : {"-h", "--help", "--version", "--json", "--volume"}) {
+        for (const char* general : {"-h", "--help", "--version", "--color", "--json", "--volume"}) {
             has.erase(general);
             wanted.erase(general);
         }
         EXPECT_EQ(wanted, has);
     }
     const auto general = OptionsIn(Section(Text("mavoea.1"), "OPTIONS"));
-    EXPECT_EQ((std::set<std::string>{"-h", "--help", "-V", "--version", "--json", "--volume"}),
-              general);
+    EXPECT_EQ(
+        (std::set<std::string>{"-h", "--help", "-V", "--version", "--color", "--json", "--volume"}),
+        general);
 }
 
 TEST_F(ManualTest, APageOfACommandHasAllThatOneLooksFor) {

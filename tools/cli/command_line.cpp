@@ -46,6 +46,9 @@ constexpr const char* kExamples = R"(Examples:
   mavoea clean -r /srv/share
   mavoea check -r /srv/share
   mavoea check -r --repair /srv/share
+  mavoea plan -r --to samba /srv/share /mnt/share
+  mavoea plan -r --to samba --output share.plan /srv/share /mnt/share
+  mavoea convert --plan share.plan
   mavoea convert -r --to appledouble /srv/share /mnt/share
   mavoea diff -r /srv/share /mnt/share
   mavoea dump @eaDir/letter.txt@MavoEAStream
