@@ -105,6 +105,11 @@ MAVOCORE_API int MLIBMavoIndexAddEx(const char* szPath, const char* szOldPath, i
 
 /* ---- Host only ------------------------------------------------------------------------------ */
 
+/* What a code on the error stack means to the caller, and what to do about it: static texts in
+ * English, never NULL, for any code. Safe in any thread; errno is left alone. */
+MAVOCORE_API const char* MAVOErrorText(int code);   /* "There is no such attribute" */
+MAVOCORE_API const char* MAVOErrorAdvice(int code); /* a sentence */
+
 /* The volume table: one "PATH TYPE" a line, PATH absolute, TYPE a number or a name as
  * MAVOVolumeTypeFromName() takes it. TYPE is the last field, so PATH may hold blanks. A line that
  * is blank or begins with '#' says nothing; of two lines with the same path the later one counts. A

@@ -85,7 +85,8 @@ TEST(PlatformLibrariesTest, MavocoreExportsWhatItsHeaderDeclares) {
                                           "MLIBMavoFileIndexAdd", "MLIBMavoIndexAddEx",
                                           "MAVOVolumeDeclare",    "MAVOStrReplaceFATReservedChar",
                                           "MAVOIndexObserverSet", "MAVOVolumeTypeFromName",
-                                          "MAVOVolumeFind",       "MAVOVolumeTableCheck"};
+                                          "MAVOVolumeFind",       "MAVOVolumeTableCheck",
+                                          "MAVOErrorText",        "MAVOErrorAdvice"};
     EXPECT_EQ(kNames, DeclaredIn(MAVOCORE_HEADER, "MAVOCORE_API"));
     EXPECT_EQ(kNames, ExportedBy(MAVOCORE_FILE));
 }
