@@ -22,7 +22,9 @@ for path in sorted((source / "docs/man").glob("mavoea-*.3.scd")):
     named += names
     if synopsis != [prototypes.get(name) for name in names]:
         wrong.append(f"{path.name}: the synopsis is not the header's")
+    # In a literal block, too, a backslash takes another in front.
     for example in re.findall(r"# EXAMPLE\n\n```\n(.*?)```\n", page, re.S):
+        example = re.sub(r"\\(.)", r"\1", example)
         if example not in examples:
             wrong.append(f"{path.name}: the example is not in examples/")
         shown.add(examples.get(example))

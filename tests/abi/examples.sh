@@ -33,6 +33,15 @@ cmp expected @eaDir/file@MavoEAStream || fail "the stream differs"
 test "$("$bin/example_list" "$dir/file")" = "colour
 size" || fail "both are not listed"
 
+# An EA directory's stream becomes a "._" file.
+mkdir other
+: >other/file
+"$bin/example_copy" "$dir/file" "$dir/other/file"
+test "$(head -c 8 other/._file | od -An -tx1)" = " 00 05 16 07 00 02 00 00" ||
+    fail "no AppleDouble file at the copy"
+grep -q colour other/._file && grep -q redlarge other/._file || fail "the values have not arrived"
+test ! -e other/@eaDir || fail "the copy has an EA directory"
+
 # What went wrong is told: by errno where no code is recorded, else by the code.
 "$bin/example_error" "$dir/file" || fail "nothing is wrong with the stream"
 if "$bin/example_error" "$dir/none" 2>said; then fail "a missing stream is opened"; fi
