@@ -17,7 +17,9 @@ wrong = [] if len(prototypes) == 53 else [f"{len(prototypes)} functions in the h
 named, shown = [], set()
 for path in sorted((source / "docs/man").glob("mavoea-*.3.scd")):
     page = path.read_text()
-    names = re.search(r"# NAME\n\n(.*?) - ", page, re.S)[1].split(", ")
+    own, *names = re.search(r"# NAME\n\n(.*?) - ", page, re.S)[1].split(", ")
+    if own != path.name.removesuffix(".3.scd"):
+        wrong.append(f"{path.name}: its name is not its own")
     synopsis = re.search(r"# SYNOPSIS\n.*?```\n(.*?)\n```", page, re.S)[1].split("\n")
     named += names
     if synopsis != [prototypes.get(name) for name in names]:
