@@ -25,6 +25,8 @@ constexpr Target kTargets[] = {
     {"attribute_text_fuzz", WriteAttributeTextSeeds},
     {"dos_attributes_fuzz", WriteDosAttributesSeeds},
     {"finder_info_fuzz", WriteFinderInfoSeeds},
+    {"foreign_object_fuzz", WriteForeignObjectSeeds},
+    {"mac_info_fuzz", WriteMacInfoSeeds},
     {"samba_stream_fuzz", WriteSambaStreamSeeds},
     {"apple_single_fuzz", WriteAppleSingleSeeds},
     {"mac_binary_fuzz", WriteMacBinarySeeds},

@@ -27,6 +27,8 @@ afp_info_fuzz 100000 128
 dos_attributes_fuzz 100000 128
 finder_info_fuzz 100000 64
 samba_stream_fuzz 100000 512
+foreign_object_fuzz 100000 1500
+mac_info_fuzz 100000 512
 attribute_text_fuzz 100000 512
 apple_single_fuzz 100000 512
 mac_binary_fuzz 100000 512

@@ -16,6 +16,8 @@ void WriteAttributeTextSeeds(const std::string& directory);
 void WriteAfpInfoSeeds(const std::string& directory);
 void WriteDosAttributesSeeds(const std::string& directory);
 void WriteFinderInfoSeeds(const std::string& directory);
+void WriteForeignObjectSeeds(const std::string& directory);
+void WriteMacInfoSeeds(const std::string& directory);
 void WriteSambaStreamSeeds(const std::string& directory);
 void WriteAppleSingleSeeds(const std::string& directory);
 void WriteMacBinarySeeds(const std::string& directory);

@@ -855,7 +855,9 @@ class AllowedTest : public ::testing::TestWithParam<Way> {
     std::optional<SecondVolume> second_;
     std::optional<Places> places_;
 };
-INSTANTIATE_TEST_SUITE_P(EveryWay, AllowedTest, ::testing::ValuesIn(Ways(kHows, {0, 1, 2}, {7})),
+INSTANTIATE_TEST_SUITE_P(Ways, AllowedTest,
+                         ::testing::ValuesIn(Ways({How::kCopy, How::kMove, How::kMoveAcross},
+                                                  {0, 1, 2}, {7})),
                          NameOf);
 
 TEST_P(AllowedTest, WhatMayBeLostIsNamedAllTheSame) {
