@@ -70,10 +70,8 @@ class Soundness final : public MendingSink {
              .hear = [this](std::string_view told) { tally_.Add(Unpacker(told).Take<Tally>()); },
              .look_at_named = [this](const Object& object,
                                      const Tell& tell) { Look(tell, [&] { CheckNamed(object); }); },
-             .look_into =
-                 [this](const DirectoryRef& directory, const Tell& tell) {
-                     Look(tell, [&] { LookInto(directory); });
-                 },
+             .look_into = [this](const DirectoryRef& directory,
+                                 const Tell& tell) { Look(tell, [&] { LookInto(directory); }); },
              .clear_progress = [this] { progress_.Clear(); },
              .show_progress =
                  [this](const Object& object) {

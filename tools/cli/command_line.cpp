@@ -580,9 +580,10 @@ constexpr const char* kHelpWhat = "Show the usage, or a command's";
 // Of every command.
 void AddGeneral(CLI::App* app, Options* options) {
     app->add_flag("--json", options->json, "Write JSON; bytes are hexadecimal digits");
-    app->add_flag("--color{always}", options->color,
-                  "Of findings and differences: --color=auto, always or never; auto: on a terminal, "
-                  "unless NO_COLOR is set")
+    app->add_flag(
+           "--color{always}", options->color,
+           "Of findings and differences: --color=auto, always or never; auto: on a terminal, "
+           "unless NO_COLOR is set")
         ->check(CLI::IsMember({"auto", "always", "never"}));
     app->add_option("--volume", options->volumes,
                     "Declare a directory's volume type for this run; may be repeated")
