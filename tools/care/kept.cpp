@@ -7,6 +7,7 @@
 #include "tools/say/text.h"
 #include "tools/store/content.h"
 #include "tools/store/sidecars.h"
+#include "util/fnv.h"
 
 namespace mavoea::tool {
 namespace {
@@ -18,20 +19,10 @@ constexpr std::size_t kNameMax = 255;
 constexpr std::string_view kStreamEnding = "@MavoEAKept";
 constexpr std::string_view kResourceEnding = "@MavoResKept";
 
-// FNV-1a.
-std::uint64_t HashOf(std::string_view text) {
-    std::uint64_t hash = 0xCBF29CE484222325;
-    for (const char c : text) {
-        hash ^= static_cast<std::uint8_t>(c);
-        hash *= 0x100000001B3;
-    }
-    return hash;
-}
-
 std::string KeptAppleDouble(const std::string& object_name) {
     std::string name = std::string(kKeptPrefix) + "._" + object_name;
     if (name.size() <= kNameMax) return name;
-    const std::string ending = '~' + HexNumber(HashOf(object_name), 16).substr(2);
+    const std::string ending = '~' + HexNumber(Fnv::Of(object_name), 16).substr(2);
     return name.substr(0, kNameMax - ending.size()) + ending;
 }
 

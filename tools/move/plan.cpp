@@ -22,6 +22,7 @@
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
+#include "util/fnv.h"
 
 namespace mavoea::tool {
 namespace {
@@ -31,33 +32,26 @@ constexpr std::string_view kTitle = "mavoea plan 1";
 // ---- The source as it is ------------------------------------------------------------------------
 
 // Of all that has a part in a conversion: paths, and of each file what changes with its contents,
-// rights and attributes. FNV-1a of 64 bits.
+// rights and attributes.
 class Fingerprint {
  public:
     void Add(std::string_view text) {
-        for (const char c : text) AddByte(static_cast<std::uint8_t>(c));
-        AddByte(0);
-    }
-    void Add(std::uint64_t number) {
-        for (int shift = 0; shift < 64; shift += 8) {
-            AddByte(static_cast<std::uint8_t>(number >> shift));
-        }
+        hash_.Add(text);
+        hash_.Add(0);
     }
     void Add(const struct stat& info) {
-        Add(std::uint64_t{info.st_ino});
-        Add(std::uint64_t{info.st_mode});
-        Add(static_cast<std::uint64_t>(info.st_size));
+        hash_.AddNumber(info.st_ino);
+        hash_.AddNumber(info.st_mode);
+        hash_.AddNumber(static_cast<std::uint64_t>(info.st_size));
         for (const timespec& time : {info.st_mtim, info.st_ctim}) {
-            Add(static_cast<std::uint64_t>(time.tv_sec));
-            Add(static_cast<std::uint64_t>(time.tv_nsec));
+            hash_.AddNumber(static_cast<std::uint64_t>(time.tv_sec));
+            hash_.AddNumber(static_cast<std::uint64_t>(time.tv_nsec));
         }
     }
-    std::string text() const { return HexNumber(state_, 16); }
+    std::string text() const { return HexNumber(hash_.value(), 16); }
 
  private:
-    void AddByte(std::uint8_t byte) { state_ = (state_ ^ byte) * 0x00000100000001B3U; }
-
-    std::uint64_t state_ = 0xCBF29CE484222325U;
+    Fnv hash_;
 };
 
 // An object of the source, and where its copy would be.

@@ -11,18 +11,10 @@
 #include "tools/say/text.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
+#include "util/fnv.h"
 
 namespace mavoea::tool {
 namespace {
-
-// FNV-1a: the name of the copy may be too long to be a part of another one.
-std::uint64_t HashOf(const std::string& name) {
-    std::uint64_t hash = 0xCBF29CE484222325;
-    for (const char letter : name) {
-        hash = (hash ^ static_cast<unsigned char>(letter)) * 0x100000001B3;
-    }
-    return hash;
-}
 
 ByteView AsBytes(const std::string& text) {
     return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()};
@@ -30,7 +22,8 @@ ByteView AsBytes(const std::string& text) {
 
 Place FileFor(const Place& to) {
     constexpr int kDigits = 16;
-    const std::string hash = HexNumber(HashOf(to.name), kDigits).substr(2);
+    // The name of the copy may be too long to be a part of another one.
+    const std::string hash = HexNumber(Fnv::Of(to.name), kDigits).substr(2);
     return {to.directory, std::string(kMovingPrefix) + hash};
 }
 

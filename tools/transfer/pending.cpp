@@ -14,6 +14,7 @@
 #include "tools/say/messages.h"
 #include "tools/say/text.h"
 #include "tools/store/sidecars.h"
+#include "util/fnv.h"
 
 namespace mavoea::tool {
 namespace {
@@ -67,33 +68,18 @@ DirectoryRef FindEaDirectory(const Directory& directory) {
 
 namespace {
 
-// FNV-1a.
-class Hash {
- public:
-    void Add(std::uint8_t byte) { value_ = (value_ ^ byte) * kPrime; }
-    std::uint32_t Folded() const { return static_cast<std::uint32_t>(value_ ^ value_ >> 32); }
+std::uint32_t Folded(std::uint64_t hash) { return static_cast<std::uint32_t>(hash ^ hash >> 32); }
 
- private:
-    static constexpr std::uint64_t kPrime = 0x100000001b3;
-    std::uint64_t value_ = 0xcbf29ce484222325;
-};
-
-std::uint32_t HashOf(const std::string& name) {
-    Hash hash;
-    for (const char c : name) hash.Add(static_cast<std::uint8_t>(c));
-    return hash.Folded();
-}
+std::uint32_t HashOf(const std::string& name) { return Folded(Fnv::Of(name)); }
 
 }  // namespace
 
 PendingOwner PendingOwner::Of(const std::string& name, ino_t inode, std::uint64_t birth,
                               nlink_t links) {
-    Hash hash;
+    Fnv hash;
     for (; links > 0; links >>= 8) hash.Add(static_cast<std::uint8_t>(links));
-    for (unsigned shift = 0; shift < 64; shift += 8) {
-        hash.Add(static_cast<std::uint8_t>(birth >> shift));
-    }
-    return {inode, (std::uint64_t{HashOf(name)} << 32) | hash.Folded()};
+    hash.AddNumber(birth);
+    return {inode, (std::uint64_t{HashOf(name)} << 32) | Folded(hash.value())};
 }
 
 bool PendingOwner::IsCalled(const std::string& name) const { return HashOf(name) == mark >> 32; }

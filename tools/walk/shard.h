@@ -8,6 +8,8 @@
 #include <string>
 #include <string_view>
 
+#include "util/fnv.h"
+
 namespace mavoea::tool {
 
 // Of the path of an object from what somebody named, with the last name of that in front:
@@ -32,25 +34,21 @@ class PathHash {
     // Of an entry of the directory that this one is of.
     constexpr PathHash Below(std::string_view name) const {
         PathHash hash = *this;
-        if (!hash.empty_) hash.Add('/');
-        for (const char c : name) hash.Add(c);
+        if (!hash.empty_) hash.hash_.Add("/");
+        hash.hash_.Add(name);
         hash.empty_ = false;
         return hash;
     }
 
     constexpr std::uint64_t value() const {
-        std::uint64_t mixed = state_;
+        std::uint64_t mixed = hash_.value();
         mixed = (mixed ^ mixed >> 33) * 0xFF51AFD7ED558CCDU;
         mixed = (mixed ^ mixed >> 33) * 0xC4CEB9FE1A85EC53U;
         return mixed ^ mixed >> 33;
     }
 
  private:
-    constexpr void Add(char c) {
-        state_ = (state_ ^ static_cast<std::uint8_t>(c)) * 0x00000100000001B3U;
-    }
-
-    std::uint64_t state_ = 0xCBF29CE484222325U;
+    Fnv hash_;
     bool empty_ = true;
 };
 
