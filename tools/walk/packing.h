@@ -45,7 +45,7 @@ class Unpacker {
     }
     std::uint64_t TakeNumber() { return Take<std::uint64_t>(); }
     std::string_view TakeText() {
-        const std::size_t size = TakeNumber();
+        const auto size = static_cast<std::size_t>(TakeNumber());
         const std::string_view text = bytes_.substr(0, size);
         bytes_.remove_prefix(size);
         return text;

@@ -127,7 +127,7 @@ class Reading {
         if (left_ == 0) return std::nullopt;
         --left_;
         const auto kind = static_cast<Errand::Kind>(bytes_.TakeNumber());
-        const DirectoryRef& directory = directories_[bytes_.TakeNumber()];
+        const DirectoryRef& directory = directories_[static_cast<std::size_t>(bytes_.TakeNumber())];
         const auto type = static_cast<mode_t>(bytes_.TakeNumber());
         const Place place = {directory, std::string(bytes_.TakeText())};
         const std::string shown(bytes_.TakeText());
