@@ -144,7 +144,7 @@ void AddTree(CLI::App* sub, Options* options) {
     AddPaths(sub, options, "PATH", "Files and directories");
 }
 
-// For what several processes can look at.
+// For what several processes can do.
 void AddJobs(CLI::App* sub, Options* options) {
     constexpr unsigned kMost = 256;
     sub->add_option("-j,--jobs", options->jobs,
@@ -154,7 +154,7 @@ void AddJobs(CLI::App* sub, Options* options) {
         ->check(CLI::Range(1U, kMost));
 }
 
-void AddTreeToLookAt(CLI::App* sub, Options* options) {
+void AddSharedTree(CLI::App* sub, Options* options) {
     AddJobs(sub, options);
     AddTree(sub, options);
 }
@@ -256,11 +256,11 @@ constexpr Syntax kCommands[] = {
                        "behind each")
              ->excludes(details);
          sub->add_flag("--values", options->values, "With --json: values, too, as base64");
-         AddTreeToLookAt(sub, options);
+         AddSharedTree(sub, options);
      }},
     {Command::kShow, "show",
      "Show in words what is known: Finder info, comment, tags, dates, marks, attributes",
-     AddTreeToLookAt},
+     AddSharedTree},
     {Command::kGet, "get", "Write a value to standard output",
      [](CLI::App* sub, Options* options) {
          CLI::Option* const hex = sub->add_flag("--hex", options->hex, "As a hex dump");
@@ -291,8 +291,9 @@ constexpr Syntax kCommands[] = {
          AddPath(sub, options, "A file or directory");
          AddName(sub, options);
      }},
-    {Command::kLock, "lock", "Lock files: Macs may not write, rename or delete them", AddTree},
-    {Command::kUnlock, "unlock", "Unlock files", AddTree},
+    {Command::kLock, "lock", "Lock files: Macs may not write, rename or delete them",
+     AddSharedTree},
+    {Command::kUnlock, "unlock", "Unlock files", AddSharedTree},
     {Command::kImport, "import",
      "Give an object the metadata in an AppleDouble (\"._\"), AppleSingle, MacBinary or BinHex "
      "file",
@@ -369,8 +370,9 @@ constexpr Syntax kCommands[] = {
          sub->add_option("DST", options->destination, "The copy's own path")->required();
      }},
     {Command::kUpgrade, "upgrade", "Convert what earlier versions kept into the current layout",
-     AddTree},
-    {Command::kRepair, "repair", "Move what resource files wrongly hold into EA streams", AddTree},
+     AddSharedTree},
+    {Command::kRepair, "repair", "Move what resource files wrongly hold into EA streams",
+     AddSharedTree},
     {Command::kClean, "clean", "List metadata whose object is gone, and remove it with --yes",
      [](CLI::App* sub, Options* options) {
          AddRecursive(sub, options);
@@ -403,6 +405,7 @@ constexpr Syntax kCommands[] = {
     {Command::kConvert, "convert",
      "Copy an object or a tree to a volume of another type, and compare the two",
      [](CLI::App* sub, Options* options) {
+         AddJobs(sub, options);
          const auto arguments = AddConversion(sub, options);
          CLI::Option* const plan = sub->add_option_function<std::string>(
              "--plan", [=](const std::string& file) { options->plan = file; },

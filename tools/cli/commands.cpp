@@ -43,6 +43,7 @@
 #include "tools/store/layout.h"
 #include "tools/store/record.h"
 #include "tools/transfer/pending.h"
+#include "tools/walk/packing.h"
 #include "tools/walk/tree.h"
 
 namespace mavoea::tool {
@@ -135,33 +136,54 @@ ExitStatus Lock(const TreeOptions& options, bool locked) {
     Progress progress(locked ? "locking" : "unlocking");
     std::uint64_t done = 0;
     std::uint64_t failed = 0;
-    const auto fail = [&](const Failure& failure) {
+    const auto fail = [&](ExitStatus grade, const std::string& message) {
         progress.Clear();
-        Report(failure);
+        Report(message);
         ++failed;
-        status = std::max(status, failure.status());
+        status = std::max(status, grade);
     };
-    const auto work = [&](const Object& object, const std::string&, const Tell&) {
-        if (progress.wanted()) {
-            progress.Show(std::to_string(done) + " done, " + std::to_string(failed) + " failed",
-                          object.path(), done + failed);
-        }
+    // Tells the status and, of a failure, what is said of it.
+    const auto work = [&](const Object& object, const std::string&, const Tell& tell) {
+        Packer told;
         try {
             SetLocked(object, locked);
-            ++done;
-            Json entry;
-            entry.SetText("path", object.path());
-            entry.Set("locked", locked);
-            json.Add(std::move(entry));
+            told.AddNumber(kSuccess);
+            told.AddText(object.path());
         } catch (const Failure& failure) {
-            fail(failure);
+            told.AddNumber(static_cast<std::uint64_t>(failure.status()));
+            told.AddText(failure.what());
         }
+        tell(told.bytes());
     };
-    VisitObjects(options,
-                 {.work = work,
-                  .on_failure = [&](const std::string&, const Failure& failure) { fail(failure); },
-                  .on_named = SettleNamed,
-                  .on_directory = [](const DirectoryRef& inside) { (void)SettlePending(inside); }});
+    const auto hear = [&](std::string_view told) {
+        Unpacker said(told);
+        const auto grade = static_cast<ExitStatus>(said.TakeNumber());
+        const std::string text(said.TakeText());
+        if (grade != kSuccess) return fail(grade, text);
+        ++done;
+        if (!options.json) return;
+        Json entry;
+        entry.SetText("path", text);
+        entry.Set("locked", locked);
+        json.Add(std::move(entry));
+    };
+    VisitObjects(
+        options,
+        {.work = work,
+         .on_failure = [&](const std::string&,
+                           const Failure& failure) { fail(failure.status(), failure.what()); },
+         .on_named = SettleNamed,
+         .on_directory = [](const DirectoryRef& inside) { (void)SettlePending(inside); },
+         .hear = hear,
+         .changes = true,
+         .clear_progress = [&] { progress.Clear(); },
+         .show_progress =
+             [&](const Object& object) {
+                 if (!progress.wanted()) return;
+                 progress.Show(
+                     std::to_string(done) + " done, " + std::to_string(failed) + " failed",
+                     object.path(), done + failed);
+             }});
     progress.Clear();
     if (options.json) Print(json);
     return status;
@@ -247,12 +269,18 @@ ExitStatus Dump(const Options& options) {
         "restore the file from a copy, or leave it alone");
 }
 
+// How many processes share the work.
+CrewSize CrewOf(const Options& options) {
+    return options.jobs > 0 ? CrewSize{.workers = options.jobs} : UsualCrew();
+}
+
 ConvertOptions ConversionOf(const Options& options) {
     return {.source = options.paths.front(),
             .destination = options.destination,
             .type = options.to,
             .recursive = options.recursive,
-            .json = options.json};
+            .json = options.json,
+            .crew = CrewOf(options)};
 }
 
 }  // namespace
@@ -265,8 +293,8 @@ ExitStatus Run(const Options& options) {
     if (!options.progress.empty()) {
         ReportProgressEach(std::chrono::seconds(std::stoi(options.progress)));
     }
-    const CrewSize crew = options.jobs > 0 ? CrewSize{.workers = options.jobs} : UsualCrew();
-    const TreeOptions tree = {options.paths, options.recursive, options.json, options.shard, crew};
+    const TreeOptions tree = {options.paths, options.recursive, options.json, options.shard,
+                              CrewOf(options)};
     switch (options.command) {
         case Command::kWhere:
             return Where(options.paths.front(), options.json);
@@ -350,7 +378,7 @@ ExitStatus Run(const Options& options) {
                                    .repair = options.repair,
                                    .remove = options.yes});
         case Command::kConvert:
-            if (options.plan) return ConvertAsPlanned(*options.plan, options.json);
+            if (options.plan) return ConvertAsPlanned(*options.plan, CrewOf(options), options.json);
             return Convert(ConversionOf(options));
         case Command::kPlan:
             return PlanConversion({.conversion = ConversionOf(options),

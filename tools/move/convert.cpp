@@ -6,16 +6,19 @@
 #include <cstdint>
 #include <filesystem>
 #include <iostream>
+#include <utility>
 #include <vector>
 
 #include "tools/place/volume.h"
 #include "tools/say/interrupt.h"
 #include "tools/say/output.h"
 #include "tools/say/progress.h"
+#include "tools/store/sidecars.h"
 #include "tools/transfer/pending.h"
 #include "tools/transfer/transfer.h"
 #include "tools/transfer/tree_comparison.h"
 #include "tools/transfer/tree_copy.h"
+#include "tools/walk/packing.h"
 
 namespace mavoea::tool {
 namespace {
@@ -28,7 +31,14 @@ class Conversion final : private TreeCopy {
           progress_("converting"),
           transfer_({.watch = {.on_bytes = [this](std::uint64_t) { Show(in_hand_); },
                                .give_up = InterruptedAgain},
-                     .on_note = [this](const std::string& note) { notes_.push_back(note); }}) {}
+                     .on_note = [this](const std::string& note) { notes_.push_back(note); }}),
+          crew_(options.crew,
+                {.work = [this](const Errand& errand, const Tell& tell) { tell(CopyOne(errand)); },
+                 .hear = [this](std::string_view told) { Hear(told); },
+                 .on_failure = [this](const std::string& path,
+                                      const Failure& failure) { AddFailure(path, failure); },
+                 .clear_progress = [this] { progress_.Clear(); },
+                 .show_progress = [this](const Object& object) { Show(object.path()); }}) {}
 
     // What was not there before has been read back as it was written: it needs no second look.
     void CopyAndCompare() {
@@ -43,6 +53,7 @@ class Conversion final : private TreeCopy {
 
     void Copy() {
         CopyTree(top_.first, top_.second);
+        crew_.Finish();
         Try(top_.second.path(), [&] { transfer_.MakeDurable(); });
     }
 
@@ -90,24 +101,80 @@ class Conversion final : private TreeCopy {
     bool Stopped() const override { return Interrupted() != 0; }
 
     void Begin(const Place& from, const Place& to, Level* level) override {
-        Show(from.path());
         const struct stat info = StatusOf(from);
         if (!S_ISDIR(info.st_mode)) {
-            transfer_.CopyObject(from, info.st_mode, to, Links::kSeveral);
-            ++converted_;
-            return;
+            return crew_.Do({.kind = Errand::Kind::kCopy,
+                             .object = {from},
+                             .type = info.st_mode & S_IFMT,
+                             .to = to,
+                             .here = info.st_nlink > 1 || !IsApart(to)});
         }
+        Show(from.path());
         level->inside = from.Open();
         level->info = info;
         level->is_new = !to.Status();
         level->made = transfer_.MakeDirectory(from, to);
-        if (!level->is_new) (void)SettlePending(level->made);
+        if (!level->is_new) {
+            (void)SettlePending(level->made);
+            (void)level->made->EntriesAtFirst();  // for IsApart()
+        }
         if (options_.recursive) level->entries = ObjectsIn(level->inside);
     }
 
     void Finish(const Level& level) override {
-        transfer_.FinishDirectory(level.from, *level.inside, level.to, level.made, level.is_new);
-        ++converted_;
+        crew_.Afterwards([this, level] {
+            Try(level.from.path(), [&] {
+                if (crew_.LeftEaDirectories()) RemoveLeftEaDirectory(*level.made);
+                transfer_.FinishDirectory(level.from, *level.inside, level.to, level.made,
+                                          level.is_new);
+                ++converted_;
+            });
+        });
+    }
+
+    // Whether nothing that other objects of its directory become can meet what it becomes. What
+    // could be metadata of another one waits until that is there.
+    bool IsApart(const Place& to) const {
+        const std::string prefix = AppleDoubleName({});
+        if (!tool::IsApart(to.name) || to.name.starts_with(prefix)) return false;
+        if (to.directory->is_new()) return true;
+        return to.directory->TellsApart(to.name) &&
+               !levels().back().entries.back().name.starts_with(prefix);
+    }
+
+    // What became of it, packed: what there is to say of a copy, or a failure; nothing of what is
+    // not begun any more.
+    std::string CopyOne(const Errand& errand) {
+        if (Stopped()) return {};
+        Packer told;
+        const Place& from = errand.object.place;
+        std::vector<std::string> before = std::exchange(notes_, {});
+        try {
+            transfer_.CopyObject(from, errand.type, errand.to, Links::kSeveral);
+            told.AddNumber(kSuccess);
+        } catch (const Failure& failure) {
+            told.AddNumber(static_cast<std::uint64_t>(failure.status()));
+            told.AddText(from.path());
+            told.AddText(failure.what());
+        }
+        if (IsWorker()) transfer_.ForgetMade();
+        for (const std::string& note : notes_) told.AddText(note);
+        notes_ = std::move(before);
+        return told.bytes();
+    }
+
+    void Hear(std::string_view told) {
+        if (told.empty()) return;
+        Unpacker said(told);
+        const auto status = static_cast<ExitStatus>(said.TakeNumber());
+        if (status == kSuccess) {
+            ++converted_;
+        } else {
+            const std::string path(said.TakeText());
+            failures_.push_back({path, std::string(said.TakeText())});
+            status_ = std::max(status_, status);
+        }
+        while (!said.empty()) notes_.emplace_back(said.TakeText());
     }
 
     void Fail(const Place& from, const Failure& failure) override {
@@ -161,6 +228,7 @@ class Conversion final : private TreeCopy {
     Pair top_;
     Progress progress_;
     Transfer transfer_;
+    Crew crew_;
     std::string in_hand_;
     std::uint64_t converted_ = 0;
     std::uint64_t compared_ = 0;

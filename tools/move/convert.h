@@ -6,6 +6,7 @@
 
 #include "tools/place/volume.h"
 #include "tools/say/messages.h"
+#include "tools/walk/crew.h"
 
 namespace mavoea::tool {
 
@@ -15,6 +16,7 @@ struct ConvertOptions {
     std::string type;         // of the destination's volume, as --volume takes it
     bool recursive = false;
     bool json = false;
+    CrewSize crew = {};
 };
 
 // What is copied, and to where.

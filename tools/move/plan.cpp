@@ -458,8 +458,9 @@ ExitStatus PlanConversion(const PlanOptions& options) {
     return Plan(options, ends).Run();
 }
 
-ExitStatus ConvertAsPlanned(const std::string& file, bool json) {
+ExitStatus ConvertAsPlanned(const std::string& file, CrewSize crew, bool json) {
     Planned planned = ReadPlan(file);
+    planned.conversion.crew = crew;
     planned.conversion.json = json;
     if (planned.conversion.recursive) RequireDescriptorPaths();
     {

@@ -23,7 +23,7 @@ ExitStatus PlanConversion(const PlanOptions& options);
 
 // Does what was planned. A Failure when the file is none of a plan, or the source has changed
 // since.
-ExitStatus ConvertAsPlanned(const std::string& file, bool json);
+ExitStatus ConvertAsPlanned(const std::string& file, CrewSize crew, bool json);
 
 }  // namespace mavoea::tool
 

@@ -75,10 +75,17 @@ DirectoryRef Directory::Open(const std::string& path, const std::string& shown,
 }
 
 DirectoryRef Directory::Adopt(int fd, const std::string& shown, const std::string& location,
-                              bool has_location) {
+                              bool has_location, bool is_new) {
     const Names names = {
         nullptr, {}, shown, std::make_shared<const std::string>(location), has_location};
-    return DirectoryRef(new Directory(fd, std::make_shared<Names>(names)));
+    DirectoryRef adopted(new Directory(fd, std::make_shared<Names>(names)));
+    if (is_new) adopted->BeginEmpty();
+    return adopted;
+}
+
+void Directory::BeginEmpty() const {
+    is_new_ = true;
+    first_ = std::make_unique<std::vector<Entry>>();
 }
 
 // One after the other: those of a deep tree would take the whole stack.
@@ -163,7 +170,7 @@ DirectoryRef Directory::MakeIn(const std::string& name, mode_t mode) const {
     if (info.st_uid != ::geteuid() || (info.st_mode & kRights & ~mode) != 0) {
         throw NotThis(made->path(), "another directory has come where one was just made");
     }
-    made->first_ = std::make_unique<std::vector<Entry>>();
+    made->BeginEmpty();
     NoteCome(name);
     return made;
 }
@@ -267,8 +274,12 @@ std::optional<bool> Directory::ListTells(const std::string& name) const {
     if (!listed()) return std::nullopt;
     if (Lists(name)) return true;
     if (first_->empty() && later_.empty()) return false;
-    if (IsAscii(name) && (OtherCase(name) == name || TellsCasesApart())) return false;
+    if (TellsApart(name)) return false;
     return std::nullopt;
+}
+
+bool Directory::TellsApart(const std::string& name) const {
+    return listed() && IsAscii(name) && (OtherCase(name) == name || TellsCasesApart());
 }
 
 bool Directory::Lists(const std::string& name) const {

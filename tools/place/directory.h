@@ -32,9 +32,10 @@ class Directory : public std::enable_shared_from_this<Directory> {
                              const std::string& location);
 
     // One that another process has handed over with its descriptor, which is this one's from here
-    // on. `location` is less than its own where that could not be named.
+    // on. `location` is less than its own where that could not be named. `is_new`: that process has
+    // made it.
     static DirectoryRef Adopt(int fd, const std::string& shown, const std::string& location,
-                              bool has_location);
+                              bool has_location, bool is_new);
 
     // A directory in this one. Null when nothing is there; a Failure when it is something else, a
     // symbolic link too.
@@ -73,6 +74,8 @@ class Directory : public std::enable_shared_from_this<Directory> {
     bool HasLocation(const std::string& name) const;
     bool has_location() const { return names_->has_location; }
     struct stat Status() const;
+    // Whether this work has made it: all that is in it has come since.
+    bool is_new() const { return is_new_; }
 
     // For calls that take a path: it leads through this descriptor, whatever has become of the
     // directory's name.
@@ -97,6 +100,8 @@ class Directory : public std::enable_shared_from_this<Directory> {
     // False where such a list says that nothing of that name is there, and this process has put
     // nothing there since. It says so of no name that the file system could take for another's.
     bool MayHave(const std::string& name) const;
+    // Whether such a list shows that only what has the very letters can have that name.
+    bool TellsApart(const std::string& name) const;
     // Has(), by the list where it can tell.
     bool HadAtFirst(const std::string& name) const;
     // Says that this process has put something there. Members that do so, and temporary files, say
@@ -165,6 +170,7 @@ class Directory : public std::enable_shared_from_this<Directory> {
     DirectoryRef FindIn(const std::string& name, const std::string& shown) const;
     std::shared_ptr<Names> NamesOf(const std::string& name, const std::string& shown) const;
     int OpenToRead() const;
+    void BeginEmpty() const;
     std::optional<bool> ListTells(const std::string& name) const;
     bool TellsCasesApart() const;
     bool Lists(const std::string& name) const;
@@ -173,6 +179,7 @@ class Directory : public std::enable_shared_from_this<Directory> {
     std::shared_ptr<Names> names_;
     mutable std::unique_ptr<std::vector<Entry>> first_;
     mutable std::set<std::string> later_;  // has come by this process since
+    mutable bool is_new_ = false;
     mutable std::optional<bool> tells_cases_apart_;
     mutable DirectoryRef kept_;
     mutable std::optional<VolumeType> volume_type_;

@@ -5,7 +5,8 @@
 
 namespace mavoea::tool {
 
-// From here on SIGINT and SIGTERM are counted only, unless they are ignored.
+// From here on SIGINT and SIGTERM are counted only, unless they are ignored: those that come to
+// this process, for it and the processes that it starts.
 void WatchForInterrupts();
 
 // The number of the first signal that came, 0 when none did.

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <array>
+#include <utility>
 
 #include "include/mavoea.h"
 #include "tools/say/messages.h"
@@ -21,6 +22,9 @@ constexpr std::size_t kNameMax = 255;
 
 // The longest name that is used unchanged.
 constexpr std::size_t kUnchangedMax = kNameMax - kStreamSuffix.size();
+
+bool leaves_ea_directories = false;
+bool left_ea_directory = false;
 
 bool MayBeAppleDouble(const struct stat& info) {
     return S_ISREG(info.st_mode) && info.st_size >= static_cast<off_t>(AppleDoubleHeader::kSize);
@@ -308,6 +312,10 @@ std::vector<LeftOver> FindLeftOver(const Directory& directory, const Directory& 
 }
 
 void RemoveEaDirectoryIfEmpty(const Directory& directory) {
+    if (leaves_ea_directories) {
+        left_ea_directory = true;
+        return;
+    }
     if (!directory.MayHave(kEaDirName) || directory.RemoveEmpty(kEaDirName)) return;
     const DirectoryRef ea_dir = directory.FindAgain(kEaDirName);
     if (!ea_dir || !ea_dir->MayHave(kCoverName)) return;
@@ -315,6 +323,16 @@ void RemoveEaDirectoryIfEmpty(const Directory& directory) {
     if (!cover || !S_ISREG(cover->st_mode) || ea_dir->Entries().size() != 1) return;
     (void)ea_dir->RemoveFile(kCoverName);
     (void)directory.RemoveEmpty(kEaDirName);
+}
+
+void LeaveEmptyEaDirectories() { leaves_ea_directories = true; }
+
+bool TakeLeftEaDirectory() { return std::exchange(left_ea_directory, false); }
+
+void RemoveLeftEaDirectory(const Directory& directory) {
+    directory.NoteCome(kEaDirName);
+    directory.Forget(kEaDirName);
+    RemoveEaDirectoryIfEmpty(directory);
 }
 
 DirectoryRef NeedEaDirectory(const Directory& directory) {

@@ -107,6 +107,14 @@ std::vector<LeftOver> FindLeftOver(const Directory& directory, const Directory& 
 // Removes an "@eaDir" in which nothing is left but a ".cover".
 void RemoveEaDirectoryIfEmpty(const Directory& directory);
 
+// From here on that leaves it where it is, for processes that work beside others in one directory:
+// one of those may be about to write into it. It is removed when all have ended.
+void LeaveEmptyEaDirectories();
+// Whether one has been left since this was last asked.
+bool TakeLeftEaDirectory();
+// Removes it after all, whatever the directory's list says.
+void RemoveLeftEaDirectory(const Directory& directory);
+
 // The EA directory, made where it is missing; for that the process becomes the superuser for a
 // moment, if it may. Throws Failure.
 DirectoryRef NeedEaDirectory(const Directory& directory);

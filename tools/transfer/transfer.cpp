@@ -681,8 +681,8 @@ void Transfer::Remember(const struct stat& info) {
 void Transfer::NoteMade(const Place& to, const struct stat& info) {
     made_apple_double_ = made_apple_double_ || to.name.starts_with(AppleDoubleName({}));
     if (S_ISLNK(info.st_mode)) made_links_.insert(IdOf(info));
-    const Directory* const directory = to.directory.get();
-    if (!fresh_.contains(directory)) made_[directory].insert_or_assign(IdOf(info), to.name);
+    if (to.directory->is_new()) return;
+    made_[to.directory.get()].insert_or_assign(IdOf(info), to.name);
 }
 
 // Under which name this has made in its directory what is at a place now; none when it has not.
@@ -690,7 +690,7 @@ std::optional<std::string> Transfer::NameOfMade(const Place& to) const {
     const auto info = to.Status();
     if (!info) return std::nullopt;
     // All that is in a directory that is new has been made here.
-    if (fresh_.contains(to.directory.get())) return to.directory->NameOf(*info, to.name);
+    if (to.directory->is_new()) return to.directory->NameOf(*info, to.name);
     const auto directory = made_.find(to.directory.get());
     if (directory == made_.end()) return std::nullopt;
     const auto found = directory->second.find(IdOf(*info));
@@ -765,22 +765,24 @@ DirectoryRef Transfer::MakeDirectory(const Place& from, const Place& to) {
     RequireNoMetadata(from, TargetAt(to, S_IFDIR));
     RequireNotMade(from, to);
     if (DirectoryRef there = to.directory->FindIn(to.name)) {
-        NoteMade(to, there->Status());
+        const struct stat info = there->Status();
+        NoteMade(to, info);
+        volumes_.try_emplace(info.st_dev, there);
         return there;
     }
     const mode_t least = S_IRWXU;
     const mode_t mode = FirstMode(StatusOf(from), options_.manner) | least;
     DirectoryRef made = Made([&] { return "cannot create directory " + Quoted(to.path()); },
                              [&] { return to.directory->MakeIn(to.name, mode); });
-    fresh_.insert(made.get());
-    NoteMade(to, made->Status());
+    const struct stat info = made->Status();
+    NoteMade(to, info);
+    volumes_.try_emplace(info.st_dev, made);
     return made;
 }
 
 void Transfer::FinishDirectory(const Place& from, const Directory& inside, const Place& to,
                                const DirectoryRef& made, bool is_new) {
     made_.erase(made.get());
-    fresh_.erase(made.get());
     Leg leg = LegFor(from, to);
     const File source = inside.Reopened();
     const File target = made->Reopened();
@@ -841,6 +843,12 @@ bool Transfer::Rename(const Place& from, const Place& to) {
     if (!RenameObject(from, to)) return false;
     NoteMade(to, StatusOf(to));
     return true;
+}
+
+void Transfer::ForgetMade() {
+    made_.clear();
+    made_links_.clear();
+    made_apple_double_ = false;
 }
 
 void Transfer::MakeDurable() {

@@ -97,6 +97,10 @@ class Transfer {
     // Whether `to` is a symbolic link that this has made.
     bool HasMadeLink(const Place& to) const;
 
+    // That other transfers copy into one directory at the same time, what of that could meet this
+    // one's work not among it. What was made before no other one asks for.
+    void ForgetMade();
+
     // All that has been copied is on disk.
     void MakeDurable();
 
@@ -138,8 +142,7 @@ class Transfer {
     std::map<FileId, FirstName> first_names_;
     std::vector<std::uint64_t> copied_;  // of each file of sources a hash of what it was
     bool sorted_ = true;                 // that
-    std::set<const Directory*> fresh_;   // directories that are new, and not finished
-    // In each other directory that is not finished, what has been made in it.
+    // In each directory that is not new, and not finished, what has been made in it.
     std::map<const Directory*, std::map<FileId, std::string>> made_;
     std::set<FileId> made_links_;
     bool made_apple_double_ = false;  // whether any of those has a name like "._x"

@@ -24,9 +24,12 @@ namespace {
 
 // Of one batch: large enough that turns cost little, small enough that none waits long at the end.
 constexpr std::size_t kErrands = WorkArea::kErrandsMost;
-// Their descriptors are open while it waits.
-constexpr std::size_t kDirectories = 8;
-static_assert(kDirectories <= kDescriptorsMost);
+// Their descriptors are open while it waits. An errand may add two.
+constexpr std::size_t kDirectories = 15;
+static_assert(kDirectories + 1 <= kDescriptorsMost);
+
+// Steps that wait, with what they keep open.
+constexpr std::size_t kSteps = 64;
 
 // Batches that wait for each worker, and what may wait for its turn to come out.
 constexpr std::size_t kWaiting = 2;
@@ -36,8 +39,11 @@ constexpr std::size_t kResultsMost = std::size_t{64} << 20;
 // may have one of any length.
 bool IsSent(const Errand& errand) {
     constexpr std::size_t kPathMost = std::size_t{1} << 15;
-    const Directory& directory = *errand.object.place.directory;
-    return errand.shown.size() <= PATH_MAX && directory.path().size() <= kPathMost;
+    const auto fits = [](const DirectoryRef& directory) {
+        return !directory || directory->path().size() <= kPathMost;
+    };
+    return errand.shown.size() <= PATH_MAX && fits(errand.object.place.directory) &&
+           fits(errand.to.directory);
 }
 
 std::string EndOf(int status) {
@@ -48,6 +54,11 @@ std::string EndOf(int status) {
 
 }  // namespace
 
+bool IsApart(const std::string& name) {
+    constexpr std::size_t kLong = 200;
+    return name.size() < kLong;
+}
+
 CrewSize UsualCrew() {
     constexpr int kMost = 8;
     constexpr std::uint64_t kAlone = 256;
@@ -57,11 +68,11 @@ CrewSize UsualCrew() {
     return {static_cast<unsigned>(std::clamp(count, 1, kMost)), kAlone};
 }
 
-// What came of a batch, or a step of the first process between two of them.
+// What came of a batch, and what the first process does after it.
 struct Crew::Slot {
     std::string results = {};
     bool complete = false;
-    std::function<void()> step = {};
+    std::vector<std::function<void()>> steps = {};
 };
 
 struct Crew::Batch {
@@ -81,9 +92,9 @@ struct Crew::Worker {
     pid_t process = -1;
     int socket = -1;
     WorkArea* area = nullptr;
-    DirectoryRef last = {};             // that it has
-    std::shared_ptr<Batch> batch = {};  // in hand
-    bool waits = false;                 // for what it has found to be collected
+    std::vector<DirectoryRef> has = {};  // of its last batch
+    std::shared_ptr<Batch> batch = {};   // in hand
+    bool waits = false;                  // for what it has found to be collected
 };
 
 Crew::Crew(CrewSize size, Duties duties)
@@ -102,20 +113,36 @@ void Crew::Do(Errand errand) {
         duties_.show_progress(errand.object);
         return duties_.work(errand, duties_.hear);
     }
-    const auto* const last = open_->errands.empty() ? nullptr : &open_->errands.back();
+    if (errand.here || !IsSent(errand)) {
+        return Then([this, errand] { duties_.work(errand, duties_.hear); });
+    }
+    const Errand* const last = open_->errands.empty() ? nullptr : &open_->errands.back();
     if (last == nullptr || last->object.place.directory != errand.object.place.directory) {
-        if (!IsSent(errand)) return Then([this, errand] { duties_.work(errand, duties_.hear); });
         ++open_->directories;
     }
+    if (last == nullptr || last->to.directory != errand.to.directory) ++open_->directories;
     open_->errands.push_back(std::move(errand));
-    if (open_->errands.size() == kErrands || open_->directories == kDirectories) CloseBatch();
+    if (open_->errands.size() == kErrands || open_->directories >= kDirectories) CloseBatch();
 }
 
 void Crew::Then(std::function<void()> step) {
     if (!shared_out_) return step();
     CloseBatch();
-    outputs_.push_back(std::make_shared<Slot>(Slot{.complete = true, .step = std::move(step)}));
+    Afterwards(std::move(step));
     Output();
+}
+
+void Crew::Afterwards(std::function<void()> step) {
+    if (!shared_out_) return step();
+    Slot* slot = open_->slot.get();
+    if (open_->errands.empty()) {
+        if (outputs_.empty()) return step();
+        slot = outputs_.back().get();
+    }
+    slot->steps.push_back(std::move(step));
+    if (++steps_ < kSteps) return;
+    CloseBatch();
+    while (steps_ > 0) Wait();
 }
 
 void Crew::Finish() {
@@ -190,12 +217,12 @@ void Crew::Assign() {
 
 // False when it has died.
 bool Crew::Give(Worker* worker, const std::shared_ptr<Batch>& batch) {
-    const Request request = RequestOf(batch->errands, batch->next, worker->last.get());
+    const Request request = RequestOf(batch->errands, batch->next, worker->has);
     std::memcpy(worker->area->request.data(), request.bytes.data(), request.bytes.size());
     worker->area->state.store({}, std::memory_order_release);
     if (!SendTurn(worker->socket, Turn::kWork, request.descriptors)) return false;
     worker->batch = batch;
-    worker->last = batch->errands.back().object.place.directory;
+    worker->has = request.directories;
     return true;
 }
 
@@ -210,6 +237,7 @@ void Crew::DoHere(const Batch& batch) {
 void Crew::Wait() {
     constexpr int kSecond = 1000;  // milliseconds
     Output();
+    if (outputs_.empty()) return;
     std::vector<pollfd> sockets;
     for (const auto& worker : workers_) {
         const bool speaks = worker->batch && !worker->waits;
@@ -293,8 +321,9 @@ void Crew::Output() {
         Say(*slot);
         slot->results.clear();
         if (slot->complete) {
-            if (slot->step) slot->step();
             outputs_.pop_front();
+            for (const auto& step : slot->steps) step();
+            steps_ -= slot->steps.size();
             continue;
         }
         const auto next = std::find_if(workers_.begin(), workers_.end(), [&](const auto& worker) {
@@ -318,8 +347,15 @@ void Crew::Say(const Slot& slot) {
         const auto kind = static_cast<ResultKind>(results.TakeNumber());
         const std::string_view text = results.TakeText();
         switch (kind) {
+            case ResultKind::kPart:
+                told_ += text;
+                break;
             case ResultKind::kTold:
-                duties_.hear(text);
+                duties_.hear(told_.empty() ? text : told_ += text);
+                told_.clear();
+                break;
+            case ResultKind::kLeftEaDirectory:
+                left_ea_directories_ = true;
                 break;
             case ResultKind::kFailure:
                 if (std::exchange(in_line_, false)) std::cout << '\n';

@@ -30,12 +30,15 @@ CrewSize UsualCrew();
 
 // What somebody of the crew is to do.
 struct Errand {
-    enum class Kind : std::uint8_t { kNamed, kFound, kDirectory };
+    enum class Kind : std::uint8_t { kNamed, kFound, kDirectory, kCopy };
 
     Kind kind;
-    Object object;      // kDirectory: only its directory counts
-    mode_t type;        // S_IFREG, ...
-    std::string shown;  // empty: the object's own path
+    Object object;           // kDirectory: only its directory counts; kCopy: only its place
+    mode_t type;             // S_IFREG, ...
+    std::string shown = {};  // empty: the object's own path
+    Place to = {};           // kCopy
+    // Only in the first process, after all errands before it: what it does may meet what others do.
+    bool here = false;
 };
 
 // Tells the process that began the work what came of it. That gets it in the order of the errands.
@@ -54,9 +57,17 @@ struct Duties {
     std::function<void(const Object&)> show_progress;
 };
 
+// Whether what one process does to an object of this name never meets what another does to a second
+// one in the same directory: names of metadata that are derived from long ones may be the same.
+bool IsApart(const std::string& name);
+
+// Whether this process is one beside the first.
+bool IsWorker();
+
 // Errands are done in any order, a bounded number at a time: what came of each waits until all that
 // stand before it are done. An errand whose process dies is one failure; the rest is done by
-// others.
+// others. Processes beside the first one leave EA directories that have become empty: another may
+// be about to write into it.
 class Crew {
  public:
     Crew(CrewSize size, Duties duties);
@@ -65,8 +76,12 @@ class Crew {
     Crew& operator=(const Crew&) = delete;
 
     void Do(Errand errand);
-    // Called in this process, after all that came of the errands before it is out.
+    // Called in this process, after all that came of the errands before it is out: soon, or when
+    // the errands around it are out as well.
     void Then(std::function<void()> step);
+    void Afterwards(std::function<void()> step);
+    // Whether others may have left EA directories that are empty. Asked in such a step.
+    bool LeftEaDirectories() const { return left_ea_directories_; }
     // Returns when everything is done, and out.
     void Finish();
 
@@ -97,10 +112,13 @@ class Crew {
     bool shared_out_ = false;
     std::uint64_t batches_ = 0;
     std::vector<std::unique_ptr<Worker>> workers_;
+    std::size_t steps_ = 0;                      // that have not been called
     std::shared_ptr<Batch> open_;                // that further errands come to
     std::deque<std::shared_ptr<Batch>> ready_;   // that nobody has taken yet
     std::deque<std::shared_ptr<Slot>> outputs_;  // in the order in which they come out
+    std::string told_;                           // the beginning of what somebody tells
     bool in_line_ = false;                       // what has come out ends in the middle of one
+    bool left_ea_directories_ = false;
 };
 
 }  // namespace mavoea::tool

@@ -4,9 +4,11 @@
 
 #include <algorithm>
 #include <cstddef>
+#include <cstdint>
 
 #include "include/mavoea.h"
 #include "tools/store/sidecars.h"
+#include "tools/walk/packing.h"
 
 namespace mavoea::tool {
 namespace {
@@ -84,7 +86,12 @@ class Walk {
             visit_.on_other(object);
             return true;
         }
-        crew_.Do({kind, object, type, shown});
+        crew_.Do({.kind = kind,
+                  .object = object,
+                  .type = type,
+                  .shown = shown,
+                  .here = visit_.changes &&
+                          (kind == Errand::Kind::kNamed || !IsApart(object.place.name))});
         return !S_ISDIR(type) || visit_.enters(object);
     }
 
@@ -118,7 +125,8 @@ class Walk {
         const DirectoryRef directory = outer.place.directory->OpenIn(outer.place.name);
         visit_.on_directory(directory);
         if (visit_.look_into) {
-            crew_.Do({Errand::Kind::kDirectory, {{directory, "."}}, S_IFDIR, {}});
+            crew_.Do(
+                {.kind = Errand::Kind::kDirectory, .object = {{directory, "."}}, .type = S_IFDIR});
         }
         const std::size_t first = pending_.size();
         for (const Directory::Entry& entry : ObjectsIn(directory)) {
@@ -129,6 +137,16 @@ class Walk {
                 const Object object = ObjectAt(inner.place, entry.type);
                 const bool enters = Do(Errand::Kind::kFound, object, entry.type, inner.hash, {});
                 if (enters && S_ISDIR(entry.type)) pending_.push_back(inner);
+            });
+        }
+        if (visit_.changes) {
+            crew_.Afterwards([this, directory, outer] {
+                if (!crew_.LeftEaDirectories()) return;
+                try {
+                    RemoveLeftEaDirectory(*directory);
+                } catch (const Failure& failure) {
+                    visit_.on_failure(outer.place.path(), failure);
+                }
             });
         }
         std::reverse(pending_.begin() + static_cast<std::ptrdiff_t>(first), pending_.end());
@@ -145,22 +163,28 @@ class Walk {
 
 // ---- The work -----------------------------------------------------------------------------------
 
+constexpr std::uint64_t kFailedOutcome = UINT64_MAX;
+
 class Work {
  public:
     explicit Work(const Task& task)
         : task_(task), report_({task.doing, task.done, task.current, task.nothing}) {}
 
     void Run(const TreeOptions& options) {
-        VisitObjects(options, {.work = [this](const Object& object, const std::string&,
-                                              const Tell&) { DoObject(object); },
-                               .on_failure =
-                                   [this](const std::string& path, const Failure& failure) {
-                                       report_.AddFailure(path, failure);
-                                   },
-                               .enters = [this](const Object& object) { return Suits(object); },
-                               .on_named = task_.on_named,
-                               .on_directory = task_.on_directory,
-                               .on_other = task_.check});
+        VisitObjects(
+            options,
+            {.work = [this](const Object& object, const std::string&,
+                            const Tell& tell) { tell(DoObject(object)); },
+             .on_failure = [this](const std::string& path,
+                                  const Failure& failure) { report_.AddFailure(path, failure); },
+             .enters = [this](const Object& object) { return Suits(object); },
+             .on_named = task_.on_named,
+             .on_directory = task_.on_directory,
+             .hear = [this](std::string_view told) { Hear(told); },
+             .changes = true,
+             .clear_progress = [this] { report_.ClearProgress(); },
+             .show_progress = [this](const Object& object) { report_.Show(object.path()); },
+             .on_other = task_.check});
     }
 
     ExitStatus Finish(bool json) { return report_.Finish(json); }
@@ -176,18 +200,38 @@ class Work {
         }
     }
 
-    void DoObject(const Object& object) {
-        report_.Show(object.path());
+    // What became of it, packed: an outcome with what there is to say, or a failure.
+    std::string DoObject(const Object& object) const {
+        Packer told;
         bool suits = false;
         try {
             task_.check(object);
             suits = true;
-            report_.Add(task_.work(object, report_.notes()));
+            Notes notes;
+            const Outcome outcome = task_.work(object, &notes);
+            told.AddNumber(static_cast<std::uint64_t>(outcome));
+            for (const std::string& note : notes) told.AddText(note);
         } catch (const Failure& failure) {
-            if (!suits || !HasGone(object.place, failure)) {
-                report_.AddFailure(object.path(), failure);
-            }
+            if (suits && HasGone(object.place, failure)) return {};
+            told.AddNumber(kFailedOutcome);
+            told.AddText(object.path());
+            told.AddNumber(static_cast<std::uint64_t>(failure.status()));
+            told.AddText(failure.what());
         }
+        return told.bytes();
+    }
+
+    void Hear(std::string_view told) {
+        if (told.empty()) return;
+        Unpacker said(told);
+        const std::uint64_t outcome = said.TakeNumber();
+        if (outcome == kFailedOutcome) {
+            const std::string path(said.TakeText());
+            const auto status = static_cast<ExitStatus>(said.TakeNumber());
+            return report_.AddFailure(path, status, std::string(said.TakeText()));
+        }
+        report_.Add(static_cast<Outcome>(outcome));
+        while (!said.empty()) report_.notes()->emplace_back(said.TakeText());
     }
 
     const Task& task_;

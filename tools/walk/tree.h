@@ -46,8 +46,10 @@ struct Visit {
     std::function<void(const DirectoryRef&)> on_directory = [](const DirectoryRef&) {};
 
     // With this, the work is shared out to processes, as a crew has it: `work` and these two may
-    // change nothing of this one, and call `hear` in it by what they tell.
+    // change nothing of this one, and call `hear` in it by what they tell. Of what changes objects
+    // the first process does those that are not apart from others.
     std::function<void(std::string_view)> hear = {};
+    bool changes = false;
     std::function<void(const Object&, const Tell&)> look_at_named = [](const Object&, const Tell&) {
     };
     // Of all shards.
@@ -75,7 +77,7 @@ struct Task {
     // Throws Failure for an object on a volume that does not suit. Nothing below such a directory
     // is looked at.
     std::function<void(const Object&)> check;
-    // Throws Failure.
+    // Throws Failure. Changes nothing of the process that it is in.
     std::function<Outcome(const Object&, Notes*)> work;
 
     // As of a visit.
@@ -83,7 +85,7 @@ struct Task {
     std::function<void(const DirectoryRef&)> on_directory = [](const DirectoryRef&) {};
 };
 
-// Does the task to one object after the other, and goes on after a failure.
+// Does the task to all objects, and goes on after a failure.
 //
 // Shows how far it is on standard error, when that is a terminal; at the end the counts are on
 // standard output, and notes and failures on standard error. kSuccess when nothing failed,

@@ -9,9 +9,10 @@ void TreeReport::Show(const std::string& path) {
     if (progress_.wanted()) progress_.Show(StatusText(), path, Total() + failures_.size());
 }
 
-void TreeReport::AddFailure(const std::string& path, const Failure& failure) {
-    failures_.push_back({path, failure.what()});
-    status_ = std::max(status_, failure.status());
+void TreeReport::AddFailure(const std::string& path, ExitStatus status,
+                            const std::string& message) {
+    failures_.push_back({path, message});
+    status_ = std::max(status_, status);
 }
 
 ExitStatus TreeReport::Finish(bool json) {

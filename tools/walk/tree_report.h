@@ -33,9 +33,13 @@ class TreeReport {
 
     // Shows how far it is on standard error, when that is a terminal.
     void Show(const std::string& path);
+    void ClearProgress() { progress_.Clear(); }
 
     void Add(Outcome outcome) { ++counts_[static_cast<std::size_t>(outcome)]; }
-    void AddFailure(const std::string& path, const Failure& failure);
+    void AddFailure(const std::string& path, const Failure& failure) {
+        AddFailure(path, failure.status(), failure.what());
+    }
+    void AddFailure(const std::string& path, ExitStatus status, const std::string& message);
     Notes* notes() { return &notes_; }
 
     // The counts are on standard output, and notes and failures on standard error. kSuccess when

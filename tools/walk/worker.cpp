@@ -12,10 +12,13 @@
 #include <streambuf>
 
 #include "tools/say/progress.h"
+#include "tools/store/sidecars.h"
 #include "tools/walk/packing.h"
 
 namespace mavoea::tool {
 namespace {
+
+bool is_worker = false;
 
 // Where the results of a worker go: into the memory that is shared, in the order in which they
 // come, whichever stream they come by.
@@ -33,11 +36,15 @@ class Results {
 
     void TellOf(std::string_view message) {
         Post();
+        for (; message.size() > kMost; message.remove_prefix(kMost)) {
+            Add(ResultKind::kPart, message.substr(0, kMost));
+        }
         Add(ResultKind::kTold, message);
     }
 
     void EndErrand() {
         Post();
+        if (TakeLeftEaDirectory()) Add(ResultKind::kLeftEaDirectory, {});
         ++done_;
         Publish();
     }
@@ -49,11 +56,12 @@ class Results {
     }
 
  private:
+    // A large one comes in pieces.
+    static constexpr std::size_t kMost = WorkArea::kResultsSize / 2;
+
     void Publish() { area_->state.store({done_, size_}, std::memory_order_release); }
 
     void Post() {
-        // A large one comes in pieces.
-        constexpr std::size_t kMost = WorkArea::kResultsSize / 2;
         for (std::size_t at = 0; at < pending_.size(); at += kMost) {
             Add(kind_, {pending_.data() + at, std::min(kMost, pending_.size() - at)});
         }
@@ -105,20 +113,21 @@ class ResultStream final : public std::streambuf {
 // The errands of one request.
 class Reading {
  public:
-    Reading(const WorkArea& area, std::vector<int> descriptors, const DirectoryRef& former)
+    Reading(const WorkArea& area, const std::vector<int>& descriptors,
+            const std::vector<DirectoryRef>& former)
         : bytes_({area.request.data(), area.request.size()}) {
+        auto descriptor = descriptors.begin();
         for (std::uint64_t left = bytes_.TakeNumber(); left > 0; --left) {
-            const bool is_former = bytes_.TakeNumber() != 0;
+            if (const auto index = static_cast<std::size_t>(bytes_.TakeNumber()); index > 0) {
+                directories_.push_back(former[index - 1]);
+                continue;
+            }
             const std::string path(bytes_.TakeText());
             const std::string location(bytes_.TakeText());
             const bool has_location = bytes_.TakeNumber() != 0;
-            if (is_former) {
-                directories_.push_back(former);
-                continue;
-            }
+            const bool is_new = bytes_.TakeNumber() != 0;
             directories_.push_back(
-                Directory::Adopt(descriptors.front(), path, location, has_location));
-            descriptors.erase(descriptors.begin());
+                Directory::Adopt(*descriptor++, path, location, has_location, is_new));
         }
         left_ = bytes_.TakeNumber();
     }
@@ -127,17 +136,29 @@ class Reading {
         if (left_ == 0) return std::nullopt;
         --left_;
         const auto kind = static_cast<Errand::Kind>(bytes_.TakeNumber());
-        const DirectoryRef& directory = directories_[static_cast<std::size_t>(bytes_.TakeNumber())];
+        const Place place = TakePlace();
         const auto type = static_cast<mode_t>(bytes_.TakeNumber());
-        const Place place = {directory, std::string(bytes_.TakeText())};
         const std::string shown(bytes_.TakeText());
-        if (kind == Errand::Kind::kDirectory) return Errand{kind, {place}, type, shown};
+        switch (kind) {
+            case Errand::Kind::kDirectory:
+                return Errand{kind, {place}, type, shown};
+            case Errand::Kind::kCopy:
+                return Errand{kind, {place}, type, shown, TakePlace()};
+            case Errand::Kind::kNamed:
+            case Errand::Kind::kFound:
+                break;
+        }
         return Errand{kind, ObjectAt(place, type), type, shown};
     }
 
-    DirectoryRef last() const { return directories_.back(); }
+    const std::vector<DirectoryRef>& directories() const { return directories_; }
 
  private:
+    Place TakePlace() {
+        const auto index = static_cast<std::size_t>(bytes_.TakeNumber());
+        return {directories_[index], std::string(bytes_.TakeText())};
+    }
+
     Unpacker bytes_;
     std::vector<DirectoryRef> directories_;
     std::uint64_t left_ = 0;
@@ -191,38 +212,46 @@ std::optional<Turn> ReceiveTurn(int socket, std::vector<int>* descriptors) {
     return static_cast<Turn>(code);
 }
 
-Request RequestOf(const std::vector<Errand>& errands, std::size_t first, const Directory* former) {
-    std::vector<const Directory*> directories;
-    Packer packed;
-    std::vector<std::size_t> indexes;
-    for (std::size_t i = first; i < errands.size(); ++i) {
-        const Directory* const directory = errands[i].object.place.directory.get();
-        if (directories.empty() || directories.back() != directory) {
-            directories.push_back(directory);
-        }
-        indexes.push_back(directories.size() - 1);
-    }
+Request RequestOf(const std::vector<Errand>& errands, std::size_t first,
+                  const std::vector<DirectoryRef>& former) {
     Request request;
-    packed.AddNumber(directories.size());
-    for (const Directory* const directory : directories) {
-        packed.AddNumber(directory == former ? 1 : 0);
-        packed.AddText(directory == former ? std::string() : directory->path());
-        packed.AddText(directory == former ? std::string() : directory->location());
-        packed.AddNumber(directory->has_location() ? 1 : 0);
-        if (directory != former) request.descriptors.push_back(directory->fd());
-    }
-    packed.AddNumber(indexes.size());
-    for (std::size_t i = 0; i < indexes.size(); ++i) {
-        const Errand& errand = errands[first + i];
+    Packer packed;
+    const auto add = [&](const Place& place) {
+        auto& all = request.directories;
+        const auto found = std::find(all.begin(), all.end(), place.directory);
+        packed.AddNumber(static_cast<std::uint64_t>(found - all.begin()));
+        packed.AddText(place.name);
+        if (found == all.end()) all.push_back(place.directory);
+    };
+    packed.AddNumber(errands.size() - first);
+    for (std::size_t i = first; i < errands.size(); ++i) {
+        const Errand& errand = errands[i];
         packed.AddNumber(static_cast<std::uint64_t>(errand.kind));
-        packed.AddNumber(indexes[i]);
+        add(errand.object.place);
         packed.AddNumber(errand.type);
-        packed.AddText(errand.object.place.name);
         packed.AddText(errand.shown);
+        if (errand.kind == Errand::Kind::kCopy) add(errand.to);
     }
-    request.bytes = packed.bytes();
+    Packer head;
+    head.AddNumber(request.directories.size());
+    for (const DirectoryRef& directory : request.directories) {
+        const auto found = std::find(former.begin(), former.end(), directory);
+        if (found != former.end()) {
+            head.AddNumber(static_cast<std::uint64_t>(found - former.begin()) + 1);
+            continue;
+        }
+        head.AddNumber(0);
+        head.AddText(directory->path());
+        head.AddText(directory->location());
+        head.AddNumber(directory->has_location() ? 1 : 0);
+        head.AddNumber(directory->is_new() ? 1 : 0);
+        request.descriptors.push_back(directory->fd());
+    }
+    request.bytes = head.bytes() + packed.bytes();
     return request;
 }
+
+bool IsWorker() { return is_worker; }
 
 void WorkAsTold(int socket, WorkArea* area,
                 const std::function<void(const Errand&, const Tell&)>& work) {
@@ -231,18 +260,20 @@ void WorkAsTold(int socket, WorkArea* area,
     ResultStream error(&results, ResultKind::kError);
     std::cout.rdbuf(&output);
     std::cerr.rdbuf(&error);
+    is_worker = true;
     SilenceProgress();
-    DirectoryRef former;
+    LeaveEmptyEaDirectories();
+    std::vector<DirectoryRef> former;
     std::vector<int> descriptors;
     while (ReceiveTurn(socket, &descriptors) == Turn::kWork) {
         results.Begin();
-        Reading reading(*area, std::move(descriptors), former);
+        Reading reading(*area, descriptors, former);
         descriptors.clear();
         while (const auto errand = reading.Next()) {
             work(*errand, [&](std::string_view message) { results.TellOf(message); });
             results.EndErrand();
         }
-        former = reading.last();
+        former = reading.directories();
         if (!SendTurn(socket, Turn::kDone)) break;
     }
     ::_exit(0);

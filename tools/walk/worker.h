@@ -45,8 +45,8 @@ struct WorkArea {
     std::array<char, kResultsSize> results;
 };
 
-// What comes of errands.
-enum class ResultKind : std::uint8_t { kOutput, kError, kTold, kFailure };
+// What comes of errands. What is told may come in several parts.
+enum class ResultKind : std::uint8_t { kOutput, kError, kPart, kTold, kFailure, kLeftEaDirectory };
 
 // A turn, with descriptors of directories when errands come along.
 enum class Turn : char { kWork = 'W', kGoOn = 'G', kEnd = 'E', kDone = 'D', kFull = 'F' };
@@ -56,13 +56,15 @@ std::optional<Turn> ReceiveTurn(int socket, std::vector<int>* descriptors = null
 // As many as come along with one turn.
 inline constexpr std::size_t kDescriptorsMost = 16;
 
-// Errands in bytes. A directory is named by a number: one that the worker has last had is not sent
-// once more.
+// Errands in bytes. A directory is named by a number: one that the worker had for its last request
+// is not sent once more.
 struct Request {
-    std::string bytes;
+    std::string bytes = {};
+    std::vector<DirectoryRef> directories = {};
     std::vector<int> descriptors = {};
 };
-Request RequestOf(const std::vector<Errand>& errands, std::size_t first, const Directory* former);
+Request RequestOf(const std::vector<Errand>& errands, std::size_t first,
+                  const std::vector<DirectoryRef>& former);
 
 // Works until it is told that this is the end, or the first process has gone.
 [[noreturn]] void WorkAsTold(int socket, WorkArea* area,
