@@ -408,18 +408,29 @@ def compare_start(options, room):
 
 
 def compare_jobs(options, room):
-    """The same trees, looked at by one process and by two."""
+    """The same trees, looked at and converted by one process and by two."""
     volumes = Volumes(options.tool, make_room(room, "jobs"), 2 * options.objects)
     for kind in (*KINDS, SAMBA):
         for file_system in FILE_SYSTEMS:
             tree = volumes.tree(file_system, kind, kind != PLAIN)
             command = volumes.command((tree, kind))
-            for name in ("check", "list"):
-                times = [[seconds([*command, name, "-r", "-j", jobs, tree]) for jobs in "12"]
+            target = f"{volumes.path(file_system, 'b')}/made"
+            convert = ["convert", "-r", "--to", str(kind), tree, target]
+            for work in (["check", "-r", tree], ["list", "-r", tree], convert):
+                times = [[by_jobs(command, work, jobs, target) for jobs in "12"]
                          for _ in range(2 * options.rounds)]
                 one, two = (statistics.median(column) for column in zip(*times))
-                print(f"{name.ljust(5)} {str(kind).ljust(5)} {file_system.ljust(5)} {two / one:5.2f}"
-                      f" ({two:.2f} / {one:.2f} s)")
+                print(f"{work[0].ljust(7)} {str(kind).ljust(5)} {file_system.ljust(5)}"
+                      f" {two / one:5.2f} ({two:.2f} / {one:.2f} s)")
+
+
+def by_jobs(command, work, jobs, target):
+    """How long so many processes take for the work; what it makes is removed."""
+    took = seconds([*command, work[0], "-j", jobs, *work[1:]])
+    if os.path.exists(target):
+        shutil.rmtree(target)
+        run("sync", "-f", os.path.dirname(target))
+    return took
 
 
 def make_room(room, name):
