@@ -500,6 +500,28 @@ TEST_F(ShardTest, EachObjectIsInOneShardAndNoneInTwo) {
     }
 }
 
+// Those of objects and those of directories as a whole.
+TEST_F(ShardTest, EachFindingIsSaidByOneShard) {
+    MakeTree();
+    for (int i = 0; i < 500; i += 10) {
+        const std::string name = At("tree/wide/") + std::to_string(i);
+        if (i % 20 == 0) {
+            std::filesystem::remove(name);  // its metadata dangles
+        } else {
+            ASSERT_EQ(0, truncate(At("tree/wide/._" + std::to_string(i)).c_str(), 80));
+        }
+    }
+    const auto whole = Split(share_.Run({"check", "-r", At("tree")}).out, '\n');
+    ASSERT_LE(50U, whole.size());
+    std::vector<std::string> all;
+    for (const char* shard : {"1/3", "2/3", "3/3"}) {
+        const ToolResult result = share_.Run({"check", "-r", "--shard", shard, At("tree")});
+        EXPECT_EQ("", result.err);
+        for (const std::string& line : Split(result.out, '\n')) all.push_back(line);
+    }
+    EXPECT_EQ(Sorted(whole), Sorted(all));
+}
+
 TEST_F(ShardTest, AllCommandsForTreesTakeShards) {
     MAVOEA_SKIP_WITHOUT_ATTRIBUTES(share_.path());
     MakeTree();

@@ -48,6 +48,8 @@ struct Tally {
     }
 };
 
+constexpr Tally kOneSound = {1, 0, 0, 0, 0, 0, 0, {}};
+
 // Says everything at once: there may be as many findings as objects.
 class Soundness final : public MendingSink {
  public:
@@ -59,7 +61,7 @@ class Soundness final : public MendingSink {
         VisitObjects(
             tree,
             {.work = [this](const Object& object, const std::string&,
-                            const Tell& tell) { Look(tell, [&] { CheckObject(object); }); },
+                            const Tell& tell) { return Look(tell, [&] { CheckObject(object); }); },
              .on_failure = [this](const std::string&,
                                   const Failure& failure) { AddFailure(failure); },
              .enters =
@@ -67,16 +69,23 @@ class Soundness final : public MendingSink {
                      return object.keeping() != Keeping::kNone &&
                             !IsOfTool({object.place.name, S_IFDIR});
                  },
-             .hear = [this](std::string_view told) { tally_.Add(Unpacker(told).Take<Tally>()); },
-             .look_at_named = [this](const Object& object,
-                                     const Tell& tell) { Look(tell, [&] { CheckNamed(object); }); },
-             .look_into = [this](const DirectoryRef& directory,
-                                 const Tell& tell) { Look(tell, [&] { LookInto(directory); }); },
+             .hear = [this](std::string_view told) { Hear(told); },
+             .changes = options_.repair,
+             .look_at_named =
+                 [this](const Object& object, const Tell& tell) {
+                     return Look(tell, [&] { CheckNamed(object); });
+                 },
+             .look_into =
+                 [this](const DirectoryRef& directory, const Tell& tell) {
+                     return Look(tell, [&] { LookInto(directory); });
+                 },
              .clear_progress = [this] { progress_.Clear(); },
              .show_progress =
                  [this](const Object& object) {
                      if (progress_.wanted()) progress_.Show(Counts(), object.path());
-                 }});
+                 }},
+            std::string("check") + (options_.repair ? ", repair" : "") +
+                (options_.remove ? ", remove what was kept" : "") + " of");
         progress_.Clear();
         Summarize();
         if (tally_.failed > 0) return kFailed;
@@ -150,9 +159,10 @@ class Soundness final : public MendingSink {
     }
 
  private:
-    // What it adds to the tally is told, in whatever process this is.
+    // What it adds to the tally is told, in whatever process this is: nothing of one more object
+    // that is sound. Whether all of it could be looked at.
     template <class Work>
-    void Look(const Tell& tell, Work work) {
+    bool Look(const Tell& tell, Work work) {
         const Tally before = std::exchange(tally_, {});
         try {
             work();
@@ -160,7 +170,12 @@ class Soundness final : public MendingSink {
             AddFailure(failure);
         }
         const Tally more = std::exchange(tally_, before);
-        tell(Packed(more));
+        tell(Packed(more) == Packed(kOneSound) ? std::string() : Packed(more));
+        return more.failed == 0 && more.in_use == 0;
+    }
+
+    void Hear(std::string_view told) {
+        tally_.Add(told.empty() ? kOneSound : Unpacker(told).Take<Tally>());
     }
 
     void Count(const Finding& finding) {

@@ -159,6 +159,29 @@ void AddSharedTree(CLI::App* sub, Options* options) {
     AddTree(sub, options);
 }
 
+// For work that may take more than a night.
+void AddLog(CLI::App* sub, Options* options) {
+    const auto add = [&](const char* name, bool resumes, const char* text) {
+        return sub
+            ->add_option_function<std::string>(
+                name,
+                [=](const std::string& path) {
+                    options->log = LogFile{.path = path, .resumes = resumes};
+                },
+                text)
+            ->type_name("FILE");
+    };
+    CLI::Option* const log =
+        add("--log", false, "Write into a new file what is done, for a run that goes on with it");
+    add("--resume", true, "Go on with that file: only what it does not have as done is done")
+        ->excludes(log);
+}
+
+void AddLoggedTree(CLI::App* sub, Options* options) {
+    AddLog(sub, options);
+    AddSharedTree(sub, options);
+}
+
 CLI::Option* AddSource(CLI::App* sub, Options* options) {
     return sub->add_option_function<std::string>(
         "SRC", [=](const std::string& path) { options->paths.arguments = {path}; }, "The original");
@@ -370,9 +393,9 @@ constexpr Syntax kCommands[] = {
          sub->add_option("DST", options->destination, "The copy's own path")->required();
      }},
     {Command::kUpgrade, "upgrade", "Convert what earlier versions kept into the current layout",
-     AddSharedTree},
+     AddLoggedTree},
     {Command::kRepair, "repair", "Move what resource files wrongly hold into EA streams",
-     AddSharedTree},
+     AddLoggedTree},
     {Command::kClean, "clean", "List metadata whose object is gone, and remove it with --yes",
      [](CLI::App* sub, Options* options) {
          AddRecursive(sub, options);
@@ -398,14 +421,13 @@ constexpr Syntax kCommands[] = {
                        "What repairs have replaced goes, where the object has all that it holds")
              ->needs(repair);
          sub->footer(MendingText() + '\n' + FindingCodes());
-         AddJobs(sub, options);
-         AddRecursive(sub, options);
-         AddPaths(sub, options, "PATH", "Files and directories");
+         AddLoggedTree(sub, options);
      }},
     {Command::kConvert, "convert",
      "Copy an object or a tree to a volume of another type, and compare the two",
      [](CLI::App* sub, Options* options) {
          AddJobs(sub, options);
+         AddLog(sub, options);
          const auto arguments = AddConversion(sub, options);
          CLI::Option* const plan = sub->add_option_function<std::string>(
              "--plan", [=](const std::string& file) { options->plan = file; },

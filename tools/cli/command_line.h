@@ -12,6 +12,7 @@
 #include "tools/cli/words.h"
 #include "tools/move/options.h"
 #include "tools/place/paths.h"
+#include "tools/walk/journal.h"
 #include "tools/walk/shard.h"
 
 namespace mavoea::tool {
@@ -66,6 +67,7 @@ struct Options {
     std::optional<std::string> type;      // restore: of the volume that the text was made of
     std::optional<std::string> encoding;  // save
     std::optional<std::string> output;    // save, plan
+    std::optional<LogFile> log;           // check, convert, upgrade, repair
     std::optional<std::string> plan;  // convert: does what it says, and takes no other arguments
 
     InfoOptions info;      // set-info

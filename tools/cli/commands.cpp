@@ -145,15 +145,18 @@ ExitStatus Lock(const TreeOptions& options, bool locked) {
     // Tells the status and, of a failure, what is said of it.
     const auto work = [&](const Object& object, const std::string&, const Tell& tell) {
         Packer told;
+        bool is_done = false;
         try {
             SetLocked(object, locked);
             told.AddNumber(kSuccess);
             told.AddText(object.path());
+            is_done = true;
         } catch (const Failure& failure) {
             told.AddNumber(static_cast<std::uint64_t>(failure.status()));
             told.AddText(failure.what());
         }
         tell(told.bytes());
+        return is_done;
     };
     const auto hear = [&](std::string_view told) {
         Unpacker said(told);
@@ -280,7 +283,8 @@ ConvertOptions ConversionOf(const Options& options) {
             .type = options.to,
             .recursive = options.recursive,
             .json = options.json,
-            .crew = CrewOf(options)};
+            .crew = CrewOf(options),
+            .log = options.log};
 }
 
 }  // namespace
@@ -293,8 +297,12 @@ ExitStatus Run(const Options& options) {
     if (!options.progress.empty()) {
         ReportProgressEach(std::chrono::seconds(std::stoi(options.progress)));
     }
-    const TreeOptions tree = {options.paths, options.recursive, options.json, options.shard,
-                              CrewOf(options)};
+    const TreeOptions tree = {.paths = options.paths,
+                              .recursive = options.recursive,
+                              .json = options.json,
+                              .shard = options.shard,
+                              .log = options.log,
+                              .crew = CrewOf(options)};
     switch (options.command) {
         case Command::kWhere:
             return Where(options.paths.front(), options.json);
@@ -378,7 +386,10 @@ ExitStatus Run(const Options& options) {
                                    .repair = options.repair,
                                    .remove = options.yes});
         case Command::kConvert:
-            if (options.plan) return ConvertAsPlanned(*options.plan, CrewOf(options), options.json);
+            if (options.plan)
+                return ConvertAsPlanned(
+                    *options.plan,
+                    {.json = options.json, .crew = CrewOf(options), .log = options.log});
             return Convert(ConversionOf(options));
         case Command::kPlan:
             return PlanConversion({.conversion = ConversionOf(options),

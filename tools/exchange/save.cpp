@@ -134,8 +134,11 @@ class Saving {
                 continue;
             }
             VisitObjects({.paths = {{path}}, .recursive = options_.recursive},
-                         {.work = [&](const Object& object, const std::string&,
-                                      const Tell&) { Do(object, path); },
+                         {.work =
+                              [&](const Object& object, const std::string&, const Tell&) {
+                                  Do(object, path);
+                                  return true;
+                              },
                           .on_failure = [this](const std::string&,
                                                const Failure& failure) { AddFailure(failure); },
                           .enters = [this](const Object&) { return !job_.stopped(); },

@@ -6,6 +6,8 @@
 #include <cstdint>
 #include <filesystem>
 #include <iostream>
+#include <optional>
+#include <set>
 #include <utility>
 #include <vector>
 
@@ -18,7 +20,9 @@
 #include "tools/transfer/transfer.h"
 #include "tools/transfer/tree_comparison.h"
 #include "tools/transfer/tree_copy.h"
+#include "tools/walk/journal.h"
 #include "tools/walk/packing.h"
+#include "util/fnv.h"
 
 namespace mavoea::tool {
 namespace {
@@ -28,23 +32,26 @@ class Conversion final : private TreeCopy {
     Conversion(const ConvertOptions& options, Pair top)
         : options_(options),
           top_(std::move(top)),
+          is_new_(!top_.second.Status()),
           progress_("converting"),
           transfer_({.watch = {.on_bytes = [this](std::uint64_t) { Show(in_hand_); },
                                .give_up = InterruptedAgain},
                      .on_note = [this](const std::string& note) { notes_.push_back(note); }}),
           crew_(options.crew,
-                {.work = [this](const Errand& errand, const Tell& tell) { tell(CopyOne(errand)); },
+                {.work = [this](const Errand& errand,
+                                const Tell& tell) { return CopyOne(errand, tell); },
                  .hear = [this](std::string_view told) { Hear(told); },
                  .on_failure = [this](const std::string& path,
                                       const Failure& failure) { AddFailure(path, failure); },
                  .clear_progress = [this] { progress_.Clear(); },
-                 .show_progress = [this](const Object& object) { Show(object.path()); }}) {}
+                 .show_progress = [this](const Object& object) { Show(object.path()); },
+                 .sync = [this] { transfer_.MakeDurable(); }},
+                OpenJournal()) {}
 
     // What was not there before has been read back as it was written: it needs no second look.
     void CopyAndCompare() {
-        const bool is_new = !top_.second.Status();
         Copy();
-        if (is_new && failures_.empty()) {
+        if (is_new_ && failures_.empty()) {
             compared_ = converted_;
         } else {
             Compare();
@@ -90,7 +97,8 @@ class Conversion final : private TreeCopy {
         for (const std::string& note : notes_) Note(note);
         for (const FailedObject& failed : failures_) Report(failed.message);
         if (Interrupted() != 0) {
-            Report("interrupted; the source is as it was, give the command again");
+            Report(std::string("interrupted; the source is as it was, ") +
+                   (journal_ ? "go on with --resume" : "give the command again"));
             constexpr int kSignalled = 128;
             return static_cast<ExitStatus>(kSignalled + Interrupted());
         }
@@ -103,11 +111,18 @@ class Conversion final : private TreeCopy {
     void Begin(const Place& from, const Place& to, Level* level) override {
         const struct stat info = StatusOf(from);
         if (!S_ISDIR(info.st_mode)) {
-            return crew_.Do({.kind = Errand::Kind::kCopy,
-                             .object = {from},
-                             .type = info.st_mode & S_IFMT,
-                             .to = to,
-                             .here = info.st_nlink > 1 || !IsApart(to)});
+            const bool begun = crew_.Do({.kind = Errand::Kind::kCopy,
+                                         .object = {from},
+                                         .type = info.st_mode & S_IFMT,
+                                         .to = to,
+                                         .here = info.st_nlink > 1 || !IsApart(to),
+                                         .state = journal_ ? StateOf(info) : 0});
+            if (begun && journal_) touched_.insert(to.directory.get());
+            if (begun || info.st_nlink == 1) return;
+            // Its further names are to be names of that copy.
+            return crew_.Then([=, this] {
+                Try(from.path(), [&] { transfer_.TakeForCopy(from, to, Links::kSeveral); });
+            });
         }
         Show(from.path());
         level->inside = from.Open();
@@ -123,13 +138,49 @@ class Conversion final : private TreeCopy {
 
     void Finish(const Level& level) override {
         crew_.Afterwards([this, level] {
-            Try(level.from.path(), [&] {
+            const std::string key = journal_ ? KeyOf(level) : std::string();
+            const bool touched = touched_.erase(level.made.get()) > 0 || level.is_new;
+            if (!touched) {
+                if (const auto former = crew_.FormerResult(key)) return Hear(*former);
+            }
+            if (journal_) touched_.insert(level.to.directory.get());
+            bool done = false;
+            const std::string told = Carried(level.from, &done, [&] {
                 if (crew_.LeftEaDirectories()) RemoveLeftEaDirectory(*level.made);
                 transfer_.FinishDirectory(level.from, *level.inside, level.to, level.made,
                                           level.is_new);
-                ++converted_;
             });
+            if (done) crew_.NoteDone(key, told);
+            Hear(told);
         });
+    }
+
+    // As what a directory that is finished stands in the journal.
+    static std::string KeyOf(const Level& level) {
+        if (!level.from.directory->HasLocation(level.from.name)) return {};
+        return "finished " + std::to_string(StateOf(level.info)) + ' ' + level.from.location();
+    }
+
+    // Another one when the object is not what it was.
+    static std::uint64_t StateOf(const struct stat& info) {
+        Fnv hash;
+        hash.AddNumber(info.st_ino);
+        hash.AddNumber(info.st_mode);
+        hash.AddNumber(static_cast<std::uint64_t>(info.st_size));
+        for (const timespec& time : {info.st_mtim, info.st_ctim}) {
+            hash.AddNumber(static_cast<std::uint64_t>(time.tv_sec));
+            hash.AddNumber(static_cast<std::uint64_t>(time.tv_nsec));
+        }
+        return hash.value();
+    }
+
+    Journal* OpenJournal() {
+        if (!options_.log) return nullptr;
+        std::string work = options_.recursive ? "convert all of " : "convert ";
+        work += top_.first.location() + " to " + top_.second.location() + ", type " + options_.type;
+        journal_.emplace(*options_.log, work, is_new_ ? "new" : "");
+        is_new_ = journal_->remark() == "new";
+        return &*journal_;
     }
 
     // Whether nothing that other objects of its directory become can meet what it becomes. What
@@ -142,29 +193,36 @@ class Conversion final : private TreeCopy {
                !levels().back().entries.back().name.starts_with(prefix);
     }
 
-    // What became of it, packed: what there is to say of a copy, or a failure; nothing of what is
-    // not begun any more.
-    std::string CopyOne(const Errand& errand) {
-        if (Stopped()) return {};
-        Packer told;
+    bool CopyOne(const Errand& errand, const Tell& tell) {
         const Place& from = errand.object.place;
+        bool done = false;
+        if (Stopped()) return false;
+        tell(Carried(from, &done,
+                     [&] { transfer_.CopyObject(from, errand.type, errand.to, Links::kSeveral); }));
+        if (IsWorker()) transfer_.ForgetMade();
+        return done;
+    }
+
+    // What became of an object, packed: what there is to say of it, or a failure.
+    template <class Carry>
+    std::string Carried(const Place& from, bool* done, Carry carry) {
+        Packer told;
         std::vector<std::string> before = std::exchange(notes_, {});
         try {
-            transfer_.CopyObject(from, errand.type, errand.to, Links::kSeveral);
+            carry();
             told.AddNumber(kSuccess);
+            *done = true;
         } catch (const Failure& failure) {
             told.AddNumber(static_cast<std::uint64_t>(failure.status()));
             told.AddText(from.path());
             told.AddText(failure.what());
         }
-        if (IsWorker()) transfer_.ForgetMade();
         for (const std::string& note : notes_) told.AddText(note);
         notes_ = std::move(before);
         return told.bytes();
     }
 
     void Hear(std::string_view told) {
-        if (told.empty()) return;
         Unpacker said(told);
         const auto status = static_cast<ExitStatus>(said.TakeNumber());
         if (status == kSuccess) {
@@ -226,6 +284,9 @@ class Conversion final : private TreeCopy {
 
     const ConvertOptions& options_;
     Pair top_;
+    bool is_new_;  // nothing was there when the work began
+    std::optional<Journal> journal_;
+    std::set<const Directory*> touched_;  // in which something has been done, with a journal
     Progress progress_;
     Transfer transfer_;
     Crew crew_;

@@ -2,21 +2,24 @@
 #ifndef MAVOEA_TOOLS_MOVE_CONVERT_H_
 #define MAVOEA_TOOLS_MOVE_CONVERT_H_
 
+#include <optional>
 #include <string>
 
 #include "tools/place/volume.h"
 #include "tools/say/messages.h"
 #include "tools/walk/crew.h"
+#include "tools/walk/journal.h"
 
 namespace mavoea::tool {
 
 struct ConvertOptions {
-    std::string source;
-    std::string destination;  // of the copy itself; its parent is there
-    std::string type;         // of the destination's volume, as --volume takes it
+    std::string source = {};
+    std::string destination = {};  // of the copy itself; its parent is there
+    std::string type = {};         // of the destination's volume, as --volume takes it
     bool recursive = false;
     bool json = false;
     CrewSize crew = {};
+    std::optional<LogFile> log = {};  // of what is done
 };
 
 // What is copied, and to where.

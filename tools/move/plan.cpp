@@ -419,7 +419,7 @@ struct Planned {
     std::string fingerprint;
 };
 
-Planned ReadPlan(const std::string& path) {
+Planned ReadPlan(const std::string& path, ConvertOptions manner) {
     constexpr std::uint64_t kMost = std::uint64_t{1} << 20;
     const Failure no_plan(kFailed, path, "it is no plan of a conversion",
                           "make one with: mavoea plan --output FILE");
@@ -435,7 +435,7 @@ Planned ReadPlan(const std::string& path) {
         if (!value || value->empty()) throw Failure(no_plan);
         return *value;
     };
-    Planned planned;
+    Planned planned = {std::move(manner), {}, {}};
     planned.conversion.source = take("source");
     planned.conversion.destination = take("destination");
     planned.conversion.type = take("type");
@@ -458,10 +458,8 @@ ExitStatus PlanConversion(const PlanOptions& options) {
     return Plan(options, ends).Run();
 }
 
-ExitStatus ConvertAsPlanned(const std::string& file, CrewSize crew, bool json) {
-    Planned planned = ReadPlan(file);
-    planned.conversion.crew = crew;
-    planned.conversion.json = json;
+ExitStatus ConvertAsPlanned(const std::string& file, ConvertOptions manner) {
+    const Planned planned = ReadPlan(file, std::move(manner));
     if (planned.conversion.recursive) RequireDescriptorPaths();
     {
         const ConversionEnds ends = EndsOf(planned.conversion);

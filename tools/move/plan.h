@@ -21,9 +21,9 @@ struct PlanOptions {
 // kFailed where something could not be looked at.
 ExitStatus PlanConversion(const PlanOptions& options);
 
-// Does what was planned. A Failure when the file is none of a plan, or the source has changed
-// since.
-ExitStatus ConvertAsPlanned(const std::string& file, CrewSize crew, bool json);
+// Does what was planned, in that manner. A Failure when the file is none of a plan, or the source
+// has changed since.
+ExitStatus ConvertAsPlanned(const std::string& file, ConvertOptions manner);
 
 }  // namespace mavoea::tool
 

@@ -263,6 +263,7 @@ ExitStatus LookAtObjects(const char* doing, const TreeOptions& options, const Lo
             if (!options.recursive || !HasGone(object.place, failure)) add(failure);
         }
         tell(Packed(counts));
+        return counts.status == kSuccess;
     };
     const auto fail = [&](const std::string&, const Failure& failure) {
         ++all.failures;

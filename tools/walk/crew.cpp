@@ -97,8 +97,11 @@ struct Crew::Worker {
     bool waits = false;                  // for what it has found to be collected
 };
 
-Crew::Crew(CrewSize size, Duties duties)
-    : size_(size), duties_(std::move(duties)), open_(std::make_shared<Batch>()) {}
+Crew::Crew(CrewSize size, Duties duties, Journal* journal)
+    : size_(size),
+      duties_(std::move(duties)),
+      journal_(journal),
+      open_(std::make_shared<Batch>()) {}
 
 Crew::~Crew() {
     for (const auto& worker : workers_) {
@@ -108,13 +111,21 @@ Crew::~Crew() {
     }
 }
 
-void Crew::Do(Errand errand) {
+bool Crew::Do(Errand errand) {
+    if (journal_ != nullptr && journal_->resumed()) {
+        if (const auto results = FormerResult(KeyOf(errand))) {
+            Then([this, results] { Say(*results); });
+            return false;
+        }
+    }
     if (!shared_out_ && (begun_++ < size_.alone || !Begin())) {
         duties_.show_progress(errand.object);
-        return duties_.work(errand, duties_.hear);
+        DoHere(errand);
+        return true;
     }
     if (errand.here || !IsSent(errand)) {
-        return Then([this, errand] { duties_.work(errand, duties_.hear); });
+        Then([this, errand] { DoHere(errand); });
+        return true;
     }
     const Errand* const last = open_->errands.empty() ? nullptr : &open_->errands.back();
     if (last == nullptr || last->object.place.directory != errand.object.place.directory) {
@@ -123,6 +134,7 @@ void Crew::Do(Errand errand) {
     if (last == nullptr || last->to.directory != errand.to.directory) ++open_->directories;
     open_->errands.push_back(std::move(errand));
     if (open_->errands.size() == kErrands || open_->directories >= kDirectories) CloseBatch();
+    return true;
 }
 
 void Crew::Then(std::function<void()> step) {
@@ -148,6 +160,31 @@ void Crew::Afterwards(std::function<void()> step) {
 void Crew::Finish() {
     CloseBatch();
     while (!outputs_.empty()) Wait();
+    if (journal_ != nullptr) Guard([&] { journal_->Sync(duties_.sync); });
+}
+
+std::optional<std::string> Crew::FormerResult(const std::string& key) const {
+    return journal_ != nullptr ? journal_->Find(key) : std::nullopt;
+}
+
+void Crew::NoteDone(const std::string& key, std::string_view result) {
+    if (journal_ == nullptr) return;
+    Guard([&] { journal_->Add(key, result); });
+    NoteDone(1);
+}
+
+void Crew::NoteDone(std::size_t count) {
+    if (journal_ != nullptr) Guard([&] { journal_->NoteDone(count, duties_.sync); });
+}
+
+// The log takes nothing any more.
+template <class Work>
+void Crew::Guard(Work work) {
+    try {
+        work();
+    } catch (const Failure& failure) {
+        duties_.on_failure(failure.subject(), failure);
+    }
 }
 
 // False when nobody but this process is to do anything.
@@ -178,7 +215,7 @@ bool Crew::StartWorker() {
         // An end that is open here too would keep others from seeing that this process has gone.
         for (const auto& other : workers_) ::close(other->socket);
         ::close(ends[0]);
-        WorkAsTold(ends[1], worker->area, duties_.work);
+        WorkAsTold(ends[1], worker->area, duties_.work, journal_);
     }
     ::close(ends[1]);
     if (worker->process < 0) return false;
@@ -226,10 +263,18 @@ bool Crew::Give(Worker* worker, const std::shared_ptr<Batch>& batch) {
     return true;
 }
 
-void Crew::DoHere(const Batch& batch) {
-    for (std::size_t i = batch.next; i < batch.errands.size(); ++i) {
-        duties_.work(batch.errands[i], duties_.hear);
+void Crew::DoHere(const Errand& errand) {
+    if (journal_ == nullptr) {
+        (void)duties_.work(errand, duties_.hear);
+        return;
     }
+    const Recorded recorded = Record(errand, duties_.work);
+    if (recorded.done) NoteDone(KeyOf(errand), recorded.results);
+    Say(recorded.results);
+}
+
+void Crew::DoHere(const Batch& batch) {
+    for (std::size_t i = batch.next; i < batch.errands.size(); ++i) DoHere(batch.errands[i]);
     batch.slot->complete = true;
 }
 
@@ -263,6 +308,7 @@ void Crew::Hear(Worker* worker) {
     Collect(worker);
     if (*turn == Turn::kFull) return LetGoOn(worker);
     worker->batch->slot->complete = true;
+    NoteDone(worker->batch->errands.size() - worker->batch->next);
     worker->batch = nullptr;
 }
 
@@ -318,7 +364,7 @@ bool Crew::MayCollect(const Worker& worker) const {
 void Crew::Output() {
     while (!outputs_.empty()) {
         const std::shared_ptr<Slot> slot = outputs_.front();
-        Say(*slot);
+        Say(slot->results);
         slot->results.clear();
         if (slot->complete) {
             outputs_.pop_front();
@@ -340,9 +386,8 @@ void Crew::Output() {
     }
 }
 
-void Crew::Say(const Slot& slot) {
-    if (slot.results.empty()) return;
-    Unpacker results(slot.results);
+void Crew::Say(std::string_view said) {
+    Unpacker results(said);
     while (!results.empty()) {
         const auto kind = static_cast<ResultKind>(results.TakeNumber());
         const std::string_view text = results.TakeText();

@@ -16,6 +16,7 @@
 
 #include "tools/place/volume.h"
 #include "tools/say/messages.h"
+#include "tools/walk/journal.h"
 
 namespace mavoea::tool {
 
@@ -32,13 +33,14 @@ CrewSize UsualCrew();
 struct Errand {
     enum class Kind : std::uint8_t { kNamed, kFound, kDirectory, kCopy };
 
-    Kind kind;
-    Object object;           // kDirectory: only its directory counts; kCopy: only its place
-    mode_t type;             // S_IFREG, ...
+    Kind kind = Kind::kFound;
+    Object object = {};      // kDirectory: only its directory counts; kCopy: only its place
+    mode_t type = 0;         // S_IFREG, ...
     std::string shown = {};  // empty: the object's own path
     Place to = {};           // kCopy
     // Only in the first process, after all errands before it: what it does may meet what others do.
     bool here = false;
+    std::uint64_t state = 0;  // of the object: a log has it as done in that one only
 };
 
 // Tells the process that began the work what came of it. That gets it in the order of the errands.
@@ -46,8 +48,9 @@ using Tell = std::function<void(std::string_view)>;
 
 struct Duties {
     // In any of the processes. What it writes to std::cout and std::cerr, and what it tells, comes
-    // out of the first process, in the order of the errands. Throws nothing.
-    std::function<void(const Errand&, const Tell&)> work;
+    // out of the first process, in the order of the errands. Whether it is done: otherwise those
+    // who go on with a log do it again. Throws nothing.
+    std::function<bool(const Errand&, const Tell&)> work;
 
     // All else in the first process.
     std::function<void(std::string_view)> hear;
@@ -55,6 +58,8 @@ struct Duties {
     // Before anything is written, and now and then with an object in hand.
     std::function<void()> clear_progress;
     std::function<void(const Object&)> show_progress;
+    // What has been done is on disk.
+    std::function<void()> sync = [] {};
 };
 
 // Whether what one process does to an object of this name never meets what another does to a second
@@ -70,12 +75,15 @@ bool IsWorker();
 // be about to write into it.
 class Crew {
  public:
-    Crew(CrewSize size, Duties duties);
+    // With a journal, which stays the caller's, what is done is noted there, and what it has is not
+    // done again: only what came of it comes out once more.
+    Crew(CrewSize size, Duties duties, Journal* journal = nullptr);
     ~Crew();
     Crew(const Crew&) = delete;
     Crew& operator=(const Crew&) = delete;
 
-    void Do(Errand errand);
+    // False when it was done before.
+    bool Do(Errand errand);
     // Called in this process, after all that came of the errands before it is out: soon, or when
     // the errands around it are out as well.
     void Then(std::function<void()> step);
@@ -84,6 +92,10 @@ class Crew {
     bool LeftEaDirectories() const { return left_ea_directories_; }
     // Returns when everything is done, and out.
     void Finish();
+
+    // For what the first process does by itself, in a step.
+    std::optional<std::string> FormerResult(const std::string& key) const;
+    void NoteDone(const std::string& key, std::string_view result);
 
  private:
     struct Area;
@@ -96,18 +108,23 @@ class Crew {
     void CloseBatch();
     void Assign();
     static bool Give(Worker* worker, const std::shared_ptr<Batch>& batch);
+    void DoHere(const Errand& errand);
     void DoHere(const Batch& batch);
+    void NoteDone(std::size_t count);
     void Wait();
     void Hear(Worker* worker);
     void Bury(Worker* worker);
     static void Collect(Worker* worker);
     void Output();
-    void Say(const Slot& slot);
+    void Say(std::string_view results);
+    template <class Work>
+    void Guard(Work work);
     static void LetGoOn(Worker* worker);
     bool MayCollect(const Worker& worker) const;
 
     CrewSize size_;
     Duties duties_;
+    Journal* journal_;
     std::uint64_t begun_ = 0;  // errands, before there were workers
     bool shared_out_ = false;
     std::uint64_t batches_ = 0;

@@ -5,6 +5,9 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
+#include <filesystem>
+#include <map>
+#include <optional>
 
 #include "include/mavoea.h"
 #include "tools/store/sidecars.h"
@@ -18,19 +21,36 @@ mode_t TypeOf(const Place& place) {
     return info ? info->st_mode & S_IFMT : 0;
 }
 
+// What a log is of: what is done, to what, and how that is told.
+std::string WorkOn(const TreeOptions& options, const std::string& doing) {
+    std::string work = doing;
+    if (options.recursive) work += " all of";
+    for (const std::string& path : options.paths.arguments) {
+        work += ' ' + std::filesystem::absolute(path).string();
+    }
+    if (options.paths.list) work += " what a list names";
+    if (options.shard.count > 1) work += ", shard " + ShardText(options.shard);
+    if (options.json) work += ", as JSON";
+    return work;
+}
+
 // One tree after the other.
 class Walk {
  public:
-    Walk(const TreeOptions& options, const Visit& visit)
+    Walk(const TreeOptions& options, const Visit& visit, Journal* journal)
         : recursive_(options.recursive),
           shard_(options.shard),
           visit_(visit),
+          logs_(journal != nullptr),
           crew_(visit.hear ? options.crew : CrewSize{},
-                {.work = [this](const Errand& errand, const Tell& tell) { Work(errand, tell); },
+                {.work = [this](const Errand& errand,
+                                const Tell& tell) { return Work(errand, tell); },
                  .hear = visit.hear ? visit.hear : [](std::string_view) {},
                  .on_failure = visit.on_failure,
                  .clear_progress = visit.clear_progress,
-                 .show_progress = visit.show_progress}) {}
+                 .show_progress = visit.show_progress,
+                 .sync = [this] { SyncVolumes(); }},
+                journal) {}
 
     void Run(const std::string& path) {
         const PathHash hash = PathHash::OfNamed(path);
@@ -39,6 +59,7 @@ class Walk {
             const Object object = FindObject(path);
             const mode_t type = TypeOf(object.place);
             const bool descends = recursive_ && S_ISDIR(type);
+            NoteVolume(object.place.directory);
             if (!descends && !shard_.Has(hash)) return;
             visit_.on_named(object);
             // The root has no directory to keep metadata in.
@@ -86,22 +107,32 @@ class Walk {
             visit_.on_other(object);
             return true;
         }
-        crew_.Do({.kind = kind,
-                  .object = object,
-                  .type = type,
-                  .shown = shown,
-                  .here = visit_.changes &&
-                          (kind == Errand::Kind::kNamed || !IsApart(object.place.name))});
+        (void)crew_.Do({.kind = kind,
+                        .object = object,
+                        .type = type,
+                        .shown = shown,
+                        .here = visit_.changes &&
+                                (kind == Errand::Kind::kNamed || !IsApart(object.place.name))});
         return !S_ISDIR(type) || visit_.enters(object);
     }
 
-    void Work(const Errand& errand, const Tell& tell) const {
+    bool Work(const Errand& errand, const Tell& tell) const {
         const Object& object = errand.object;
         if (errand.kind == Errand::Kind::kDirectory) {
             return visit_.look_into(object.place.directory, tell);
         }
-        if (errand.kind == Errand::Kind::kNamed) visit_.look_at_named(object, tell);
-        visit_.work(object, errand.shown.empty() ? object.path() : errand.shown, tell);
+        const bool looked =
+            errand.kind != Errand::Kind::kNamed || visit_.look_at_named(object, tell);
+        return visit_.work(object, errand.shown.empty() ? object.path() : errand.shown, tell) &&
+               looked;
+    }
+
+    // Where work is done of which a log says that it is on disk.
+    void NoteVolume(const DirectoryRef& directory) {
+        if (logs_ && visit_.changes) volumes_.try_emplace(directory->Status().st_dev, directory);
+    }
+    void SyncVolumes() const {
+        for (const auto& [device, directory] : volumes_) directory->SyncVolume();
     }
 
     void Fail(const std::string& path, PathHash hash, const Failure& failure) {
@@ -123,9 +154,10 @@ class Walk {
     // more than the heap.
     void DoDirectory(const Inner& outer) {
         const DirectoryRef directory = outer.place.directory->OpenIn(outer.place.name);
+        NoteVolume(directory);
         visit_.on_directory(directory);
-        if (visit_.look_into) {
-            crew_.Do(
+        if (visit_.look_into && shard_.Has(outer.hash)) {
+            (void)crew_.Do(
                 {.kind = Errand::Kind::kDirectory, .object = {{directory, "."}}, .type = S_IFDIR});
         }
         const std::size_t first = pending_.size();
@@ -155,6 +187,8 @@ class Walk {
     bool recursive_;
     Shard shard_;
     const Visit& visit_;
+    bool logs_;
+    std::map<dev_t, DirectoryRef> volumes_;
     Crew crew_;
     std::vector<Inner> pending_;     // directories
     std::uint64_t others_ = 0;       // failures, with what belongs to other shards
@@ -173,8 +207,12 @@ class Work {
     void Run(const TreeOptions& options) {
         VisitObjects(
             options,
-            {.work = [this](const Object& object, const std::string&,
-                            const Tell& tell) { tell(DoObject(object)); },
+            {.work =
+                 [this](const Object& object, const std::string&, const Tell& tell) {
+                     const Result result = DoObject(object);
+                     tell(result.told);
+                     return result.done;
+                 },
              .on_failure = [this](const std::string& path,
                                   const Failure& failure) { report_.AddFailure(path, failure); },
              .enters = [this](const Object& object) { return Suits(object); },
@@ -184,7 +222,8 @@ class Work {
              .changes = true,
              .clear_progress = [this] { report_.ClearProgress(); },
              .show_progress = [this](const Object& object) { report_.Show(object.path()); },
-             .on_other = task_.check});
+             .on_other = task_.check},
+            task_.doing);
     }
 
     ExitStatus Finish(bool json) { return report_.Finish(json); }
@@ -201,7 +240,11 @@ class Work {
     }
 
     // What became of it, packed: an outcome with what there is to say, or a failure.
-    std::string DoObject(const Object& object) const {
+    struct Result {
+        std::string told;
+        bool done;
+    };
+    Result DoObject(const Object& object) const {
         Packer told;
         bool suits = false;
         try {
@@ -211,14 +254,15 @@ class Work {
             const Outcome outcome = task_.work(object, &notes);
             told.AddNumber(static_cast<std::uint64_t>(outcome));
             for (const std::string& note : notes) told.AddText(note);
+            return {told.bytes(), true};
         } catch (const Failure& failure) {
-            if (suits && HasGone(object.place, failure)) return {};
+            if (suits && HasGone(object.place, failure)) return {{}, true};
             told.AddNumber(kFailedOutcome);
             told.AddText(object.path());
             told.AddNumber(static_cast<std::uint64_t>(failure.status()));
             told.AddText(failure.what());
         }
-        return told.bytes();
+        return {told.bytes(), false};
     }
 
     void Hear(std::string_view told) {
@@ -244,9 +288,11 @@ bool HasGone(const Place& place, const Failure& failure) {
     return failure.status() == kNotFound && !place.directory->Has(place.name);
 }
 
-void VisitObjects(const TreeOptions& options, const Visit& visit) {
+void VisitObjects(const TreeOptions& options, const Visit& visit, const std::string& doing) {
     if (options.recursive) RequireDescriptorPaths();
-    Walk walk(options, visit);
+    std::optional<Journal> journal;
+    if (options.log) journal.emplace(*options.log, WorkOn(options, doing), std::string());
+    Walk walk(options, visit, journal ? &*journal : nullptr);
     PathReader paths(
         options.paths, [&](const Failure& failure) { walk.Fail(failure); }, [&] { walk.Settle(); });
     while (const auto path = paths.Next()) walk.Run(*path);

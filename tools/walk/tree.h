@@ -11,6 +11,7 @@
 #include "tools/place/volume.h"
 #include "tools/say/messages.h"
 #include "tools/walk/crew.h"
+#include "tools/walk/journal.h"
 #include "tools/walk/shard.h"
 #include "tools/walk/tree_report.h"
 
@@ -21,8 +22,9 @@ struct TreeOptions {
     NamedPaths paths;
     bool recursive = false;
     bool json = false;
-    Shard shard = {};             // only its objects
-    CrewSize crew = UsualCrew();  // of work that can be shared out
+    Shard shard = {};                 // only its objects
+    std::optional<LogFile> log = {};  // of what is done
+    CrewSize crew = UsualCrew();      // of work that can be shared out
 };
 
 // Calls `work` for each object that was named and, in recursive work, for all below it, and goes on
@@ -34,7 +36,8 @@ struct TreeOptions {
 // there, fail with one line for all of those.
 struct Visit {
     // `shown` is the path as it was given, or the object's own. Tells `hear` what came of it.
-    std::function<void(const Object&, const std::string& shown, const Tell&)> work;
+    // Whether it is done, so that nobody who goes on with a log has to do it again.
+    std::function<bool(const Object&, const std::string& shown, const Tell&)> work;
     std::function<void(const std::string& path, const Failure&)> on_failure;
 
     // False: nothing below it is to be looked at.
@@ -50,10 +53,11 @@ struct Visit {
     // the first process does those that are not apart from others.
     std::function<void(std::string_view)> hear = {};
     bool changes = false;
-    std::function<void(const Object&, const Tell&)> look_at_named = [](const Object&, const Tell&) {
+    std::function<bool(const Object&, const Tell&)> look_at_named = [](const Object&, const Tell&) {
+        return true;
     };
-    // Of all shards.
-    std::function<void(const DirectoryRef&, const Tell&)> look_into = {};
+    // Before what is in it.
+    std::function<bool(const DirectoryRef&, const Tell&)> look_into = {};
     std::function<void()> clear_progress = [] {};
     std::function<void(const Object&)> show_progress = [](const Object&) {};
 
@@ -61,7 +65,8 @@ struct Visit {
     // nothing is to be looked at.
     std::function<void(const Object&)> on_other = [](const Object&) {};
 };
-void VisitObjects(const TreeOptions& options, const Visit& visit);
+// `doing` names the work in its log, if it has one.
+void VisitObjects(const TreeOptions& options, const Visit& visit, const std::string& doing = {});
 
 // Whether it failed because the object has gone since its directory was listed, with which nothing
 // is wrong.

@@ -13,6 +13,7 @@
 
 #include "tools/say/progress.h"
 #include "tools/store/sidecars.h"
+#include "tools/walk/journal.h"
 #include "tools/walk/packing.h"
 
 namespace mavoea::tool {
@@ -20,11 +21,10 @@ namespace {
 
 bool is_worker = false;
 
-// Where the results of a worker go: into the memory that is shared, in the order in which they
-// come, whichever stream they come by.
+// Where the results of errands go, in the order in which they come, whichever stream they come by.
 class Results {
  public:
-    Results(int socket, WorkArea* area) : socket_(socket), area_(area) {}
+    virtual ~Results() = default;
 
     void Write(ResultKind kind, std::string_view text) {
         constexpr std::size_t kPiece = std::size_t{1} << 15;
@@ -42,9 +42,56 @@ class Results {
         Add(ResultKind::kTold, message);
     }
 
-    void EndErrand() {
+ protected:
+    // A large one comes in pieces.
+    static constexpr std::size_t kMost = WorkArea::kResultsSize / 2;
+
+    void Post() {
+        for (std::size_t at = 0; at < pending_.size(); at += kMost) {
+            Add(kind_, {pending_.data() + at, std::min(kMost, pending_.size() - at)});
+        }
+        pending_.clear();
+    }
+
+    void Add(ResultKind kind, std::string_view text) {
+        Packer packed;
+        packed.AddNumber(static_cast<std::uint64_t>(kind));
+        packed.AddText(text);
+        Take(packed.bytes());
+    }
+
+ private:
+    virtual void Take(const std::string& packed) = 0;
+
+    ResultKind kind_ = ResultKind::kOutput;
+    std::string pending_;
+};
+
+// Those of the first process.
+class OwnResults final : public Results {
+ public:
+    std::string End() {
+        Post();
+        return std::move(results_);
+    }
+
+ private:
+    void Take(const std::string& packed) override { results_ += packed; }
+
+    std::string results_;
+};
+
+// Those of a worker go into the memory that is shared.
+class SharedResults final : public Results {
+ public:
+    SharedResults(int socket, WorkArea* area, const Journal* journal)
+        : socket_(socket), area_(area), journal_(journal) {}
+
+    void EndErrand(const Errand& errand, bool done) {
         Post();
         if (TakeLeftEaDirectory()) Add(ResultKind::kLeftEaDirectory, {});
+        if (journal_ != nullptr && done) NoteDone(errand);
+        record_.clear();
         ++done_;
         Publish();
     }
@@ -56,25 +103,25 @@ class Results {
     }
 
  private:
-    // A large one comes in pieces.
-    static constexpr std::size_t kMost = WorkArea::kResultsSize / 2;
-
     void Publish() { area_->state.store({done_, size_}, std::memory_order_release); }
 
-    void Post() {
-        for (std::size_t at = 0; at < pending_.size(); at += kMost) {
-            Add(kind_, {pending_.data() + at, std::min(kMost, pending_.size() - at)});
+    void NoteDone(const Errand& errand) {
+        try {
+            journal_->Add(KeyOf(errand), record_);
+        } catch (const Failure& failure) {
+            Packer packed;
+            packed.AddNumber(static_cast<std::uint64_t>(ResultKind::kFailure));
+            packed.AddText(failure.subject());
+            packed.AddText(failure.cause());
+            Take(packed.bytes());
         }
-        pending_.clear();
     }
 
-    void Add(ResultKind kind, std::string_view text) {
-        Packer head;
-        head.AddNumber(static_cast<std::uint64_t>(kind));
-        head.AddText(text);
-        if (head.bytes().size() > area_->results.size() - size_) MakeRoom();
-        std::memcpy(area_->results.data() + size_, head.bytes().data(), head.bytes().size());
-        size_ += head.bytes().size();
+    void Take(const std::string& packed) override {
+        if (journal_ != nullptr) record_ += packed;
+        if (packed.size() > area_->results.size() - size_) MakeRoom();
+        std::memcpy(area_->results.data() + size_, packed.data(), packed.size());
+        size_ += packed.size();
     }
 
     void MakeRoom() {
@@ -85,15 +132,19 @@ class Results {
 
     int socket_;
     WorkArea* area_;
-    ResultKind kind_ = ResultKind::kOutput;
-    std::string pending_;
+    const Journal* journal_;
+    std::string record_;
     std::size_t size_ = 0;
     std::size_t done_ = 0;
 };
 
 class ResultStream final : public std::streambuf {
  public:
-    ResultStream(Results* results, ResultKind kind) : results_(results), kind_(kind) {}
+    ResultStream(std::ostream* stream, Results* results, ResultKind kind)
+        : stream_(stream), former_(stream->rdbuf(this)), results_(results), kind_(kind) {}
+    ~ResultStream() override { stream_->rdbuf(former_); }
+    ResultStream(const ResultStream&) = delete;
+    ResultStream& operator=(const ResultStream&) = delete;
 
  private:
     int_type overflow(int_type c) override {
@@ -106,6 +157,8 @@ class ResultStream final : public std::streambuf {
         return size;
     }
 
+    std::ostream* stream_;
+    std::streambuf* former_;
     Results* results_;
     ResultKind kind_;
 };
@@ -135,20 +188,25 @@ class Reading {
     std::optional<Errand> Next() {
         if (left_ == 0) return std::nullopt;
         --left_;
-        const auto kind = static_cast<Errand::Kind>(bytes_.TakeNumber());
+        Errand errand;
+        errand.kind = static_cast<Errand::Kind>(bytes_.TakeNumber());
         const Place place = TakePlace();
-        const auto type = static_cast<mode_t>(bytes_.TakeNumber());
-        const std::string shown(bytes_.TakeText());
-        switch (kind) {
-            case Errand::Kind::kDirectory:
-                return Errand{kind, {place}, type, shown};
+        errand.type = static_cast<mode_t>(bytes_.TakeNumber());
+        errand.shown = bytes_.TakeText();
+        errand.state = bytes_.TakeNumber();
+        switch (errand.kind) {
             case Errand::Kind::kCopy:
-                return Errand{kind, {place}, type, shown, TakePlace()};
+                errand.to = TakePlace();
+                [[fallthrough]];
+            case Errand::Kind::kDirectory:
+                errand.object.place = place;
+                break;
             case Errand::Kind::kNamed:
             case Errand::Kind::kFound:
+                errand.object = ObjectAt(place, errand.type);
                 break;
         }
-        return Errand{kind, ObjectAt(place, type), type, shown};
+        return errand;
     }
 
     const std::vector<DirectoryRef>& directories() const { return directories_; }
@@ -230,6 +288,7 @@ Request RequestOf(const std::vector<Errand>& errands, std::size_t first,
         add(errand.object.place);
         packed.AddNumber(errand.type);
         packed.AddText(errand.shown);
+        packed.AddNumber(errand.state);
         if (errand.kind == Errand::Kind::kCopy) add(errand.to);
     }
     Packer head;
@@ -253,13 +312,25 @@ Request RequestOf(const std::vector<Errand>& errands, std::size_t first,
 
 bool IsWorker() { return is_worker; }
 
-void WorkAsTold(int socket, WorkArea* area,
-                const std::function<void(const Errand&, const Tell&)>& work) {
-    Results results(socket, area);
-    ResultStream output(&results, ResultKind::kOutput);
-    ResultStream error(&results, ResultKind::kError);
-    std::cout.rdbuf(&output);
-    std::cerr.rdbuf(&error);
+std::string KeyOf(const Errand& errand) {
+    const Place& place = errand.object.place;
+    if (!place.directory->HasLocation(place.name)) return {};  // others might have the same
+    return std::to_string(static_cast<unsigned>(errand.kind)) + ' ' + std::to_string(errand.state) +
+           ' ' + place.location();
+}
+
+Recorded Record(const Errand& errand, const DoErrand& work) {
+    OwnResults results;
+    const ResultStream output(&std::cout, &results, ResultKind::kOutput);
+    const ResultStream error(&std::cerr, &results, ResultKind::kError);
+    const bool done = work(errand, [&](std::string_view message) { results.TellOf(message); });
+    return {results.End(), done};
+}
+
+void WorkAsTold(int socket, WorkArea* area, const DoErrand& work, const Journal* journal) {
+    SharedResults results(socket, area, journal);
+    const ResultStream output(&std::cout, &results, ResultKind::kOutput);
+    const ResultStream error(&std::cerr, &results, ResultKind::kError);
     is_worker = true;
     SilenceProgress();
     LeaveEmptyEaDirectories();
@@ -270,8 +341,9 @@ void WorkAsTold(int socket, WorkArea* area,
         Reading reading(*area, descriptors, former);
         descriptors.clear();
         while (const auto errand = reading.Next()) {
-            work(*errand, [&](std::string_view message) { results.TellOf(message); });
-            results.EndErrand();
+            const bool done =
+                work(*errand, [&](std::string_view message) { results.TellOf(message); });
+            results.EndErrand(*errand, done);
         }
         former = reading.directories();
         if (!SendTurn(socket, Turn::kDone)) break;

@@ -66,9 +66,21 @@ struct Request {
 Request RequestOf(const std::vector<Errand>& errands, std::size_t first,
                   const std::vector<DirectoryRef>& former);
 
+// As what an errand stands in a journal.
+std::string KeyOf(const Errand& errand);
+
+using DoErrand = std::function<bool(const Errand&, const Tell&)>;
+
+// What comes of an errand that this process does, in bytes.
+struct Recorded {
+    std::string results;
+    bool done = false;
+};
+Recorded Record(const Errand& errand, const DoErrand& work);
+
 // Works until it is told that this is the end, or the first process has gone.
-[[noreturn]] void WorkAsTold(int socket, WorkArea* area,
-                             const std::function<void(const Errand&, const Tell&)>& work);
+[[noreturn]] void WorkAsTold(int socket, WorkArea* area, const DoErrand& work,
+                             const Journal* journal);
 
 }  // namespace mavoea::tool
 
