@@ -1,5 +1,6 @@
-/* Carries the metadata of an object along to where its data has been copied, from a volume
- * with EA directories (type 1) to one with "._" files (type 0). -1 has the volume asked. */
+/* Carries the metadata of an object along to where its data has been
+ * copied, from a volume with EA directories (type 1) to one with
+ * "._" files (type 0). -1 has the volume asked. */
 #include <errno.h>
 #include <mavocore.h>
 #include <mavoea.h>
@@ -8,16 +9,20 @@
 
 int main(int argc, char** argv) {
     if (argc != 3) {
-        fprintf(stderr, "usage: %s SOURCE COPY (absolute paths)\n", argv[0]);
+        fprintf(stderr, "usage: %s SOURCE COPY (absolute paths)\n",
+                argv[0]);
         return 2;
     }
-    MLIBCErrSetEx(0, "", 0); /* what is recorded from here on is new */
+    /* What is recorded from here on is new. */
+    MLIBCErrSetEx(0, "", 0);
     errno = 0;
-    /* no move; both indexes are told */
+    /* No move; both indexes are told. */
     if (MAVOEACopy(argv[1], argv[2], 0, 0, 1, 0, 1, 1) < 0) {
         const int code = MLIBCErrGet();
-        fprintf(stderr, "%s: the metadata could not be copied: %s\n", argv[2],
-                code != 0 ? MAVOErrorText(code) : "see the system log");
+        fprintf(
+            stderr, "%s: the metadata could not be copied: %s\n",
+            argv[2],
+            code != 0 ? MAVOErrorText(code) : "see the system log");
         return 1;
     }
     return 0;

@@ -1,4 +1,4 @@
-/* Opens an object's EA stream, and tells a person what went wrong. */
+/* Opens an object's EA stream, and tells what went wrong. */
 #include <errno.h>
 #include <fcntl.h>
 #include <mavocore.h>
@@ -10,11 +10,13 @@
 /* `error` is the errno that the failed call left. */
 static void tell(const char* object, int error) {
     const int code = MLIBCErrGet();
-    if (code == 0) { /* the call has recorded nothing: errno is all there is */
+    /* The call has recorded nothing: errno is all there is. */
+    if (code == 0) {
         fprintf(stderr, "%s: %s\n", object, strerror(error));
         return;
     }
-    fprintf(stderr, "%s: %s. %s\n", object, MAVOErrorText(code), MAVOErrorAdvice(code));
+    fprintf(stderr, "%s: %s. %s\n", object, MAVOErrorText(code),
+            MAVOErrorAdvice(code));
 }
 
 int main(int argc, char** argv) {
@@ -24,9 +26,11 @@ int main(int argc, char** argv) {
         fprintf(stderr, "usage: %s OBJECT\n", argv[0]);
         return 2;
     }
-    MLIBCErrSetEx(0, "", 0); /* so that an old record is not taken for this one */
+    /* So that an old record is not taken for this one. */
+    MLIBCErrSetEx(0, "", 0);
     errno = 0;
-    fd = MAVOEAOpen(EA_FORM_FILE, argv[1], MAVOEA_KIND_STREAM, O_RDONLY, EA_PLACE_EADIR);
+    fd = MAVOEAOpen(EA_FORM_FILE, argv[1], MAVOEA_KIND_STREAM,
+                    O_RDONLY, EA_PLACE_EADIR);
     if (fd < 0) {
         tell(argv[1], errno);
         return 1;
@@ -42,5 +46,9 @@ int main(int argc, char** argv) {
         close(fd);
         return 1;
     }
-    return close(fd) == 0 ? 0 : 1;
+    if (close(fd) != 0) {
+        tell(argv[1], errno);
+        return 1;
+    }
+    return 0;
 }

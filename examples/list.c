@@ -9,7 +9,8 @@
 
 static void tell(const char* object) {
     const int code = MLIBCErrGet();
-    fprintf(stderr, "%s: %s\n", object, code == 0 ? strerror(errno) : MAVOErrorText(code));
+    fprintf(stderr, "%s: %s\n", object,
+            code == 0 ? strerror(errno) : MAVOErrorText(code));
 }
 
 static int list(int fd) {
@@ -30,15 +31,19 @@ int main(int argc, char** argv) {
         fprintf(stderr, "usage: %s OBJECT\n", argv[0]);
         return 2;
     }
-    MLIBCErrSetEx(0, "", 0); /* what is recorded from here on is new */
+    /* What is recorded from here on is new. */
+    MLIBCErrSetEx(0, "", 0);
     errno = 0;
-    fd = MAVOEAOpen(EA_FORM_FILE, argv[1], MAVOEA_KIND_STREAM, O_RDONLY, EA_PLACE_EADIR);
-    if (fd < 0 && errno == ENOENT && MLIBCErrGet() == 0) return 0; /* it has no attributes */
+    fd = MAVOEAOpen(EA_FORM_FILE, argv[1], MAVOEA_KIND_STREAM,
+                    O_RDONLY, EA_PLACE_EADIR);
+    /* It has no attributes. */
+    if (fd < 0 && errno == ENOENT && MLIBCErrGet() == 0) return 0;
     result = fd < 0 ? -1 : list(fd);
     if (result != 0) tell(argv[1]);
     if (fd >= 0 && close(fd) != 0) {
         if (result == 0) tell(argv[1]);
         result = -1;
     }
-    return fflush(stdout) == 0 && result == 0 ? 0 : 1;
+    return fflush(stdout) == 0 && !ferror(stdout) && result == 0 ? 0
+                                                                 : 1;
 }

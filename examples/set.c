@@ -1,8 +1,10 @@
 /* Gives a named attribute of an object's EA stream a new value.
  *
- * MAVOEASWrite() never makes a value shorter: "red" written over "blue" leaves "rede". So the old
- * value is removed first. MAVOEASTruncate() is for streams without a resource fork only. Removing
- * and writing are two steps: a crash in between leaves the object without the attribute. */
+ * MAVOEASWrite() never makes a value shorter: "red" written over
+ * "blue" leaves "rede". So the old value is removed first.
+ * MAVOEASTruncate() is for streams without a resource fork only.
+ * Removing and writing are two steps: a crash in between leaves the
+ * object without the attribute. */
 #include <errno.h>
 #include <fcntl.h>
 #include <mavocore.h>
@@ -13,18 +15,23 @@
 
 static void tell(const char* object) {
     const int code = MLIBCErrGet();
-    fprintf(stderr, "%s: %s\n", object, code == 0 ? strerror(errno) : MAVOErrorText(code));
+    fprintf(stderr, "%s: %s\n", object,
+            code == 0 ? strerror(errno) : MAVOErrorText(code));
 }
 
-static int replace(EASHandle* h, const char* name, const char* value) {
+static int replace(EASHandle* h, const char* name,
+                   const char* value) {
     const unsigned size = (unsigned)strlen(value);
     if (MAVOEASSearch(h, name) >= 0) {
         if (MAVOEASRemove(h, name) != 0) return -1;
     } else if (MLIBCErrGet() != MAVOEA_ERR_NO_ATTRIBUTE) {
         return -1;
     }
-    MLIBCErrSetEx(0, "", 0); /* that there was none is no error */
-    return MAVOEASWrite(h, name, value, size, 0, 0) == (int)size ? 0 : -1;
+    /* That there was none is no error. */
+    MLIBCErrSetEx(0, "", 0);
+    return MAVOEASWrite(h, name, value, size, 0, 0) == (int)size
+               ? 0
+               : -1;
 }
 
 int main(int argc, char** argv) {
@@ -34,8 +41,11 @@ int main(int argc, char** argv) {
         fprintf(stderr, "usage: %s OBJECT NAME VALUE\n", argv[0]);
         return 2;
     }
-    MLIBCErrSetEx(0, "", 0); /* what is recorded from here on is new */
-    fd = MAVOEAOpen(EA_FORM_FILE, argv[1], MAVOEA_KIND_STREAM, O_RDWR | O_CREAT, EA_PLACE_EADIR);
+    /* What is recorded from here on is new. */
+    MLIBCErrSetEx(0, "", 0);
+    errno = 0;
+    fd = MAVOEAOpen(EA_FORM_FILE, argv[1], MAVOEA_KIND_STREAM,
+                    O_RDWR | O_CREAT, EA_PLACE_EADIR);
     h = fd < 0 ? NULL : MAVOEASOpen(fd, F_WRLCK);
     if (h != NULL) {
         result = replace(h, argv[2], argv[3]);
