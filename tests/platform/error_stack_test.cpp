@@ -58,6 +58,7 @@ TEST(ErrorStackTest, AFullStackLosesItsOldestRecord) {
     });
 }
 
+// Promise: "THREADS: The error stack is each thread's own"
 TEST(ErrorStackTest, EachThreadHasItsOwnStack) {
     InNewThread([] {
         MLIBCErrSetEx(1, "outer", 10);

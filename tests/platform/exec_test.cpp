@@ -5,6 +5,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <signal.h>
+#include <stdlib.h>
 #include <string.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -124,6 +125,14 @@ TEST(ExecTest, ArgumentsArriveAsTheyAreWithoutAShell) {
     EXPECT_EQ("[a b][][$HOME][*][;exit 3]['\"\\]", TextOf(out));
 }
 
+// Promise: "FORK: The program inherits the environment"
+TEST(ExecTest, TheProgramGetsTheEnvironment) {
+    ASSERT_EQ(0, setenv("MAVOEA_EXEC_TEST", "as it is", 1));
+    const int result = Script("test \"$MAVOEA_EXEC_TEST\" = 'as it is'");
+    unsetenv("MAVOEA_EXEC_TEST");
+    EXPECT_EQ(0, result);
+}
+
 TEST(ExecTest, TheProgramsNameIsItsFirstArgument) {
     const TempDir dir;
     const std::string out = dir / "out";
@@ -135,6 +144,7 @@ TEST(ExecTest, TheProgramsNameIsItsFirstArgument) {
     EXPECT_EQ((dir / "link") + "\n", TextOf(out));
 }
 
+// Promise: "SIGNALS: The host's libraries change no signal's action"
 TEST(ExecTest, TheCallersSignalsStayAsTheyAreMeanwhile) {
     const Disposition ignored(SIGPIPE, SIG_IGN);
     const Disposition caught(SIGUSR1, CountSignal);
@@ -150,6 +160,7 @@ TEST(ExecTest, TheCallersSignalsStayAsTheyAreMeanwhile) {
     EXPECT_EQ(before, SignalMasks(std::ifstream("/proc/thread-self/status")));
 }
 
+// Promise: "FORK: The program inherits the environment"
 TEST(ExecTest, TheProgramGetsTheSignalMaskAndTheIgnoredSignals) {
     const Disposition ignored(SIGPIPE, SIG_IGN);
     const Disposition caught(SIGUSR1, CountSignal);
@@ -169,6 +180,7 @@ TEST(ExecTest, TheProgramGetsTheSignalMaskAndTheIgnoredSignals) {
     EXPECT_EQ(own["SigIgn"], its["SigIgn"]);
 }
 
+// Promise: "FORK: The program inherits the environment"
 TEST(ExecTest, TheCallersDescriptorsStayAsTheyAre) {
     const int kept = open("/dev/null", O_RDONLY | O_CLOEXEC);
     const int handed_on = open("/dev/null", O_RDONLY);
@@ -203,6 +215,7 @@ TEST(ExecTest, OtherChildrenAreLeftToTheirParent) {
     EXPECT_EQ(ECHILD, errno);
 }
 
+// Promise: "FORK: A process that ignores SIGCHLD"
 TEST(ExecTest, WhereSigchldIsIgnoredTheProgramRunsAndItsStatusIsLost) {
     const TempDir dir;
     const std::string out = dir / "out";

@@ -1192,6 +1192,7 @@ TEST_F(EaPathPropertyTest, PathAndKindOfTheCallerAreNeverModified) {
 }
 
 // Promise: "mavoea.h: Threads."
+// Promise: "THREADS: Path derivation"
 TEST_F(EaPathPropertyTest, SeveralThreadsDeriveAtOnce) {
     const std::string path = "/v/" + As(241) + "bc.txt";
     const std::string expected = "/v/@eaDir/" + As(237) + "&.txt@MavoEAStream";

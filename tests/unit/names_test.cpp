@@ -164,6 +164,7 @@ TEST_F(NamesTest, NoNameIsInNoClass) {
 }
 
 // Promise: "mavoea.h: Threads."
+// Promise: "THREADS: Path derivation"
 TEST_F(NamesTest, SeveralThreadsTestAtOnce) {
     std::vector<int> wrong(4, 0);
     std::vector<std::thread> threads;
