@@ -122,15 +122,6 @@ def faults(source):
         if own != path.name.removesuffix(".3.scd"):
             yield f"{path.name}: its name is not its own"
         named += names
-        synopsis = re.search(r"# SYNOPSIS\n.*?```\n(.*?)\n```", page, re.S)[1]
-        declared = [" ".join(text.split()) for text in synopsis.split(";")]
-        if declared != [header.prototypes.get(name, "").rstrip(";") for name in names] + [""]:
-            yield f"{path.name}: the synopsis is not the header's"
-            continue
-        for fault in faults_of_description(names, header, page):
-            yield f"{path.name}: {fault}"
-        for fault in faults_of_results(names, header, page):
-            yield f"{path.name}: {fault}"
         # In a literal block, too, a backslash takes another in front.
         example = re.fullmatch(r"\n```\n(.*?)```\n\n", section(page, "EXAMPLE"), re.S)
         text = re.sub(r"\\(.)", r"\1", example[1]) if example else None
@@ -138,6 +129,15 @@ def faults(source):
             yield f"{path.name}: the example is not in examples/"
         else:
             shown.append(examples[text])
+        synopsis = re.search(r"# SYNOPSIS\n.*?```\n(.*?)\n```", page, re.S)[1]
+        declared = [" ".join(part.split()) for part in synopsis.split(";")]
+        if declared != [header.prototypes.get(name, "").rstrip(";") for name in names] + [""]:
+            yield f"{path.name}: the synopsis is not the header's"
+            continue
+        for fault in faults_of_description(names, header, page):
+            yield f"{path.name}: {fault}"
+        for fault in faults_of_results(names, header, page):
+            yield f"{path.name}: {fault}"
     if sorted(named) != sorted(header.prototypes):
         yield f"not on one page: {set(named) ^ set(header.prototypes) or 'named twice'}"
     if sorted(shown) != sorted(examples.values()):
