@@ -4,7 +4,8 @@
 Every function is on one page, with the header's declaration. DESCRIPTION has the header's sentences
 and no others: what tells of results may be missing there. RETURN VALUE, ERRORS and CODES have an
 entry for each function, CODES with exactly the codes that the header names for it, and ERRORS with
-each errno. The example of a page is a file of examples/, each of which is on one page."""
+each errno. The example of a page is a file of examples/, each of which is on one page. libmavoea(3) has the
+header's constants and types, and what else callers need, as it is declared."""
 
 import pathlib
 import re
@@ -14,6 +15,10 @@ PROTOTYPE = re.compile(r"^MAVOEA_API (.*?;)", re.S | re.M)
 COMMENT = re.compile(r"/\*((?:(?!\*/).)*)\*/\n(?=(.?))", re.S)
 CODE = re.compile(r"0x[0-9A-F]+")
 ERRNO = re.compile(r"\bE[A-Z]{3,}\b")
+DEFINITION = re.compile(
+    r"^(?:(?:typedef struct \w+|enum) \{.*?^\}.*?;$|#define MAVOEA_(?!H_|API|VERSION)\w+ .*?$)",
+    re.S | re.M,
+)
 # A sentence of the header that may stand in another section than DESCRIPTION.
 RESULT = re.compile(r"0x|-\d|\b[01]\b|errno|\breturns?\b|\bcodes?\b|NULL|\bfail|logged", re.I)
 ENTRY = re.compile(r"^(\*\w+\*\(\)(?:, \*\w+\*\(\))*)\n((?:\t.*\n|\n(?=\t))+)", re.M)
@@ -110,7 +115,26 @@ def faults_of_results(names, header, page):
             yield f"CODES, {about}: only in the header or only here: {sorted(differing)}"
 
 
+def faults_of_definitions(source):
+    page = (source / "docs/man/libmavoea.3.scd").read_text()
+    ours = (source / "include/mavoea.h").read_text()
+    both = ours + (source / "platform/include/mavocore.h").read_text()
+    declared = " ".join(both.replace("MAVOCORE_API ", "").split())
+    shown = []
+    for block in re.findall(r"^```\n(.*?)^```$", page, re.S | re.M):
+        shown += [" ".join(part.split()) for part in re.split(r"\n\n|\n(?=#)", block)]
+    for part in shown:
+        if part not in declared:
+            yield f"libmavoea.3.scd: in no header: {part}"
+    for definition in DEFINITION.findall(ours):
+        part = " ".join(definition.split())
+        # libmavoea-errors(7) has the codes.
+        if part not in shown and "MAVOEA_ERR_" not in part:
+            yield f"libmavoea.3.scd: only in the header: {part}"
+
+
 def faults(source):
+    yield from faults_of_definitions(source)
     header = Header((source / "include/mavoea.h").read_text())
     if len(header.prototypes) != 53:
         yield f"{len(header.prototypes)} functions in the header"
