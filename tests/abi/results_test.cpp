@@ -68,6 +68,7 @@ TEST_F(ResultsTest, OfPaths) {
     EXPECT_STREQ("/v/@eaDir/a@k", buffer_);
     EXPECT_EQ(Failed(0, 0xD00), OF(MAVOEAPath(1, "/v/a", "k", buffer_, 4096, 2)));
     EXPECT_EQ(Failed(0, 0xD00), OF(MAVOEAADPath("/v/a", nullptr, 4096)));
+    EXPECT_EQ(Failed(0, 0xD00), OF(MAVOEAADPath("/v/abc", buffer_, 0)));
     EXPECT_EQ((Outcome{0, 0, 0}), OF(MAVOEAADPath("/v/abc", buffer_, 5)));
     EXPECT_STREQ("/v/.", buffer_);
     const std::string long_name(254, 'n');
