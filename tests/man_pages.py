@@ -4,8 +4,8 @@
 Every function is on one page, with the header's declaration. DESCRIPTION has the header's sentences
 and no others: what tells of results may be missing there. RETURN VALUE, ERRORS and CODES have an
 entry for each function, CODES with exactly the codes that the header names for it, and ERRORS with
-each errno. The example of a page is a file of examples/, each of which is on one page. libmavoea(3) has the
-header's constants and types, and what else callers need, as it is declared."""
+each errno. The example of a page is a file of examples/, each of which is on one page. libmavoea(3)
+has the header's constants and types, and what else callers need, as it is declared."""
 
 import pathlib
 import re
@@ -68,7 +68,9 @@ def section(page, title):
 
 def entries(text):
     """[(function, its entry)] of a section, and what stands in front of the first one."""
-    found = [(name, body) for names, body in ENTRY.findall(text) for name in re.findall(r"\w+", names)]
+    found = []
+    for names, body in ENTRY.findall(text):
+        found += [(name, body) for name in re.findall(r"\w+", names)]
     first = ENTRY.search(text)
     return found, text[: first.start()] if first else text
 

@@ -38,7 +38,7 @@ fork() { "$bin/example_finder_info_and_fork" "$@"; }
 resource() { # resource FORK LENGTH: the file, of TEXT and ttxt, with that fork; the length in octal
     printf '\000\005\026\007\000\002\000\000Mac OS X        \000\002'
     printf '\000\000\000\011\000\000\000\062\000\000\000\040' # Finder info: at 50, 32 bytes
-    printf '\000\000\000\002\000\000\000\122\000\000\000'"\\$2" # resource fork: at 82
+    printf '\000\000\000\002\000\000\000\122\000\000\000%b' "\\0$2" # resource fork: at 82
     printf TEXTttxt
     head -c 24 /dev/zero
     printf %s "$1"
@@ -92,7 +92,9 @@ test "$("$bin/example_paths" /v/file)" = "/v/@eaDir/file@MavoEAStream
 /v/@eaDir/file@MavoResource
 /v/._file" || fail "the paths differ"
 a242=$(printf %0242d 0)
-if "$bin/example_paths" "/v/${a242}ABCDEFGHIJKL" >said 2>message; then fail "254 bytes have a path"; fi
+if "$bin/example_paths" "/v/${a242}ABCDEFGHIJKL" >said 2>message; then
+    fail "254 bytes have a path"
+fi
 test "$(cat message)" = "/v/${a242}ABCDEFGHIJKL: no path: The name or path is too long" ||
     fail "said: $(cat message)"
 
