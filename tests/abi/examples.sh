@@ -151,6 +151,17 @@ if "$bin/example_xattr" "$dir" com.apple.ResourceFork 2>said; then fail "a direc
 test "$(cat said)" = "$dir: com.apple.ResourceFork: There is no resource fork" ||
     fail "said: $(cat said)"
 
+# What could not be written out is a failure.
+printf hello | dd of=@eaDir/noted@MavoResource conv=notrunc bs=1 seek=38 status=none
+printf '\000' | dd of=@eaDir/noted@MavoResource conv=notrunc status=none
+for shown in list:file paths:file names:shown record:noted upgrade:file finder_info_and_fork:file; do
+    "$bin/example_${shown%:*}" "$dir/${shown#*:}" >said || fail "$shown ends with a failure"
+    test -s said || fail "$shown says nothing"
+    if "$bin/example_${shown%:*}" "$dir/${shown#*:}" >/dev/full 2>said; then
+        fail "$shown does not look whether it could say it"
+    fi
+done
+
 # What went wrong is told: by errno where no code is recorded, else by the code.
 "$bin/example_error" "$dir/file" || fail "nothing is wrong with the stream"
 if "$bin/example_error" "$dir/none" 2>said; then fail "a missing stream is opened"; fi
