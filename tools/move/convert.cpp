@@ -20,6 +20,7 @@
 #include "tools/transfer/transfer.h"
 #include "tools/transfer/tree_comparison.h"
 #include "tools/transfer/tree_copy.h"
+#include "tools/walk/counting.h"
 #include "tools/walk/journal.h"
 #include "tools/walk/packing.h"
 #include "util/fnv.h"
@@ -34,7 +35,11 @@ class Conversion final : private TreeCopy {
           top_(std::move(top)),
           is_new_(!top_.second.Status()),
           progress_("converting"),
-          transfer_({.watch = {.on_bytes = [this](std::uint64_t) { Show(in_hand_); },
+          transfer_({.watch = {.on_bytes =
+                                   [this](std::uint64_t size) {
+                                       bytes_ += size;
+                                       Show(in_hand_);
+                                   },
                                .give_up = InterruptedAgain},
                      .on_note = [this](const std::string& note) { notes_.push_back(note); }}),
           crew_(options.crew,
@@ -65,6 +70,7 @@ class Conversion final : private TreeCopy {
     }
 
     void Compare() {
+        compares_ = true;
         CompareTrees(
             top_, options_.recursive, Compared(),
             {.on_pair = [this](const Pair& pair) { Show(pair.first.path()); },
@@ -208,14 +214,19 @@ class Conversion final : private TreeCopy {
     std::string Carried(const Place& from, bool* done, Carry carry) {
         Packer told;
         std::vector<std::string> before = std::exchange(notes_, {});
+        const std::uint64_t bytes = bytes_;
+        std::optional<Failure> failed;
         try {
             carry();
-            told.AddNumber(kSuccess);
             *done = true;
         } catch (const Failure& failure) {
-            told.AddNumber(static_cast<std::uint64_t>(failure.status()));
+            failed = failure;
+        }
+        told.AddNumber(std::exchange(bytes_, bytes) - bytes);
+        told.AddNumber(static_cast<std::uint64_t>(failed ? failed->status() : kSuccess));
+        if (failed) {
             told.AddText(from.path());
-            told.AddText(failure.what());
+            told.AddText(failed->what());
         }
         for (const std::string& note : notes_) told.AddText(note);
         notes_ = std::move(before);
@@ -224,6 +235,7 @@ class Conversion final : private TreeCopy {
 
     void Hear(std::string_view told) {
         Unpacker said(told);
+        bytes_ += said.TakeNumber();
         const auto status = static_cast<ExitStatus>(said.TakeNumber());
         if (status == kSuccess) {
             ++converted_;
@@ -265,9 +277,12 @@ class Conversion final : private TreeCopy {
 
     void Show(const std::string& path) {
         in_hand_ = path;
+        if (!progress_.wanted()) return;
         progress_.Show(std::to_string(converted_) + " converted, " + std::to_string(compared_) +
-                           " compared, " + std::to_string(failures_.size()) + " failed",
-                       path, converted_ + compared_ + failures_.size());
+                           " compared, " + std::to_string(failures_.size()) + " failed, " +
+                           SizeText(bytes_),
+                       path, converted_ + compared_ + failures_.size(),
+                       compares_ ? compared_ : converted_ + failures_.size());
     }
 
     void PrintJson() const {
@@ -291,6 +306,8 @@ class Conversion final : private TreeCopy {
     Transfer transfer_;
     Crew crew_;
     std::string in_hand_;
+    std::uint64_t bytes_ = 0;  // of data
+    bool compares_ = false;
     std::uint64_t converted_ = 0;
     std::uint64_t compared_ = 0;
     std::uint64_t differences_ = 0;
@@ -341,6 +358,8 @@ ExitStatus Convert(const ConvertOptions& options) {
     if (options.recursive) RequireDescriptorPaths();
     const ConversionEnds ends = EndsOf(options);
     WatchForInterrupts();
+    std::optional<Counting> counting;
+    if (options.recursive) counting.emplace(Counting::Kind::kCopied, std::vector{options.source});
     Conversion conversion(options, {ends.source.place, ends.destination});
     conversion.CopyAndCompare();
     return conversion.Summarize();

@@ -4,6 +4,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <string>
 
@@ -13,8 +14,15 @@ namespace mavoea::tool {
 // terminal has the one that is rewritten. 0: with each object.
 void ReportProgressEach(std::chrono::seconds interval);
 
+// From here on it is also said of how many objects that is, and when the rest will be done, as soon
+// as `total` knows; asked each time that something is said.
+void ExpectTotal(std::function<std::optional<std::uint64_t>()> total);
+
 // From here on nobody is told anything: another process does that.
 void SilenceProgress();
+
+// "812 bytes", "1.5 GiB".
+std::string SizeText(std::uint64_t size);
 
 // One line on standard error, rewritten now and then, when that is a terminal. It goes away at the
 // end of the scope. Lines that stay come when somebody asks for one by SIGUSR1, and in the interval
@@ -32,9 +40,10 @@ class Progress {
     bool wanted() const;
 
     // "DOING: STATUS, PATH"; lines that stay say how many objects that is each second, where it is
-    // known how many have been `done`.
+    // known how many have been `done`. `of_total`: how many of those that are expected, where that
+    // is another number.
     void Show(const std::string& status, const std::string& path,
-              std::optional<std::uint64_t> done = {});
+              std::optional<std::uint64_t> done = {}, std::optional<std::uint64_t> of_total = {});
     void Clear();
 
  private:
@@ -42,6 +51,7 @@ class Progress {
 
     void Tell(const std::string& status, const std::string& path,
               std::optional<std::uint64_t> done);
+    std::string Share(std::optional<std::uint64_t> done) const;
 
     const char* doing_;
     bool on_;

@@ -177,9 +177,10 @@ void Journal::Read(const std::string& work) {
         if (bytes.empty()) break;
         at += bytes.size();
         pending.append(bytes.begin(), bytes.end());
+        const std::string_view lines = pending;
         std::size_t begin = 0;
         for (std::size_t end = 0; (end = pending.find('\n', begin)) != std::string::npos;) {
-            take(std::string_view(pending).substr(begin, end - begin), offset);
+            take(lines.substr(begin, end - begin), offset);
             offset += end - begin + 1;
             begin = end + 1;
         }

@@ -11,6 +11,7 @@
 
 #include "include/mavoea.h"
 #include "tools/store/sidecars.h"
+#include "tools/walk/counting.h"
 #include "tools/walk/packing.h"
 
 namespace mavoea::tool {
@@ -292,6 +293,10 @@ void VisitObjects(const TreeOptions& options, const Visit& visit, const std::str
     if (options.recursive) RequireDescriptorPaths();
     std::optional<Journal> journal;
     if (options.log) journal.emplace(*options.log, WorkOn(options, doing), std::string());
+    std::optional<Counting> counting;
+    if (options.recursive && !options.paths.list) {
+        counting.emplace(Counting::Kind::kVisited, options.paths.arguments, options.shard);
+    }
     Walk walk(options, visit, journal ? &*journal : nullptr);
     PathReader paths(
         options.paths, [&](const Failure& failure) { walk.Fail(failure); }, [&] { walk.Settle(); });
