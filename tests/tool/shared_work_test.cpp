@@ -136,6 +136,29 @@ TEST_P(SharedWorkTest, WhatStandsThereGivesWay) {
                 IsEmpty());
 }
 
+TEST_P(SharedWorkTest, AComparisonIsAsOneProcessDoesIt) {
+    MakeTree();
+    (void)RunTool(Convert(1, "copy"));
+    WriteFile(travel_.To("copy/large/7"), Ascii("other data"));
+    fs::remove(travel_.To("copy/large/8"));
+    fs::remove_all(travel_.To("copy/small9"));
+    fs::create_directories(travel_.To("copy/more"));
+    ASSERT_EQ(0, travel_.Run({"set", travel_.To("copy/large/9"), Colour(), "other"}).status);
+    for (const char* manner : {"--data", "--brief", "--itemize-changes", "--json"}) {
+        SCOPED_TRACE(manner);
+        const auto run = [&](const char* jobs) {
+            return travel_.Run(
+                {"diff", "-r", manner, "-j", jobs, travel_.From("tree"), travel_.To("copy")});
+        };
+        const ToolResult one = run("1");
+        const ToolResult more = run("4");
+        EXPECT_EQ(1, one.status);
+        EXPECT_EQ(one.status, more.status);
+        EXPECT_EQ(one.out, more.out);
+        EXPECT_EQ(one.err, more.err);
+    }
+}
+
 TEST_P(SharedWorkTest, AfterAnyKillTheSameCommandFinishes) {
     constexpr int kRounds = 4;
     std::minstd_rand random(20240711);

@@ -454,6 +454,7 @@ constexpr Syntax kCommands[] = {
      }},
     {Command::kDiff, "diff", "Compare the metadata of two objects or trees on volumes of any kinds",
      [](CLI::App* sub, Options* options) {
+         AddJobs(sub, options);
          AddRecursive(sub, options);
          sub->add_flag("--data", options->data, "What is in the files, too");
          CLI::Option* const brief =

@@ -399,6 +399,7 @@ ExitStatus Run(const Options& options) {
             return Diff({.first = options.paths.front(),
                          .second = options.destination,
                          .recursive = options.recursive,
+                         .crew = CrewOf(options),
                          .data = options.data,
                          .brief = options.brief,
                          .itemized = options.itemized,

@@ -71,13 +71,14 @@ class Conversion final : private TreeCopy {
 
     void Compare() {
         compares_ = true;
+        // A list as JSON is put together in one process.
+        const CrewSize crew = options_.json ? CrewSize{} : options_.crew;
         CompareTrees(
-            top_, options_.recursive, Compared(),
-            {.on_pair = [this](const Pair& pair) { Show(pair.first.path()); },
-             .compared =
+            top_, options_.recursive, Compared(), crew,
+            {.compared =
                  [this](const Pair&, const std::vector<Difference>& differences) {
                      for (const Difference& difference : differences) Add(difference);
-                     ++compared_;
+                     ++found_.compared;
                  },
              .alone =
                  [this](const Pair& pair, Side side) {
@@ -85,8 +86,16 @@ class Conversion final : private TreeCopy {
                      Add({.path = (missing ? pair.first : pair.second).path(),
                           .what = missing ? Difference::What::kMissing : Difference::What::kExtra});
                  },
-             .fails = [this](const Pair& pair,
-                             const Failure& failure) { AddFailure(pair.first.path(), failure); },
+             .fails =
+                 [this](const Pair& pair, const Failure& failure) {
+                     Pack(pair.first.path(), failure, &found_.failures);
+                 },
+             .take = [this] { return TakeFound(); },
+             .add = [this](std::string_view told) { AddFound(told); },
+             .on_failure = [this](const std::string& path,
+                                  const Failure& failure) { AddFailure(path, failure); },
+             .clear_progress = [this] { progress_.Clear(); },
+             .show_progress = [this](const std::string& path) { Show(path); },
              .stopped = [] { return Interrupted() != 0; },
              .give_up = InterruptedAgain});
     }
@@ -117,7 +126,7 @@ class Conversion final : private TreeCopy {
     void Begin(const Place& from, const Place& to, Level* level) override {
         const struct stat info = StatusOf(from);
         if (!S_ISDIR(info.st_mode)) {
-            const bool begun = crew_.Do({.kind = Errand::Kind::kCopy,
+            const bool begun = crew_.Do({.kind = Errand::Kind::kPair,
                                          .object = {from},
                                          .type = info.st_mode & S_IFMT,
                                          .to = to,
@@ -189,6 +198,41 @@ class Conversion final : private TreeCopy {
         return &*journal_;
     }
 
+    // What comparisons have found, until it is told.
+    struct Found {
+        std::uint64_t compared = 0;
+        std::uint64_t differences = 0;
+        Packer failures = {};
+    };
+
+    std::string TakeFound() {
+        const Found found = std::exchange(found_, {});
+        Packer told;
+        told.AddNumber(found.compared);
+        told.AddNumber(found.differences);
+        return told.bytes() + found.failures.bytes();
+    }
+
+    void AddFound(std::string_view told) {
+        Unpacker said(told);
+        compared_ += said.TakeNumber();
+        differences_ += said.TakeNumber();
+        while (!said.empty()) AddFailure(&said);
+    }
+
+    // As one is packed.
+    static void Pack(const std::string& path, const Failure& failure, Packer* packer) {
+        packer->AddNumber(static_cast<std::uint64_t>(failure.status()));
+        packer->AddText(path);
+        packer->AddText(failure.what());
+    }
+    void AddFailure(Unpacker* said) {
+        const auto status = static_cast<ExitStatus>(said->TakeNumber());
+        const std::string path(said->TakeText());
+        failures_.push_back({path, std::string(said->TakeText())});
+        status_ = std::max(status_, status);
+    }
+
     // Whether nothing that other objects of its directory become can meet what it becomes. What
     // could be metadata of another one waits until that is there.
     bool IsApart(const Place& to) const {
@@ -223,11 +267,8 @@ class Conversion final : private TreeCopy {
             failed = failure;
         }
         told.AddNumber(std::exchange(bytes_, bytes) - bytes);
-        told.AddNumber(static_cast<std::uint64_t>(failed ? failed->status() : kSuccess));
-        if (failed) {
-            told.AddText(from.path());
-            told.AddText(failed->what());
-        }
+        told.AddNumber(failed ? 1 : 0);
+        if (failed) Pack(from.path(), *failed, &told);
         for (const std::string& note : notes_) told.AddText(note);
         notes_ = std::move(before);
         return told.bytes();
@@ -236,13 +277,10 @@ class Conversion final : private TreeCopy {
     void Hear(std::string_view told) {
         Unpacker said(told);
         bytes_ += said.TakeNumber();
-        const auto status = static_cast<ExitStatus>(said.TakeNumber());
-        if (status == kSuccess) {
+        if (said.TakeNumber() == 0) {
             ++converted_;
         } else {
-            const std::string path(said.TakeText());
-            failures_.push_back({path, std::string(said.TakeText())});
-            status_ = std::max(status_, status);
+            AddFailure(&said);
         }
         while (!said.empty()) notes_.emplace_back(said.TakeText());
     }
@@ -261,7 +299,7 @@ class Conversion final : private TreeCopy {
     }
 
     void Add(const Difference& difference) {
-        ++differences_;
+        ++found_.differences;
         if (options_.json) {
             list_.Add(DifferenceJson(difference));
         } else {
@@ -311,6 +349,7 @@ class Conversion final : private TreeCopy {
     std::uint64_t converted_ = 0;
     std::uint64_t compared_ = 0;
     std::uint64_t differences_ = 0;
+    Found found_;
     Json list_ = Json::Array();
     std::vector<std::string> notes_;
     std::vector<FailedObject> failures_;

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cstdint>
 #include <iostream>
+#include <utility>
 #include <vector>
 
 #include "tools/place/volume.h"
@@ -17,6 +18,7 @@
 #include "tools/say/text.h"
 #include "tools/store/metadata.h"
 #include "tools/transfer/tree_comparison.h"
+#include "tools/walk/packing.h"
 
 namespace mavoea::tool {
 namespace {
@@ -141,15 +143,24 @@ class Diffing {
 
     ExitStatus Run() {
         CompareTrees(top_, options_.recursive, {.data = options_.data, .copied = false},
-                     {.on_pair = [this](const Pair& pair) { Show(pair); },
-                      .compared =
+                     options_.crew,
+                     {.compared =
                           [this](const Pair& pair, const std::vector<Difference>& differences) {
-                              ++compared_;
+                              ++found_.compared;
                               if (!differences.empty()) Add(pair, differences);
                           },
                       .alone = [this](const Pair& pair, Side side) { AddAlone(pair, side); },
                       .fails = [this](const Pair& pair,
                                       const Failure& failure) { AddFailure(pair, failure); },
+                      .take = [this] { return Packed(std::exchange(found_, {})); },
+                      .add = [this](std::string_view told) { Add(Unpacker(told).Take<Counts>()); },
+                      .on_failure =
+                          [this](const std::string&, const Failure& failure) {
+                              ++all_.failed;
+                              Report(failure);
+                          },
+                      .clear_progress = [this] { progress_.Clear(); },
+                      .show_progress = [this](const std::string& path) { Show(path); },
                       .stopped = [] { return Interrupted() != 0; },
                       .give_up = InterruptedAgain});
         progress_.Clear();
@@ -159,15 +170,28 @@ class Diffing {
             constexpr int kSignalled = 128;
             return static_cast<ExitStatus>(kSignalled + Interrupted());
         }
-        if (failed_ > 0) return kFailed;
-        return different_ > 0 ? kDifferent : kSuccess;
+        if (all_.failed > 0) return kFailed;
+        return all_.different > 0 ? kDifferent : kSuccess;
     }
 
  private:
-    void Show(const Pair& pair) {
-        progress_.Show(
-            std::to_string(compared_) + " compared, " + std::to_string(different_) + " different",
-            pair.first.path());
+    struct Counts {
+        std::uint64_t compared = 0;
+        std::uint64_t different = 0;
+        std::uint64_t failed = 0;
+    };
+
+    void Add(const Counts& more) {
+        all_.compared += more.compared;
+        all_.different += more.different;
+        all_.failed += more.failed;
+    }
+
+    void Show(const std::string& path) {
+        if (!progress_.wanted()) return;
+        progress_.Show(std::to_string(all_.compared) + " compared, " +
+                           std::to_string(all_.different) + " different",
+                       path, all_.compared + all_.failed);
     }
 
     void Say(const std::string& line) {
@@ -176,7 +200,7 @@ class Diffing {
     }
 
     void Add(const Pair& pair, const std::vector<Difference>& differences) {
-        ++different_;
+        ++found_.different;
         if (options_.json) {
             Json list = Json::Array();
             for (Difference difference : differences) {
@@ -198,7 +222,7 @@ class Diffing {
     }
 
     void AddAlone(const Pair& pair, Side side) {
-        ++different_;
+        ++found_.different;
         const Place& place = side == Side::kFirst ? pair.first : pair.second;
         if (options_.json) {
             const bool missing = side == Side::kFirst;
@@ -223,7 +247,7 @@ class Diffing {
     }
 
     void AddFailure(const Pair& pair, const Failure& failure) {
-        ++failed_;
+        ++found_.failed;
         progress_.Clear();
         Report(failure);
         if (!options_.json) return;
@@ -236,9 +260,9 @@ class Diffing {
 
     void PrintSummary() {
         Json json;
-        json.Set("compared", compared_);
-        json.Set("different", different_);
-        json.Set("failed", failed_);
+        json.Set("compared", all_.compared);
+        json.Set("different", all_.different);
+        json.Set("failed", all_.failed);
         json.Set("interrupted", Interrupted() != 0);
         Say(json.Line());
     }
@@ -257,9 +281,8 @@ class Diffing {
     const DiffOptions& options_;
     const Pair& top_;
     Progress progress_;
-    std::uint64_t compared_ = 0;
-    std::uint64_t different_ = 0;
-    std::uint64_t failed_ = 0;
+    Counts all_;
+    Counts found_;  // until it is told
 };
 
 Place Named(const std::string& path) {

@@ -5,6 +5,7 @@
 #include <string>
 
 #include "tools/say/messages.h"
+#include "tools/walk/crew.h"
 
 namespace mavoea::tool {
 
@@ -12,6 +13,7 @@ struct DiffOptions {
     std::string first;
     std::string second;
     bool recursive = false;
+    CrewSize crew = {};
     bool data = false;  // what is in files, too
     bool brief = false;
     bool itemized = false;

@@ -31,13 +31,13 @@ CrewSize UsualCrew();
 
 // What somebody of the crew is to do.
 struct Errand {
-    enum class Kind : std::uint8_t { kNamed, kFound, kDirectory, kCopy };
+    enum class Kind : std::uint8_t { kNamed, kFound, kDirectory, kPair };
 
     Kind kind = Kind::kFound;
-    Object object = {};      // kDirectory: only its directory counts; kCopy: only its place
+    Object object = {};      // kDirectory: only its directory counts; kPair: only its place
     mode_t type = 0;         // S_IFREG, ...
     std::string shown = {};  // empty: the object's own path
-    Place to = {};           // kCopy
+    Place to = {};           // kPair: the second one
     // Only in the first process, after all errands before it: what it does may meet what others do.
     bool here = false;
     std::uint64_t state = 0;  // of the object: a log has it as done in that one only

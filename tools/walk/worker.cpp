@@ -195,7 +195,7 @@ class Reading {
         errand.shown = bytes_.TakeText();
         errand.state = bytes_.TakeNumber();
         switch (errand.kind) {
-            case Errand::Kind::kCopy:
+            case Errand::Kind::kPair:
                 errand.to = TakePlace();
                 [[fallthrough]];
             case Errand::Kind::kDirectory:
@@ -289,7 +289,7 @@ Request RequestOf(const std::vector<Errand>& errands, std::size_t first,
         packed.AddNumber(errand.type);
         packed.AddText(errand.shown);
         packed.AddNumber(errand.state);
-        if (errand.kind == Errand::Kind::kCopy) add(errand.to);
+        if (errand.kind == Errand::Kind::kPair) add(errand.to);
     }
     Packer head;
     head.AddNumber(request.directories.size());
