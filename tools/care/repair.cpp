@@ -7,6 +7,7 @@
 #include "include/mavoea.h"
 #include "tools/care/upgrade.h"
 #include "tools/care/whole_file.h"
+#include "tools/place/dry_run.h"
 #include "tools/say/messages.h"
 #include "tools/store/foreign/detection.h"
 #include "tools/store/reader.h"
@@ -102,10 +103,11 @@ Outcome RepairObject(const Object& volume_object) {
             "a repair would lose its " + missing.front().item + ": " + missing.front().reason,
             "move the file away if that is no loss");
     }
-    if (joins) JoinInStream(object, sidecars, found);
+    if (joins && !DryRun()) JoinInStream(object, sidecars, found);
     const Written written =
         writer.Write(object, *Inode::Open(object.place), fitting,
                      {.old = Old::kKept, .first = joins ? First::kResource : First::kStream});
+    if (DryRun()) return Outcome::kDone;
     auto lost = WhatIsMissing(fitting, ReadMetadata(object, Sidecars::Services::kFind));
     lost.insert(lost.end(), written.missing.begin(), written.missing.end());
     if (lost.empty()) return Outcome::kDone;

@@ -144,6 +144,13 @@ void AddTree(CLI::App* sub, Options* options) {
     AddPaths(sub, options, "PATH", "Files and directories");
 }
 
+// Of commands that change things.
+void AddDryRun(CLI::App* sub, Options* options) {
+    sub->add_flag("-v,--verbose", options->verbose, "Say what becomes of each object");
+    sub->add_flag("-n,--dry-run", options->dry_run,
+                  "Say that, as far as it is known before, and change nothing");
+}
+
 // For what several processes can do.
 void AddJobs(CLI::App* sub, Options* options) {
     constexpr unsigned kMost = 256;
@@ -180,6 +187,19 @@ void AddLog(CLI::App* sub, Options* options) {
 void AddLoggedTree(CLI::App* sub, Options* options) {
     AddLog(sub, options);
     AddSharedTree(sub, options);
+}
+
+void AddTreeToChange(CLI::App* sub, Options* options) {
+    AddDryRun(sub, options);
+    AddSharedTree(sub, options);
+}
+
+void AddLoggedTreeToChange(CLI::App* sub, Options* options) {
+    AddDryRun(sub, options);
+    AddLoggedTree(sub, options);
+    for (const char* name : {"--log", "--resume"}) {
+        sub->get_option(name)->excludes(sub->get_option("--dry-run"));
+    }
 }
 
 CLI::Option* AddSource(CLI::App* sub, Options* options) {
@@ -245,6 +265,7 @@ void AddInfo(CLI::App* sub, Options* options) {
     AddText(sub, &info->backed_up, "--backup-date", "DATE",
             "When it was backed up, in UTC: 2024-05-01T09:30:00Z");
     AddText(sub, &info->created, "--created", "DATE", "When it was made, as Macs show it");
+    AddDryRun(sub, options);
     AddPaths(sub, options, "PATH", "Files and directories");
 }
 
@@ -307,16 +328,18 @@ constexpr Syntax kCommands[] = {
                 "VALUE is hexadecimal digits, behind \"0x\" or not; blanks and colons between "
                 "pairs are left out")
              ->needs(value);
+         AddDryRun(sub, options);
      }},
     {Command::kSetInfo, "set-info", kSetInfoWhat, AddInfo},
     {Command::kRemove, "remove", "Remove an attribute",
      [](CLI::App* sub, Options* options) {
+         AddDryRun(sub, options);
          AddPath(sub, options, "A file or directory");
          AddName(sub, options);
      }},
     {Command::kLock, "lock", "Lock files: Macs may not write, rename or delete them",
-     AddSharedTree},
-    {Command::kUnlock, "unlock", "Unlock files", AddSharedTree},
+     AddTreeToChange},
+    {Command::kUnlock, "unlock", "Unlock files", AddTreeToChange},
     {Command::kImport, "import",
      "Give an object the metadata in an AppleDouble (\"._\"), AppleSingle, MacBinary or BinHex "
      "file",
@@ -393,9 +416,9 @@ constexpr Syntax kCommands[] = {
          sub->add_option("DST", options->destination, "The copy's own path")->required();
      }},
     {Command::kUpgrade, "upgrade", "Convert what earlier versions kept into the current layout",
-     AddLoggedTree},
+     AddLoggedTreeToChange},
     {Command::kRepair, "repair", "Move what resource files wrongly hold into EA streams",
-     AddLoggedTree},
+     AddLoggedTreeToChange},
     {Command::kClean, "clean", "List metadata whose object is gone, and remove it with --yes",
      [](CLI::App* sub, Options* options) {
          AddRecursive(sub, options);

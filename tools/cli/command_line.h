@@ -76,7 +76,8 @@ struct Options {
 
     bool json = false;
     bool recursive = false;
-    bool verbose = false;         // carry, check, restore
+    bool verbose = false;
+    bool dry_run = false;
     bool force = false;           // export, save, plan
     bool replaces_data = false;   // import
     bool keep = false;            // import -r: the "._" files stay

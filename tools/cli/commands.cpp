@@ -10,6 +10,7 @@
 #include "format/ea_stream.h"
 #include "tools/care/check.h"
 #include "tools/care/clean.h"
+#include "tools/care/lock.h"
 #include "tools/care/repair.h"
 #include "tools/care/upgrade.h"
 #include "tools/cli/opening.h"
@@ -25,6 +26,7 @@
 #include "tools/move/copy.h"
 #include "tools/move/delete.h"
 #include "tools/move/plan.h"
+#include "tools/place/dry_run.h"
 #include "tools/place/file.h"
 #include "tools/place/volume.h"
 #include "tools/say/colour.h"
@@ -43,7 +45,6 @@
 #include "tools/store/layout.h"
 #include "tools/store/record.h"
 #include "tools/transfer/pending.h"
-#include "tools/walk/packing.h"
 #include "tools/walk/tree.h"
 
 namespace mavoea::tool {
@@ -96,12 +97,21 @@ Bytes ValueToSet(const Options& options) {
     return ReadToEnd(STDIN_FILENO, "standard input", kStreamSizeMax);
 }
 
+void SayOf(const Options& options, const Object& object, const std::string& what) {
+    if ((options.verbose || options.dry_run) && !options.json) {
+        std::cout << Printable(object.path()) << ": " << what << '\n';
+    }
+}
+
 ExitStatus Set(const Options& options) {
     const std::string name = NameIn(options);
     const Object object = FindObject(options.paths.front());
     const Bytes value = ValueToSet(options);
     OpenToChange(object)->Set(name, value);
     if (const auto note = NoteOfUnseen(object, name, value.size())) Note(*note);
+    SayOf(options, object,
+          "set " + NameOfAttribute(name) + ", " + std::to_string(value.size()) +
+              (value.size() == 1 ? " byte" : " bytes"));
     if (options.json) {
         Json json;
         json.SetText("path", object.path());
@@ -115,9 +125,8 @@ ExitStatus Set(const Options& options) {
 ExitStatus Remove(const Options& options) {
     const std::string name = NameIn(options);
     const Object object = FindObject(options.paths.front());
-    if (!OpenToChange(object)->Remove(name)) {
-        throw NoAttribute(options.paths.front(), name);
-    }
+    if (!RemoveFrom(object, name)) throw NoAttribute(options.paths.front(), name);
+    SayOf(options, object, "removed " + NameOfAttribute(name));
     if (options.json) {
         Json json;
         json.SetText("path", object.path());
@@ -126,70 +135,6 @@ ExitStatus Remove(const Options& options) {
         Print(json);
     }
     return kSuccess;
-}
-
-// ---- lock, unlock -------------------------------------------------------------------------------
-
-ExitStatus Lock(const TreeOptions& options, bool locked) {
-    ExitStatus status = kSuccess;
-    Json json = Json::Array();
-    Progress progress(locked ? "locking" : "unlocking");
-    std::uint64_t done = 0;
-    std::uint64_t failed = 0;
-    const auto fail = [&](ExitStatus grade, const std::string& message) {
-        progress.Clear();
-        Report(message);
-        ++failed;
-        status = std::max(status, grade);
-    };
-    // Tells the status and, of a failure, what is said of it.
-    const auto work = [&](const Object& object, const std::string&, const Tell& tell) {
-        Packer told;
-        bool is_done = false;
-        try {
-            SetLocked(object, locked);
-            told.AddNumber(kSuccess);
-            told.AddText(object.path());
-            is_done = true;
-        } catch (const Failure& failure) {
-            told.AddNumber(static_cast<std::uint64_t>(failure.status()));
-            told.AddText(failure.what());
-        }
-        tell(told.bytes());
-        return is_done;
-    };
-    const auto hear = [&](std::string_view told) {
-        Unpacker said(told);
-        const auto grade = static_cast<ExitStatus>(said.TakeNumber());
-        const std::string text(said.TakeText());
-        if (grade != kSuccess) return fail(grade, text);
-        ++done;
-        if (!options.json) return;
-        Json entry;
-        entry.SetText("path", text);
-        entry.Set("locked", locked);
-        json.Add(std::move(entry));
-    };
-    VisitObjects(
-        options,
-        {.work = work,
-         .on_failure = [&](const std::string&,
-                           const Failure& failure) { fail(failure.status(), failure.what()); },
-         .on_named = SettleNamed,
-         .on_directory = [](const DirectoryRef& inside) { (void)SettlePending(inside); },
-         .hear = hear,
-         .changes = true,
-         .clear_progress = [&] { progress.Clear(); },
-         .show_progress =
-             [&](const Object& object) {
-                 if (!progress.wanted()) return;
-                 progress.Show(
-                     std::to_string(done) + " done, " + std::to_string(failed) + " failed",
-                     object.path(), done + failed);
-             }});
-    progress.Clear();
-    if (options.json) Print(json);
-    return status;
 }
 
 // ---- dump ---------------------------------------------------------------------------------------
@@ -297,12 +242,15 @@ ExitStatus Run(const Options& options) {
     if (!options.progress.empty()) {
         ReportProgressEach(std::chrono::seconds(std::stoi(options.progress)));
     }
+    if (options.dry_run) BeginDryRun();
+    const bool verbose = options.verbose || options.dry_run;
     const TreeOptions tree = {.paths = options.paths,
                               .recursive = options.recursive,
                               .json = options.json,
                               .shard = options.shard,
                               .log = options.log,
-                              .crew = CrewOf(options)};
+                              .crew = CrewOf(options),
+                              .verbose = verbose};
     switch (options.command) {
         case Command::kWhere:
             return Where(options.paths.front(), options.json);
@@ -318,7 +266,10 @@ ExitStatus Run(const Options& options) {
         case Command::kSet:
             return Set(options);
         case Command::kSetInfo:
-            return SetInfo(options.paths, options.info, options.json);
+            return SetInfo({.paths = options.paths,
+                            .info = options.info,
+                            .verbose = verbose,
+                            .json = options.json});
         case Command::kRemove:
             return Remove(options);
         case Command::kLock:

@@ -13,6 +13,9 @@ namespace mavoea::tool {
 // end. Throws Failure.
 std::unique_ptr<Changer> OpenToChange(const Object& object);
 
+// Removes one; false when there was none.
+bool RemoveFrom(const Object& object, const std::string& name);
+
 }  // namespace mavoea::tool
 
 #endif  // MAVOEA_TOOLS_CLI_OPENING_H_

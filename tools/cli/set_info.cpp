@@ -4,10 +4,12 @@
 
 #include <algorithm>
 #include <cstdint>
+#include <iostream>
 #include <map>
 
 #include "format/netatalk_record.h"
 #include "tools/cli/opening.h"
+#include "tools/place/dry_run.h"
 #include "tools/say/mac_text.h"
 #include "tools/say/output.h"
 #include "tools/say/text.h"
@@ -186,7 +188,7 @@ class InfoSetting {
             Fill(&entries);
             missing = entries.Write();
         }
-        Compare(&missing);
+        if (!DryRun()) Compare(&missing);
         if (missing.empty()) return Names();
         throw Failure(kFailed, object_.path(), "not everything has arrived: " + Joined(missing),
                       "see what is there with: mavoea show PATH");
@@ -433,21 +435,32 @@ class InfoSetting {
     std::optional<std::uint8_t> label_of_tags_;
 };
 
+std::string ChangedText(const std::vector<std::string>& names) {
+    if (names.empty()) return "nothing to change";
+    std::string text;
+    for (const std::string& name : names)
+        text += (text.empty() ? "changed " : ", ") + Printable(name);
+    return text;
+}
+
 }  // namespace
 
-ExitStatus SetInfo(const NamedPaths& paths, const InfoOptions& options, bool json) {
-    const InfoChange change = ToChange(options);
+ExitStatus SetInfo(const SetInfoOptions& options) {
+    const InfoChange change = ToChange(options.info);
     ExitStatus status = kSuccess;
     const auto fail = [&](const Failure& failure) {
         Report(failure);
         status = std::max(status, failure.status());
     };
     Json list = Json::Array();
-    PathReader reader(paths, fail);
+    PathReader reader(options.paths, fail);
     while (const auto path = reader.Next()) {
         try {
             const Object object = FindObject(*path);
             const std::vector<std::string> changed = InfoSetting(object, change).Run();
+            if (options.verbose && !options.json) {
+                std::cout << Printable(object.path()) << ": " << ChangedText(changed) << '\n';
+            }
             Json entry;
             entry.SetText("path", object.path());
             entry.Set("changed", Json(changed));
@@ -456,7 +469,7 @@ ExitStatus SetInfo(const NamedPaths& paths, const InfoOptions& options, bool jso
             fail(failure);
         }
     }
-    if (json) Print(list);
+    if (options.json) Print(list);
     return status;
 }
 

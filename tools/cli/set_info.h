@@ -25,7 +25,13 @@ struct InfoOptions {
 // Changes one object after the other and goes on after a failure. kSuccess when all that was asked
 // for has been read back from all of them; otherwise the gravest status. Words that mean nothing,
 // and nothing to change, are a Failure before anything is looked at.
-ExitStatus SetInfo(const NamedPaths& paths, const InfoOptions& options, bool json);
+struct SetInfoOptions {
+    NamedPaths paths;
+    InfoOptions info;
+    bool verbose = false;  // says of each object what has been changed
+    bool json = false;
+};
+ExitStatus SetInfo(const SetInfoOptions& options);
 
 }  // namespace mavoea::tool
 

@@ -692,7 +692,7 @@ class TreeImport {
         if (beside) {
             sources.push_back(ReadSource(files->back()));
             if (IsInPlace(object, sources.back())) {
-                report_.Add(Outcome::kCurrent);
+                report_.Add(files->back().path(), Outcome::kCurrent);
                 sources.pop_back();
                 files->pop_back();
                 beside = false;
@@ -709,7 +709,7 @@ class TreeImport {
                            ReadSource((*files)[i]));
         }
         auto done = OntoObject(object, std::move(sources), beside, options_, report_.notes()).Run();
-        for (std::size_t i = 0; i < files->size(); ++i) report_.Add(Outcome::kDone);
+        for (const Place& file : *files) report_.Add(file.path(), Outcome::kDone);
         if (options_.keep) done.clear();
         waiting_.Add(object.place, info, std::move(done));
     }

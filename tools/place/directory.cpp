@@ -15,6 +15,7 @@
 #include <memory>
 #include <string_view>
 
+#include "tools/place/dry_run.h"
 #include "tools/say/messages.h"
 
 namespace mavoea::tool {
@@ -340,6 +341,12 @@ std::shared_ptr<const File> Directory::FindFile(const std::string& name, int fla
 }
 
 bool Directory::RemoveFile(const std::string& name) const {
+    if (DryRun()) {
+        const int error = WhyNoRemoval({shared_from_this(), name});
+        if (error == ENOENT) return false;
+        if (error != 0) throw SystemFailure(PathOf(name), error);
+        return true;
+    }
     if (::unlinkat(fd(), name.c_str(), 0) == 0) return true;
     if (errno == ENOENT) return false;
     throw SystemFailure(PathOf(name), errno);
@@ -358,6 +365,7 @@ bool Directory::Remove(const std::string& name) const {
 }
 
 bool Directory::RemoveEmpty(const std::string& name) const {
+    if (DryRun()) return false;
     if (::unlinkat(fd(), name.c_str(), AT_REMOVEDIR) == 0) {
         Forget(name);
         return true;
@@ -368,6 +376,11 @@ bool Directory::RemoveEmpty(const std::string& name) const {
 
 void Directory::Rename(const std::string& name, const Directory& to,
                        const std::string& new_name) const {
+    if (DryRun()) {
+        const int error = WhyNoRemoval({shared_from_this(), name});
+        if (error != 0) throw SystemFailure(PathOf(name), error);
+        return;
+    }
     if (::renameat(fd(), name.c_str(), to.fd(), new_name.c_str()) == 0) {
         return to.NoteCome(new_name);
     }
@@ -498,6 +511,7 @@ std::optional<Bytes> Inode::Attribute(const std::string& name) const {
         return by_path_ ? ::getxattr(ProcPath().c_str(), name.c_str(), value, size)
                         : ::fgetxattr(file_->fd(), name.c_str(), value, size);
     };
+    if (const auto* const rehearsed = Rehearsed::Find(*this, name)) return *rehearsed;
     Bytes value(kUsual);
     for (;;) {
         ssize_t size = read(value.data(), value.size());
@@ -514,6 +528,12 @@ std::optional<Bytes> Inode::Attribute(const std::string& name) const {
 }
 
 void Inode::SetAttribute(const std::string& name, ByteView value) const {
+    if (DryRun()) {
+        if (const int error = WhyNoAttribute(*this, name, value.size())) {
+            throw SystemFailure(path(), error);
+        }
+        return Rehearsed::Note(*this, name, Bytes(value.begin(), value.end()));
+    }
     const int result =
         by_path_ ? ::setxattr(ProcPath().c_str(), name.c_str(), value.data(), value.size(), 0)
                  : ::fsetxattr(file_->fd(), name.c_str(), value.data(), value.size(), 0);
@@ -521,6 +541,12 @@ void Inode::SetAttribute(const std::string& name, ByteView value) const {
 }
 
 bool Inode::RemoveAttribute(const std::string& name) const {
+    if (DryRun()) {
+        if (!Attribute(name)) return false;
+        if (const int error = WhyNoAttribute(*this, name, 0)) throw SystemFailure(path(), error);
+        Rehearsed::Note(*this, name, std::nullopt);
+        return true;
+    }
     const int result = by_path_ ? ::removexattr(ProcPath().c_str(), name.c_str())
                                 : ::fremovexattr(file_->fd(), name.c_str());
     if (result == 0) return true;
@@ -529,6 +555,10 @@ bool Inode::RemoveAttribute(const std::string& name) const {
 }
 
 void Inode::SetMode(mode_t mode) const {
+    if (DryRun()) {
+        if (const int error = WhyNoMode(*this)) throw SystemFailure(path(), error);
+        return;
+    }
     const int result = by_path_ ? ::chmod(ProcPath().c_str(), mode) : ::fchmod(file_->fd(), mode);
     if (result != 0) throw SystemFailure(path(), errno);
 }

@@ -4,6 +4,7 @@
 #include <set>
 
 #include "include/mavoea.h"
+#include "tools/place/dry_run.h"
 #include "tools/say/text.h"
 #include "tools/store/foreign/detection.h"
 #include "tools/store/marks.h"
@@ -79,7 +80,8 @@ class ObjectAdoption {
             writer.Write(object_, *inode, fitting,
                          {.durability = durability, .old = Old::kKept, .first = First::kResource});
         missing.insert(missing.end(), written.missing.begin(), written.missing.end());
-        const auto again = WhatIsMissing(fitting, ReadCurrent());
+        const auto again =
+            DryRun() ? std::vector<Missing>() : WhatIsMissing(fitting, ReadCurrent());
         missing.insert(missing.end(), again.begin(), again.end());
         if (!missing.empty()) {
             failure_ = Failure(
@@ -93,7 +95,7 @@ class ObjectAdoption {
         // Record and marks are in none of the files that have been synced.
         const bool kept_with_object =
             durability == Durability::kNow && (had_head || object_.kind() == VolumeKind::kFileEA);
-        if (kept_with_object && inode->HoldsContents()) inode->Sync();
+        if (kept_with_object && !DryRun() && inode->HoldsContents()) inode->Sync();
         RemoveFiles(going);
     }
 

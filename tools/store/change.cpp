@@ -1,12 +1,14 @@
 #include "tools/store/change.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 
 #include <cerrno>
 #include <limits>
 
 #include "format/apple_double.h"
 #include "include/mavoea.h"
+#include "tools/place/dry_run.h"
 #include "tools/say/messages.h"
 #include "tools/store/apple_double_file.h"
 #include "tools/store/foreign/changer.h"
@@ -18,9 +20,18 @@
 #include "tools/store/rights.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/stream_file.h"
+#include "util/superuser_scope.h"
 
 namespace mavoea::tool {
 namespace {
+
+// As far as that is known before.
+void RequireEaDirectoryCanBeMade(const Directory& beside) {
+    const SuperuserScope superuser;
+    const int error = superuser.ok() ? WhyNoNewFile(beside) : EPERM;
+    if (error == 0) return;
+    throw LibraryFailure(beside.PathOf(kEaDirName), {MAVOEA_ERR_MAKE_DIRECTORY, error});
+}
 
 // ---- Volumes that keep metadata in files beside the object --------------------------------------
 
@@ -112,7 +123,12 @@ class FileChanger final : public Changer {
     std::unique_ptr<ChangedFile> Open(const std::string& name, bool make) const {
         DirectoryRef in = object_.place.directory;
         if (object_.keeping() == Keeping::kEaDirectory) {
-            in = make ? NeedEaDirectory(*in) : in->FindAgain(kEaDirName);
+            const DirectoryRef beside = in;
+            in = make && !DryRun() ? NeedEaDirectory(*in) : in->FindAgain(kEaDirName);
+            if (!in && make) {
+                RequireEaDirectoryCanBeMade(*beside);
+                return ChangedFile::Rehearse(beside->PathOf(kEaDirName) + '/' + name);
+            }
         }
         return in ? ChangedFile::Open(object_.place, {in, name}, make) : nullptr;
     }
@@ -160,13 +176,19 @@ class AttributeChanger final : public Changer {
         if (KindOf(name) == Kind::kFinderInfo) CheckFinderInfoSize(inode_->path(), value);
         if (KindOf(name) != Kind::kResourceFork) return inode_->SetAttribute(name, value);
         static constexpr std::uint8_t kNothing = 0;  // The library takes no NULL.
-        const ErrorMark mark;
-        if (MAVOEAXattrSet(inode_->ProcPath().c_str(), name.c_str(),
-                           value.empty() ? &kNothing : value.data(), static_cast<int>(value.size()),
-                           0) == 0) {
-            return;
+        LibraryError error;
+        if (DryRun()) {
+            if (ForkSize() >= 0) return;
+            error.error = errno;
+        } else {
+            const ErrorMark mark;
+            if (MAVOEAXattrSet(inode_->ProcPath().c_str(), name.c_str(),
+                               value.empty() ? &kNothing : value.data(),
+                               static_cast<int>(value.size()), 0) == 0) {
+                return;
+            }
+            error = mark.Get();
         }
-        const LibraryError error = mark.Get();
         if (!OffersNoFork(error)) throw LibraryFailure(inode_->path(), error);
         throw Failure(kFailed, inode_->path(), "its file system offers no resource fork for it",
                       "only files have one, on volumes of Mac file systems");
@@ -174,6 +196,8 @@ class AttributeChanger final : public Changer {
 
     bool Remove(const std::string& name) override {
         if (KindOf(name) != Kind::kResourceFork) return inode_->RemoveAttribute(name);
+        // The library would give the file another mode to look for one.
+        if (DryRun()) return ForkSize() > 0;
         const std::string path = inode_->ProcPath();
         const ErrorMark mark;
         // Emptying a fork that is empty succeeds.
@@ -187,6 +211,12 @@ class AttributeChanger final : public Changer {
     }
 
  private:
+    // Negative with errno.
+    off_t ForkSize() const {
+        struct stat info;
+        return ::stat((inode_->ProcPath() + "/rsrc").c_str(), &info) == 0 ? info.st_size : -1;
+    }
+
     // Directories have none, and most file systems offer none.
     static bool OffersNoFork(const LibraryError& error) {
         return error.code == MAVOEA_ERR_NOTHING_THERE || error.error == ENOTDIR ||
@@ -236,7 +266,7 @@ void LetSidecarFollow(const Object& object, const Inode& inode, mode_t before) {
     const auto& found = sidecars.apple_double;
     if (!found || (found->info.st_mode & kPermissionBits) != (before & 0666)) return;
     const auto file = found->directory->FindFile(found->name, O_RDONLY);
-    if (file && file->Status().st_nlink == 1) Rights::Of(inode).Give(*file);
+    if (file && file->Status().st_nlink == 1 && !DryRun()) Rights::Of(inode).Give(*file);
 }
 
 class LockChanger final : public Changer {
@@ -250,14 +280,13 @@ class LockChanger final : public Changer {
             throw Failure(kFailed, object_.path(), "the locked state is 0 or 1",
                           "give it without a line's end, or use mavoea lock and mavoea unlock");
         }
-        SetLocked(object_, value[0] == '1');
+        (void)SetLocked(object_, value[0] == '1');
     }
 
     bool Remove(const std::string& name) override {
         if (KindOf(name) != Kind::kLocked) return changer_->Remove(name);
         if (!ReadMetadata(object_, Sidecars::Services::kLeaveOut).locked) return false;
-        SetLocked(object_, false);
-        return true;
+        return SetLocked(object_, false);
     }
 
  private:
@@ -297,14 +326,16 @@ std::unique_ptr<Changer> OpenChanger(const Object& object) {
     return std::make_unique<LockChanger>(object, MakeChanger(object));
 }
 
-void SetLocked(const Object& object, bool locked) {
+bool SetLocked(const Object& object, bool locked) {
     if (object.keeping() == Keeping::kNone) throw NoStore(object);
     RequireDeclared(object);
     const Metadata metadata = ReadMetadata(object, Sidecars::Services::kLeaveOut);
     if (!metadata.problems.empty()) throw Failure(metadata.problems.front());
     const auto inode = Inode::Open(object.place);
+    bool will_be = metadata.locked;
     if (inode->HoldsContents()) {
         const Dialect* const dialect = object.dialect();
+        will_be = locked;
         if (dialect != nullptr && dialect->marks != Dialect::Marks::kHost) {
             SetForeignLock(*dialect, *inode, locked);
         } else if (LocksByMode(object)) {
@@ -314,13 +345,15 @@ void SetLocked(const Object& object, bool locked) {
             if (!locked) LetSidecarFollow(object, *inode, before);
             if (!locked && dialect != nullptr) SetForeignLock(*dialect, *inode, false);
         } else {
+            if (DryRun() && locked) will_be = metadata.locked || TakesMarks(*inode);
             SetLockFlag(*inode, locked);
             SetRecordLock(object, *inode, locked);
             // An upgrade may have taken the write bits.
             if (!locked && RemembersMode(*inode)) UnlockMode(*inode);
         }
     }
-    if (ReadMetadata(object, Sidecars::Services::kLeaveOut).locked == locked) return;
+    if (!DryRun()) will_be = ReadMetadata(object, Sidecars::Services::kLeaveOut).locked;
+    if (will_be == locked) return metadata.locked != locked;
     throw Failure(kFailed, object.path(),
                   locked ? "its file system cannot keep the locked state" : "it stays locked",
                   "the locked state takes a file system with attributes of users, and an object "

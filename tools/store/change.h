@@ -27,9 +27,9 @@ void CheckFinderInfoSize(const std::string& path, const Bytes& value);
 // would be another object's as well.
 std::unique_ptr<Changer> OpenChanger(const Object& object);
 
-// Sets the Mac locked state. Failure when the object is not in that state afterwards; what is
-// damaged is told before anything has changed.
-void SetLocked(const Object& object, bool locked);
+// Sets the Mac locked state; false when that is what it was. Failure when the object is not in that
+// state afterwards; what is damaged is told before anything has changed.
+bool SetLocked(const Object& object, bool locked);
 
 }  // namespace mavoea::tool
 

@@ -10,13 +10,20 @@
 namespace mavoea::tool {
 
 // Locked against other processes until the end of its scope. A file that is made gets its name, and
-// its object's rights, with Commit(); without, nothing of it stays. All members throw Failure.
+// its object's rights, with Commit(); without, nothing of it stays. A dry run changes a copy
+// without a name. All members throw Failure.
 class ChangedFile {
  public:
     // Null when there is no such file and it is not to be made.
     static std::unique_ptr<ChangedFile> Open(const Place& object, const Place& file, bool make);
 
-    const File& file() const { return made_ ? made_->file() : *existing_; }
+    // One that is to be made by a dry run, in a directory that is to be made as well.
+    static std::unique_ptr<ChangedFile> Rehearse(const std::string& path);
+
+    const File& file() const {
+        if (copy_) return *copy_;
+        return made_ ? made_->file() : *existing_;
+    }
     const std::string& path() const { return file().path(); }
 
     void Commit();
@@ -30,7 +37,8 @@ class ChangedFile {
 
     std::shared_ptr<const File> existing_;
     std::unique_ptr<TemporaryFile> made_;
-    DirectoryRef directory_;  // of a file that is made
+    std::shared_ptr<const File> copy_;  // in a dry run: what is changed in place of the two
+    DirectoryRef directory_;            // of a file that is made
     Rights rights_;
 };
 

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 
+#include "tools/place/dry_run.h"
 #include "tools/store/reader.h"
 #include "tools/store/writer.h"
 
@@ -52,7 +53,7 @@ std::vector<Missing> EntryChange::Write() const {
     std::vector<Missing> missing = fit.missing;
     const bool fits = std::any_of(changed_.begin(), changed_.end(),
                                   [&](EntryId id) { return fitting.entries.contains(id); });
-    if (!fits && !changes_created_) return missing;
+    if ((!fits && !changes_created_) || DryRun()) return missing;
     const Written written = WriterFor(object_).Write(object_, *Inode::Open(object_.place), fitting,
                                                      {.old = Old::kKept});
     missing.insert(missing.end(), written.missing.begin(), written.missing.end());

@@ -14,6 +14,7 @@
 #include "platform/file_status.h"
 #include "platform/kernel.h"
 #include "platform/marks.h"
+#include "tools/place/dry_run.h"
 #include "tools/say/messages.h"
 #include "tools/store/foreign/marks.h"
 
@@ -84,16 +85,23 @@ void ReadMarks(const Object& object, const Inode& inode, const std::vector<std::
     metadata->locked = metadata->locked || locked;
 }
 
+bool TakesMarks(const Inode& inode) {
+    return WhyNoAttribute(inode, attribute_word::kName, sizeof(std::uint32_t)) == 0;
+}
+
 void SetLockFlag(const Inode& inode, bool locked) {
+    if (DryRun()) return;
     (void)EASetLockFlag(inode.ProcPath().c_str(), locked ? 1 : 0);
 }
 
 void SetHidden(const Inode& inode, bool hidden) {
+    if (DryRun()) return;
     (void)kernel::FileCommand(inode.ProcPath().c_str(),
                               hidden ? marks::kSetHidden : marks::kClearHidden);
 }
 
 void SetArchived(const Inode& inode) {
+    if (DryRun()) return;
     if (inode.fd() >= 0) {
         (void)kernel::SetArchiveBit(inode.fd());
     } else {

@@ -27,6 +27,8 @@ void ReadMarks(const Object& object, const Inode& inode, const std::vector<std::
 // The platform's own locked flag. Setting it where the file system has no place for it does
 // nothing.
 void SetLockFlag(const Inode& inode, bool locked);
+// Whether it has one, as far as that is known before.
+bool TakesMarks(const Inode& inode);
 
 void SetHidden(const Inode& inode, bool hidden);
 void SetArchived(const Inode& inode);

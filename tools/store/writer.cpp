@@ -10,6 +10,7 @@
 
 #include "format/netatalk_record.h"
 #include "include/mavoea.h"
+#include "tools/place/dry_run.h"
 #include "tools/store/by_kind.h"
 #include "tools/store/encoding.h"
 #include "tools/store/fitting.h"
@@ -536,6 +537,7 @@ Written Writer::Write(const Object& to, const Inode& inode, const Metadata& fitt
     } else {
         RequireOwnNames(to, old);
     }
+    if (DryRun()) return Foresee(to, fitting, old, parts);
     NewFiles files(inode, options);
     AddServices(to, fitting, &files, &written);
     Sidecars beside;
@@ -563,6 +565,31 @@ Written Writer::Write(const Object& to, const Inode& inode, const Metadata& fitt
     // What else there is, is looked for by name.
     const bool alone = fitting.services.empty() && !old.problem && !old.Any();
     written.beside = alone ? std::move(beside) : Sidecars::Find(to, Sidecars::Services::kFind);
+    return written;
+}
+
+Written Writer::Foresee(const Object& to, const Metadata& fitting, const Sidecars& old,
+                        const std::vector<Part>& parts) {
+    RequireUnlocked(old);
+    Written written;
+    for (const Metadata::ServiceFile& service : fitting.services) {
+        written.whole.insert(service.holder);
+    }
+    for (const Part& part : parts) {
+        if (part.kind.empty()) {
+            const std::string name = AppleDoubleName(to.place.name);
+            RequireAppleDoublePlace(to, name);
+            if (const int error = WhyNoNewFile(*to.place.directory)) {
+                throw SystemFailure(to.place.directory->PathOf(name), error);
+            }
+        } else if (old.ea_dir) {
+            const std::string name = NameInEaDirectory(to.place.name) + part.kind;
+            if (const int error = WhyNoNewFile(*old.ea_dir)) {
+                throw SystemFailure(old.ea_dir->PathOf(name), error);
+            }
+        }
+        if (part.whole) written.whole.insert(part.whole->path());
+    }
     return written;
 }
 

@@ -73,6 +73,11 @@ class Writer {
     // to be kept there from now on.
     virtual void WriteToObject(const Inode&, const Metadata&, Written*) const {}
     virtual bool WritesObjectFirst() const { return false; }
+
+ private:
+    // What a dry run can say of it.
+    static Written Foresee(const Object& to, const Metadata& fitting, const Sidecars& old,
+                           const std::vector<Part>& parts);
 };
 
 // For volumes of a type; Failure for those that keep nothing.

@@ -11,6 +11,7 @@
 #include <map>
 #include <random>
 
+#include "tools/place/dry_run.h"
 #include "tools/say/messages.h"
 #include "tools/say/text.h"
 #include "tools/store/sidecars.h"
@@ -389,6 +390,7 @@ bool SettlePendingDirectory(const DirectoryRef& directory, const DirectoryRef& h
 
 // An object that is pending itself has to be there before its metadata is looked at.
 bool SettlePending(const DirectoryRef& directory, const std::optional<std::string>& name) {
+    if (DryRun()) return false;
     bool any = SettleAllIn(directory, directory, name);
     if (const DirectoryRef ea_dir = FindEaDirectory(*directory)) {
         any = SettleAllIn(directory, ea_dir, name) || any;
@@ -398,6 +400,7 @@ bool SettlePending(const DirectoryRef& directory, const std::optional<std::strin
 }
 
 bool SettleObject(const Place& object, const struct stat& info) {
+    if (DryRun()) return false;
     const std::uint64_t birth = BirthOf(object);
     bool any = false;
     for (const nlink_t links : {nlink_t{0}, info.st_nlink}) {

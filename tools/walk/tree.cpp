@@ -202,8 +202,12 @@ constexpr std::uint64_t kFailedOutcome = UINT64_MAX;
 
 class Work {
  public:
-    explicit Work(const Task& task)
-        : task_(task), report_({task.doing, task.done, task.current, task.nothing}) {}
+    Work(const TreeOptions& options, const Task& task)
+        : task_(task),
+          report_({task.doing, task.done, task.current, task.nothing},
+                  !options.verbose ? TreeReport::Each::kNotTold
+                  : options.json   ? TreeReport::Each::kInJson
+                                   : TreeReport::Each::kTold) {}
 
     void Run(const TreeOptions& options) {
         VisitObjects(
@@ -254,6 +258,7 @@ class Work {
             Notes notes;
             const Outcome outcome = task_.work(object, &notes);
             told.AddNumber(static_cast<std::uint64_t>(outcome));
+            told.AddText(object.path());
             for (const std::string& note : notes) told.AddText(note);
             return {told.bytes(), true};
         } catch (const Failure& failure) {
@@ -275,7 +280,7 @@ class Work {
             const auto status = static_cast<ExitStatus>(said.TakeNumber());
             return report_.AddFailure(path, status, std::string(said.TakeText()));
         }
-        report_.Add(static_cast<Outcome>(outcome));
+        report_.Add(std::string(said.TakeText()), static_cast<Outcome>(outcome));
         while (!said.empty()) report_.notes()->emplace_back(said.TakeText());
     }
 
@@ -305,7 +310,7 @@ void VisitObjects(const TreeOptions& options, const Visit& visit, const std::str
 }
 
 ExitStatus RunOnTree(const TreeOptions& options, const Task& task) {
-    Work work(task);
+    Work work(options, task);
     work.Run(options);
     return work.Finish(options.json);
 }

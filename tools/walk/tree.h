@@ -25,6 +25,7 @@ struct TreeOptions {
     Shard shard = {};                 // only its objects
     std::optional<LogFile> log = {};  // of what is done
     CrewSize crew = UsualCrew();      // of work that can be shared out
+    bool verbose = false;             // what became of each is told
 };
 
 // Calls `work` for each object that was named and, in recursive work, for all below it, and goes on

@@ -2,11 +2,28 @@
 
 #include <algorithm>
 #include <iostream>
+#include <string_view>
+#include <utility>
+
+#include "tools/say/text.h"
 
 namespace mavoea::tool {
 
 void TreeReport::Show(const std::string& path) {
     if (progress_.wanted()) progress_.Show(StatusText(), path, Total() + failures_.size());
+}
+
+void TreeReport::Add(const std::string& path, Outcome outcome) {
+    const auto index = static_cast<std::size_t>(outcome);
+    ++counts_[index];
+    if (each_ == Each::kNotTold) return;
+    constexpr std::string_view kWith = "with ";
+    std::string_view word = WordsByOutcome()[index];
+    if (word.starts_with(kWith)) word.remove_prefix(kWith.size());
+    std::string line = Printable(path) + ": " + std::string(word);
+    if (each_ == Each::kInJson) return lines_.push_back(std::move(line));
+    progress_.Clear();
+    std::cout << line << '\n';
 }
 
 void TreeReport::AddFailure(const std::string& path, ExitStatus status,
@@ -53,6 +70,7 @@ void TreeReport::PrintJson() const {
         if (WordsByOutcome()[i] != nullptr) json.Set(kKeys[i], counts_[i]);
     }
     json.Set("failed", failures_.size());
+    if (each_ == Each::kInJson) SetMessages(json, "lines", lines_);
     SetMessages(json, "notes", notes_);
     SetFailures(json, failures_);
     Print(json);

@@ -29,13 +29,16 @@ class TreeReport {
         const char* current;
         const char* nothing;
     };
-    explicit TreeReport(const Words& words) : words_(words), progress_(words.doing) {}
+    // Whether each outcome is told, in the words of the summary: at once, or in the JSON.
+    enum class Each { kNotTold, kTold, kInJson };
+    explicit TreeReport(const Words& words, Each each = Each::kNotTold)
+        : words_(words), progress_(words.doing), each_(each) {}
 
     // Shows how far it is on standard error, when that is a terminal.
     void Show(const std::string& path);
     void ClearProgress() { progress_.Clear(); }
 
-    void Add(Outcome outcome) { ++counts_[static_cast<std::size_t>(outcome)]; }
+    void Add(const std::string& path, Outcome outcome);
     void AddFailure(const std::string& path, const Failure& failure) {
         AddFailure(path, failure.status(), failure.what());
     }
@@ -55,6 +58,8 @@ class TreeReport {
 
     const Words words_;
     Progress progress_;
+    const Each each_;
+    std::vector<std::string> lines_;         // for the JSON
     std::array<std::uint64_t, 3> counts_{};  // by Outcome
     Notes notes_;
     std::vector<FailedObject> failures_;

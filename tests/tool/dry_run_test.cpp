@@ -1,0 +1,244 @@
+// A dry run says what the command would do and changes nothing: not a byte, mode, attribute or
+// time.
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <functional>
+
+#include "tests/support/mac_files.h"
+#include "tests/support/object_files.h"
+#include "tests/support/process.h"
+#include "tests/support/snapshot.h"
+#include "tests/support/stream_builder.h"
+#include "tests/tool/holdings.h"
+#include "tests/tool/tool.h"
+
+namespace mavoea::test {
+namespace {
+
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+
+constexpr int kXattr = 7;
+constexpr int kFileEa = 2;
+constexpr int kSamba = 20;
+
+std::string NameOfType(int type) {
+    switch (type) {
+        case 0:
+            return "appledouble";
+        case 1:
+            return "eadir";
+        case kFileEa:
+            return "fileea";
+        case kXattr:
+            return "xattr";
+        default:
+            return "samba";
+    }
+}
+
+Bytes StreamOf(const std::string& value) {
+    return StreamImage{.attributes = {{"user.colour", Ascii(value)}}, .fork = Ascii("fork")}
+        .Build();
+}
+
+class DryRunTest : public ::testing::TestWithParam<int> {
+ protected:
+    void SetUp() override {
+        MAVOEA_SKIP_UNLESS_ROOT();
+        MAVOEA_SKIP_WITHOUT_ATTRIBUTES(dir_.path());
+        MakeDir(top());
+        Put("a");
+        Put("b");
+        MakeDir(top() + "/inner");
+        Put("inner/c");
+        SetOldTimes(top());
+    }
+
+    std::string top() const { return dir_ / "share"; }
+    std::string operator/(const std::string& name) const { return top() + '/' + name; }
+
+    void Put(const std::string& name) const {
+        WriteFile(*this / name, Ascii("data of " + name));
+        chmod((*this / name).c_str(), 0644);
+    }
+
+    ToolResult Run(Arguments arguments, const std::string& input = {}) const {
+        arguments.insert(arguments.begin(), {"--volume", top() + "=" + NameOfType(GetParam())});
+        return RunTool(arguments, input);
+    }
+
+    bool HasEaDirectory() const { return GetParam() == 1 || GetParam() == kFileEa; }
+
+    // The same words, status and failures as of the real run with --verbose, which comes next; and
+    // nothing has changed when it does.
+    void ExpectForeseen(const Arguments& arguments, const std::string& lines, int status = 0,
+                        const std::string& input = {}) {
+        SCOPED_TRACE(::testing::PrintToString(arguments));
+        SetOldTimes(top());
+        const Snapshot before = TakeSnapshot(top());
+        Arguments dry = arguments;
+        dry.insert(dry.begin() + 1, "--dry-run");
+        const ToolResult said = Run(dry, input);
+        EXPECT_THAT(Differences(before, TakeSnapshot(top())), IsEmpty());
+        EXPECT_EQ(lines, said.out);
+        EXPECT_EQ(status, said.status) << said.err;
+        Arguments real = arguments;
+        real.insert(real.begin() + 1, "--verbose");
+        const ToolResult done = Run(real, input);
+        EXPECT_EQ(done.out, said.out);
+        EXPECT_EQ(done.err, said.err);
+        EXPECT_EQ(done.status, said.status);
+    }
+
+ private:
+    TempDir dir_;
+};
+
+INSTANTIATE_TEST_SUITE_P(VolumeTypes, DryRunTest, ::testing::Values(0, 1, kFileEa, kXattr, kSamba),
+                         [](const auto& tested) { return NameOfType(tested.param); });
+
+// ---- lock, unlock -------------------------------------------------------------------------------
+
+TEST_P(DryRunTest, LockingIsForeseenObjectByObject) {
+    ASSERT_EQ(0, symlink("a", (*this / "link").c_str()));
+    ExpectForeseen({"lock", *this / "a"},
+                   *this / "a: locked\n1 locked, 0 already locked, 0 failed\n");
+    ExpectForeseen({"lock", "-r", top()}, top() + ": locked\n" + *this / "a: already locked\n" +
+                                              *this / "b: locked\n" + *this / "inner: locked\n" +
+                                              *this / "inner/c: locked\n" +
+                                              "4 locked, 1 already locked, 0 failed\n");
+    ExpectForeseen({"unlock", *this / "a", *this / "missing", *this / "b"},
+                   *this / "a: unlocked\n" + *this / "b: unlocked\n" +
+                       "2 unlocked, 0 already unlocked, 1 failed\n",
+                   1);
+}
+
+// ---- set, remove, set-info ----------------------------------------------------------------------
+
+TEST_P(DryRunTest, ValuesAreSetAndRemovedAsForeseen) {
+    const std::string a = *this / "a";
+    ExpectForeseen({"set", a, "user.colour", "blue"}, a + ": set \"user.colour\", 4 bytes\n");
+    ExpectForeseen({"set", a, "user.colour"}, a + ": set \"user.colour\", 70 bytes\n", 0,
+                   std::string(70, 'x'));
+    ExpectForeseen({"set", a, "user.other", "1"}, a + ": set \"user.other\", 1 byte\n");
+    ExpectForeseen({"remove", a, "user.colour"}, a + ": removed \"user.colour\"\n");
+    ExpectForeseen({"remove", a, "user.colour"}, "", 1);
+    EXPECT_EQ("user.other\n", Run({"list", a}).out);
+}
+
+TEST_P(DryRunTest, FinderInfoForkAndLockAreSetAndRemovedAsForeseen) {
+    const std::string a = *this / "a";
+    // Plain attributes of other names than "user.*" have no place on a Linux file system.
+    const bool plain = GetParam() == kXattr;
+    const std::string info = "TEXTttxt" + std::string(24, '\0');
+    ExpectForeseen({"set", a, kFinderInfoName},
+                   plain ? "" : a + ": set \"com.apple.FinderInfo\", 32 bytes\n", plain ? 2 : 0,
+                   info);
+    ExpectForeseen({"set", a, kFinderInfoName}, "", 2, "too short");
+    ExpectForeseen({"remove", a, kFinderInfoName},
+                   plain ? "" : a + ": removed \"com.apple.FinderInfo\"\n", plain ? 1 : 0);
+    ExpectForeseen({"remove", a, kFinderInfoName}, "", 1);
+    ExpectForeseen({"set", a, kForkName},
+                   plain ? "" : a + ": set \"com.apple.ResourceFork\", 8 bytes\n", plain ? 2 : 0,
+                   "the fork");
+    ExpectForeseen({"remove", a, kForkName},
+                   plain ? "" : a + ": removed \"com.apple.ResourceFork\"\n", plain ? 1 : 0);
+    ExpectForeseen({"set", a, kLockedName, "1"}, a + ": set \"mavoea.locked\", 1 byte\n");
+    ExpectForeseen({"remove", a, kLockedName}, a + ": removed \"mavoea.locked\"\n");
+}
+
+TEST_P(DryRunTest, InfoIsSetAsForeseen) {
+    if (GetParam() == kXattr) {
+        return ExpectForeseen({"set-info", *this / "a", "--type", "TEXT"}, "", 2);
+    }
+    const std::string a = *this / "a";
+    const ToolResult first = Run({"set-info", "-v", *this / "b", "--type", "TEXT", "--tags",
+                                  "Home:red", "--comment", "hello"});
+    ASSERT_EQ(0, first.status);
+    const std::string same = ": " + first.out.substr((*this / "b: ").size());
+    EXPECT_THAT(same, HasSubstr("com.apple.FinderInfo"));
+    const Arguments change = {"--type", "TEXT", "--tags", "Home:red", "--comment", "hello"};
+    Arguments words = {"set-info", a, *this / "missing", *this / "inner/c"};
+    words.insert(words.end(), change.begin(), change.end());
+    ExpectForeseen(words, a + same + *this / "inner/c" + same, 1);
+    ExpectForeseen({"set-info", a, "--type", "TEXT"}, a + ": nothing to change\n");
+    ExpectForeseen({"set-info", *this / "inner", "--type", "TEXT"}, "", 2);
+}
+
+// ---- upgrade, repair ----------------------------------------------------------------------------
+
+TEST_P(DryRunTest, UpgradesAreForeseenObjectByObject) {
+    if (!HasEaDirectory()) {
+        ExpectForeseen({"upgrade", *this / "a"},
+                       "0 converted, 0 already current, 0 with nothing to "
+                       "convert, 1 failed\n",
+                       2);
+        return;
+    }
+    PutAppleDouble(*this / "a", AllMacFiles()[0].bytes);
+    PutLegacy(*this / "b", "colour", Ascii("blue"));
+    PutStream(*this / "inner/c", StreamOf("red"));
+    Put("inner/damaged");
+    PutLegacy(*this / "inner/damaged", "colour", Ascii("red"));
+    MakeDir(*this / "inner/@eaDir/damaged/folder");
+    Put("inner/left");
+    PutStream(*this / "inner/left", StreamOf("red"));
+    PutLegacy(*this / "inner/left", "colour", Ascii("blue"));
+    ExpectForeseen({"upgrade", "-r", top()},
+                   top() + ": nothing to convert\n" + *this / "a: converted\n" +
+                       *this / "b: converted\n" + *this / "inner: nothing to convert\n" +
+                       *this / "inner/c: already current\n" +
+                       *this / "inner/left: already current\n" +
+                       "2 converted, 2 already current, 2 with nothing to convert, 1 failed\n",
+                   2);
+}
+
+TEST_P(DryRunTest, ValuesOfEarlierVersionsAreRemovedAsForeseen) {
+    if (!HasEaDirectory()) return;
+    const std::string a = *this / "a";
+    PutLegacy(a, "colour", Ascii("blue"));
+    ExpectForeseen({"remove", a, "shape"}, "", 1);
+    PutLegacy(*this / "b", "colour", Ascii("blue"));
+    ExpectForeseen({"remove", *this / "b", "colour"}, *this / "b: removed \"colour\"\n");
+}
+
+TEST_P(DryRunTest, RepairsAreForeseenObjectByObject) {
+    if (!HasEaDirectory()) return;
+    PutResource(*this / "a", StreamOf("blue"));
+    PutResource(*this / "inner/c", Ascii("no AppleDouble file"));
+    ExpectForeseen({"repair", "-r", top()},
+                   top() + ": nothing to repair\n" + *this / "a: repaired\n" +
+                       *this / "b: nothing to repair\n" + *this / "inner: nothing to repair\n" +
+                       "1 repaired, 3 with nothing to repair, 1 failed\n",
+                   2);
+}
+
+// ---- What is known before -----------------------------------------------------------------------
+
+TEST_P(DryRunTest, WhatAnotherUserMayNotDoIsForeseen) {
+    const std::string a = *this / "a";
+    chmod(top().c_str(), 0755);
+    chmod(std::filesystem::path(top()).parent_path().c_str(), 0755);
+    const Snapshot before = TakeSnapshot(top());
+    for (const Arguments& words :
+         std::vector<Arguments>{{"lock", a}, {"set", a, "user.colour", "blue"}}) {
+        Arguments declared = {"--volume", top() + "=" + NameOfType(GetParam())};
+        declared.insert(declared.end(), words.begin(), words.end());
+        const ToolResult real = RunTool(declared, {}, {.user = 54321});
+        declared.emplace_back("--dry-run");
+        const ToolResult dry = RunTool(declared, {}, {.user = 54321});
+        EXPECT_EQ(2, dry.status);
+        EXPECT_EQ(real.status, dry.status);
+        EXPECT_EQ(real.err, dry.err);
+    }
+    EXPECT_THAT(Differences(before, TakeSnapshot(top())), IsEmpty());
+}
+
+}  // namespace
+}  // namespace mavoea::test
