@@ -219,6 +219,48 @@ TEST_P(DryRunTest, RepairsAreForeseenObjectByObject) {
                    2);
 }
 
+// ---- rm -----------------------------------------------------------------------------------------
+
+TEST_P(DryRunTest, RemovalsAreForeseenObjectByObject) {
+    const std::string a = *this / "a";
+    const std::string inner = *this / "inner";
+    ASSERT_EQ(0, Run({"set", *this / "inner/c", "user.colour", "blue"}).status);
+    MakeDir(inner + "/empty");
+    Put("single");
+    ExpectForeseen({"rm", *this / "single"}, "removed '" + *this / "single'\n");
+    const std::string removed = "removed '" + inner + "/c'\nremoved directory '" + inner +
+                                "/empty'\nremoved directory '" + inner + "'\n";
+    const ToolResult list = Run({"rm", "-r", "--dry-run", inner});
+    EXPECT_THAT(list.out, HasSubstr("removed directory '" + inner + "'\n"));
+    EXPECT_EQ(removed.size() + std::string("4 removed, 0 failed\n").size(), list.out.size());
+    // What has gone before, by itself or with a directory above it, is missing.
+    ExpectForeseen(
+        {"rm", "-r", a, inner, inner + "/c", a},
+        "removed '" + a + "'\n" + list.out.substr(0, removed.size()) + "4 removed, 2 failed\n", 1);
+    EXPECT_FALSE(Exists(a));
+    EXPECT_FALSE(Exists(inner));
+}
+
+TEST_P(DryRunTest, DirectoriesInWhichSomethingStaysAreForeseenToStay) {
+    const std::string inner = *this / "inner";
+    WriteFile(inner + "/._gone", Ascii("of no object"));
+    ExpectForeseen({"rm", *this / "inner", *this / "a"},
+                   "removed '" + *this / "a'\n1 removed, 1 failed\n", 1);
+    const ToolResult said = Run({"rm", "-r", "--dry-run", inner});
+    const ToolResult done = Run({"rm", "-r", "--verbose", inner});
+    EXPECT_EQ(done.out, said.out);
+    EXPECT_EQ(done.err, said.err);
+    EXPECT_EQ(done.status, said.status);
+}
+
+TEST_P(DryRunTest, NothingIsAsked) {
+    const std::string a = *this / "a";
+    const ToolResult said = Run({"rm", "-i", "--dry-run", a});
+    EXPECT_THAT(said, Succeeded());
+    EXPECT_EQ("removed '" + a + "'\n", said.out);
+    EXPECT_TRUE(Exists(a));
+}
+
 // ---- What is known before -----------------------------------------------------------------------
 
 TEST_P(DryRunTest, WhatAnotherUserMayNotDoIsForeseen) {

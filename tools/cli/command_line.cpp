@@ -598,6 +598,7 @@ std::variant<Options, int> ParseAs(Command command, Habit habit, std::span<const
     options.copy = std::move(read.copy);
     options.remove = std::move(read.remove);
     options.progress = std::move(read.progress);
+    options.dry_run = read.dry_run;
     options.json = before.json || read.json;
     options.copy.job.json = options.remove.job.json = options.json;
     return options;

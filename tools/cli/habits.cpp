@@ -126,6 +126,8 @@ constexpr Syntax kSyntax[] = {
     {kRm, 'd', "dir", no_argument, nullptr, "Empty directories, too"},
     {kRm, 'r', "recursive", no_argument, nullptr, "Directories with all that is in them"},
     {kRm, 'R', nullptr, no_argument, nullptr, nullptr},
+    {kRm, 'n', "dry-run", no_argument, nullptr,
+     "Say that, as far as it is known before, ask nothing, and change nothing"},
     {kRm, kOneFileSystem, "one-file-system", no_argument, nullptr,
      "Leave out directories on other file systems than what was named"},
     {kRm, kPreserveRoot, "preserve-root", optional_argument, "all",
@@ -529,6 +531,9 @@ class Line {
         switch (letter) {
             case 'd':
                 remove.directories = true;
+                break;
+            case 'n':
+                options_.dry_run = remove.job.verbose = true;
                 break;
             case 'f':
                 remove.ask = AskToRemove::kNever;

@@ -21,6 +21,7 @@ struct HabitOptions {
     std::vector<std::string> volumes;  // PATH=TYPE
     std::string progress;              // seconds, empty: none
     bool json = false;
+    bool dry_run = false;
 };
 
 // What the words behind the command's say, or the exit status when everything has been said. The

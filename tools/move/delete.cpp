@@ -8,6 +8,7 @@
 #include <string>
 
 #include "tools/move/ends.h"
+#include "tools/place/dry_run.h"
 #include "tools/place/paths.h"
 #include "tools/place/volume.h"
 #include "tools/say/job.h"
@@ -49,6 +50,7 @@ Named FindNamed(const std::string& path) {
         0) {
         throw SystemFailure(path, errno);
     }
+    if (WouldBeGone(named.place)) throw SystemFailure(path, ENOENT);
     if (directory_only && !S_ISDIR(named.info.st_mode)) throw SystemFailure(path, ENOTDIR);
     named.place.shown = WithOneSlash(path);
     named.behind_link = link;
@@ -78,6 +80,7 @@ class Deletion final : private TreeRemoval {
     // ---- What was named -------------------------------------------------------------------------
 
     bool AgreesToAll() {
+        if (DryRun()) return true;
         constexpr std::size_t kMany = 3;
         const std::size_t count = options_.job.paths.size();
         const bool recursive = options_.job.recursive;
@@ -181,7 +184,7 @@ class Deletion final : private TreeRemoval {
 
     Answer Ask(const char* what, const Place& place, mode_t type) {
         const bool is_protected = asks_if_protected_ && !place.Writable();
-        if (!asks_always_ && !is_protected) return Answer::kYes;
+        if ((!asks_always_ && !is_protected) || DryRun()) return Answer::kYes;
         const std::string name = S_ISDIR(type) ? "directory" : NameOfType(StatusOf(place));
         const std::string object =
             (is_protected ? "write-protected " : "") + name + ' ' + Quoted(place.path());

@@ -5,8 +5,11 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <map>
+#include <set>
 #include <utility>
 
+#include "tools/place/dry_run.h"
 #include "tools/say/job.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
@@ -21,6 +24,48 @@ constexpr std::size_t kMostOpen = 16;
 Failure HasNotGone(const std::string& path) {
     return {kFailed, path, "it has changed, or come, since its directory was carried",
             "give the command again"};
+}
+
+// What would have gone in a dry run, as far as later steps ask for it.
+class Gone {
+ public:
+    void Add(const Directory& directory, const std::string& name) {
+        names_[IdOf(directory.Status())].insert(name);
+    }
+    // A directory with all that was in it.
+    void AddDirectory(const struct stat& info) {
+        names_.erase(IdOf(info));
+        directories_.insert(IdOf(info));
+    }
+
+    bool Has(const Directory& directory, const std::string& name) const {
+        const auto found = names_.find(IdOf(directory.Status()));
+        return found != names_.end() && found->second.contains(name);
+    }
+    bool HasDirectory(const struct stat& info) const { return directories_.contains(IdOf(info)); }
+
+ private:
+    using Id = std::pair<dev_t, ino_t>;
+    static Id IdOf(const struct stat& info) { return {info.st_dev, info.st_ino}; }
+
+    std::map<Id, std::set<std::string>> names_;  // by directory
+    std::set<Id> directories_;
+};
+Gone& WouldHaveGone() {
+    static Gone all;
+    return all;
+}
+
+// The call that removes an object.
+void Unlink(const Place& place, int flags) {
+    if (DryRun()) {
+        if (const int error = WhyNoRemoval(place)) throw SystemFailure(place.path(), error);
+        if ((flags & AT_REMOVEDIR) != 0) WouldHaveGone().AddDirectory(StatusOf(place));
+        return WouldHaveGone().Add(*place.directory, place.name);
+    }
+    if (::unlinkat(place.directory->fd(), place.name.c_str(), flags) != 0) {
+        throw SystemFailure(place.path(), errno);
+    }
 }
 
 // What lies beside an object that is about to go.
@@ -48,6 +93,11 @@ class Beside {
 
     void Remove() const {
         if (shared_) return;
+        if (DryRun()) {
+            for (const Sidecars::Found& file : sidecars_.Files()) {
+                WouldHaveGone().Add(*file.directory, file.name);
+            }
+        }
         RemoveFiles(sidecars_.Files());
         if (sidecars_.folder) (void)sidecars_.ea_dir->RemoveEmpty(object_.place.name);
     }
@@ -78,9 +128,18 @@ void RemoveEaDirectory(const Directory& inside, const MayGo& may_go) {
     (void)inside.RemoveEmpty(kEaDirName);
 }
 
+// But for the EA directory.
+void RequireNothingLeft(const Directory& inside, const Place& place) {
+    for (const Directory::Entry& entry : inside.Entries()) {
+        if (entry.name == kEaDirName || (DryRun() && WouldHaveGone().Has(inside, entry.name)))
+            continue;
+        throw SystemFailure(place.path(), ENOTEMPTY);
+    }
+}
+
 // The indexes know nothing of what no path leads to.
 void ReportRemovedAt(const Place& place) {
-    if (place.directory->HasLocation(place.name)) ReportRemoved(place.location());
+    if (!DryRun() && place.directory->HasLocation(place.name)) ReportRemoved(place.location());
 }
 
 // Both return whether an EA directory is beside it, in which nothing may be left.
@@ -90,9 +149,7 @@ bool RemoveFileAt(const Object& object, bool alone, const MayGo& may_go) {
     if (may_go && !may_go(StatusOf(place))) throw HasNotGone(place.path());
     beside.RequireMayGo(may_go);
     // Data first: without it, metadata is of no use to anybody.
-    if (::unlinkat(place.directory->fd(), place.name.c_str(), 0) != 0) {
-        throw SystemFailure(place.path(), errno);
-    }
+    Unlink(place, 0);
     beside.Remove();
     ReportRemovedAt(place);
     return beside.in_ea_directory();
@@ -106,14 +163,11 @@ bool RemoveDirectoryAt(const Object& object, const Directory* inside, bool alone
     beside.RequireMayGo(may_go);
     const auto ea_dir = inside == nullptr ? std::nullopt : inside->StatusOf(kEaDirName);
     if (ea_dir && S_ISDIR(ea_dir->st_mode) && !inside->RemoveEmpty(kEaDirName)) {
-        for (const Directory::Entry& entry : inside->Entries()) {
-            if (entry.name != kEaDirName) throw SystemFailure(place.path(), ENOTEMPTY);
-        }
+        RequireNothingLeft(*inside, place);
         RemoveEaDirectory(*inside, may_go);
     }
-    if (::unlinkat(place.directory->fd(), place.name.c_str(), AT_REMOVEDIR) != 0) {
-        throw SystemFailure(place.path(), errno);
-    }
+    if (inside != nullptr && DryRun()) RequireNothingLeft(*inside, place);
+    Unlink(place, AT_REMOVEDIR);
     beside.Remove();
     ReportRemovedAt(place);
     return beside.in_ea_directory();
@@ -133,6 +187,20 @@ void RemoveEmptyDirectory(const Object& object, bool alone, const MayGo& may_go)
 }
 
 // ---- Trees --------------------------------------------------------------------------------------
+
+bool WouldBeGone(const Place& place) {
+    if (!DryRun()) return false;
+    if (WouldHaveGone().Has(*place.directory, place.name)) return true;
+    // Or a directory above it.
+    struct stat below = {};
+    struct stat info;
+    for (std::string above = ".";; above += "/..") {
+        if (::fstatat(place.directory->fd(), above.c_str(), &info, 0) != 0) return false;
+        if (WouldHaveGone().HasDirectory(info)) return true;
+        if (SameFile(info, below)) return false;
+        below = info;
+    }
+}
 
 void TreeRemoval::RemoveTree(const Place& named, const struct stat& info) {
     if (named_.directory != named.directory) Tidy();

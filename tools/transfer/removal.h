@@ -24,6 +24,9 @@ void RemoveObject(const Object& object, bool alone, const MayGo& may_go = {});
 // Throws Failure.
 void RemoveEmptyDirectory(const Object& object, bool alone, const MayGo& may_go = {});
 
+// Whether what has been looked at earlier in a dry run has taken it away.
+bool WouldBeGone(const Place& place);
+
 // Removes trees: what is in a directory before the directory itself. A directory in which something
 // had to stay is left without another word.
 //
