@@ -315,7 +315,7 @@ def print_result(work, ratios, counts):
 
 
 def print_markdown(results):
-    """The table for the README: a row for each kind that is copied from, or looked at."""
+    """The table for docs/speed.md: a row for each kind that is copied from, or looked at."""
     columns = [*KINDS, SAMBA]
     print("| Command, kind | " + " | ".join(f"to {to}" for to in columns) + " |")
     print("|---" * (len(columns) + 1) + "|")
@@ -451,7 +451,7 @@ def main():
     parser.add_argument("--memory", action="store_true", help="how much memory it takes, instead")
     parser.add_argument("--start", action="store_true", help="the tool's start, instead")
     parser.add_argument("--jobs", action="store_true", help="two processes beside one, instead")
-    parser.add_argument("--markdown", action="store_true", help="print the table for the README")
+    parser.add_argument("--markdown", action="store_true", help="print the table for docs/speed.md")
     parser.add_argument("--tool", default=f"{here}/../build/release/bin/mavoea", metavar="FILE")
     options = parser.parse_args()
     options.tool = os.path.abspath(options.tool)
