@@ -37,7 +37,9 @@ tool_tests=-DMAVOEA_TOOL_TESTS="$root/build/release/bin"
 build_and_test sanitize "$tool_tests"
 
 step "Debian's packages"
-sh tests/packages/run.sh || [ $? -eq 77 ] # nothing can be mounted here
+sh tools/package.sh
+sh tests/packages/run.sh build/packages || [ $? -eq 77 ] # nothing can be mounted here
+sh tests/packages/cross.sh i386 || [ $? -eq 77 ]
 
 step "libraries: powerpc"
 sh tests/powerpc/libraries.sh
