@@ -37,14 +37,23 @@ mount -t proc proc "$root/proc"
 [ ! -e /etc/resolv.conf ] || cp /etc/resolv.conf "$root/etc"
 [ ! -e /etc/hosts ] || cp /etc/hosts "$root/etc"
 
+inside() {
+    env -i PATH=/usr/sbin:/usr/bin:/sbin:/bin HOME=/root LC_ALL=C.UTF-8 DEBIAN_FRONTEND=noninteractive \
+        DEB_BUILD_OPTIONS="nocheck ${DEB_BUILD_OPTIONS:-}" DEB_BUILD_PROFILES="cross nocheck" \
+        DPKG_GENSYMBOLS_CHECK_LEVEL="${DPKG_GENSYMBOLS_CHECK_LEVEL:-1}" chroot "$root" "$@"
+}
+
 mkdir "$root/build"
+if [ -z "$(find "$root/var/lib/apt/lists" -name "*_binary-${architecture}_Packages*")" ]; then
+    mkdir "$root/build/libraries"
+    sh "$here/../tests/source_packages.sh" "$root/build/libraries" attr acl libplist
+    cp "$here/cross_libraries.sh" "$root/build/libraries"
+    inside sh /build/libraries/cross_libraries.sh "$architecture"
+fi
 dpkg-source --no-check -x "$source" "$root/build/source" > /dev/null
-env -i PATH=/usr/sbin:/usr/bin:/sbin:/bin HOME=/root LC_ALL=C.UTF-8 DEBIAN_FRONTEND=noninteractive \
-    DEB_BUILD_OPTIONS="nocheck ${DEB_BUILD_OPTIONS:-}" DEB_BUILD_PROFILES="cross nocheck" \
-    DPKG_GENSYMBOLS_CHECK_LEVEL="${DPKG_GENSYMBOLS_CHECK_LEVEL:-1}" \
-    chroot "$root" sh -c 'cd /build/source
-        apt-get build-dep -q -y --no-install-recommends --host-architecture "$0" . &&
-        dpkg-buildpackage -us -uc -b --host-arch "$0"' "$architecture"
+inside sh -c 'cd /build/source
+    apt-get build-dep -q -y --no-install-recommends --host-architecture "$0" . &&
+    dpkg-buildpackage -us -uc -b --host-arch "$0"' "$architecture"
 cp "$root"/build/*_"$architecture".* "${source%/*}"
 
 [ $# -gt 0 ] || exit 0

@@ -2,8 +2,8 @@
 # cross.sh ARCHITECTURE [DIRECTORY]: the packages that `sh tools/package.sh --host ARCHITECTURE` makes,
 # beside those for this machine, as `sh tools/package.sh` has made them in DIRECTORY (build/packages):
 # lintian finds nothing; they have the same files, rights, symbols and needs; everything in them is of
-# that architecture; they install beside this machine's libraries; and where it runs such programs they
-# pass debian/tests, the compiler being the other architecture's.
+# that architecture; they install beside this machine's libraries; and where it, or an emulator, runs such
+# programs they pass debian/tests, the compiler being the other architecture's.
 #
 # Ends with 77 where there is no root, or nothing can be mounted.
 set -eu
@@ -48,7 +48,7 @@ if [ -n "${MAVOEA_ROOT:-}" ]; then
             sed -n 's/^ *Machine: *//p' | sort -u >> "$work/machines"
         rm -r "$work/files"
     done
-    readelf -h "$MAVOEA_ROOT/usr/lib/$triplet/libc.so.6" 2> /dev/null |
+    readelf -h "$MAVOEA_ROOT/usr/lib/$triplet/libc.so.6" |
         sed -n 's/^ *Machine: *//p' > "$work/machine"
     sort -u "$work/machines" | diff "$work/machine" - || fail "built for another machine"
 
@@ -59,21 +59,38 @@ if [ -n "${MAVOEA_ROOT:-}" ]; then
     mkdir "$MAVOEA_ROOT/packages"
     cp "$MAVOEA_PACKAGES"/*_"$architecture".deb "$MAVOEA_ROOT/packages"
     rm "$MAVOEA_ROOT"/packages/*-dbgsym_*
-    inside sh -c 'apt-get install -q -y --no-install-recommends /packages/*.deb "pkgconf:$0"' \
-        "$architecture" > "$work/log" 2>&1 || { cat "$work/log" >&2; fail "they do not install"; }
+    inside sh -c 'apt-get install -q -y --no-install-recommends /packages/*.deb' > "$work/log" 2>&1 ||
+        { cat "$work/log" >&2; fail "they do not install"; }
     [ "$(inside dpkg-query -W -f '${Architecture}' mavoea)" = "$architecture" ] ||
         fail "the tool that was installed is another one"
-    # Its loader is a program of that architecture.
+    type=$(dpkg-architecture -a "$architecture" -q DEB_HOST_GNU_TYPE 2> /dev/null)
+    try() {
+        inside sh -c "cd /build/source && $1" > "$work/log" 2>&1 || { cat "$work/log" >&2; fail "$2"; }
+    }
+    # Their loader is a program of that architecture.
     loader=$(readelf -p .interp "$MAVOEA_ROOT/usr/bin/mavoea" | sed -n 's,^.* \(/lib.*\)$,\1,p')
-    if ! inside "$loader" --version > /dev/null 2>&1; then
+    case $architecture in
+        powerpc) emulator=qemu-ppc ;;
+        *) emulator= ;;
+    esac
+    if inside "$loader" --version > /dev/null 2>&1; then
+        try debian/tests/tool "the tool fails"
+        try "apt-get install -q -y --no-install-recommends pkgconf:$architecture" "no pkg-config"
+        try "DEB_HOST_GNU_TYPE=$type debian/tests/program" "programs fail"
+    elif [ -n "$emulator" ]; then
+        try "apt-get install -q -y --no-install-recommends qemu-user" "no emulator"
+        mkdir -p "$MAVOEA_ROOT/usr/local/bin"
+        printf '#!/bin/sh\nexec %s -L /usr/%s /usr/bin/mavoea "$@"\n' $emulator "$type" \
+            > "$MAVOEA_ROOT/usr/local/bin/mavoea"
+        chmod 755 "$MAVOEA_ROOT/usr/local/bin/mavoea"
+        try 'PATH=/usr/local/bin:$PATH debian/tests/tool' "the tool fails"
+        try "$type-gcc -o /tmp/program tests/abi/installed/program.c -lmavoea -lmavocore &&
+            $emulator -L /usr/$type /tmp/program | grep '^/volume/@eaDir/file@MavoEAStream '" \
+            "a program fails"
+    else
         echo "programs of $architecture do not run here"
         exit 0
     fi
-    inside sh -c 'cd /build/source && debian/tests/tool' > "$work/log" 2>&1 ||
-        { cat "$work/log" >&2; fail "the tool fails"; }
-    inside sh -c 'cd /build/source && DEB_HOST_GNU_TYPE=$0 debian/tests/program' \
-        "$(dpkg-architecture -a "$architecture" -q DEB_HOST_GNU_TYPE 2> /dev/null)" \
-        > "$work/log" 2>&1 || { cat "$work/log" >&2; fail "programs fail"; }
     echo "all passed"
     exit 0
 fi
