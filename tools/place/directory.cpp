@@ -586,7 +586,8 @@ void Inode::Sync() const {
 std::string TemporaryName() {
     std::array<std::uint8_t, kLetterCount> random{};
     // Names that are taken are no harm: another one is tried.
-    (void)::getrandom(random.data(), random.size(), GRND_NONBLOCK);
+    [[maybe_unused]] const ssize_t filled =
+        ::getrandom(random.data(), random.size(), GRND_NONBLOCK);
     std::string text(kOwnPrefix);
     for (const std::uint8_t byte : random) text += kLetters[byte % kLetters.size()];
     return text;
