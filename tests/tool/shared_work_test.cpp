@@ -160,7 +160,7 @@ TEST_P(SharedWorkTest, AComparisonIsAsOneProcessDoesIt) {
 }
 
 TEST_P(SharedWorkTest, AfterAnyKillTheSameCommandFinishes) {
-    constexpr int kRounds = 4;
+    constexpr int kRounds = 3;
     std::minstd_rand random(20240711);
     MakeUsualTree(60);
     const auto began = std::chrono::steady_clock::now();
@@ -183,13 +183,14 @@ TEST_P(SharedWorkTest, AfterAnyKillTheSameCommandFinishes) {
     }
 }
 
-INSTANTIATE_TEST_SUITE_P(Ways, SharedWorkTest,
-                         ::testing::Values(Way{0, 0}, Way{0, 1}, Way{1, 0}, Way{1, 1}, Way{1, 2},
-                                           Way{2, 7}, Way{7, 0}, Way{7, 1}, Way{7, 7}),
-                         [](const auto& tested) {
-                             return "From" + std::to_string(tested.param.from) + "To" +
-                                    std::to_string(tested.param.to);
-                         });
+INSTANTIATE_TEST_SUITE_P(
+    Ways, SharedWorkTest,
+    ::testing::ValuesIn(Thinned(std::vector<Way>{
+        {0, 1}, {1, 0}, {0, 0}, {1, 1}, {1, 2}, {2, 7}, {7, 0}, {7, 1}, {7, 7}})),
+    [](const auto& tested) {
+        return "From" + std::to_string(tested.param.from) + "To" + std::to_string(tested.param.to);
+    });
+});
 
 // ---- On one volume ------------------------------------------------------------------------------
 
