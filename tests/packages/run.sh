@@ -2,7 +2,8 @@
 # run.sh [DIRECTORY]: Debian's packages, as `sh tools/package.sh` makes them or has made them in
 # DIRECTORY: lintian finds nothing; a second build elsewhere gives the same bytes; in a bare system of
 # their own they install with what they say they need, pass debian/tests, give way to the platform's
-# libraries, and leave nothing behind when they go.
+# libraries, and leave nothing behind when they go; and what README has its readers type works there, as
+# it stands.
 #
 # Ends with 77 where there is no root, or nothing can be mounted. Installs mmdebstrap, and takes
 # Debian's packages from where apt has them on this machine.
@@ -67,13 +68,14 @@ apt-get indextargets --format 'deb $(REPO_URI) $(RELEASE) $(COMPONENT)' \
     "Created-By: Packages" "Origin: Debian" | sort -u > "$work/sources"
 grep -q . "$work/sources" || fail "apt has no lists of Debian's packages"
 quietly mmdebstrap --mode=root --variant=minbase --skip=check/empty,cleanup/apt \
-    --aptopt='APT::Sandbox::User "root"' --dpkgopt=force-unsafe-io "$codename" "$root" "$work/sources"
-mount -t proc proc "$root/proc"
-mkdir "$root/packages"
-cp "$packages"/*.deb "$root/packages"
+    --aptopt='APT::Sandbox::User "root"' --aptopt='APT::Get::Assume-Yes "true"' --dpkgopt=force-unsafe-io "$codename" "$root" "$work/sources"
 cp /etc/resolv.conf /etc/hosts "$root/etc"
 printf '#!/bin/sh\nexit 101\n' > "$root/usr/sbin/policy-rc.d"
 chmod 755 "$root/usr/sbin/policy-rc.d"
+cp -a "$root" "$work/untouched"
+mount -t proc proc "$root/proc"
+mkdir "$root/packages"
+cp "$packages"/*.deb "$root/packages"
 
 inside() {
     env -i PATH=/usr/sbin:/usr/bin:/sbin:/bin HOME=/root LC_ALL=C.UTF-8 \
@@ -160,4 +162,36 @@ installed libmavoea5 || fail "the library does not take the platform's libraries
 quietly inside apt-get purge -q -y 'libmavo*'
 files > "$work/after"
 diff "$work/before" "$work/after" || fail "the libraries have left something"
+
+# newcomer: a system in which nobody has done anything yet, and a clone there.
+newcomer() {
+    umount "$root/proc"
+    root=$(mktemp -d "$work/newcomer.XXX")
+    cp -a "$work/untouched/." "$root"
+    mount -t proc proc "$root/proc"
+    dpkg-source --no-check -x "$packages"/mavoea_*.dsc "$root/root/clone" > /dev/null
+}
+
+# typed PART: the first commands that README has in that part, typed by the superuser in the clone. Prints
+# what the last of them does.
+typed() {
+    awk -v part="## $1" '/^## / { within = $0 == part; next }
+        within && /^    / { print substr($0, 5); there = 1; next }
+        there { exit }' README.md > "$root/root/typed"
+    [ -s "$root/root/typed" ] || fail "README has no commands for: $1"
+    sed '$s/.*/{ & ; } > \/root\/said/' "$root/root/typed" > "$root/root/script"
+    quietly inside sh -c 'cd /root/clone && sh -eux /root/script'
+    cat "$root/root/said"
+}
+
+say "README: I have files"
+newcomer
+typed "I have files" > "$work/said"
+[ "$(head -n 1 "$work/said")" = /root/clone/README.md ] && grep -q 'volume type: ' "$work/said" ||
+    { cat "$work/said" >&2; fail "the tool says nothing of README.md"; }
+say "README: I write a service"
+newcomer
+mkdir -p "$root/root/clone/build/packages"
+cp "$packages"/*.deb "$root/root/clone/build/packages"
+[ "$(typed "I write a service")" = blue ] || fail "README's first program has not set the attribute"
 say "all passed"
