@@ -79,6 +79,13 @@ class DryRunTest : public ::testing::TestWithParam<int> {
     // nothing has changed when it does.
     void ExpectForeseen(const Arguments& arguments, const std::string& lines, int status = 0,
                         const std::string& input = {}) {
+        const ToolResult said = ExpectSame(arguments, input);
+        EXPECT_EQ(lines, said.out);
+        EXPECT_EQ(status, said.status) << said.err;
+    }
+
+    // For what has no lines of its own for a test; returns the dry run's.
+    ToolResult ExpectSame(const Arguments& arguments, const std::string& input = {}) {
         SCOPED_TRACE(::testing::PrintToString(arguments));
         SetOldTimes(top());
         const Snapshot before = TakeSnapshot(top());
@@ -86,14 +93,13 @@ class DryRunTest : public ::testing::TestWithParam<int> {
         dry.insert(dry.begin() + 1, "--dry-run");
         const ToolResult said = Run(dry, input);
         EXPECT_THAT(Differences(before, TakeSnapshot(top())), IsEmpty());
-        EXPECT_EQ(lines, said.out);
-        EXPECT_EQ(status, said.status) << said.err;
         Arguments real = arguments;
         real.insert(real.begin() + 1, "--verbose");
         const ToolResult done = Run(real, input);
         EXPECT_EQ(done.out, said.out);
         EXPECT_EQ(done.err, said.err);
         EXPECT_EQ(done.status, said.status);
+        return said;
     }
 
  private:
@@ -169,6 +175,12 @@ TEST_P(DryRunTest, InfoIsSetAsForeseen) {
     ExpectForeseen(words, a + same + *this / "inner/c" + same, 1);
     ExpectForeseen({"set-info", a, "--type", "TEXT"}, a + ": nothing to change\n");
     ExpectForeseen({"set-info", *this / "inner", "--type", "TEXT"}, "", 2);
+    // A "._" file of a volume has no place for dates.
+    EXPECT_EQ(GetParam() == 0 ? 2 : 0, ExpectSame({"set-info", a, "--type", "ABCD", "--comment",
+                                                   "other", "--created", "2024-05-01T09:30:00Z"})
+                                           .status);
+    EXPECT_EQ(0,
+              ExpectSame({"set-info", a, "--tags", "", "--comment", "", "--label", "blue"}).status);
 }
 
 // ---- upgrade, repair ----------------------------------------------------------------------------
@@ -246,11 +258,7 @@ TEST_P(DryRunTest, DirectoriesInWhichSomethingStaysAreForeseenToStay) {
     WriteFile(inner + "/._gone", Ascii("of no object"));
     ExpectForeseen({"rm", *this / "inner", *this / "a"},
                    "removed '" + *this / "a'\n1 removed, 1 failed\n", 1);
-    const ToolResult said = Run({"rm", "-r", "--dry-run", inner});
-    const ToolResult done = Run({"rm", "-r", "--verbose", inner});
-    EXPECT_EQ(done.out, said.out);
-    EXPECT_EQ(done.err, said.err);
-    EXPECT_EQ(done.status, said.status);
+    ExpectSame({"rm", "-r", inner});
 }
 
 TEST_P(DryRunTest, NothingIsAsked) {
@@ -259,6 +267,106 @@ TEST_P(DryRunTest, NothingIsAsked) {
     EXPECT_THAT(said, Succeeded());
     EXPECT_EQ("removed '" + a + "'\n", said.out);
     EXPECT_TRUE(Exists(a));
+}
+
+// ---- import, restore ----------------------------------------------------------------------------
+
+Bytes MacFileOf(const std::string& colour) {
+    return StreamImage{.attributes = {{"user.colour", Ascii(colour)}}, .fork = {}}.Build();
+}
+
+TEST_P(DryRunTest, AnImportIsForeseen) {
+    const std::string a = *this / "a";
+    WriteFile(*this / "file", MacFileOf("blue"));
+    ExpectForeseen({"import", *this / "file", a}, a + ": 1 attribute\n");
+    EXPECT_EQ("user.colour\n", Run({"list", a}).out);
+    for (const MacFile& file : AllMacFiles()) {
+        SCOPED_TRACE(file.layout);
+        WriteFile(*this / "file", file.bytes);
+        ExpectSame({"import", *this / "file", a});
+        ExpectSame({"import", *this / "file", *this / "inner"});
+    }
+    ExpectForeseen({"import", a, a}, "", 2);
+    ExpectForeseen({"import", *this / "file", *this / "missing"}, "", 1);
+}
+
+TEST_P(DryRunTest, AnImportOfDataIsForeseen) {
+    const std::string a = *this / "a";
+    const std::string archive = *this / "archive";
+    ASSERT_EQ(0, Run({"export", "--format", "applesingle", a, archive}).status);
+    ExpectForeseen({"import", archive, *this / "new"}, *this / "new: data of 9 bytes\n");
+    ExpectForeseen({"import", archive, *this / "new"}, *this / "new: nothing to take over\n");
+    ExpectForeseen({"import", archive, *this / "b"}, "", 2);
+    ExpectForeseen({"import", "--data", archive, *this / "b"}, *this / "b: data of 9 bytes\n");
+    EXPECT_EQ(Ascii("data of a"), ReadFile(*this / "b"));
+}
+
+TEST_P(DryRunTest, AnImportOfATreeIsForeseenFileByFile) {
+    const std::string folder = *this / "__MACOSX";
+    MakeDir(folder);
+    MakeDir(folder + "/inner");
+    WriteFile(*this / "._a", MacFileOf("blue"));
+    WriteFile(folder + "/._b", MacFileOf("red"));
+    WriteFile(*this / "inner/._c", MacFileOf("green"));
+    WriteFile(folder + "/inner/._c", MacFileOf("grey"));
+    WriteFile(*this / "inner/._gone", MacFileOf("blue"));
+    WriteFile(*this / "inner/._inner", Ascii("no AppleDouble file"));
+    const ToolResult said = ExpectSame({"import", "-r", top()});
+    EXPECT_THAT(said.out, HasSubstr(folder + "/._b: imported\n"));
+    EXPECT_EQ(2, said.status);
+    EXPECT_EQ(GetParam() == 0, Exists(*this / "._a"));
+    EXPECT_FALSE(Exists(folder));
+    ExpectSame({"import", "-r", top()});
+}
+
+TEST_P(DryRunTest, ARestoreIsForeseenObjectByObject) {
+    const std::string text =
+        "# file: a\nuser.user.colour=\"blue\"\n\n# file: inner/c\n"
+        "user.user.colour=\"red\"\n\n# file: missing\nuser.user.colour=\"red\"\n\n";
+    ExpectForeseen({"restore", "--directory", top()},
+                   "'" + *this / "a'\n'" + *this / "inner/c'\n2 restored, 1 failed\n", 2, text);
+    EXPECT_EQ("user.colour\n", Run({"list", *this / "inner/c"}).out);
+    std::string saved;
+    for (const MacFile& file : AllMacFiles()) {
+        WriteFile(*this / "file", file.bytes);
+        Put("source");
+        EXPECT_NE(-1, Run({"import", *this / "file", *this / "source"}).status);
+        saved = Run({"save", *this / "source"}).out;
+        ASSERT_EQ(0, Run({"rm", *this / "source"}).status);
+        Put("source");
+        ExpectSame({"restore", "--directory", "/", "--absolute-names"}, saved);
+    }
+}
+
+// ---- export, salvage ----------------------------------------------------------------------------
+
+TEST_P(DryRunTest, AnExportIsForeseen) {
+    const std::string a = *this / "a";
+    const std::string file = *this / "new";
+    ASSERT_EQ(0, Run({"set", a, "user.colour", "blue"}).status);
+    ExpectForeseen({"export", a, file}, a + ": exported to " + file + "\n");
+    EXPECT_TRUE(Exists(file));
+    ExpectForeseen({"export", a, file}, "", 2);
+    ExpectForeseen({"export", "--force", a, file}, a + ": exported to " + file + "\n");
+    // It has no place for named attributes.
+    const std::string binary = *this / "binary";
+    ExpectForeseen({"export", "--format", "macbinary", a, binary},
+                   a + ": exported to " + binary + "\n", 2);
+    EXPECT_EQ("", Run({"export", "--dry-run", a, "-"}).out);
+}
+
+TEST_P(DryRunTest, ASalvageIsForeseenFileByFile) {
+    const std::string a = *this / "a";
+    const std::string directory = *this / "salvaged";
+    ExpectForeseen({"salvage", a, directory}, "", 1);
+    ASSERT_EQ(0, Run({"set", a, "user.colour", "blue"}).status);
+    ExpectForeseen({"salvage", a, directory}, a + ": \"user.colour\" into attribute.user.colour\n");
+    EXPECT_EQ(Ascii("blue"), ReadFile(directory + "/attribute.user.colour"));
+    ExpectForeseen({"salvage", a, directory}, "", 2);
+    if (GetParam() == kXattr || GetParam() == kSamba) return;
+    const Bytes whole = StreamOf("blue");
+    (GetParam() == 0 ? PutAppleDouble : PutStream)(a, Bytes(whole.begin(), whole.end() - 2));
+    EXPECT_EQ(2, ExpectSame({"salvage", a, *this / "second"}).status);
 }
 
 // ---- What is known before -----------------------------------------------------------------------

@@ -144,11 +144,15 @@ void AddTree(CLI::App* sub, Options* options) {
     AddPaths(sub, options, "PATH", "Files and directories");
 }
 
-// Of commands that change things.
-void AddDryRun(CLI::App* sub, Options* options) {
-    sub->add_flag("-v,--verbose", options->verbose, "Say what becomes of each object");
+// Of commands that change things, and have --verbose.
+void AddDryRunOnly(CLI::App* sub, Options* options) {
     sub->add_flag("-n,--dry-run", options->dry_run,
                   "Say that, as far as it is known before, and change nothing");
+}
+
+void AddDryRun(CLI::App* sub, Options* options) {
+    sub->add_flag("-v,--verbose", options->verbose, "Say what becomes of each object");
+    AddDryRunOnly(sub, options);
 }
 
 // For what several processes can do.
@@ -362,6 +366,7 @@ constexpr Syntax kCommands[] = {
          sub->add_flag("--keep-existing", options->keep_existing,
                        "Values that an object has are not replaced; a file with others stays")
              ->needs(tree);
+         AddDryRun(sub, options);
      }},
     {Command::kExport, "export", "Write an object's metadata into a file as Macs have them",
      [](CLI::App* sub, Options* options) {
@@ -371,6 +376,7 @@ constexpr Syntax kCommands[] = {
              ->type_name("FORMAT")
              ->default_val("appledouble");
          sub->add_flag("-f,--force", options->force, "Replace a FILE that is there");
+         AddDryRun(sub, options);
          AddPath(sub, options, "A file or directory");
          sub->add_option("FILE", options->archive, "A new file; \"-\": standard output")
              ->required();
@@ -400,6 +406,7 @@ constexpr Syntax kCommands[] = {
          sub->add_flag("--absolute-names", options->absolute_names,
                        "Follow paths that begin with a slash from the root");
          sub->add_flag("-v,--verbose", options->verbose, "Say what is done");
+         AddDryRunOnly(sub, options);
          sub->add_option("FILE", options->archive, "The text; \"-\": standard input")
              ->default_val("-");
      }},
@@ -510,6 +517,7 @@ constexpr Syntax kCommands[] = {
     {Command::kSalvage, "salvage",
      "Write what can still be read of an object's metadata into files of their own",
      [](CLI::App* sub, Options* options) {
+         AddDryRun(sub, options);
          AddPath(sub, options, "A file or directory");
          sub->add_option("DIR", options->destination, "A new directory")->required();
      }},

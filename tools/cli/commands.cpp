@@ -281,6 +281,7 @@ ExitStatus Run(const Options& options) {
                 return ImportTree({.directories = options.paths.arguments,
                                    .keep = options.keep,
                                    .keep_existing = options.keep_existing,
+                                   .verbose = verbose,
                                    .json = options.json});
             }
             return Import({.file = options.archive,
@@ -292,6 +293,7 @@ ExitStatus Run(const Options& options) {
                            .file = options.archive,
                            .format = options.format,
                            .force = options.force,
+                           .verbose = verbose,
                            .json = options.json});
         case Command::kSave:
             return Save({.paths = options.paths,
@@ -306,7 +308,7 @@ ExitStatus Run(const Options& options) {
                             .directory = options.directory,
                             .from_type = options.type,
                             .absolute_names = options.absolute_names,
-                            .verbose = options.verbose,
+                            .verbose = verbose,
                             .json = options.json});
         case Command::kCopy:
             return Copy(options.copy);
@@ -358,6 +360,7 @@ ExitStatus Run(const Options& options) {
         case Command::kSalvage:
             return Salvage({.path = options.paths.front(),
                             .directory = options.destination,
+                            .verbose = verbose,
                             .json = options.json});
         case Command::kDump:
             break;

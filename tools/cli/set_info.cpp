@@ -184,6 +184,7 @@ class InfoSetting {
         }
         std::vector<Missing> missing;
         if (ChangesEntries()) {
+            Rehearsed::Forget();  // of the places of a value not all are rehearsed
             EntryChange entries(object_);
             Fill(&entries);
             missing = entries.Write();

@@ -8,7 +8,9 @@
 #include <iostream>
 
 #include "tools/exchange/archiving.h"
+#include "tools/place/dry_run.h"
 #include "tools/say/output.h"
+#include "tools/say/text.h"
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
 
@@ -57,6 +59,7 @@ void WriteToOutput(const Archive& archive) {
         throw Failure(kFailed, "standard output", "a terminal cannot show this format",
                       "name a file, or lead the output into one");
     }
+    if (DryRun()) return;
     WriteArchive(archive, [](ByteView bytes) {
         std::cout.write(reinterpret_cast<const char*>(bytes.data()),
                         static_cast<std::streamsize>(bytes.size()));
@@ -100,6 +103,11 @@ void RequireSame(const Archive& wanted, const Archive& found, const File& file) 
 
 // Who may read the object may read it, as a copy.
 void WriteToFile(const Archive& archive, const Place& target, mode_t mode, bool force) {
+    if (DryRun()) {
+        const int error = WhyNoNewFile(*target.directory);
+        if (error != 0) throw SystemFailure(target.path(), error);
+        return;
+    }
     TemporaryFile temporary(target, mode & kReadAndWrite);
     const std::shared_ptr<const File>& file = temporary.shared_file();
     std::uint64_t end = 0;
@@ -151,6 +159,10 @@ ExitStatus Export(const ExportOptions& options) {
         WriteToOutput(archive);
     } else {
         WriteToFile(archive, *target, StatusOf(object.place).st_mode, options.force);
+    }
+    if (options.verbose && !options.json && !to_output) {
+        std::cout << Printable(object.path()) << ": exported to " << Printable(options.file)
+                  << '\n';
     }
     if (options.json) Print(ExportJson(options, object, archive, missing));
     if (missing.empty()) return kSuccess;

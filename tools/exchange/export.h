@@ -13,6 +13,7 @@ struct ExportOptions {
     std::string file;    // "-": standard output
     std::string format;  // "appledouble" and so on
     bool force = false;  // a file that is there is replaced
+    bool verbose = false;
     bool json = false;
 };
 

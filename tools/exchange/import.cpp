@@ -9,6 +9,7 @@
 
 #include "tools/exchange/archive.h"
 #include "tools/exchange/taking_over.h"
+#include "tools/place/dry_run.h"
 #include "tools/say/output.h"
 #include "tools/say/text.h"
 #include "tools/store/foreign/detection.h"
@@ -86,6 +87,11 @@ void MakeFile(const Object& object, const Archive& archive) {
         throw Failure(kFailed, object.path(), "metadata of an object that has gone is in its place",
                       "see what it is with: mavoea clean DIR");
     }
+    if (DryRun()) {
+        const int error = WhyNoNewFile(*object.place.directory);
+        if (error != 0) throw SystemFailure(object.path(), error);
+        return;
+    }
     constexpr mode_t kReadAndWrite = 0666;
     TemporaryFile temporary(object.place, kReadAndWrite);
     const std::shared_ptr<const File>& file = temporary.shared_file();
@@ -109,6 +115,7 @@ void ReplaceData(const Object& object, const Content& data) {
         throw Failure(kFailed, object.path(), "it has several names, and its data is another",
                       "remove it first");
     }
+    if (DryRun()) return;
     file->Reserve(0, data.size());
     Fill(file, data);
     file->Resize(data.size());
@@ -161,7 +168,7 @@ void PrintText(const std::string& path, const Archive& archive, DataDone done) {
 }
 
 Json ImportJson(const std::string& source, const std::string& path, const Archive& archive,
-                DataDone done, const TakingOver& import) {
+                DataDone done, const TakingOver* import) {
     const Metadata& metadata = archive.metadata;
     Json json;
     json.SetText("path", path);
@@ -179,8 +186,10 @@ Json ImportJson(const std::string& source, const std::string& path, const Archiv
     json.Set("attributes", std::move(attributes));
     json.Set("finderInfo", metadata.finder_info.has_value());
     json.Set("resourceFork", metadata.fork ? metadata.fork->value.size() : 0);
-    json.Set("notTakenOver", MissingJson(import.missing()));
-    SetMessages(json, "failures", import.failures());
+    json.Set("notTakenOver",
+             MissingJson(import == nullptr ? std::vector<Missing>() : import->missing()));
+    SetMessages(json, "failures",
+                import == nullptr ? std::vector<std::string>() : import->failures());
     return json;
 }
 
@@ -213,11 +222,20 @@ ExitStatus Import(const ImportOptions& options) {
         on_object.emplace(object);
     }
     const DataDone done = PutData(object, archive, options.replaces_data);
+    if (DryRun() && done == DataDone::kMade) {
+        // There is no object yet that could tell what it takes.
+        if (options.json) {
+            Print(ImportJson(options.file, object.path(), archive, done, nullptr));
+        } else {
+            PrintText(object.path(), archive, done);
+        }
+        return kSuccess;
+    }
     if (!on_object) on_object.emplace(object);
     TakingOver& import = *on_object;
     import.Run(archive.metadata);
     if (options.json) {
-        Print(ImportJson(options.file, object.path(), archive, done, import));
+        Print(ImportJson(options.file, object.path(), archive, done, &import));
     } else if (import.failures().empty()) {
         PrintText(object.path(), archive, done);
     }

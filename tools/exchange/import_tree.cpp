@@ -14,6 +14,7 @@
 #include "include/mavoea.h"
 #include "tools/exchange/taking_over.h"
 #include "tools/place/directory.h"
+#include "tools/place/dry_run.h"
 #include "tools/place/volume.h"
 #include "tools/say/text.h"
 #include "tools/store/adoption.h"
@@ -139,6 +140,7 @@ class Waiting {
 
  private:
     bool Sync() {
+        if (DryRun()) return true;
         try {
             for (const auto& [device, directory] : volumes_) directory->SyncVolume();
             return true;
@@ -366,6 +368,10 @@ class OntoObject {
                               " cannot be put together: " + Joined(missing),
                           kByItself);
         }
+        if (DryRun()) {
+            sources_.erase(sources_.begin(), sources_.end() - 1);
+            return;
+        }
         const Place place = {beside.directory, beside.name};
         TemporaryFile temporary(place);
         std::uint64_t end = 0;
@@ -475,6 +481,7 @@ class OntoObject {
         const Written written = writer.Write(object_, *Inode::Open(object_.place), fitting,
                                              {.durability = durability, .old = Old::kKept});
         missing.insert(missing.end(), written.missing.begin(), written.missing.end());
+        if (DryRun()) return missing;
         const auto differing = WhatIsMissing(fitting, ReadApart());
         missing.insert(missing.end(), differing.begin(), differing.end());
         return missing;
@@ -528,7 +535,8 @@ class TreeImport {
           report_({.doing = "importing",
                    .done = "imported",
                    .current = "where they belong",
-                   .nothing = nullptr}),
+                   .nothing = nullptr},
+                  TreeReport::EachOf(options.verbose, options.json)),
           waiting_(&report_) {}
 
     ExitStatus Run() {

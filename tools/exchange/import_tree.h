@@ -14,6 +14,7 @@ struct ImportTreeOptions {
     std::vector<std::string> directories;
     bool keep = false;           // the "._" files stay
     bool keep_existing = false;  // values that an object has stay
+    bool verbose = false;        // what became of each "._" file is told
     bool json = false;
 };
 

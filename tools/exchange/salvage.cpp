@@ -2,9 +2,13 @@
 
 #include <sys/stat.h>
 
+#include <algorithm>
+#include <cerrno>
+#include <iostream>
 #include <set>
 #include <vector>
 
+#include "tools/place/dry_run.h"
 #include "tools/place/volume.h"
 #include "tools/say/output.h"
 #include "tools/say/text.h"
@@ -44,7 +48,15 @@ struct Salvaged {
 
 class Rescue {
  public:
-    explicit Rescue(DirectoryRef directory) : directory_(std::move(directory)) {}
+    explicit Rescue(const Place& target) : target_(target) {
+        if (!DryRun()) {
+            directory_ = target.directory->MakeIn(target.name, S_IRWXU);
+        } else if (target.Status()) {
+            throw SystemFailure(target.path(), EEXIST);
+        } else if (const int error = WhyNoNewFile(*target.directory)) {
+            throw SystemFailure(target.path(), error);
+        }
+    }
 
     void Write(const Metadata& metadata) {
         for (const Metadata::Attribute& one : metadata.attributes) {
@@ -94,9 +106,17 @@ class Rescue {
         json_.Set("problems", std::move(problems));
         const std::string text = json_.Text() + '\n';
         WriteFile(kManifest, Content(Bytes(text.begin(), text.end())));
-        directory_->Sync();
+        if (directory_) directory_->Sync();
     }
 
+    std::string Text(const Object& object) const {
+        std::string text;
+        for (const Salvaged& one : all_) {
+            text +=
+                Printable(object.path()) + ": " + one.item + " into " + Printable(one.file) + '\n';
+        }
+        return text;
+    }
     const Json& json() const { return json_; }
     const std::vector<Missing>& missing() const { return missing_; }
 
@@ -112,7 +132,7 @@ class Rescue {
         try {
             WriteFile(file, readable);
         } catch (const Failure& failure) {
-            if (failure.subject() == directory_->PathOf(file)) throw;
+            if (failure.subject() == target_.path() + '/' + file) throw;
             missing_.push_back({item, failure.cause()});
             return;
         }
@@ -123,11 +143,22 @@ class Rescue {
     std::string FreeName(const std::string& wanted) {
         constexpr std::size_t kMost = 200;
         std::string name = wanted.substr(0, kMost);
-        if (name.size() == wanted.size() && !directory_->Has(name)) return name;
+        if (name.size() == wanted.size() && !Has(name)) return name;
         return name + '~' + std::to_string(all_.size() + missing_.size());
     }
 
+    bool Has(const std::string& name) const {
+        if (directory_) return directory_->Has(name);
+        return std::any_of(all_.begin(), all_.end(),
+                           [&](const Salvaged& one) { return one.file == name; });
+    }
+
     void WriteFile(const std::string& name, const Content& content) {
+        if (DryRun()) {
+            // What cannot be read is found by reading.
+            (void)FirstDifference(content, content);
+            return;
+        }
         TemporaryFile temporary({directory_, name});
         const std::shared_ptr<const File>& file = temporary.shared_file();
         WriteTo(*file, 0, content);
@@ -139,7 +170,8 @@ class Rescue {
         temporary.GiveToNewTarget();
     }
 
-    DirectoryRef directory_;
+    Place target_;
+    DirectoryRef directory_;  // null in a dry run
     std::vector<Salvaged> all_;
     std::vector<Missing> missing_;
     Json json_;
@@ -157,10 +189,11 @@ ExitStatus Salvage(const SalvageOptions& options) {
                       "mavoea where PATH has the files in which metadata may be");
     }
     const Place target = PlaceOf(options.directory, Shown::kWhole);
-    Rescue rescue(target.directory->MakeIn(target.name, S_IRWXU));
+    Rescue rescue(target);
     rescue.Write(metadata);
     rescue.WriteManifest(object, metadata);
-    target.directory->Sync();
+    if (!DryRun()) target.directory->Sync();
+    if (options.verbose && !options.json) std::cout << rescue.Text(object);
     if (options.json) Print(rescue.json());
     for (const Failure& problem : metadata.problems) Report(problem);
     if (rescue.missing().empty() && metadata.problems.empty()) return kSuccess;

@@ -11,6 +11,7 @@ namespace mavoea::tool {
 struct SalvageOptions {
     std::string path;
     std::string directory;  // which must not be there
+    bool verbose = false;
     bool json = false;
 };
 

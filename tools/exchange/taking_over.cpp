@@ -2,6 +2,7 @@
 
 #include <algorithm>
 
+#include "tools/place/dry_run.h"
 #include "tools/say/text.h"
 #include "tools/store/adoption.h"
 #include "tools/store/foreign/spelling.h"
@@ -144,7 +145,7 @@ void TakingOver::SetValues(const Metadata& metadata) {
     std::erase_if(
         values, [&](const Value& one) { return Has(former, one.name, *one.content) || !Set(one); });
     if (values.empty()) return;
-    const Metadata now = ReadMetadata(object_, Sidecars::Services::kLeaveOut);
+    const Metadata now = DryRun() ? metadata : ReadMetadata(object_, Sidecars::Services::kLeaveOut);
     for (const Value& one : values) {
         if (!Has(now, one.name, *one.content)) {
             Miss(NameOfAttribute(one.name), "what is there differs");
@@ -176,7 +177,10 @@ void TakingOver::AddRest(const Metadata& taken) {
         return std::find(rest.begin(), rest.end(), one.item) != rest.end();
     };
     try {
+        // Of the places of a value not all are rehearsed.
+        Rehearsed::Forget();
         Metadata wanted = ReadMetadata(object_, Sidecars::Services::kFind);
+        if (DryRun()) AddSet(taken, &wanted);
         if (!wanted.problems.empty()) throw Failure(wanted.problems.front());
         if (!Merge(taken, &wanted)) return;
         if (!wanted.strays.empty()) {
@@ -200,11 +204,31 @@ void TakingOver::AddRest(const Metadata& taken) {
         const Written written =
             writer.Write(object_, *Inode::Open(object_.place), fitting, {.old = Old::kKept});
         for (const Missing& one : written.missing) Miss(one.item, one.reason);
+        if (DryRun()) return;
         const Metadata found = ReadMetadata(object_, Sidecars::Services::kFind);
         for (const Missing& one : WhatIsMissing(fitting, found)) Miss(one.item, one.reason);
     } catch (const Failure& failure) {
         for (const std::string& item : rest) Miss(item, failure.cause());
     }
+}
+
+// What the object would have by now, if it is not in what was read.
+void TakingOver::AddSet(const Metadata& taken, Metadata* there) const {
+    const auto is_lost = [&](const std::string& name) {
+        return std::any_of(lost_.begin(), lost_.end(),
+                           [&](const Missing& one) { return one.item == NameOfAttribute(name); });
+    };
+    for (const Metadata::Attribute& attribute : taken.attributes) {
+        if (is_lost(attribute.name) || Has(*there, attribute.name, attribute.value)) continue;
+        std::erase_if(there->attributes,
+                      [&](const Metadata::Attribute& one) { return one.name == attribute.name; });
+        there->attributes.push_back({attribute.name, attribute.value, 0, {}});
+        there->whole_stream.reset();
+    }
+    if (taken.finder_info && !is_lost(std::string(kFinderInfoName))) {
+        there->finder_info = taken.finder_info;
+    }
+    if (taken.fork && !is_lost(std::string(kResourceForkName))) there->fork = taken.fork;
 }
 
 // False when all of it is there already.

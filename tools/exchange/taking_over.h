@@ -55,6 +55,7 @@ class TakingOver {
     void SetValues(const Metadata& metadata);
     bool Set(const Value& value);
     void AddRest(const Metadata& taken);
+    void AddSet(const Metadata& taken, Metadata* there) const;
     bool Merge(const Metadata& taken, Metadata* wanted) const;
     void RequireOwnService(const std::string& name) const;
 

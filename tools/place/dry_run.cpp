@@ -77,6 +77,8 @@ const std::optional<Bytes>* Rehearsed::Find(const Inode& inode, const std::strin
     return found == in_hand.attributes.end() ? nullptr : &found->second;
 }
 
+void Rehearsed::Forget() { in_hand = {}; }
+
 void Rehearsed::Note(const Inode& inode, const std::string& name, std::optional<Bytes> value) {
     if (!IsInHand(inode)) in_hand = {inode.info().st_dev, inode.info().st_ino, {}};
     in_hand.attributes.insert_or_assign(name, std::move(value));

@@ -28,6 +28,8 @@ class Rehearsed {
     // Null when the run is none, or would leave the attribute alone.
     static const std::optional<Bytes>* Find(const Inode& inode, const std::string& name);
     // Without a value it goes.
+    // From here on what is there is seen.
+    static void Forget();
     static void Note(const Inode& inode, const std::string& name, std::optional<Bytes> value);
 };
 

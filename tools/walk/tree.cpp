@@ -205,9 +205,7 @@ class Work {
     Work(const TreeOptions& options, const Task& task)
         : task_(task),
           report_({task.doing, task.done, task.current, task.nothing},
-                  !options.verbose ? TreeReport::Each::kNotTold
-                  : options.json   ? TreeReport::Each::kInJson
-                                   : TreeReport::Each::kTold) {}
+                  TreeReport::EachOf(options.verbose, options.json)) {}
 
     void Run(const TreeOptions& options) {
         VisitObjects(

@@ -31,6 +31,10 @@ class TreeReport {
     };
     // Whether each outcome is told, in the words of the summary: at once, or in the JSON.
     enum class Each { kNotTold, kTold, kInJson };
+    static Each EachOf(bool verbose, bool json) {
+        if (!verbose) return Each::kNotTold;
+        return json ? Each::kInJson : Each::kTold;
+    }
     explicit TreeReport(const Words& words, Each each = Each::kNotTold)
         : words_(words), progress_(words.doing), each_(each) {}
 
