@@ -338,6 +338,36 @@ TEST_P(DryRunTest, ARestoreIsForeseenObjectByObject) {
     }
 }
 
+// ---- carry --------------------------------------------------------------------------------------
+
+TEST_P(DryRunTest, WhatIsCarriedIsForeseenObjectByObject) {
+    const std::string from = *this / "inner";
+    const std::string to = *this / "copy";
+    MakeDir(from + "/deep");
+    for (const char* const name : {"/c", "/d", "/deep/e", "/missing", "/other"}) {
+        WriteFile(from + name, Ascii("data"));
+    }
+    MakeDir(to);
+    MakeDir(to + "/deep");
+    MakeDir(to + "/other");
+    for (const char* const name : {"/c", "/d", "/deep/e"}) WriteFile(to + name, Ascii("data"));
+    ASSERT_EQ(0, Run({"set", from + "/c", "user.colour", "blue"}).status);
+    ASSERT_EQ(0, Run({"set", to + "/c", "user.other", "red"}).status);
+    ASSERT_EQ(0, Run({"set", from + "/deep", "user.colour", "blue"}).status);
+    ASSERT_EQ(0, Run({"lock", from + "/deep/e"}).status);
+    const ToolResult said = ExpectSame({"carry", "-r", from, to});
+    EXPECT_THAT(said.out, HasSubstr("'" + from + "/c' -> '" + to + "/c'\n"));
+    EXPECT_THAT(said.out, HasSubstr("5 carried, 2 failed\n"));
+    EXPECT_EQ("user.colour\n", Run({"list", to + "/c"}).out);
+    for (const MacFile& file : AllMacFiles()) {
+        SCOPED_TRACE(file.layout);
+        WriteFile(*this / "file", file.bytes);
+        (void)Run({"import", *this / "file", from + "/d"});
+        ExpectSame({"carry", from + "/d", to + "/d"});
+        ExpectSame({"carry", from + "/d", to + "/d"});
+    }
+}
+
 // ---- export, salvage ----------------------------------------------------------------------------
 
 TEST_P(DryRunTest, AnExportIsForeseen) {

@@ -419,6 +419,7 @@ constexpr Syntax kCommands[] = {
      [](CLI::App* sub, Options* options) {
          AddRecursive(sub, options);
          sub->add_flag("-v,--verbose", options->verbose, "Say what is done");
+         AddDryRunOnly(sub, options);
          AddSource(sub, options)->required();
          sub->add_option("DST", options->destination, "The copy's own path")->required();
      }},

@@ -319,7 +319,7 @@ ExitStatus Run(const Options& options) {
         case Command::kCarry:
             return Carry({{.paths = options.paths.arguments,
                            .recursive = options.recursive,
-                           .verbose = options.verbose,
+                           .verbose = verbose,
                            .json = options.json},
                           options.destination});
         case Command::kUpgrade:

@@ -439,8 +439,9 @@ class InfoSetting {
 std::string ChangedText(const std::vector<std::string>& names) {
     if (names.empty()) return "nothing to change";
     std::string text;
-    for (const std::string& name : names)
+    for (const std::string& name : names) {
         text += (text.empty() ? "changed " : ", ") + Printable(name);
+    }
     return text;
 }
 

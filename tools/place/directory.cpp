@@ -564,10 +564,12 @@ void Inode::SetMode(mode_t mode) const {
 }
 
 bool Inode::TrySetOwner(uid_t owner, gid_t group) const {
+    if (DryRun()) return true;
     return ::fchownat(file_->fd(), "", owner, group, AT_EMPTY_PATH) == 0;
 }
 
 void Inode::SetTimes(const timespec (&times)[2]) const {
+    if (DryRun()) return;
     const int result = by_path_ ? ::utimensat(AT_FDCWD, ProcPath().c_str(), times, 0)
                                 : ::futimens(file_->fd(), times);
     if (result != 0 && errno != EPERM) throw SystemFailure(path(), errno);

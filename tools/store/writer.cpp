@@ -181,6 +181,15 @@ Place NeedFolders(DirectoryRef in, std::string path) {
     return {in, path};
 }
 
+// Whether it is there, in folders that need not be there.
+bool HasBelow(DirectoryRef in, std::string path) {
+    for (std::size_t slash; in && (slash = path.find('/')) != std::string::npos;) {
+        in = in->FindIn(path.substr(0, slash));
+        path.erase(0, slash + 1);
+    }
+    return in && in->Has(path);
+}
+
 // Into the EA directory of `to`; volumes of every kind can have one.
 void AddServices(const Object& to, const Metadata& metadata, NewFiles* files, Written* written) {
     for (const Metadata::ServiceFile& service : metadata.services) {
@@ -468,11 +477,12 @@ class AttributeWriter final : public Writer {
         const mode_t mode = inode.Status().st_mode & kPermissionBits;
         // The execute bit is what makes it reachable.
         const bool widen = (mode & S_IXUSR) == 0;
-        constexpr int kFlags = O_RDWR | O_TRUNC | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
-        int fd = ::open(path.c_str(), kFlags);
+        constexpr int kUsual = O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
+        const int flags = kUsual | (DryRun() ? O_PATH : O_RDWR | O_TRUNC);
+        int fd = ::open(path.c_str(), flags);
         if (fd < 0 && errno == EACCES && widen) {
             inode.SetMode(mode | S_IXUSR);
-            fd = ::open(path.c_str(), kFlags);
+            fd = ::open(path.c_str(), flags);
             const int error = errno;
             inode.SetMode(mode);
             errno = error;
@@ -484,6 +494,7 @@ class AttributeWriter final : public Writer {
             return;
         }
         const File file(fd, inode.path());
+        if (DryRun()) return;
         (void)WriteTo(file, 0, fork);
         file.Sync();
     }
@@ -537,7 +548,7 @@ Written Writer::Write(const Object& to, const Inode& inode, const Metadata& fitt
     } else {
         RequireOwnNames(to, old);
     }
-    if (DryRun()) return Foresee(to, fitting, old, parts);
+    if (DryRun()) return Foresee(to, inode, fitting, old, parts);
     NewFiles files(inode, options);
     AddServices(to, fitting, &files, &written);
     Sidecars beside;
@@ -568,8 +579,8 @@ Written Writer::Write(const Object& to, const Inode& inode, const Metadata& fitt
     return written;
 }
 
-Written Writer::Foresee(const Object& to, const Metadata& fitting, const Sidecars& old,
-                        const std::vector<Part>& parts) {
+Written Writer::Foresee(const Object& to, const Inode& inode, const Metadata& fitting,
+                        const Sidecars& old, const std::vector<Part>& parts) const {
     RequireUnlocked(old);
     Written written;
     for (const Metadata::ServiceFile& service : fitting.services) {
@@ -590,6 +601,7 @@ Written Writer::Foresee(const Object& to, const Metadata& fitting, const Sidecar
         }
         if (part.whole) written.whole.insert(part.whole->path());
     }
+    WriteToObject(inode, fitting, &written);
     return written;
 }
 
@@ -603,6 +615,7 @@ void RequirePlace(const Object& to) {
 bool CopyLeftOver(const LeftOver& file, const DirectoryRef& directory) {
     const std::string first = file.path.substr(0, file.path.find('/'));
     if (BelongsToAnObject(*directory, first)) return false;
+    if (DryRun()) return !HasBelow(directory->FindAgain(kEaDirName), file.path);
     const Place to = NeedFolders(NeedEaDirectory(*directory), file.path);
     const auto source = file.found.directory->FindFile(file.found.name, O_RDONLY);
     if (!source || to.directory->Has(to.name)) return false;

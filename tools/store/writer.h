@@ -76,8 +76,8 @@ class Writer {
 
  private:
     // What a dry run can say of it.
-    static Written Foresee(const Object& to, const Metadata& fitting, const Sidecars& old,
-                           const std::vector<Part>& parts);
+    Written Foresee(const Object& to, const Inode& inode, const Metadata& fitting,
+                    const Sidecars& old, const std::vector<Part>& parts) const;
 };
 
 // For volumes of a type; Failure for those that keep nothing.

@@ -4,10 +4,12 @@
 
 #include "include/mavoea.h"
 #include "platform/include/mavocore.h"
+#include "tools/place/dry_run.h"
 
 namespace mavoea::tool {
 
 void ReportNew(const std::string& path, mode_t mode) {
+    if (DryRun()) return;
     constexpr int kAdded = 1;
     constexpr int kDirectoryAdded = 3;
     (void)MAVOIndex(path.c_str(), nullptr, S_ISDIR(mode) ? kDirectoryAdded : kAdded);

@@ -131,9 +131,8 @@ void RemoveEaDirectory(const Directory& inside, const MayGo& may_go) {
 // But for the EA directory.
 void RequireNothingLeft(const Directory& inside, const Place& place) {
     for (const Directory::Entry& entry : inside.Entries()) {
-        if (entry.name == kEaDirName || (DryRun() && WouldHaveGone().Has(inside, entry.name)))
-            continue;
-        throw SystemFailure(place.path(), ENOTEMPTY);
+        const bool goes = entry.name == kEaDirName || WouldHaveGone().Has(inside, entry.name);
+        if (!goes) throw SystemFailure(place.path(), ENOTEMPTY);
     }
 }
 

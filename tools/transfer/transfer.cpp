@@ -11,6 +11,7 @@
 
 #include "format/netatalk_record.h"
 #include "platform/dos_attributes.h"
+#include "tools/place/dry_run.h"
 #include "tools/say/job.h"
 #include "tools/say/messages.h"
 #include "tools/say/text.h"
@@ -336,7 +337,8 @@ void AddWhatDidNotArrive(const Leg& leg, Arrival arrival, std::vector<Missing>* 
         std::erase_if(fitting.entries, [&](const auto& entry) { return damaged(entry.second); });
     }
     if (leg.wanted.HasAny() || leg.wanted.locked || leg.wanted.hidden) {
-        const Metadata found = ReadMetadata(leg.to, *leg.target, arrival.written.beside);
+        const Metadata found =
+            DryRun() ? fitting : ReadMetadata(leg.to, *leg.target, arrival.written.beside);
         for (const Missing& one : WhatIsMissing(fitting, found)) {
             if (!Names(*missing, one.item)) missing->push_back(one);
         }
@@ -852,6 +854,7 @@ void Transfer::ForgetMade() {
 }
 
 void Transfer::MakeDurable() {
+    if (DryRun()) return;
     for (const auto& [device, directory] : volumes_) directory->SyncVolume();
 }
 
