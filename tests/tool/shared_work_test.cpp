@@ -190,7 +190,6 @@ INSTANTIATE_TEST_SUITE_P(
     [](const auto& tested) {
         return "From" + std::to_string(tested.param.from) + "To" + std::to_string(tested.param.to);
     });
-});
 
 // ---- On one volume ------------------------------------------------------------------------------
 
