@@ -164,7 +164,7 @@ TEST_F(ResumedConversionTest, ALineThatWasCutShortDoesNotCount) {
     const std::string text = TextOf(Log());
     const std::string first = LinesOf(text).front();
     for (std::size_t size = text.size(); size > first.size();
-         size -= std::min(size, 13 * SeriesStep())) {
+         size -= std::min(size, 61 * SeriesStep())) {
         SCOPED_TRACE(size);
         WriteFile(Log(), Ascii(text.substr(0, size)));
         const ToolResult end = RunTool(Convert({"--resume", Log()}));

@@ -60,14 +60,14 @@ class SharedWorkTest : public ::testing::TestWithParam<Way> {
         for (int i = 0; i < size; ++i) Make("tree/large/" + std::to_string(i), std::to_string(i));
         std::string deep = "tree/deep";
         for (int i = 0; i < 20; ++i) Make((deep += "/d") + "/f", "deep");
-        for (int i = 0; i < 40; ++i) Make("tree/small" + std::to_string(i) + "/f", "small");
+        for (int i = 0; i < 15; ++i) Make("tree/small" + std::to_string(i) + "/f", "small");
         fs::create_directories(travel_.From("tree/empty/empty"));
     }
 
     // With several names of one file, names whose names of metadata are alike, links, what looks
     // like metadata, what nobody may write to.
     void MakeTree() const {
-        MakeUsualTree(150);
+        MakeUsualTree(80);
         const std::string odd = travel_.From("tree/odd");
         fs::create_directories(odd);
         for (const char* name : {"one", "two"}) {
@@ -206,7 +206,7 @@ class SharedTaskTest : public ::testing::Test {
     }
     void MakeMany(const std::function<void(const std::string&)>& give) const {
         for (int i = 0; i < 150; ++i) Make("tree/large/" + std::to_string(i), give);
-        for (int i = 0; i < 40; ++i) Make("tree/small" + std::to_string(i) + "/f", give);
+        for (int i = 0; i < 15; ++i) Make("tree/small" + std::to_string(i) + "/f", give);
         for (const char c : {'a', 'b'}) Make("tree/odd/" + std::string(243, 'n') + c, give);
     }
 
