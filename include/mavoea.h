@@ -177,8 +177,8 @@ MAVOEA_API int MAVOEAPathNoADFS(int form, const char* szPath, const char* szName
                                 int cbBuf);
 
 /* The AppleDouble file "<parent>/._<name>". A result longer than cbBuf - 1 bytes is cut short, as
- * snprintf does, and still returns 0; a name of more than 253 bytes gives 0xC300. errno is left
- * alone. */
+ * snprintf does, and still returns 0; a name of more than 253 bytes gives 0xC300, a cbBuf below 1
+ * 0xD00. errno is left alone, but for ENOMEM. */
 MAVOEA_API int MAVOEAADPath(const char* szPath, char* szBuf, int cbBuf);
 
 /* MAVOEAPathNoADFS() for EA_PLACE_EADIR, MAVOEAADPath() for EA_PLACE_APPLEDOUBLE (szName must not
@@ -206,6 +206,7 @@ MAVOEA_API int MAVOEAMKDir(int blParentFirst, const char* szEADirPath);
  * has a lease on the file, and for nobody else. What is missing is first looked for in earlier
  * layouts, by MAVOEAUpgrade(), but not in EA_FORM_FOLDER; its failures leave their codes. Where it
  * fails, with O_CREAT, nothing is made over what it may have left: -1, with its errno and codes.
+ * What is there is opened, with O_EXCL too; only EA_FORM_FOLDER refuses it (errno EEXIST).
  * Returns a descriptor, which the caller closes, or -1: a failed open(2) records no code and leaves
  * its errno, ELOOP for a link, EISDIR for a directory and ENXIO for anything else that is no
  * regular file; 0xD00 NULL argument (errno ENOENT) or unknown place; otherwise the codes of the
@@ -230,8 +231,8 @@ MAVOEA_API int MAVOEAIsHiddenDir(const char* szPath);
  * NULL. */
 MAVOEA_API int MAVOEAIsHiddenDirName(const char* szName);
 
-/* Appends the three hidden directory names to *ppList. 0, or -1 on NULL (0xD00) or when the list
- * takes no more (names appended before stay). */
+/* Appends the three hidden directory names to *ppList. 0, or -1 on NULL (0xD00) or, with no code,
+ * when the list takes no more (names appended before stay). */
 MAVOEA_API int MAVOEAHiddenDirGet(MLIBCSzList** ppList);
 
 /* 1 for hidden directory names, ".", ".." and names that begin with ".MAVOGALDB". */
@@ -240,7 +241,9 @@ MAVOEA_API int MAVOEAIsVetoFile(const char* szName);
 /* 1 for veto files, ".DS_Store" and names that begin with "._". */
 MAVOEA_API int MAVOEAIsHiddenFile(const char* szName);
 
-/* Tells the platform's search index of a change; returns what the index returns. */
+/* Tells the platform's search index of a change; returns what the index returns. op is the index's
+ * own: the library passes 4 for what has been renamed from szOldPath, and 7, with NULL for that,
+ * for what has been removed. */
 MAVOEA_API int MAVOIndex(const char* szPath, const char* szOldPath, int op);
 
 /* Sets the SMB archive bit of szPath. 0, or -1 with errno (no code). */
@@ -257,8 +260,10 @@ MAVOEA_API int EASetSmbArchive(const char* szPath);
  * descriptor of the same file drops the process's locks on it.
  *
  * Returns a handle for MAVOEASClose(), or NULL: 0xD00 fd below 0, or more than 13 entry
- * descriptors; 0x200 out of memory; 0x400 another process holds a conflicting lock; 0xA00 header or
- * table cannot be read, or the file ends before what its header declares. */
+ * descriptors; 0x200 out of memory; 0x400 another process holds a conflicting lock (errno EAGAIN or
+ * EACCES), fd is not open for what the lock needs (EBADF), or lockType is none of the three
+ * (EINVAL); 0xA00 header or table cannot be read, or the file ends before what its header declares.
+ */
 MAVOEA_API EASHandle* MAVOEASOpen(int fd, int lockType);
 
 /* Frees h and releases its lock; the descriptor stays open. -1 when the lock could not be released
@@ -270,8 +275,8 @@ MAVOEA_API int MAVOEASClose(EASHandle* h);
 MAVOEA_API int MAVOEASLockGet(EASHandle* h, struct flock64* lock);
 
 /* Changes the handle's lock without waiting. The file is not read again: who had no lock until then
- * writes over what others have changed since MAVOEASOpen(). 0xD00; 0x400 when another process is in
- * the way, the lock then stays as it was. */
+ * writes over what others have changed since MAVOEASOpen(). 0xD00; 0x400 with the causes and errno
+ * of MAVOEASOpen(), the lock then stays as it was. */
 MAVOEA_API int MAVOEASLockSet(EASHandle* h, int lockType);
 
 /* fsync(2). 0xD00, 0x2A00. */
@@ -291,8 +296,8 @@ MAVOEA_API int MAVOEASFlush(EASHandle* h);
  * such attribute. */
 MAVOEA_API int MAVOEASSearch(EASHandle* h, const char* name);
 
-/* Appends all attribute names to *ppList, in table order, and returns their number; -1: 0xD00, or
- * a name that could not be appended, which empties the list. */
+/* Appends all attribute names to *ppList, in table order, and returns their number; -1: 0xD00, or,
+ * with no code, a name that could not be appended, which empties the list. */
 MAVOEA_API int MAVOEASEnum(EASHandle* h, MLIBCSzList** ppList);
 
 /* Copies up to `size` bytes of the value, from `offset` on, into buf (never NULL) and returns their
@@ -314,7 +319,8 @@ MAVOEA_API int MAVOEASWrite(EASHandle* h, const char* name, const void* data, un
                             unsigned offset, int flags);
 
 /* Removes an attribute, cuts the file at the end of the resource fork and syncs it. -1: 0xD00;
- * 0x200; 0x300; 0x2000; 0xA00; 0xB00; 0x2A00. */
+ * 0x200; 0x300; 0x2000; 0xA00; 0xB00; 0x2A00. A failure to move the resource fork records none; the
+ * log has its cause. */
 MAVOEA_API int MAVOEASRemove(EASHandle* h, const char* name);
 
 /* Sets a value's length, filling with zeros where it grows, and syncs the file. The attribute
@@ -346,10 +352,12 @@ MAVOEA_API int MAVOEASUpdateEntry(EASHandle* h, unsigned index, unsigned char* b
  * offer it; an empty fork counts as absent. While a fork is used, a file without the owner-execute
  * bit gets it, as the superuser, and loses it again. Failures of the attribute calls themselves
  * record no code and leave errno; so do those of a fork that have none below, which are logged.
- * NULL and negative arguments: a log line and 0xD00. */
+ * Where the filesystem offers no forks, errno is ENOTDIR then. NULL and negative arguments: a log
+ * line and 0xD00. */
 
-/* Appends all attribute names to *ppList; empties it when there are none. 0, or -1: 0xD00; 0x2A00;
- * 0x100; or the list takes no more. */
+/* Appends all attribute names to *ppList; empties it, with result 0, when there are none and when
+ * the object is missing. -1: 0xD00; 0x2A00; 0x100; or, with no code, the list takes no more
+ * (names appended before stay). */
 MAVOEA_API int MAVOEAXattrEnum(const char* szPath, MLIBCSzList** ppList);
 
 /* Reads a value into szValue and returns its length; with cbValue 0 only the length. -1: 0xD00;
@@ -377,19 +385,22 @@ MAVOEA_API int MAVOEAXattrRemove(const char* szPath, const char* szName);
  * 1024, or an entry that is not acceptable (logged); 0xA00 magic or version (logged). */
 MAVOEA_API int MAVOEAAdoubleRead(const void* buf, int len, EAAdouble* ad);
 
-/* The record of path's object, from its attribute and from its resource file. 0; 1 there is none;
- * -1, logged: 0xD00 NULL; 0xA00 unreadable, of another size, damaged or, in the attribute,
- * incomplete; 0x900 the resource file could not be opened; the path functions' codes. */
+/* The record of path's object, from its attribute and from its resource file. 0; 1 there is none,
+ * as in a resource file of less than 741 bytes; -1: 0xD00 NULL; and, logged, 0xA00 unreadable or,
+ * in the attribute, of another size or incomplete; the code of MAVOEAAdoubleRead() for a damaged
+ * one, in the attribute with 0xA00 recorded after it; 0x900 the resource file could not be opened;
+ * the path functions' codes. */
 MAVOEA_API int MAVOEAFileEAAdoubleRead(const char* path, EAAdouble* ad);
 MAVOEA_API int MAVOEAEADirAdoubleRead(const char* path, EAAdouble* ad);
 
 /* Stores the len bytes at buf, 1024 at most, as the record of path's object. 0, or -1: 0xD00; 0x300
  * not permitted (attribute); 0xB00 not written; and, logged, 0x900 the resource file could not be
- * opened.
+ * opened; the path functions' codes for it.
  *
  * The resource file is created where it is missing (and removed again when nothing could be
- * written); of one that exists only the head changes. MAVOEAEADirAdoubleFlush() keeps the
- * descriptor that it opens, one a call: a caller that flushes many files must allow for that. */
+ * written); of one that exists only the head changes. Its EA directory is not made: 0x900 with
+ * errno ENOENT where that is missing. MAVOEAEADirAdoubleFlush() keeps the descriptor that it opens,
+ * one a call: a caller that flushes many files must allow for that. */
 MAVOEA_API int MAVOEAFileEAAdoubleFlush(const void* buf, int len, const char* path);
 MAVOEA_API int MAVOEAEADirAdoubleFlush(const void* buf, int len, const char* path);
 
@@ -404,8 +415,9 @@ MAVOEA_API int MAVOEAEADirAdoubleFlush(const void* buf, int len, const char* pat
 
 /* Finder info from the resource file (zeros when there is none) into the attribute, then the flush
  * time. The attribute's record is replaced by a fresh one: its comment, dates, AFP file info and
- * private entries are reset. 0, or -1: 0xD00 NULL; what opening the resource file, storing the
- * record and the flush time give. */
+ * private entries are reset. 0, or -1: 0xD00 NULL, but with checkFSType 1 that is on no volume of
+ * type 2 and gives 0; what opening the resource file, storing the record and the flush time give.
+ */
 MAVOEA_API int MAVOEAFileEAFSFinfoEASync(const char* path, int checkFSType);
 
 /* Writes Finder info into the resource file, in place, under its write lock; one that is missing is
@@ -458,15 +470,15 @@ MAVOEA_API int MAVOEAFixErrorAD(const char* path);
  * disk: what fails before leaves everything as it was. The process's working directory is neither
  * used nor changed, unless szPath is relative to it.
  *
- * 0 converted; 1 the current layout is there already; 2 there is nothing of that kind; -1: 0xD00 an
- * unknown kind or NULL; 0x900 the stream could not be made, or what may be there (a file of either
- * layout, the folder, the "._" file) could not be looked at; 0xA00 the folder could not be read to
- * its end; 0x2A00 none of its files could be looked at; 0x2800 rename; 0x3900 the legacy folder
- * could not be removed, all else is done; what the path and stream functions give. errno is that of
- * the call that failed. Codes are recorded for files that stay, too: 0x2A00 stat, 0x900 open, 0x100
- * memory, 0xA00 read, 0xD00 a name of 255 bytes; for the "._" file that objects with names of 254
- * and 255 bytes cannot have: 0xC300; and for marks: 0x900, 0xA00, 0x4000 no AppleDouble file, or
- * one without them. */
+ * 0 converted, of other kinds also when "/bin/mv" has failed; 1 the current layout is there
+ * already; 2 there is nothing of that kind; -1: 0xD00 an unknown kind or NULL; 0x900 the stream
+ * could not be made, or what may be there (a file of either layout, the folder, the "._" file)
+ * could not be looked at; 0xA00 the folder could not be read to its end; 0x2A00 none of its files
+ * could be looked at; 0x2800 rename; 0x3900 the legacy folder could not be removed, all else is
+ * done; what the path and stream functions give. errno is that of the call that failed. Codes are
+ * recorded for files that stay, too: 0x2A00 stat, 0x900 open, 0x100 memory, 0xA00 read, 0xD00 a
+ * name of 255 bytes; for the "._" file that objects with names of 254 and 255 bytes cannot have:
+ * 0xC300; and for marks: 0x900, 0xA00, 0x4000 no AppleDouble file, or one without them. */
 MAVOEA_API int MAVOEAUpgrade(const char* szPath, const char* szName);
 
 /* ---- Remove, rename and copy ----------------------------------------------------------------- */
@@ -494,10 +506,12 @@ MAVOEA_API int MAVOEARemoveWithoutEAStream(const char* szPath, int fsType);
 MAVOEA_API int EARemove(int form, const char* szPath);
 
 /* Removes the EA directory in or at szMetaPath (up to its first "@eaDir") if nothing but a regular
- * file ".cover" is left in it. 0 when it is gone, or was not there; -1 when it stays. No codes. */
+ * file ".cover" is left in it. 0 when it is gone, or was not there; -1 when it stays,
+ * and for NULL and a path without "@eaDir". No codes. */
 MAVOEA_API int EARemoveEADir(const char* szMetaPath);
 
-/* Removes the EA directory, with all that is in it, of a directory that holds nothing else. */
+/* Removes the EA directory, with all that is in it, of a directory that holds nothing else. NULL is
+ * none. No codes: a directory that cannot be opened is logged. */
 MAVOEA_API void MAVOEARemoveDanglingEADir(const char* szDir);
 
 /* Moves the metadata of an object that has been renamed from szOldPath to szNewPath, over what is
@@ -506,7 +520,7 @@ MAVOEA_API void MAVOEARemoveDanglingEADir(const char* szDir);
  * and 5: 0, whatever became of the "._" file and of the legacy folder, which follows it. Types 1,
  * 2, 3, 6, 7 and 10: the sum of three moves, each 0, -1 or the exit status of "/bin/mv" where it
  * takes that to reach another volume; the archive bit is set at szNewPath. Each move that fails
- * records a code, by "/bin/mv" two, or is logged. Other types do nothing. Negative: 0xD00 NULL;
+ * records a code, by "/bin/mv" two, or is logged. Other types do nothing: 0. Negative: 0xD00 NULL;
  * 0x2800 rename; the codes of paths, EA directories and the upgrade. */
 MAVOEA_API int MAVOEARename(const char* szOldPath, const char* szNewPath, int fsType,
                             EAIndexFlags* pFlags);
@@ -523,9 +537,10 @@ MAVOEA_API int MAVOEARename(const char* szOldPath, const char* szNewPath, int fs
  * updateIndex tell the two indexes, also of what failed.
  *
  * 0 when it is done, also when the destination's type takes no metadata and when only what follows
- * the copy failed, which is logged; -1 or less: -1 failed, -3 the name is too long for a "._" file,
- * -4 the source's type has no metadata, -32 and -33 a "._" name that clients do not take. What has
- * been done stays done. A failure may record no code, one or several; 0xD00 is NULL. */
+ * the copy failed, which is logged; -1 or less: -3 the name is too long for a "._" file, -4
+ * the source's type has no metadata, -32 and -33 a "._" name that clients do not take, -1, -2 and
+ * any other number failed. What has been done stays done. A failure may record no code, one or
+ * several; 0xD00 is NULL. */
 MAVOEA_API int MAVOEACopyEx(const char* szSrc, char* szDst, int move, int copyEADir, int srcFSType,
                             int dstFSType, int updateFileIndex, int updateIndex,
                             int (*copyFn)(const char* from, const char* to));

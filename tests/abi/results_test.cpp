@@ -188,6 +188,7 @@ TEST_F(ResultsTest, OfAttributesOfStreams) {
     close(fd);
 }
 
+// Promise: "Named attributes: Where the filesystem"
 TEST_F(ResultsTest, OfExtendedAttributes) {
     const std::string fork = "com.apple.ResourceFork";
     char value[8];
@@ -275,6 +276,31 @@ TEST_F(ResultsTest, OfEarlierLayouts) {
     EXPECT_EQ(Failed(0, 0xD00), OF(MAVOEAUpgrade(object, nullptr)));
     EXPECT_EQ(Failed(0, 0xD00), OF(MAVOEAUpgrade(object, "other")));
     EXPECT_EQ(2, MAVOEAUpgrade(object, MAVOEA_KIND_STREAM));
+}
+
+// Promise: "MAVOEACopyEx: -1 or less"
+TEST_F(ResultsTest, OfACopyThatTellsWhatItMet) {
+    const std::string file = dir_ / "@eaDir/object@MavoResource";
+    std::string to = dir_ / "copy";
+    const auto copy = [&] { return MAVOEACopy(object_.c_str(), to.data(), 0, 0, 1, 0, 0, 0); };
+    ASSERT_EQ(0, mkdir((dir_ / "@eaDir").c_str(), 0777));
+    ASSERT_EQ(0, symlink("elsewhere", file.c_str()));
+    EXPECT_EQ(-2, copy()) << "it cannot be opened";
+    ASSERT_EQ(0, unlink(file.c_str()));
+
+    Bytes head = {0x00, 0x05, 0x16, 0x07, 0x00, 0x01, 0x00, 0x00};  // AppleDouble, version 1
+    head.resize(82);
+    WriteFile(file, head);
+    EXPECT_EQ(-1, copy());
+    head[5] = 2;
+    head[25] = 3;  // entries, the first of which is the Finder info
+    head[29] = 9;
+    WriteFile(file, head);
+    EXPECT_EQ(-5, copy());
+    head.resize(10);
+    WriteFile(file, head);
+    EXPECT_EQ(-5, copy());
+    EXPECT_FALSE(Exists(dir_ / "._copy"));
 }
 
 TEST_F(ResultsTest, OfCarrying) {

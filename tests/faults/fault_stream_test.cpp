@@ -503,6 +503,8 @@ TEST(StreamWriteFaults, InALargeStreamOnlyWhatLiesBehindAValueMoves) {
 
 // Promise: "MAVOEASRemove: 0x200"
 // Promise: "MAVOEASRemove: 0xA00"
+// Promise: "MAVOEASRemove: A failure to move"
+// Promise: "MAVOEASRemove: the log has its cause"
 TEST(StreamRemoveFaults, AnAttributeIsRemovedOrTheFailureRecorded) {
     StreamImage image = ThreeAttributes(40'000);
     image.attributes[2].value = Pattern(300, 4);  // what stays outweighs header and table

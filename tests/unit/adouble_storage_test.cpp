@@ -77,7 +77,7 @@ TEST_F(StorageTest, AnObjectWithoutTheAttributeHasNoRecord) {
     EXPECT_EQ(1, MAVOEAFileEAAdoubleRead((dir_ / "missing").c_str(), &ad_));
 }
 
-// Promise: "MAVOEAFileEAAdoubleRead: -1, logged: 0xD00"
+// Promise: "MAVOEAFileEAAdoubleRead: -1: 0xD00 NULL"
 TEST_F(StorageTest, NullIsABadArgumentToTheReads) {
     EXPECT_EQ(-1, MAVOEAFileEAAdoubleRead(nullptr, &ad_));
     EXPECT_EQ(-1, MAVOEAFileEAAdoubleRead(object_.c_str(), nullptr));
@@ -87,9 +87,10 @@ TEST_F(StorageTest, NullIsABadArgumentToTheReads) {
                                            RecordOf(0xD00, "ea_fileafs_adouble_read"),
                                            RecordOf(0xD00, "ea_eadirfs_adouble_read"),
                                            RecordOf(0xD00, "ea_eadirfs_adouble_read")));
+    EXPECT_THAT(TakeLog(), IsEmpty());
 }
 
-// Promise: "MAVOEAFileEAAdoubleRead: 0xA00"
+// Promise: "MAVOEAFileEAAdoubleRead: and, logged, 0xA00"
 TEST_F(StorageTest, AnAttributeOfAnotherSizeIsRefused) {
     Bytes record = AttributeRecord();
     record.resize(401);
@@ -106,7 +107,7 @@ TEST_F(StorageTest, AnAttributeOfAnotherSizeIsRefused) {
                                        object_ + "] " + strerror(ERANGE)));
 }
 
-// Promise: "MAVOEAFileEAAdoubleRead: 0xA00"
+// Promise: "MAVOEAFileEAAdoubleRead: the code of MAVOEAAdoubleRead()"
 TEST_F(StorageTest, AnAttributeThatDoesNotParseIsRefused) {
     Bytes record = AttributeRecord();
     record[0] = 1;
@@ -119,7 +120,7 @@ TEST_F(StorageTest, AnAttributeThatDoesNotParseIsRefused) {
     EXPECT_EQ("ea_fileafs_adouble_read:LINE MAVOEAAdoubleRead failed", log[1]);
 }
 
-// Promise: "MAVOEAFileEAAdoubleRead: 0xA00"
+// Promise: "MAVOEAFileEAAdoubleRead: and, logged, 0xA00"
 // Promise: "Netatalk record: The attribute has all"
 TEST_F(StorageTest, AnAttributeHasItsEightEntries) {
     const Bytes whole = AttributeRecord();
@@ -144,7 +145,7 @@ TEST_F(StorageTest, AnAttributeHasItsEightEntries) {
     }
 }
 
-// Promise: "MAVOEAFileEAAdoubleRead: 0xA00"
+// Promise: "MAVOEAFileEAAdoubleRead: and, logged, 0xA00"
 TEST_F(StorageTest, AFailedReadOfTheAttributeIsLogged) {
     const FailCall fault("getxattr", EIO);
     EXPECT_EQ(-1, ReadFileEA());
@@ -226,6 +227,7 @@ TEST_F(StorageTest, AShorterOrMissingResourceFileHasNoRecord) {
     EXPECT_EQ(1, ReadEADir());
 }
 
+// Promise: "MAVOEAFileEAAdoubleRead: the code of MAVOEAAdoubleRead()"
 TEST_F(StorageTest, AResourceFileThatDoesNotParseIsRefusedWithTheParsersCode) {
     FillResourceFile(OneEntry(9, 2000, 32));
     EXPECT_EQ(-1, ReadEADir());
@@ -235,6 +237,7 @@ TEST_F(StorageTest, AResourceFileThatDoesNotParseIsRefusedWithTheParsersCode) {
     EXPECT_EQ("ea_eadirfs_adouble_read:LINE EAAdoubleRead failed", log[1]);
 }
 
+// Promise: "MAVOEAFileEAAdoubleRead: and, logged, 0xA00"
 // Promise: "MAVOEAFileEAAdoubleRead: 0x900"
 TEST_F(StorageTest, AResourceFileThatCannotBeOpenedOrReadIsLogged) {
     FillResourceFile(OneEntry(9, 100, 32));
@@ -253,6 +256,7 @@ TEST_F(StorageTest, AResourceFileThatCannotBeOpenedOrReadIsLogged) {
 }
 
 // Promise: "MAVOEAFileEAAdoubleRead: the path functions' codes"
+// Promise: "MAVOEAFileEAAdoubleFlush: the path functions' codes"
 TEST_F(StorageTest, APathThatIsTooLongIsLogged) {
     const std::string path = "/" + std::string(4090, 'p');
     const Bytes block(741);
@@ -297,10 +301,13 @@ TEST_F(StorageTest, EveryFlushKeepsTheDescriptorThatItOpened) {
 }
 
 // Promise: "MAVOEAFileEAAdoubleFlush: and, logged, 0x900"
+// Promise: "MAVOEAFileEAAdoubleFlush: Its EA directory is not made"
 TEST_F(StorageTest, AResourceFileThatCouldNotBeMadeOrOpenedIsLogged) {
     const Bytes block(741);
     // There is no EA directory to make it in.
     EXPECT_EQ(-1, MAVOEAEADirAdoubleFlush(block.data(), 741, object_.c_str()));
+    EXPECT_EQ(ENOENT, errno);
+    EXPECT_FALSE(Exists(dir_ / "@eaDir"));
     EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x900, "ea_eadirfs_flush")));
     EXPECT_THAT(TakeLog(), ElementsAre("ea_eadirfs_flush:LINE Error open path [" + object_ + "] " +
                                        strerror(ENOENT)));

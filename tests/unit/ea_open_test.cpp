@@ -191,6 +191,21 @@ TEST_P(EaOpenInEaDirTest, AFileThatExistsIsOpenedWithoutCreating) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAOpen: What is there is opened"
+// Promise: "MAVOEAOpen: only EA_FORM_FOLDER"
+TEST_P(EaOpenInEaDirTest, OnlyTheFolderFormCreatesExclusively) {
+    MakeEaDir();
+    WriteFile(stream_, Ascii("stream"));
+    const Fd fd(OpenStream(O_RDWR | O_CREAT | O_EXCL));
+    ASSERT_TRUE(fd.ok());
+    EXPECT_EQ("stream", fd.Read());
+
+    const Fd made(Open(0, object_.c_str(), "MAVO:x", O_RDWR | O_CREAT | O_EXCL));
+    ASSERT_TRUE(made.ok());
+    ExpectFailed(EEXIST, Open(0, object_.c_str(), "MAVO:x", O_RDWR | O_CREAT | O_EXCL));
+    ExpectNothingReported();
+}
+
 TEST_P(EaOpenInEaDirTest, AnEaDirectoryThatExistsKeepsItsMode) {
     ASSERT_EQ(0, ::mkdir(ea_dir_.c_str(), 0700));
     const Fd fd(OpenStream(O_RDWR | O_CREAT));
@@ -984,6 +999,15 @@ TEST_F(EaOpenAppleDoubleTest, WhoCannotBecomeTheSuperuserCreatesIt) {
         ExpectNothingReported();
     });
     EXPECT_TRUE(Exists(sidecar_));
+}
+
+// Promise: "MAVOEAOpen: What is there is opened"
+TEST_F(EaOpenAppleDoubleTest, AFileThatExistsIsOpenedWithExclusiveCreationToo) {
+    WriteFile(sidecar_, Ascii("sidecar"));
+    const Fd fd(Open(O_RDWR | O_CREAT | O_EXCL));
+    ASSERT_TRUE(fd.ok());
+    EXPECT_EQ("sidecar", fd.Read());
+    ExpectNothingReported();
 }
 
 TEST_F(EaOpenAppleDoubleTest, NullArgumentsFailWith0xD00AndEnoent) {

@@ -774,6 +774,8 @@ TEST_F(EaAdPathTest, EmptyPathAndRootGiveTheBarePrefix) {
     EXPECT_THAT(ADPath("//"), Gives("/._"));
 }
 
+// Promise: "MAVOEAADPath: a name of more than 253"
+// Promise: "MAVOEAADPath: errno is left alone"
 TEST_F(EaAdPathTest, MissingArgumentsAreRefusedAndErrnoIsLeftAlone) {
     EXPECT_THAT(
         Observe(kRoom, [](char* buffer, int size) { return MAVOEAADPath(nullptr, buffer, size); }),
@@ -838,6 +840,7 @@ TEST_F(EaAdPathTest, PathsUpTo4094BytesAllocateNothing) {
 }
 
 // Promise: "Paths: 0x200 out of memory"
+// Promise: "MAVOEAADPath: errno is left alone"
 TEST_F(EaAdPathTest, PathOver4094BytesNeedsMemory) {
     for (const std::size_t length : {std::size_t{4095}, std::size_t{4096}, std::size_t{9000}}) {
         SCOPED_TRACE(length);
@@ -846,8 +849,8 @@ TEST_F(EaAdPathTest, PathOver4094BytesNeedsMemory) {
         const std::string whole = path.substr(0, slash) + "/._" + path.substr(slash + 1);
         EXPECT_THAT(ADPath(path, kEndless), Gives(whole));
         EXPECT_THAT(ADPath(path, 100), Gives(whole.substr(0, 99)));
-        const FailCall fault("malloc", kErrnoBefore);
-        EXPECT_THAT(ADPath(path, kEndless), FailsWith(0x200, "ea_adpath", kErrnoBefore));
+        const FailCall fault("malloc", ENOMEM);
+        EXPECT_THAT(ADPath(path, kEndless), FailsWith(0x200, "ea_adpath", ENOMEM));
         EXPECT_TRUE(fault.fired());
     }
 }

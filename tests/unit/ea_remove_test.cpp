@@ -180,6 +180,7 @@ TEST_P(EaRemoveByTypeTest, TheIndexesAreToldWhereTheTypeIsKnownAndTheArchiveBitI
 }
 
 // Promise: "EAIndexFlags: a NULL pointer means both"
+// Promise: "MAVOIndex: op is"
 // Promise: "fileIndex"
 // Promise: "index"
 // Promise: "Remove, rename and copy: the platform's indexes"
@@ -1048,6 +1049,7 @@ TEST_F(EaRemoveTest, AnEaDirectoryThatIsMissingIsAsGoodAsRemoved) {
     ExpectNothingReported();
 }
 
+// Promise: "EARemoveEADir: -1 when"
 TEST_F(EaRemoveTest, APathWithoutAnEaDirectoryFailsAndTouchesNothing) {
     MakeDir(dir_ / "@EADIR");
     TakeCallNames();
@@ -1351,7 +1353,7 @@ class DanglingEaDirTest : public EaRemoveTest {
     const std::string holder_ = dir_ / "holder";
 };
 
-// Promise: "MAVOEARemoveDanglingEADir"
+// Promise: "MAVOEARemoveDanglingEADir: Removes"
 TEST_F(DanglingEaDirTest, AnEaDirectoryThatIsAloneIsRemovedWithEverythingInIt) {
     Fill();
     RemoveDangling();
@@ -1367,7 +1369,7 @@ TEST_F(DanglingEaDirTest, AnEmptyDirectoryIsLeftAlone) {
     EXPECT_TRUE(Exists(holder_));
 }
 
-// Promise: "MAVOEARemoveDanglingEADir"
+// Promise: "MAVOEARemoveDanglingEADir: Removes"
 TEST_F(DanglingEaDirTest, AnyOtherEntryKeepsTheEaDirectory) {
     for (const char* const name :
          {"file", ".hidden", "...", "@eaDir2", "@EADIR", "._x", ".cover"}) {
@@ -1460,6 +1462,7 @@ TEST_F(DanglingEaDirTest, WhateverTheProgramAnswersIsIgnored) {
     }
 }
 
+// Promise: "MAVOEARemoveDanglingEADir: NULL is none"
 TEST_F(DanglingEaDirTest, NullIsNoDirectory) {
     TakeCallNames();
     MAVOEARemoveDanglingEADir(nullptr);
@@ -1467,6 +1470,7 @@ TEST_F(DanglingEaDirTest, NullIsNoDirectory) {
     ExpectNothingDone();
 }
 
+// Promise: "MAVOEARemoveDanglingEADir: No codes"
 TEST_F(DanglingEaDirTest, ADirectoryThatCannotBeOpenedIsLogged) {
     MAVOEARemoveDanglingEADir((dir_ / "none").c_str());
     ExpectOnlyLogged("ea_remove_dangling_eadir:LINE failed to opendir [" + (dir_ / "none") +

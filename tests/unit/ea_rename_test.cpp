@@ -232,6 +232,7 @@ TEST_P(EaRenameByTypeTest, TheArchiveBitIsSetOnTheNewPathOfEaDirectoryVolumes) {
 }
 
 // Promise: "EAIndexFlags: a NULL pointer means both"
+// Promise: "MAVOIndex: op is"
 // Promise: "Remove, rename and copy: the platform's indexes"
 TEST_P(EaRenameByTypeTest, EachSettingOfTheOptionsTellsTheIndexesThatItSays) {
     for (const int file_index : {-1, 0, 1, 2}) {

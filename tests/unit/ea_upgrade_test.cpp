@@ -2107,6 +2107,7 @@ TEST_F(EaUpgradeReservedTest, WithoutAColonBothNamesAreTheSame) {
 }
 
 // The last colon of the whole path, whose directories may have some.
+// Promise: "MAVOEAUpgrade: 0 converted"
 TEST_F(EaUpgradeReservedTest, AColonOfTheObjectsPathIsReplacedWhereTheKindHasNone) {
     const std::string folder = dir_ / "b:c/@eaDir/d";
     std::filesystem::create_directories(folder);

@@ -120,7 +120,7 @@ class XattrEnumTest : public XattrTest {
 };
 using RealXattrEnumTest = RealXattrTest;
 
-// Promise: "MAVOEAXattrEnum: 0, or -1: 0xD00"
+// Promise: "MAVOEAXattrEnum: -1: 0xD00"
 TEST_F(XattrEnumTest, ANullPathIsLoggedAndRecorded) {
     List list({"before"});
     EXPECT_EQ(-1, MAVOEAXattrEnum(nullptr, list.out()));
@@ -128,7 +128,7 @@ TEST_F(XattrEnumTest, ANullPathIsLoggedAndRecorded) {
     EXPECT_THAT(list.strings(), ElementsAre("before"));
 }
 
-// Promise: "MAVOEAXattrEnum: 0, or -1: 0xD00"
+// Promise: "MAVOEAXattrEnum: -1: 0xD00"
 TEST_F(XattrEnumTest, ANullListPointerIsLoggedAndRecorded) {
     EXPECT_EQ(-1, MAVOEAXattrEnum(object_.c_str(), nullptr));
     ExpectCheckFailed("ea_xattr_enum", "((void *)0) != ppList");
@@ -221,6 +221,7 @@ TEST_F(XattrEnumTest, AFileWithoutAttributesEmptiesTheList) {
     ExpectNothingReported();
 }
 
+// Promise: "MAVOEAXattrEnum: empties it"
 TEST_F(XattrEnumTest, AMissingFileEmptiesTheListAndIsNoFailure) {
     List list({"one"});
     EXPECT_EQ(0, MAVOEAXattrEnum(missing_.c_str(), list.out()));
@@ -307,7 +308,7 @@ TEST_F(XattrEnumTest, EveryFailingCallIsRecordedOnceAndLeavesNothingBehind) {
     }
 }
 
-// Promise: "MAVOEAXattrEnum: or the list"
+// Promise: "MAVOEAXattrEnum: or, with no code"
 TEST_F(XattrEnumTest, AListThatTakesNoMoreEndsTheWalk) {
     using namespace std::string_literals;
     OfferNames("user.a\0user.b\0user.c\0"s);

@@ -553,6 +553,34 @@ TEST_F(EasHandleTest, ALockThatIsNotGrantedLeavesTheOldOne) {
     EXPECT_EQ(F_RDLCK, LockInTheWay(path_, F_WRLCK));
 }
 
+// Promise: "MAVOEASOpen: 0x400"
+// Promise: "MAVOEASLockSet: 0x400"
+TEST_F(EasHandleTest, ALockThatTheKernelDoesNotKnowOrTheDescriptorDoesNotAllowIsRefused) {
+    Fill(Image());
+    EXPECT_EQ(nullptr, Open(77));
+    EXPECT_EQ(EINVAL, errno);
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
+    const Handle handle = Open(F_WRLCK);
+    ASSERT_NE(nullptr, handle);
+    EXPECT_EQ(-1, MAVOEASLockSet(handle.get(), 77));
+    EXPECT_EQ(EINVAL, errno);
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
+    EXPECT_EQ(F_WRLCK, handle->lockType);
+
+    const int reads = open(path_.c_str(), O_RDONLY | O_CLOEXEC);
+    EXPECT_EQ(nullptr, MAVOEASOpen(reads, F_WRLCK));
+    EXPECT_EQ(EBADF, errno);
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
+    EASHandle* const reader = MAVOEASOpen(reads, F_RDLCK);
+    ASSERT_NE(nullptr, reader);
+    EXPECT_EQ(-1, MAVOEASLockSet(reader, F_WRLCK));
+    EXPECT_EQ(EBADF, errno);
+    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
+    EXPECT_EQ(F_RDLCK, reader->lockType);
+    EXPECT_EQ(0, MAVOEASClose(reader));
+    close(reads);
+}
+
 // Promise: "MAVOEASLockSet: The file is not read again"
 TEST_F(EasHandleTest, AWriteUnderALateLockLosesWhatAnotherHasWrittenBefore) {
     StreamImage image = Image();
