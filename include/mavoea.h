@@ -470,15 +470,16 @@ MAVOEA_API int MAVOEAFixErrorAD(const char* path);
  * disk: what fails before leaves everything as it was. The process's working directory is neither
  * used nor changed, unless szPath is relative to it.
  *
- * 0 converted, of other kinds also when "/bin/mv" has failed; 1 the current layout is there
+ * 0 converted, of other kinds also when "/bin/mv" has run and failed; 1 the current layout is there
  * already; 2 there is nothing of that kind; -1: 0xD00 an unknown kind or NULL; 0x900 the stream
  * could not be made, or what may be there (a file of either layout, the folder, the "._" file)
  * could not be looked at; 0xA00 the folder could not be read to its end; 0x2A00 none of its files
  * could be looked at; 0x2800 rename; 0x3900 the legacy folder could not be removed, all else is
- * done; what the path and stream functions give. errno is that of the call that failed. Codes are
- * recorded for files that stay, too: 0x2A00 stat, 0x900 open, 0x100 memory, 0xA00 read, 0xD00 a
- * name of 255 bytes; for the "._" file that objects with names of 254 and 255 bytes cannot have:
- * 0xC300; and for marks: 0x900, 0xA00, 0x4000 no AppleDouble file, or one without them. */
+ * done; no code where "/bin/mv" could not be run; what the path and stream functions give. errno is
+ * that of the call that failed. Codes are recorded for files that stay, too: 0x2A00 stat, 0x900
+ * open, 0x100 memory, 0xA00 read, 0xD00 a name of 255 bytes; for the "._" file that objects with
+ * names of 254 and 255 bytes cannot have: 0xC300; and for marks: 0x900, 0xA00, 0x4000 no
+ * AppleDouble file, or one without them. */
 MAVOEA_API int MAVOEAUpgrade(const char* szPath, const char* szName);
 
 /* ---- Remove, rename and copy ----------------------------------------------------------------- */

@@ -631,14 +631,6 @@ TEST_F(EasHandleTest, LocksWithoutAHandleOrDescriptorAreRefused) {
     handle->fd = fd_;
 }
 
-TEST_F(EasHandleTest, AnUnknownLockTypeIsALockFailure) {
-    const Handle handle = Open(F_RDLCK);
-    ASSERT_NE(nullptr, handle);
-    EXPECT_EQ(-1, MAVOEASLockSet(handle.get(), 77));
-    EXPECT_THAT(TakeRecords(), ElementsAre(RecordOf(0x400, "eas_lock_set")));
-    EXPECT_EQ(F_RDLCK, handle->lockType);
-}
-
 // Promise: "MAVOEASLockGet: Asks"
 TEST_F(EasHandleTest, TheKernelIsAskedAboutALock) {
     Fill(Image());
