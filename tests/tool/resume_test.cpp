@@ -324,6 +324,10 @@ TEST_F(ResumedConversionTest, ALogThatOthersMayHaveWrittenIsRefused) {
         EXPECT_EQ(expected.err, RunTool(Convert({"--resume", Log()})).err);
     }
     ASSERT_EQ(0, chmod(Log().c_str(), 0600));
+    const std::string other = travel_.dir() / "other";
+    fs::create_hard_link(Log(), other);
+    EXPECT_EQ(expected.err, RunTool(Convert({"--resume", Log()})).err);
+    fs::remove(other);
     EXPECT_EQ(0, RunTool(Convert({"--resume", Log()})).status);
     if (geteuid() != 0) return;
     ASSERT_EQ(0, chown(Log().c_str(), 4242, 4242));

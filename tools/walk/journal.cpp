@@ -12,6 +12,7 @@
 #include <cstdlib>
 #include <thread>
 
+#include "include/mavoea.h"
 #include "tools/say/messages.h"
 #include "tools/say/text.h"
 #include "util/fnv.h"
@@ -20,9 +21,13 @@ namespace mavoea::tool {
 namespace {
 
 // The first word of each line, behind its checksum.
-constexpr bool kLittle = std::endian::native == std::endian::little;
-// WORK REMARK, escaped. Results are as this machine has numbers.
-constexpr std::string_view kTitle = kLittle ? "mavoea-log-1-little" : "mavoea-log-1-big";
+// WORK REMARK, escaped. Results are as this version and this machine have them.
+const std::string& Title() {
+    static const std::string title =
+        "mavoea-log-" + std::to_string(MAVOEA_VERSION) +
+        (std::endian::native == std::endian::little ? "-little" : "-big");
+    return title;
+}
 constexpr std::string_view kRun = "run";    // BOOT: from here on, while the system of that id runs
 constexpr std::string_view kDone = "done";  // RESULT KEY: in digits, and escaped
 constexpr std::string_view kDisk = "disk";  // OFFSET: the lines before that are on disk
@@ -112,15 +117,15 @@ Journal::Journal(const LogFile& file, const std::string& work, const std::string
 
 void Journal::Begin(const std::string& work, const std::string& remark) {
     remark_ = remark;
-    Write(Line(kTitle, AsWord(work) + ' ' + AsWord(remark)));
+    Write(Line(Title(), AsWord(work) + ' ' + AsWord(remark)));
 }
 
 void Journal::Resume(const std::string& work) {
     const struct stat info = file_->Status();
     if (!S_ISREG(info.st_mode)) throw NoLog(file_->path());
-    // Whoever wrote it decides what is left out.
+    // Whoever wrote it decides what is left out; and no other file is written to.
     constexpr mode_t kOthers = S_IWGRP | S_IWOTH;
-    if (info.st_uid != ::geteuid() || (info.st_mode & kOthers) != 0) {
+    if (info.st_uid != ::geteuid() || (info.st_mode & kOthers) != 0 || info.st_nlink != 1) {
         throw Failure(kFailed, file_->path(), "others may have written to it",
                       "go on with a log that is this user's own");
     }
@@ -152,7 +157,7 @@ void Journal::Read(const std::string& work) {
         if (!has_title) {
             const auto whose = FromPrintable(TakeWord(&*text));
             const auto remark = FromPrintable(TakeWord(&*text));
-            if (word != kTitle || !whose || !remark) throw NoLog(file_->path());
+            if (word != Title() || !whose || !remark) throw NoLog(file_->path());
             if (*whose != work) {
                 throw Failure(kFailed, file_->path(), "it is the log of other work: " + *whose,
                               "give the command as it was, or begin a new log");

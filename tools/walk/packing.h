@@ -8,6 +8,8 @@
 #include <string_view>
 #include <type_traits>
 
+#include "tools/say/messages.h"
+
 namespace mavoea::tool {
 
 // Of what is nothing but its bytes.
@@ -30,7 +32,7 @@ class Packer {
     std::string bytes_;
 };
 
-// Takes off what a Packer has put there, in the same order.
+// Takes off what a Packer has put there, in the same order. Throws Failure where there is less.
 class Unpacker {
  public:
     explicit Unpacker(std::string_view bytes) : bytes_(bytes) {}
@@ -38,6 +40,7 @@ class Unpacker {
     template <class Value>
     Value Take() {
         static_assert(std::is_trivially_copyable_v<Value>);
+        Require(sizeof(Value));
         Value value;
         std::memcpy(&value, bytes_.data(), sizeof value);
         bytes_.remove_prefix(sizeof value);
@@ -46,6 +49,7 @@ class Unpacker {
     std::uint64_t TakeNumber() { return Take<std::uint64_t>(); }
     std::string_view TakeText() {
         const auto size = static_cast<std::size_t>(TakeNumber());
+        Require(size);
         const std::string_view text = bytes_.substr(0, size);
         bytes_.remove_prefix(size);
         return text;
@@ -53,6 +57,12 @@ class Unpacker {
     bool empty() const { return bytes_.empty(); }
 
  private:
+    void Require(std::size_t size) const {
+        if (bytes_.size() >= size) return;
+        throw Failure(kFailed, "what another process told", "it is cut short",
+                      "give the command again");
+    }
+
     std::string_view bytes_;
 };
 
