@@ -96,6 +96,15 @@ TEST_P(AttributesTest, ControlCharactersInANameCannotForgeALine) {
     EXPECT_EQ("user.a\nuser.b\\\x1B[2J", json["attributes"][0]["name"]);
 }
 
+// U+009B is what ESC and '[' are; U+00A0 and U+00DB are letters.
+TEST_P(AttributesTest, ControlCharactersOfTwoBytesAreShownAsSuch) {
+    const std::string letters = "\xC2\xA0\xC3\x9B";
+    const std::string shown = "user.\\xC2\\x9B" + letters;
+    ASSERT_THAT(volume_->Set("user.\xC2\x9B" + letters, Ascii("x")), Succeeded());
+    EXPECT_EQ(shown + '\n', volume_->List().out);
+    EXPECT_EQ("x", volume_->Run({"get", "--escaped", volume_->object(), shown}).out);
+}
+
 TEST_P(AttributesTest, ARemovedAttributeIsGoneAndTheOthersStay) {
     ASSERT_THAT(volume_->Set("user.a", Ascii("1")), Succeeded());
     ASSERT_THAT(volume_->Set("user.b", Ascii("22")), Succeeded());

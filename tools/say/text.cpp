@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <utility>
 
 namespace mavoea::tool {
 namespace {
@@ -104,14 +105,19 @@ std::string HexDump(ByteView bytes) {
 
 std::string Printable(std::string_view text) {
     std::string safe;
-    for (const char c : text) {
-        const auto byte = static_cast<std::uint8_t>(c);
-        if (c == '\\') {
+    bool in_control = false;
+    for (std::size_t i = 0; i < text.size(); ++i) {
+        const auto byte = static_cast<std::uint8_t>(text[i]);
+        const bool ends_control = std::exchange(in_control, false);
+        // U+0080 to U+009F, some of which begin what terminals do.
+        in_control = byte == 0xC2 && i + 1 < text.size() &&
+                     (static_cast<std::uint8_t>(text[i + 1]) & 0xE0U) == 0x80;
+        if (byte == '\\') {
             safe += "\\\\";
-        } else if (byte < 0x20 || byte == 0x7F) {
+        } else if (byte < 0x20 || byte == 0x7F || in_control || ends_control) {
             safe += "\\x" + HexNumber(byte, 2).substr(2);
         } else {
-            safe += c;
+            safe += text[i];
         }
     }
     return safe;
