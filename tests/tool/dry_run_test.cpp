@@ -106,7 +106,8 @@ class DryRunTest : public ::testing::TestWithParam<int> {
     TempDir dir_;
 };
 
-INSTANTIATE_TEST_SUITE_P(VolumeTypes, DryRunTest, ::testing::Values(0, 1, kFileEa, kXattr, kSamba),
+INSTANTIATE_TEST_SUITE_P(VolumeTypes, DryRunTest,
+                         ::testing::ValuesIn(Types({0, 1, kFileEa, kXattr, kSamba})),
                          [](const auto& tested) { return NameOfType(tested.param); });
 
 // ---- lock, unlock -------------------------------------------------------------------------------
