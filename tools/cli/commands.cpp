@@ -339,10 +339,11 @@ ExitStatus Run(const Options& options) {
                                    .repair = options.repair,
                                    .remove = options.yes});
         case Command::kConvert:
-            if (options.plan)
+            if (options.plan) {
                 return ConvertAsPlanned(
                     *options.plan,
                     {.json = options.json, .crew = CrewOf(options), .log = options.log});
+            }
             return Convert(ConversionOf(options));
         case Command::kPlan:
             return PlanConversion({.conversion = ConversionOf(options),
