@@ -12,10 +12,10 @@
 #include <new>
 #include <utility>
 
-#include "include/mavoea.h"
 #include "tools/place/volume.h"
 #include "tools/say/progress.h"
 #include "tools/store/sidecars.h"
+#include "tools/walk/tree.h"
 
 namespace mavoea::tool {
 
@@ -89,9 +89,7 @@ std::uint64_t Counting::Count() const {
         try {
             const DirectoryRef inside = outer.place.directory->OpenIn(outer.place.name);
             for (const Directory::Entry& entry : ObjectsIn(inside)) {
-                const bool visited =
-                    !S_ISLNK(entry.type) && MAVOEAIsHiddenDirName(entry.name.c_str()) == 0;
-                if (kind_ == Kind::kVisited && !visited) continue;
+                if (kind_ == Kind::kVisited && !IsVisited(entry)) continue;
                 add({inside, entry.name}, entry.type, outer.hash.Below(entry.name));
             }
         } catch (const Failure&) {  // the work will say so

@@ -163,7 +163,7 @@ class Walk {
         }
         const std::size_t first = pending_.size();
         for (const Directory::Entry& entry : ObjectsIn(directory)) {
-            if (S_ISLNK(entry.type) || MAVOEAIsHiddenDirName(entry.name.c_str()) != 0) continue;
+            if (!IsVisited(entry)) continue;
             const Inner inner = {{directory, entry.name}, outer.hash.Below(entry.name)};
             if (!S_ISDIR(entry.type) && !shard_.Has(inner.hash)) continue;
             Guard(inner, [&] {
@@ -287,6 +287,10 @@ class Work {
 };
 
 }  // namespace
+
+bool IsVisited(const Directory::Entry& entry) {
+    return !S_ISLNK(entry.type) && MAVOEAIsHiddenDirName(entry.name.c_str()) == 0;
+}
 
 bool HasGone(const Place& place, const Failure& failure) {
     return failure.status() == kNotFound && !place.directory->Has(place.name);

@@ -69,6 +69,9 @@ struct Visit {
 // `doing` names the work in its log, if it has one.
 void VisitObjects(const TreeOptions& options, const Visit& visit, const std::string& doing = {});
 
+// Whether what a directory has is an object of a visit.
+bool IsVisited(const Directory::Entry& entry);
+
 // Whether it failed because the object has gone since its directory was listed, with which nothing
 // is wrong.
 bool HasGone(const Place& place, const Failure& failure);
