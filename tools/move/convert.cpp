@@ -23,6 +23,7 @@
 #include "tools/walk/counting.h"
 #include "tools/walk/journal.h"
 #include "tools/walk/packing.h"
+#include "tools/walk/worker.h"
 #include "util/fnv.h"
 
 namespace mavoea::tool {
@@ -153,7 +154,9 @@ class Conversion final : private TreeCopy {
 
     void Finish(const Level& level) override {
         crew_.Afterwards([this, level] {
-            const std::string key = journal_ ? KeyOf(level) : std::string();
+            const std::string key = KeyOf({.kind = Errand::Kind::kDirectory,
+                                           .object = {level.from},
+                                           .state = StateOf(level.info)});
             const bool touched = touched_.erase(level.made.get()) > 0 || level.is_new;
             if (!touched) {
                 if (const auto former = crew_.FormerResult(key)) return Hear(*former);
@@ -168,12 +171,6 @@ class Conversion final : private TreeCopy {
             if (done) crew_.NoteDone(key, told);
             Hear(told);
         });
-    }
-
-    // As what a directory that is finished stands in the journal.
-    static std::string KeyOf(const Level& level) {
-        if (!level.from.directory->HasLocation(level.from.name)) return {};
-        return "finished " + std::to_string(StateOf(level.info)) + ' ' + level.from.location();
     }
 
     // Another one when the object is not what it was.
