@@ -47,6 +47,7 @@ enum Long : int {
     kContext,
     kAtomic,
     kAllowLoss,
+    kDryRun,
     kInteractive,
     kOneFileSystem,
     kPreserveRoot,
@@ -123,6 +124,8 @@ constexpr Syntax kSyntax[] = {
      "Replace what is there in one step when its copy is whole, and never write to it"},
     {kCp | kMv, kAllowLoss, "allow-loss", no_argument, nullptr,
      "What cannot be kept at the destination is named, and may be lost"},
+    {kCp | kMv, kDryRun, "dry-run", no_argument, nullptr,
+     "Say what would be done, as far as it is known before, ask nothing, and change nothing"},
     {kRm, 'd', "dir", no_argument, nullptr, "Empty directories, too"},
     {kRm, 'r', "recursive", no_argument, nullptr, "Directories with all that is in them"},
     {kRm, 'R', nullptr, no_argument, nullptr, nullptr},
@@ -462,6 +465,9 @@ class Line {
                 break;
             case kAllowLoss:
                 copy.allow_loss = true;
+                break;
+            case kDryRun:
+                options_.dry_run = copy.job.verbose = true;
                 break;
             default:
                 break;

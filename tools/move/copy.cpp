@@ -15,6 +15,7 @@
 #include "tools/move/parents.h"
 #include "tools/move/same_file.h"
 #include "tools/move/unfinished.h"
+#include "tools/place/dry_run.h"
 #include "tools/place/paths.h"
 #include "tools/place/volume.h"
 #include "tools/say/interrupt.h"
@@ -303,6 +304,8 @@ class Placement final : private TreeCopy {
 
     void Finish(const Level& level) override {
         transfer_.FinishDirectory(level.from, *level.inside, level.to, level.made, level.is_new);
+        // Of several sources another one may come into it.
+        if (DryRun() && !job_options_.several()) Foreseen::Forget(*level.made);
         CountDone();
     }
 
@@ -398,7 +401,7 @@ class Placement final : private TreeCopy {
             case Overwrite::kUsual:
                 if (Copies() || ::isatty(STDIN_FILENO) != 1 || target.place.Writable()) return true;
         }
-        return job_.Ask(QuestionAbout(target)) && !job_.stopped();
+        return DryRun() || (job_.Ask(QuestionAbout(target)) && !job_.stopped());
     }
 
     std::string QuestionAbout(const Target& target) const {

@@ -6,6 +6,7 @@
 #include <cerrno>
 #include <filesystem>
 
+#include "tools/place/dry_run.h"
 #include "tools/place/volume.h"
 #include "tools/say/job.h"
 #include "tools/say/messages.h"
@@ -70,7 +71,11 @@ void OpenStream(Source* source) {
     const Place& place = source->place;
     // Whoever feeds a FIFO is waited for. A link has been found worth following, and nothing else
     // is read that may have come since.
-    const int flags = O_RDONLY | O_CLOEXEC | O_NOCTTY | (source->followed() ? 0 : O_NOFOLLOW);
+    const int usual = O_CLOEXEC | O_NOCTTY | (source->followed() ? 0 : O_NOFOLLOW);
+    if (DryRun() && ::faccessat(place.directory->fd(), place.name.c_str(), R_OK, AT_EACCESS) != 0) {
+        throw Refusal("cannot open " + Quoted(place.path()) + " for reading", errno);
+    }
+    const int flags = usual | (DryRun() ? O_PATH : O_RDONLY);
     auto file = std::make_unique<File>(::openat(place.directory->fd(), place.name.c_str(), flags),
                                        place.path());
     if (file->fd() < 0) {
@@ -82,6 +87,11 @@ void OpenStream(Source* source) {
 
 Target FindTarget(const Place& to, bool follows, bool loops_go) {
     Target target = {to, to};
+    // What this has made is not followed.
+    if (to.directory->foreseen() || Foreseen::Find(*to.directory, to.name) != nullptr) {
+        target.own = target.info = to.Status();
+        return target;
+    }
     struct stat info;
     const int fd = to.directory->fd();
     if (::fstatat(fd, to.name.c_str(), &info, AT_SYMLINK_NOFOLLOW) != 0) {
@@ -110,7 +120,20 @@ Target FindTarget(const Place& to, bool follows, bool loops_go) {
     return target;
 }
 
+namespace {
+
+// In the place of one that would be open for writing.
+std::unique_ptr<const File> OpenedInDryRun(const Place& place) {
+    if (const int error = WhyNoWriting(place)) {
+        throw Refusal("cannot create regular file " + Quoted(place.path()), error);
+    }
+    return std::make_unique<const File>(-1, place.path());
+}
+
+}  // namespace
+
 std::unique_ptr<const File> OpenTarget(const Target& target) {
+    if (DryRun()) return OpenedInDryRun(target.place);
     constexpr int kFlags = O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
     const Place& place = target.place;
     const auto open = [&](int flags) {
@@ -127,6 +150,7 @@ std::unique_ptr<const File> OpenTarget(const Target& target) {
 
 std::unique_ptr<const File> OpenSpecialTarget(const Target& target) {
     const Place& place = target.named;
+    if (DryRun()) return OpenedInDryRun(place);
     const int flags = O_WRONLY | O_NOCTTY | O_CLOEXEC | (target.is_link() ? 0 : O_NOFOLLOW);
     auto file = std::make_unique<File>(::openat(place.directory->fd(), place.name.c_str(), flags),
                                        place.path());
@@ -142,7 +166,7 @@ bool SamePlace(const Place& one, const Place& other) {
 
 bool IsInside(const Place& place, const struct stat& directory) {
     if (const auto info = place.Status(); info && SameFile(*info, directory)) return true;
-    int fd = ::fcntl(place.directory->fd(), F_DUPFD_CLOEXEC, 0);
+    int fd = ::fcntl(place.directory->OnDisk().fd(), F_DUPFD_CLOEXEC, 0);
     for (;;) {
         const File at(fd, place.path());
         if (fd < 0) throw SystemFailure(place.path(), errno);

@@ -6,6 +6,7 @@
 #include <cerrno>
 #include <vector>
 
+#include "tools/place/dry_run.h"
 #include "tools/place/volume.h"
 #include "tools/say/messages.h"
 #include "tools/say/text.h"
@@ -49,7 +50,7 @@ std::string TextIn(const File& file) {
 }  // namespace
 
 UnfinishedMove::UnfinishedMove(const Place& to, const struct stat& source) : to_(to) {
-    if (Find(to, source)) return;
+    if (DryRun() || Find(to, source)) return;
     Forget();  // another move, which has no more to say
     TemporaryFile file(FileFor(to));
     file.file().Write(0, AsBytes(TextFor(source)));
@@ -57,6 +58,7 @@ UnfinishedMove::UnfinishedMove(const Place& to, const struct stat& source) : to_
 }
 
 void UnfinishedMove::BeginRemoval() const {
+    if (DryRun()) return;
     const Place place = FileFor(to_);
     const auto file = place.directory->FindFile(place.name, O_RDWR);
     if (!file) throw SystemFailure(place.path(), ENOENT);
@@ -64,7 +66,9 @@ void UnfinishedMove::BeginRemoval() const {
     if (!text.ends_with(kRemoving)) file->Write(text.size(), AsBytes(kRemoving));
 }
 
-void UnfinishedMove::Forget(const Place& to) { (void)to.directory->RemoveFile(FileFor(to).name); }
+void UnfinishedMove::Forget(const Place& to) {
+    if (!DryRun()) (void)to.directory->RemoveFile(FileFor(to).name);
+}
 
 bool UnfinishedMove::Find(const Place& to, const struct stat& source) {
     const auto file = FindOwn(to);

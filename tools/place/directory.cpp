@@ -107,7 +107,23 @@ std::shared_ptr<Directory::Names> Directory::NamesOf(const std::string& name,
 
 DirectoryRef Directory::FindIn(const std::string& name) const { return FindIn(name, {}); }
 
+// One that is not there, or would have another place.
+DirectoryRef Directory::Foresee(const std::string& name, const std::string& shown,
+                                const struct stat& info) const {
+    const std::shared_ptr<Directory> foreseen(new Directory(-1, NamesOf(name, shown)));
+    foreseen->on_disk_ = OnDisk().shared_from_this();
+    foreseen->foreseen_info_ = info;
+    return foreseen;
+}
+
 DirectoryRef Directory::FindIn(const std::string& name, const std::string& shown) const {
+    if (const auto* const entry = Foreseen::Find(*this, name); entry != nullptr || foreseen()) {
+        if (entry == nullptr || !entry->info) return nullptr;
+        if (S_ISDIR(entry->info->st_mode)) return Foresee(name, shown, *entry->info);
+        const std::string path = shown.empty() ? PathOf(name) : shown;
+        if (!S_ISLNK(entry->info->st_mode)) throw SystemFailure(path, ENOTDIR);
+        throw NotThis(path, "a symbolic link in the place of a directory");
+    }
     const int fd = ::openat(this->fd(), name.c_str(), kFlags | O_NOFOLLOW);
     if (fd >= 0) return DirectoryRef(new Directory(fd, NamesOf(name, shown)));
     const int error = errno;
@@ -164,6 +180,15 @@ DirectoryRef Directory::LockIn(const std::string& name, bool* busy) const {
 
 DirectoryRef Directory::MakeIn(const std::string& name, mode_t mode) const {
     constexpr mode_t kRights = S_IRWXU | S_IRWXG | S_IRWXO;
+    if (DryRun()) {
+        const int error = Has(name) ? EEXIST : WhyNoNewFile(*this);
+        if (error != 0) throw SystemFailure(PathOf(name), error);
+        const struct stat info = Foreseen::StatusOfNew(*this, S_IFDIR | mode);
+        Foreseen::Come({shared_from_this(), name}, info);
+        DirectoryRef made = Foresee(name, {}, info);
+        made->BeginEmpty();
+        return made;
+    }
     if (::mkdirat(fd(), name.c_str(), mode) != 0) throw SystemFailure(PathOf(name), errno);
     DirectoryRef made = OpenIn(name);
     // Whoever may write here may have put another one in its place, which is not to be changed.
@@ -198,6 +223,7 @@ bool Directory::HasLocation(const std::string& name) const {
 }
 
 struct stat Directory::Status() const {
+    if (foreseen()) return foreseen_info_;
     struct stat info;
     if (::fstat(fd(), &info) != 0) throw SystemFailure(path(), errno);
     return info;
@@ -215,6 +241,20 @@ int Directory::OpenToRead() const {
 File Directory::Reopened() const { return {OpenToRead(), path()}; }
 
 std::vector<Directory::Entry> Directory::Entries() const {
+    std::vector<Entry> entries;
+    if (!foreseen()) entries = EntriesOnDisk();
+    if (const auto* const foreseen = Foreseen::In(*this)) {
+        std::erase_if(entries, [&](const Entry& entry) { return foreseen->contains(entry.name); });
+        for (const auto& [name, entry] : *foreseen) {
+            if (entry.info) entries.push_back({name, entry.info->st_mode & S_IFMT});
+        }
+    }
+    std::sort(entries.begin(), entries.end(),
+              [](const Entry& one, const Entry& other) { return one.name < other.name; });
+    return entries;
+}
+
+std::vector<Directory::Entry> Directory::EntriesOnDisk() const {
     const int own = OpenToRead();
     const std::unique_ptr<DIR, int (*)(DIR*)> dir(::fdopendir(own), ::closedir);
     if (!dir) {
@@ -238,8 +278,6 @@ std::vector<Directory::Entry> Directory::Entries() const {
         entries.push_back({std::string(name), type});
     }
     if (errno != 0) throw SystemFailure(path(), errno);
-    std::sort(entries.begin(), entries.end(),
-              [](const Entry& one, const Entry& other) { return one.name < other.name; });
     return entries;
 }
 
@@ -309,6 +347,8 @@ void Directory::NoteCome(const std::string& name) const {
 }
 
 std::optional<struct stat> Directory::StatusOf(const std::string& name) const {
+    if (const auto* const entry = Foreseen::Find(*this, name)) return entry->info;
+    if (foreseen()) return std::nullopt;
     struct stat info;
     if (::fstatat(fd(), name.c_str(), &info, AT_SYMLINK_NOFOLLOW) == 0) return info;
     if (errno == ENOENT || errno == ENAMETOOLONG) return std::nullopt;
@@ -326,6 +366,10 @@ std::string Directory::NameOf(const struct stat& info, const std::string& name) 
 }
 
 std::shared_ptr<const File> Directory::FindFile(const std::string& name, int flags) const {
+    if (const auto* const entry = Foreseen::Find(*this, name); entry != nullptr || foreseen()) {
+        const bool none = entry == nullptr || !entry->contents_in;
+        return none ? nullptr : entry->contents_in->FindFile(entry->contents_name, O_RDONLY);
+    }
     // Never waits for the other end of a FIFO, or for whoever holds a lease.
     const int all = flags | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
     auto file = std::make_shared<File>(OpenQuietly(fd(), name.c_str(), all), PathOf(name));
@@ -419,6 +463,7 @@ struct stat StatusOf(const Place& place) {
 
 std::uint64_t BirthOf(const Place& place) {
     constexpr std::uint64_t kSecond = 1'000'000'000;
+    if (Foreseen::Find(*place.directory, place.name) != nullptr) return 0;
     struct statx info;
     if (::statx(place.directory->fd(), place.name.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BTIME,
                 &info) != 0) {
@@ -441,7 +486,20 @@ Failure HasBecomeAnother(const Place& place) {
 
 // ---- Inode --------------------------------------------------------------------------------------
 
+std::shared_ptr<const Inode> Inode::Foresee(const Place& place, const struct stat& info) {
+    const Directory& around = place.directory->OnDisk();
+    auto file = std::make_shared<const File>(
+        ::openat(around.fd(), ".", O_PATH | O_DIRECTORY | O_CLOEXEC), place.path());
+    if (file->fd() < 0) throw SystemFailure(place.path(), errno);
+    return std::shared_ptr<const Inode>(new Inode(std::move(file), info));
+}
+
 std::shared_ptr<const Inode> Inode::Find(const Place& place) {
+    if (const auto* const entry = Foreseen::Find(*place.directory, place.name);
+        entry != nullptr || place.directory->foreseen()) {
+        if (entry == nullptr || !entry->info) return nullptr;
+        return Foresee(place, *entry->info);
+    }
     constexpr int kInodeFlags = O_PATH | O_NOFOLLOW | O_CLOEXEC;
     auto file = std::make_shared<const File>(
         ::openat(place.directory->fd(), place.name.c_str(), kInodeFlags), place.path());
@@ -458,6 +516,7 @@ std::shared_ptr<const Inode> Inode::Open(const Place& place) {
 }
 
 std::shared_ptr<const Inode> Inode::OpenToRead(const Place& place) {
+    if (Foreseen::Find(*place.directory, place.name) != nullptr) return Open(place);
     // Never waits for the other end of a FIFO, or for whoever holds a lease.
     constexpr int kReadFlags = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
     const auto file = std::make_shared<const File>(
@@ -468,7 +527,9 @@ std::shared_ptr<const Inode> Inode::OpenToRead(const Place& place) {
 }
 
 std::shared_ptr<const Inode> Inode::Of(const std::shared_ptr<const File>& file) {
-    return std::shared_ptr<const Inode>(new Inode(file, false));
+    // What would wait for somebody is not opened in a dry run.
+    const bool by_path = DryRun() && (::fcntl(file->fd(), F_GETFL) & O_PATH) != 0;
+    return std::shared_ptr<const Inode>(new Inode(file, by_path));
 }
 
 std::shared_ptr<const Inode> Inode::Of(const File& file) {
@@ -483,6 +544,7 @@ bool Inode::HoldsContents() const { return S_ISREG(info_.st_mode) || S_ISDIR(inf
 std::string Inode::ProcPath() const { return ProcPathOf(file_->fd()); }
 
 std::vector<std::string> Inode::AttributeNames() const {
+    if (foreseen_) return {};
     constexpr std::size_t kUsual = 1024;
     const auto read = [this](char* list, std::size_t size) {
         return by_path_ ? ::listxattr(ProcPath().c_str(), list, size)
@@ -512,6 +574,7 @@ std::optional<Bytes> Inode::Attribute(const std::string& name) const {
                         : ::fgetxattr(file_->fd(), name.c_str(), value, size);
     };
     if (const auto* const rehearsed = Rehearsed::Find(*this, name)) return *rehearsed;
+    if (foreseen_) return std::nullopt;
     Bytes value(kUsual);
     for (;;) {
         ssize_t size = read(value.data(), value.size());

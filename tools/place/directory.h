@@ -76,6 +76,10 @@ class Directory : public std::enable_shared_from_this<Directory> {
     struct stat Status() const;
     // Whether this work has made it: all that is in it has come since.
     bool is_new() const { return is_new_; }
+    // Whether it is one that a dry run would have made. No descriptor leads to it.
+    bool foreseen() const { return on_disk_ != nullptr; }
+    // Itself, or the one that is there in which it would be.
+    const Directory& OnDisk() const { return on_disk_ ? *on_disk_ : *this; }
 
     // For calls that take a path: it leads through this descriptor, whatever has become of the
     // directory's name.
@@ -168,8 +172,11 @@ class Directory : public std::enable_shared_from_this<Directory> {
     Directory(int fd, std::shared_ptr<Names> names)
         : file_(fd, std::string()), names_(std::move(names)) {}
     DirectoryRef FindIn(const std::string& name, const std::string& shown) const;
+    DirectoryRef Foresee(const std::string& name, const std::string& shown,
+                         const struct stat& info) const;
     std::shared_ptr<Names> NamesOf(const std::string& name, const std::string& shown) const;
     int OpenToRead() const;
+    std::vector<Entry> EntriesOnDisk() const;
     void BeginEmpty() const;
     std::optional<bool> ListTells(const std::string& name) const;
     bool TellsCasesApart() const;
@@ -177,6 +184,8 @@ class Directory : public std::enable_shared_from_this<Directory> {
 
     File file_;  // its path is not used
     std::shared_ptr<Names> names_;
+    DirectoryRef on_disk_;            // null: this one is
+    struct stat foreseen_info_ = {};  // where it is not
     mutable std::unique_ptr<std::vector<Entry>> first_;
     mutable std::set<std::string> later_;  // has come by this process since
     mutable bool is_new_ = false;
@@ -226,6 +235,8 @@ class Inode final : public AttributeSource {
     static std::shared_ptr<const Inode> Of(const std::shared_ptr<const File>& file);
     // The same with a descriptor of its own.
     static std::shared_ptr<const Inode> Of(const File& file);
+    // One that a dry run would have put there: without attributes, until it gives it some.
+    static std::shared_ptr<const Inode> Foresee(const Place& place, const struct stat& info);
 
     const std::string& path() const override { return file_->path(); }
     // That calls on open files take; -1 when there is none.
@@ -234,8 +245,9 @@ class Inode final : public AttributeSource {
     std::shared_ptr<const File> file() const { return by_path_ ? nullptr : file_; }
     const struct stat& info() const { return info_; }  // when it was opened
     struct stat Status() const {
-        return file_->Status();
+        return foreseen_ ? info_ : file_->Status();
     }
+    bool foreseen() const { return foreseen_; }
 
     // Whether it is a regular file or a directory, which alone have attributes and marks.
     bool HoldsContents() const;
@@ -260,9 +272,12 @@ class Inode final : public AttributeSource {
  private:
     Inode(std::shared_ptr<const File> file, bool by_path)
         : file_(std::move(file)), by_path_(by_path), info_(file_->Status()) {}
+    Inode(std::shared_ptr<const File> file, const struct stat& foreseen)
+        : file_(std::move(file)), by_path_(true), foreseen_(true), info_(foreseen) {}
 
     std::shared_ptr<const File> file_;
-    bool by_path_;  // the descriptor only says which file it is, and takes no calls
+    bool by_path_;           // the descriptor only says which file it is, and takes no calls
+    bool foreseen_ = false;  // it is that of a directory where it would be
     struct stat info_;
 };
 

@@ -7,7 +7,8 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <map>
+#include <ctime>
+#include <set>
 #include <utility>
 
 namespace mavoea::tool {
@@ -29,6 +30,20 @@ bool IsInHand(const Inode& inode) {
     return inode.info().st_ino == in_hand.inode && inode.info().st_dev == in_hand.device;
 }
 
+using FileId = std::pair<dev_t, ino_t>;
+
+FileId IdOf(const struct stat& info) { return {info.st_dev, info.st_ino}; }
+
+struct ForeseenState {
+    std::map<FileId, Foreseen::Entries> directories;
+    std::set<FileId> gone;  // directories
+    ino_t last_number = 0;
+};
+ForeseenState& State() {
+    static ForeseenState state;
+    return state;
+}
+
 // 0, or the errno.
 int MayWrite(int directory, const char* path, int mode) {
     return ::faccessat(directory, path, mode, AT_EACCESS) == 0 ? 0 : errno;
@@ -41,6 +56,7 @@ bool DryRun() { return dry_run; }
 
 int WhyNoAttribute(const Inode& inode, const std::string& name, std::size_t size) {
     const std::string path = inode.ProcPath();
+    if (!inode.HoldsContents() && name.starts_with("user.")) return EPERM;
     if (name.size() > kAttributeNameMax) return ERANGE;
     if (size > kAttributeSizeMax) return E2BIG;
     if (const int error = MayWrite(AT_FDCWD, path.c_str(), W_OK)) return error;
@@ -55,10 +71,20 @@ int WhyNoMode(const Inode& inode) {
     return error == EACCES ? 0 : error;
 }
 
-int WhyNoNewFile(const Directory& directory) { return MayWrite(directory.fd(), ".", W_OK | X_OK); }
+int WhyNoNewFile(const Directory& directory) {
+    // Whoever makes a directory may write to it.
+    if (directory.foreseen()) return 0;
+    struct statx info;
+    const int result = ::statx(directory.fd(), "", AT_EMPTY_PATH, STATX_BASIC_STATS, &info);
+    if (result == 0 && (info.stx_attributes & STATX_ATTR_IMMUTABLE) != 0) return EPERM;
+    return MayWrite(directory.fd(), ".", W_OK | X_OK);
+}
 
 int WhyNoRemoval(const Place& place) {
     if (const int error = WhyNoNewFile(*place.directory)) return error;
+    if (const auto* const foreseen = Foreseen::Find(*place.directory, place.name)) {
+        return foreseen->info ? 0 : ENOENT;
+    }
     struct statx info;
     if (::statx(place.directory->fd(), place.name.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS,
                 &info) != 0) {
@@ -69,6 +95,77 @@ int WhyNoRemoval(const Place& place) {
     const uid_t user = ::geteuid();
     const bool owns = user == 0 || user == around.st_uid || user == info.stx_uid;
     return (around.st_mode & S_ISVTX) != 0 && !owns ? EPERM : 0;
+}
+
+int WhyNoWriting(const Place& place) {
+    if (const auto* const foreseen = Foreseen::Find(*place.directory, place.name)) {
+        return foreseen->info ? 0 : ENOENT;
+    }
+    struct statx info;
+    const int directory = place.directory->fd();
+    if (::statx(directory, place.name.c_str(), 0, STATX_BASIC_STATS, &info) != 0) return errno;
+    if ((info.stx_attributes & (STATX_ATTR_IMMUTABLE | STATX_ATTR_APPEND)) != 0) return EPERM;
+    return MayWrite(directory, place.name.c_str(), W_OK);
+}
+
+const Foreseen::Entry* Foreseen::Find(const Directory& directory, const std::string& name) {
+    const Entries* const entries = In(directory);
+    if (entries == nullptr) return nullptr;
+    const auto found = entries->find(name);
+    return found == entries->end() ? nullptr : &found->second;
+}
+
+const Foreseen::Entries* Foreseen::In(const Directory& directory) {
+    if (State().directories.empty()) return nullptr;
+    const auto found = State().directories.find(IdOf(directory.Status()));
+    return found == State().directories.end() ? nullptr : &found->second;
+}
+
+void Foreseen::Come(const Place& place, const struct stat& info, const Place* from) {
+    Entry entry = {.info = info};
+    if (from != nullptr) {
+        entry.contents_in = from->directory;
+        entry.contents_name = from->name;
+    }
+    State().directories[IdOf(place.directory->Status())][place.name] = std::move(entry);
+    place.directory->NoteCome(place.name);
+    place.directory->Forget(place.name);
+}
+
+void Foreseen::Go(const Directory& directory, const std::string& name) {
+    State().directories[IdOf(directory.Status())][name] = {};
+    directory.Forget(name);
+}
+
+void Foreseen::GoWithAll(const Directory& directory, const std::string& name) {
+    if (const auto info = directory.StatusOf(name)) {
+        State().directories.erase(IdOf(*info));
+        State().gone.insert(IdOf(*info));
+    }
+    Go(directory, name);
+}
+
+bool Foreseen::HasGone(const struct stat& directory) {
+    return State().gone.contains(IdOf(directory));
+}
+
+void Foreseen::Forget(const Directory& directory) {
+    State().directories.erase(IdOf(directory.Status()));
+}
+
+struct stat Foreseen::StatusOfNew(const Directory& directory, mode_t mode) {
+    const struct stat around = directory.Status();
+    struct stat info = {};
+    info.st_dev = around.st_dev;
+    info.st_ino = --State().last_number;  // from the highest one downwards
+    info.st_mode = mode;
+    info.st_nlink = S_ISDIR(mode) ? 2 : 1;
+    info.st_uid = ::geteuid();
+    info.st_gid = (around.st_mode & S_ISGID) != 0 ? around.st_gid : ::getegid();
+    timespec now = {};
+    (void)::clock_gettime(CLOCK_REALTIME, &now);
+    info.st_atim = info.st_mtim = info.st_ctim = now;
+    return info;
 }
 
 const std::optional<Bytes>* Rehearsed::Find(const Inode& inode, const std::string& name) {

@@ -3,6 +3,9 @@
 #ifndef MAVOEA_TOOLS_PLACE_DRY_RUN_H_
 #define MAVOEA_TOOLS_PLACE_DRY_RUN_H_
 
+#include <sys/stat.h>
+
+#include <map>
 #include <optional>
 #include <string>
 
@@ -20,6 +23,38 @@ int WhyNoAttribute(const Inode& inode, const std::string& name, std::size_t size
 int WhyNoMode(const Inode& inode);
 int WhyNoNewFile(const Directory& directory);
 int WhyNoRemoval(const Place& place);
+int WhyNoWriting(const Place& place);
+
+// What a dry run would have put into directories and taken out of them. Who looks into one by the
+// members of Directory finds it so.
+class Foreseen {
+ public:
+    struct Entry {
+        std::optional<struct stat> info = {};  // none: it would be gone
+        // Where the same contents are; a null directory where nobody asks for them.
+        DirectoryRef contents_in = {};
+        std::string contents_name = {};
+    };
+    using Entries = std::map<std::string, Entry>;
+
+    // Null for what is as it is on disk.
+    static const Entry* Find(const Directory& directory, const std::string& name);
+    static const Entries* In(const Directory& directory);
+
+    // `from` is what it would be a copy of.
+    static void Come(const Place& place, const struct stat& info, const Place* from = nullptr);
+    static void Go(const Directory& directory, const std::string& name);
+    // A directory with all that was in it.
+    static void GoWithAll(const Directory& directory, const std::string& name);
+    // Whether one is gone, under whatever name it was found.
+    static bool HasGone(const struct stat& directory);
+
+    // Nobody will look into it any more.
+    static void Forget(const Directory& directory);
+
+    // Of something new there, with a number that nothing has.
+    static struct stat StatusOfNew(const Directory& directory, mode_t mode);
+};
 
 // What a dry run would have made of the attributes of the object that it has in hand, so that its
 // later steps find what they would. Of another object nothing is known any more.
@@ -27,9 +62,9 @@ class Rehearsed {
  public:
     // Null when the run is none, or would leave the attribute alone.
     static const std::optional<Bytes>* Find(const Inode& inode, const std::string& name);
-    // Without a value it goes.
     // From here on what is there is seen.
     static void Forget();
+    // Without a value it goes.
     static void Note(const Inode& inode, const std::string& name, std::optional<Bytes> value);
 };
 

@@ -57,9 +57,10 @@ Place RootPlace() { return {Directory::Open("/", "/", "/"), "."}; }
 
 int TypeOfFileSystem(const Place& place, bool is_directory) {
 #if MAVOEA_HOST_PLATFORM
-    const Directory& directory = *place.directory;
-    return MAVOGetFSType(
-        (is_directory ? directory.ProcPath(place.name) : directory.ProcPath()).c_str(), 1);
+    const Directory& directory = place.directory->OnDisk();
+    const bool asks_it = is_directory && !place.directory->foreseen();
+    return MAVOGetFSType((asks_it ? directory.ProcPath(place.name) : directory.ProcPath()).c_str(),
+                         1);
 #else
     (void)is_directory;
     return MAVOGetFSType(place.location().c_str(), 1);

@@ -473,6 +473,7 @@ class AttributeWriter final : public Writer {
     }
 
     static void WriteFork(const Inode& inode, const Content& fork, Written* written) {
+        if (inode.foreseen()) return MissFork(ENOENT, written);
         const std::string path = inode.ProcPath() + "/rsrc";
         const mode_t mode = inode.Status().st_mode & kPermissionBits;
         // The execute bit is what makes it reachable.
@@ -487,16 +488,17 @@ class AttributeWriter final : public Writer {
             inode.SetMode(mode);
             errno = error;
         }
-        if (fd < 0) {
-            const bool none = errno == ENOTDIR || errno == ENOENT;
-            written->missing.push_back({"resource fork", none ? "its file system offers none for it"
-                                                              : SystemFailure::Words(errno)});
-            return;
-        }
+        if (fd < 0) return MissFork(errno, written);
         const File file(fd, inode.path());
         if (DryRun()) return;
         (void)WriteTo(file, 0, fork);
         file.Sync();
+    }
+
+    static void MissFork(int error, Written* written) {
+        const bool none = error == ENOTDIR || error == ENOENT;
+        written->missing.push_back({"resource fork", none ? "its file system offers none for it"
+                                                          : SystemFailure::Words(error)});
     }
 };
 

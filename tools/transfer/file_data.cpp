@@ -54,6 +54,14 @@ void RequireWritten(const File& to, std::uint64_t at, ByteView bytes) {
                   "check the disk");
 }
 
+// The next data or hole; file systems that know of no holes have data throughout.
+std::uint64_t Seek(const File& from, std::uint64_t at, int what, std::uint64_t size) {
+    if (at >= size) return size;
+    const off_t found = ::lseek(from.fd(), static_cast<off_t>(at), what);
+    if (found >= 0) return std::min(static_cast<std::uint64_t>(found), size);
+    return what == SEEK_DATA && errno != ENXIO ? at : size;
+}
+
 }  // namespace
 
 // ---- A large file, or one with holes ------------------------------------------------------------
@@ -69,8 +77,8 @@ class LargeCopy {
     void Run() {
         std::uint64_t end = 0;
         for (std::uint64_t at = 0; at < size_; at = end) {
-            at = data_.sparse_ == Sparse::kNever ? at : Seek(at, SEEK_DATA, size_);
-            end = data_.sparse_ == Sparse::kNever ? size_ : Seek(at, SEEK_HOLE, size_);
+            at = data_.sparse_ == Sparse::kNever ? at : Seek(from_, at, SEEK_DATA, size_);
+            end = data_.sparse_ == Sparse::kNever ? size_ : Seek(from_, at, SEEK_HOLE, size_);
             CopyRange(at, end);
         }
         // What has no size, as in /proc, or has grown meanwhile.
@@ -80,14 +88,6 @@ class LargeCopy {
     }
 
  private:
-    // The next data or hole; file systems that know of no holes have data throughout.
-    std::uint64_t Seek(std::uint64_t at, int what, std::uint64_t size) const {
-        if (at >= size) return size;
-        const off_t found = ::lseek(from_.fd(), static_cast<off_t>(at), what);
-        if (found >= 0) return std::min(static_cast<std::uint64_t>(found), size);
-        return what == SEEK_DATA && errno != ENXIO ? at : size;
-    }
-
     void CopyRange(std::uint64_t at, std::uint64_t end) {
         while (at < end && in_kernel_) {
             data_.Ask(from_);
@@ -173,6 +173,16 @@ void FileData::Copy(const File& from, const File& to) {
     const struct stat now = from.Status();
     if (info.st_size == 0 && now.st_size == 0) return;  // as in /proc
     if (now.st_size != info.st_size || !SameTime(now.st_mtim, info.st_mtim)) throw Changed(from);
+}
+
+void FileData::Foresee(const File& from) const {
+    const std::uint64_t size = from.Size();
+    std::uint64_t end = 0;
+    for (std::uint64_t at = 0; at < size; at = end) {
+        at = sparse_ == Sparse::kNever ? at : Seek(from, at, SEEK_DATA, size);
+        end = sparse_ == Sparse::kNever ? size : Seek(from, at, SEEK_HOLE, size);
+        watch_.on_bytes(end - at);
+    }
 }
 
 bool FileData::TryToShare(const File& from, const struct stat& info, const File& to) {

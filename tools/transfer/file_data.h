@@ -33,6 +33,9 @@ class FileData {
     // otherwise, when all is there, reads it back where `to` can be read, and compares.
     void Copy(const File& from, const File& to);
 
+    // Tells of the bytes that this would copy.
+    void Foresee(const File& from) const;
+
     // Whatever can be read, until it ends, into whatever can be written. `from` does not block.
     void CopyStream(const File& from, const File& to);
 

@@ -17,12 +17,14 @@ void ReportNew(const std::string& path, mode_t mode) {
 }
 
 void ReportRenamed(const std::string& from, const std::string& to) {
+    if (DryRun()) return;
     constexpr int kRenamed = 4;
     (void)MAVOIndex(to.c_str(), from.c_str(), kRenamed);
     (void)MLIBMavoFileIndexAdd(to.c_str(), from.c_str(), kRenamed);
 }
 
 void ReportRemoved(const std::string& path) {
+    if (DryRun()) return;
     constexpr int kSearchRemoved = 7;
     constexpr int kFileRemoved = 6;
     (void)MAVOIndex(path.c_str(), nullptr, kSearchRemoved);

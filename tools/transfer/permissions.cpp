@@ -4,12 +4,14 @@
 #include <attr/error_context.h>
 #include <attr/libattr.h>
 #include <fcntl.h>
+#include <sys/xattr.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstring>
 #include <vector>
 
+#include "tools/place/dry_run.h"
 #include "tools/say/job.h"
 #include "tools/say/messages.h"
 
@@ -17,6 +19,7 @@ namespace mavoea::tool {
 namespace {
 
 constexpr mode_t kPermissions = 07777;
+constexpr const char* kAccessAcl = "system.posix_acl_access";
 
 // Whether what failed with it is about what may be kept.
 bool IsRefusal(int error) {
@@ -89,6 +92,15 @@ void CopyAttributes(const Inode& from, const Inode& to, const Manner& manner,
     }
 }
 
+// An ACL with more than the mode says has no place on some file systems.
+void ForeseeMode(const Inode& from, const Inode& to, Complaints* complaints) {
+    if (const int error = WhyNoMode(to)) throw SystemFailure(to.path(), error);
+    if (::acl_extended_file(from.ProcPath().c_str()) != 1) return;
+    const bool takes =
+        ::getxattr(to.ProcPath().c_str(), kAccessAcl, nullptr, 0) >= 0 || errno != ENOTSUP;
+    if (!takes) complaints->refused = ENOTSUP;
+}
+
 int CopyMode(const Subject& from, const Subject& to, error_context* context) {
     // Those of directories have default ACLs as well, which take a path.
     if (from.fd >= 0 && to.fd >= 0 && !S_ISDIR(from.inode->info().st_mode)) {
@@ -109,7 +121,9 @@ std::optional<std::string> CopyPermissions(const Subject& from, const Subject& t
     if (S_ISLNK(info.st_mode) || !manner.keeps_mode) return std::nullopt;
 
     Complaints permissions;
-    if (CopyMode(from, to, &permissions) != 0) {
+    if (DryRun()) {
+        ForeseeMode(*from.inode, *to.inode, &permissions);
+    } else if (CopyMode(from, to, &permissions) != 0) {
         if (permissions.grave != 0) throw SystemFailure(to.inode->path(), permissions.grave);
         to.inode->SetMode(info.st_mode & kPermissions);
     }

@@ -5,8 +5,6 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <map>
-#include <set>
 #include <utility>
 
 #include "tools/place/dry_run.h"
@@ -26,42 +24,12 @@ Failure HasNotGone(const std::string& path) {
             "give the command again"};
 }
 
-// What would have gone in a dry run, as far as later steps ask for it.
-class Gone {
- public:
-    void Add(const Directory& directory, const std::string& name) {
-        names_[IdOf(directory.Status())].insert(name);
-    }
-    // A directory with all that was in it.
-    void AddDirectory(const struct stat& info) {
-        names_.erase(IdOf(info));
-        directories_.insert(IdOf(info));
-    }
-
-    bool Has(const Directory& directory, const std::string& name) const {
-        const auto found = names_.find(IdOf(directory.Status()));
-        return found != names_.end() && found->second.contains(name);
-    }
-    bool HasDirectory(const struct stat& info) const { return directories_.contains(IdOf(info)); }
-
- private:
-    using Id = std::pair<dev_t, ino_t>;
-    static Id IdOf(const struct stat& info) { return {info.st_dev, info.st_ino}; }
-
-    std::map<Id, std::set<std::string>> names_;  // by directory
-    std::set<Id> directories_;
-};
-Gone& WouldHaveGone() {
-    static Gone all;
-    return all;
-}
-
 // The call that removes an object.
 void Unlink(const Place& place, int flags) {
     if (DryRun()) {
         if (const int error = WhyNoRemoval(place)) throw SystemFailure(place.path(), error);
-        if ((flags & AT_REMOVEDIR) != 0) WouldHaveGone().AddDirectory(StatusOf(place));
-        return WouldHaveGone().Add(*place.directory, place.name);
+        if ((flags & AT_REMOVEDIR) != 0) return Foreseen::GoWithAll(*place.directory, place.name);
+        return Foreseen::Go(*place.directory, place.name);
     }
     if (::unlinkat(place.directory->fd(), place.name.c_str(), flags) != 0) {
         throw SystemFailure(place.path(), errno);
@@ -93,12 +61,12 @@ class Beside {
 
     void Remove() const {
         if (shared_) return;
+        RemoveFiles(sidecars_.Files());
         if (DryRun()) {
             for (const Sidecars::Found& file : sidecars_.Files()) {
-                WouldHaveGone().Add(*file.directory, file.name);
+                Foreseen::Go(*file.directory, file.name);
             }
         }
-        RemoveFiles(sidecars_.Files());
         if (sidecars_.folder) (void)sidecars_.ea_dir->RemoveEmpty(object_.place.name);
     }
 
@@ -131,14 +99,13 @@ void RemoveEaDirectory(const Directory& inside, const MayGo& may_go) {
 // But for the EA directory.
 void RequireNothingLeft(const Directory& inside, const Place& place) {
     for (const Directory::Entry& entry : inside.Entries()) {
-        const bool goes = entry.name == kEaDirName || WouldHaveGone().Has(inside, entry.name);
-        if (!goes) throw SystemFailure(place.path(), ENOTEMPTY);
+        if (entry.name != kEaDirName) throw SystemFailure(place.path(), ENOTEMPTY);
     }
 }
 
 // The indexes know nothing of what no path leads to.
 void ReportRemovedAt(const Place& place) {
-    if (!DryRun() && place.directory->HasLocation(place.name)) ReportRemoved(place.location());
+    if (place.directory->HasLocation(place.name)) ReportRemoved(place.location());
 }
 
 // Both return whether an EA directory is beside it, in which nothing may be left.
@@ -189,13 +156,14 @@ void RemoveEmptyDirectory(const Object& object, bool alone, const MayGo& may_go)
 
 bool WouldBeGone(const Place& place) {
     if (!DryRun()) return false;
-    if (WouldHaveGone().Has(*place.directory, place.name)) return true;
+    const auto* const entry = Foreseen::Find(*place.directory, place.name);
+    if (entry != nullptr && !entry->info) return true;
     // Or a directory above it.
     struct stat below = {};
     struct stat info;
     for (std::string above = ".";; above += "/..") {
         if (::fstatat(place.directory->fd(), above.c_str(), &info, 0) != 0) return false;
-        if (WouldHaveGone().HasDirectory(info)) return true;
+        if (Foreseen::HasGone(info)) return true;
         if (SameFile(info, below)) return false;
         below = info;
     }

@@ -1,5 +1,8 @@
 #include "tools/transfer/rename.h"
 
+#include <fcntl.h>
+#include <linux/stat.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -7,6 +10,7 @@
 #include <cstdio>
 
 #include "include/mavoea.h"
+#include "tools/place/dry_run.h"
 #include "tools/place/volume.h"
 #include "tools/say/messages.h"
 #include "tools/store/marks.h"
@@ -25,6 +29,18 @@ using Part = Pending::Part;
 bool TryToRename(const Place& from, const Place& to) {
     return ::renameat(from.directory->fd(), from.name.c_str(), to.directory->fd(),
                       to.name.c_str()) == 0;
+}
+
+// Whether nothing can be renamed from one of them into the other: one file system may be mounted
+// at several places.
+bool AreApart(const Directory& one, const Directory& other) {
+    if (one.Status().st_dev != other.Status().st_dev) return true;
+    const auto mount = [](const Directory& directory) -> std::uint64_t {
+        struct statx info;
+        const int fd = directory.OnDisk().fd();
+        return ::statx(fd, "", AT_EMPTY_PATH, STATX_MNT_ID, &info) == 0 ? info.stx_mnt_id : 0;
+    };
+    return mount(one) != mount(other);
 }
 
 // Whether a rename of that inode, or into its place, has left something in an EA directory.
@@ -90,7 +106,7 @@ class Renaming {
         const bool plain = !pending && !sidecars_.problem && !sidecars_.Any() && !old_.Any();
         // Of an object without metadata the call itself says whether it is another file system.
         if (!plain && info_.st_dev != to_.directory->Status().st_dev) return false;
-        if (pending) {
+        if (pending && !DryRun()) {
             SettleBefore(source, target);
             Look(source, target);
         }
@@ -100,6 +116,7 @@ class Renaming {
         if (sidecars_.AnyByName() || old_.AnyByName()) RequireOthersNames(target);
         try {
             Plan(target);
+            if (DryRun()) return Foresee();
             PrepareSteps();
             SetAside();
             if (!RenameItself()) {
@@ -221,7 +238,7 @@ class Renaming {
 
     void Add(const Found& found, const std::string& name, Level level) {
         const Place to = {DirectoryAt(level), name};
-        const auto info = to.Status();
+        const auto info = to.directory ? to.Status() : std::nullopt;
         if (info && (info->st_mode & S_IFMT) != (found.info.st_mode & S_IFMT)) throw InTheWay(to);
         const bool stays = !case_only_ && found.name == name && info && SameFile(*info, found.info);
         if (stays && SameFile(to.directory->Status(), found.directory->Status())) {
@@ -232,9 +249,11 @@ class Renaming {
         }
     }
 
-    // Once there is a pending directory in it, nobody removes an EA directory.
+    // Once there is a pending directory in it, nobody removes an EA directory. Null for one that a
+    // dry run would have made.
     DirectoryRef DirectoryAt(Level level) {
         if (level == kBeside) return to_.directory;
+        if (DryRun()) return to_.directory->FindAgain(kEaDirName);
         if (const auto& pending = pending_[0][level]) return pending->holder();
         return NeedEaDirectory(*to_.directory);
     }
@@ -286,6 +305,22 @@ class Renaming {
             }
         }
         return PendingAt(level, replaced);
+    }
+
+    bool Foresee() const {
+        if (AreApart(*from_.directory, *to_.directory)) return false;
+        int error = WhyNoRemoval(from_);
+        if (error == 0) error = there_ ? WhyNoRemoval(to_) : WhyNoNewFile(*to_.directory);
+        // Its ".." becomes another.
+        const bool changes =
+            S_ISDIR(info_.st_mode) && !SameFile(from_.directory->Status(), to_.directory->Status());
+        if (error == 0 && changes) error = WhyNoWriting(from_);
+        if (error != 0) throw SystemFailure(from_.path(), error);
+        for (const Step& step : steps_) Foreseen::Go(*step.from.directory, step.from.name);
+        for (const Found& old : old_.Files()) Foreseen::Go(*old.directory, old.name);
+        if (!same_ || case_only_) Foreseen::Come(to_, info_);
+        Foreseen::Go(*from_.directory, from_.name);
+        return true;
     }
 
     // ---- Before the object ----------------------------------------------------------------------

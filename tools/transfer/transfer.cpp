@@ -252,6 +252,37 @@ bool SameState(const struct stat& one, const struct stat& other) {
     return HashOf(one, false) == HashOf(other, false);
 }
 
+// What would be at the destination from here on, for whatever looks there later in a dry run.
+// `copied` is where it has its contents from.
+std::shared_ptr<const Inode> Foresee(const Place& to, bool replaces, const struct stat& info,
+                                     const Place& copied) {
+    if (const int error = replaces ? WhyNoRemoval(to) : WhyNoNewFile(*to.directory)) {
+        throw SystemFailure(to.path(), error);
+    }
+    // Of others nobody asks for what is in them.
+    const bool may_be_metadata = to.name.starts_with(AppleDoubleName({}));
+    Foreseen::Come(to, info, may_be_metadata ? &copied : nullptr);
+    return Inode::Foresee(to, info);
+}
+
+void ForeseeTarget(Leg* leg, mode_t mode, const Manner& manner) {
+    const struct stat& source = leg->source->info();
+    struct stat info = Foreseen::StatusOfNew(*leg->to.place.directory, mode);
+    info.st_size = manner.data ? source.st_size : 0;
+    info.st_rdev = source.st_rdev;
+    if (manner.keeps_times) info.st_mtim = source.st_mtim;
+    leg->target = Foresee(leg->to.place, leg->replaces, info, leg->from.place);
+}
+
+// One more name for the file at `there`.
+void ForeseeLink(Leg* leg, const Place& there) {
+    const struct stat info = StatusOf(there);
+    if (info.st_dev != leg->to.place.directory->Status().st_dev) {
+        throw SystemFailure(leg->to.path(), EXDEV);
+    }
+    leg->target = Foresee(leg->to.place, leg->replaces, info, leg->from.place);
+}
+
 // What is read of it. A Failure in the words of cp when nothing may be.
 std::shared_ptr<const File> ContentsOf(const Leg& leg) {
     if (auto file = leg.source->file()) return file;
@@ -271,15 +302,26 @@ Object TargetAt(const Place& to, mode_t type) {
     return AsReadable(S_ISDIR(type) ? ObjectAt(to, nullptr) : ObjectAt(to, type));
 }
 
-// Whether the copy at `there` may have this object's metadata, too, where that is in the file
-// itself.
-bool SharesMetadata(const Place& there, const Leg& leg) {
+// What the copy of `from` at `there` has.
+Metadata MetadataOfCopy(const Place& from, const Place& there) {
+    const auto info = StatusOf(there);
+    const Object copy = AsReadable(ObjectAt(there, &info));
+    if (Foreseen::Find(*there.directory, there.name) == nullptr) {
+        return ReadMetadata(copy, Sidecars::Services::kLeaveOut);
+    }
+    const auto source = StatusOf(from);
+    std::vector<Missing> missing;
+    return WriterFor(copy).Fit(ReadMetadata(ObjectAt(from, &source), Sidecars::Services::kLeaveOut),
+                               copy, &missing);
+}
+
+// Whether the copy of `first` at `there` may have this object's metadata, too, where that is in the
+// file itself.
+bool SharesMetadata(const Place& first, const Place& there, const Leg& leg) {
     const bool in_inode = leg.to.keeping() == Keeping::kXattr ||
                           leg.to.kind() == VolumeKind::kFileEA || leg.to.dialect() != nullptr;
     if (!in_inode) return true;
-    const auto info = StatusOf(there);
-    const Metadata other =
-        ReadMetadata(AsReadable(ObjectAt(there, &info)), Sidecars::Services::kLeaveOut);
+    const Metadata other = MetadataOfCopy(first, there);
     Metadata own = leg.wanted;
     own.services.clear();
     if (leg.to.kind() == VolumeKind::kFileEA) own.attributes.clear();
@@ -412,6 +454,12 @@ void Transfer::CopyFile(Leg* leg, const File* stream) {
         }
         return Creating(leg->source->info(), leg->to.place);
     };
+    if (DryRun()) {
+        Made(making,
+             [&] { ForeseeTarget(leg, S_IFREG | FirstMode(leg->source->info(), manner), manner); });
+        ForeseeBytes(own.get());
+        return CopyInodeTo(*leg, -1, -1);
+    }
     const auto temporary = Made(making, [&] {
         return std::make_unique<TemporaryFile>(leg->to.place,
                                                FirstMode(leg->source->info(), manner));
@@ -427,6 +475,10 @@ void Transfer::CopyFile(Leg* leg, const File* stream) {
             temporary->GiveToNewTarget();
         }
     });
+}
+
+void Transfer::ForeseeBytes(const File* source) const {
+    if (options_.manner.data && source != nullptr) data_.Foresee(*source);
 }
 
 void Transfer::CopyBytes(const File& source, bool stream, const File& target) {
@@ -449,15 +501,19 @@ void Transfer::Overwrite(const Place& from, const File* stream, const Place& to,
     if (stream == nullptr && CopyName(&leg, links)) return Finish(&leg);
     const std::shared_ptr<const File> file = stream == nullptr ? ContentsOf(leg) : nullptr;
     const File& source = file ? *file : *stream;
-    leg.target = Inode::Of(target);
+    leg.target = DryRun() ? Inode::Open(to) : Inode::Of(target);
     leg.former_mode = leg.target->info().st_mode & kPermissionBits;
     if (stream != nullptr) RequireUnlockedTarget(leg);
-    // Nobody sees more of it than he may of what it will be.
-    if (BeginsClosed(options_.manner)) {
-        (void)::fchmod(target.fd(), *leg.former_mode & (S_IRUSR | S_IWUSR));
+    if (DryRun()) {
+        ForeseeBytes(file.get());
+    } else {
+        // Nobody sees more of it than he may of what it will be.
+        if (BeginsClosed(options_.manner)) {
+            (void)::fchmod(target.fd(), *leg.former_mode & (S_IRUSR | S_IWUSR));
+        }
+        if (options_.manner.data) target.Resize(0);
+        CopyBytes(source, stream != nullptr, target);
     }
-    if (options_.manner.data) target.Resize(0);
-    CopyBytes(source, stream != nullptr, target);
     RemoveFormerAttributes(leg);
     CopyInodeTo(leg, source.fd(), target.fd());
     RememberName(leg, links);
@@ -465,24 +521,33 @@ void Transfer::Overwrite(const Place& from, const File* stream, const Place& to,
 }
 
 void Transfer::CopyNode(Leg* leg) {
+    Made([&] { return Creating(leg->source->info(), leg->to.place); }, [&] { MakeNode(leg); });
+}
+
+void Transfer::MakeNode(Leg* leg) const {
+    const Manner& manner = options_.manner;
     const struct stat& info = leg->source->info();
-    Made([&] { return Creating(info, leg->to.place); },
-         [&] {
-             const auto node = TemporaryNode::MakeBy(leg->to.place, [&](int directory,
-                                                                        const char* name) {
-                 if (S_ISLNK(info.st_mode)) {
-                     return ::symlinkat(LinkTarget(leg->from.place).c_str(), directory, name);
-                 }
-                 const mode_t mode = FirstMode(info, options_.manner);
-                 return ::mknodat(directory, name, (info.st_mode & S_IFMT) | mode, info.st_rdev);
-             });
-             leg->target = node->inode();
-             CopyInodeTo(*leg, -1, -1);
-             if (!S_ISLNK(info.st_mode) && !options_.manner.keeps_mode) {
-                 leg->target->SetMode(MadeMode(*leg, options_.manner));
-             }
-             node->GiveToTarget();
-         });
+    const mode_t type = info.st_mode & S_IFMT;
+    const mode_t mode = S_ISLNK(type) ? S_IRWXU | S_IRWXG | S_IRWXO : FirstMode(info, manner);
+    std::unique_ptr<TemporaryNode> node;
+    if (DryRun()) {
+        const bool takes_root = S_ISCHR(type) || S_ISBLK(type);
+        if (takes_root && ::geteuid() != 0) throw SystemFailure(leg->to.path(), EPERM);
+        ForeseeTarget(leg, type | mode, manner);
+    } else {
+        node = TemporaryNode::MakeBy(leg->to.place, [&](int directory, const char* name) {
+            return S_ISLNK(type) ? ::symlinkat(LinkTarget(leg->from.place).c_str(), directory, name)
+                                 : ::mknodat(directory, name, type | mode, info.st_rdev);
+        });
+        leg->target = node->inode();
+    }
+    CopyInodeTo(*leg, -1, -1);
+    if (!S_ISLNK(type) && !manner.keeps_mode) leg->target->SetMode(MadeMode(*leg, manner));
+    if (node) node->GiveToTarget();
+}
+
+void Transfer::CopyStream(const File& source, const File& target) {
+    if (!DryRun()) data_.CopyStream(source, target);
 }
 
 void Transfer::CarryMetadata(const Place& from, const Place& to) {
@@ -502,13 +567,17 @@ void Transfer::LinkObject(const Place& from, const Place& to) {
     const auto what = [&] {
         return "cannot create hard link " + Quoted(to.path()) + " to " + Quoted(from.path());
     };
+    leg.is_link = true;
+    if (DryRun()) {
+        Made(what, [&] { ForeseeLink(&leg, from); });
+        return Finish(&leg);
+    }
     const auto node = Made(what, [&] {
         return TemporaryNode::MakeBy(to, [&](int directory, const char* name) {
             return ::linkat(from.directory->fd(), from.name.c_str(), directory, name, 0);
         });
     });
     leg.target = node->inode();
-    leg.is_link = true;
     Made(what, [&] { node->GiveToTarget(); });
     Finish(&leg);
 }
@@ -516,7 +585,12 @@ void Transfer::LinkObject(const Place& from, const Place& to) {
 void Transfer::MakeLink(const std::string& text, const Place& to) {
     const std::string what =
         "cannot create symbolic link " + Quoted(to.path()) + " to " + Quoted(text);
-    if (::symlinkat(text.c_str(), to.directory->fd(), to.name.c_str()) != 0) {
+    if (DryRun()) {
+        const int error = to.Status() ? EEXIST : WhyNoNewFile(*to.directory);
+        if (error != 0) throw Refusal(what, error);
+        constexpr mode_t kAll = S_IRWXU | S_IRWXG | S_IRWXO;
+        Foreseen::Come(to, Foreseen::StatusOfNew(*to.directory, S_IFLNK | kAll));
+    } else if (::symlinkat(text.c_str(), to.directory->fd(), to.name.c_str()) != 0) {
         throw Refusal(what, errno);
     }
     NoteMade(to, StatusOf(to));
@@ -534,12 +608,22 @@ bool Transfer::CopyName(Leg* leg, Links links) {
         return false;
     }
     const Place& there = first->second.to;
-    if (!SharesMetadata(there, *leg)) {
+    if (!SharesMetadata(first->second.from, there, *leg)) {
         leg->wanted.strays.push_back(
             {"being one file with " + Printable(there.path()),
              "names of one file have one metadata there, and here each has its own",
              {}});
         return false;
+    }
+    const auto what = [&] {
+        return "cannot create hard link " + Quoted(leg->to.path()) + " to " + Quoted(there.path());
+    };
+    if (DryRun()) {
+        const bool impossible = StatusOf(there).st_dev != leg->to.place.directory->Status().st_dev;
+        if (impossible) return false;
+        Made(what, [&] { ForeseeLink(leg, there); });
+        leg->is_link = true;
+        return true;
     }
     const auto node = TemporaryNode::TryToMake(leg->to.place, [&](int directory, const char* name) {
         return ::linkat(there.directory->fd(), there.name.c_str(), directory, name, 0);
@@ -548,9 +632,6 @@ bool Transfer::CopyName(Leg* leg, Links links) {
     const bool impossible = !node && (error == EXDEV || error == EMLINK || error == EPERM ||
                                       error == ENOTSUP || error == ENOENT);
     if (impossible) return false;
-    const auto what = [&] {
-        return "cannot create hard link " + Quoted(leg->to.path()) + " to " + Quoted(there.path());
-    };
     if (!node) throw Refusal(what(), error);
     leg->target = node->inode();
     leg->is_link = true;
@@ -570,7 +651,7 @@ void Transfer::TakeForCopy(const Place& from, const Place& to, Links links) {
 void Transfer::RememberName(const Leg& leg, Links links) {
     const struct stat& info = leg.source->info();
     if (links == Links::kAll || (links == Links::kSeveral && info.st_nlink > 1)) {
-        first_names_.insert_or_assign(IdOf(info), FirstName{leg.to.place, info});
+        first_names_.insert_or_assign(IdOf(info), FirstName{leg.to.place, info, leg.from.place});
     }
 }
 
@@ -786,10 +867,11 @@ void Transfer::FinishDirectory(const Place& from, const Directory& inside, const
                                const DirectoryRef& made, bool is_new) {
     made_.erase(made.get());
     Leg leg = LegFor(from, to);
-    const File source = inside.Reopened();
-    const File target = made->Reopened();
-    leg.source = Inode::Of(source);
-    leg.target = Inode::Of(target);
+    const auto opened = [](const Directory& directory) {
+        return Inode::Of(std::make_shared<const File>(directory.Reopened()));
+    };
+    leg.source = opened(inside);
+    leg.target = made->foreseen() ? Inode::Foresee(to, made->Status()) : opened(*made);
     if (!SameFile(StatusOf(to), leg.target->info())) throw HasBecomeAnother(to);
     if (!is_new) leg.former_mode = leg.target->info().st_mode & kPermissionBits;
     std::exception_ptr failure;
@@ -802,7 +884,7 @@ void Transfer::FinishDirectory(const Place& from, const Directory& inside, const
         }
     }
     RemoveFormerAttributes(leg);
-    CopyInodeTo(leg, source.fd(), target.fd());
+    CopyInodeTo(leg, -1, -1);
     Finish(&leg);
     if (failure) std::rethrow_exception(failure);
 }

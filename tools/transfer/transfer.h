@@ -65,7 +65,7 @@ class Transfer {
 
     // What can be read from one into the other, and nothing else. Either of them is no regular
     // file.
-    void CopyStream(const File& source, const File& target) { data_.CopyStream(source, target); }
+    void CopyStream(const File& source, const File& target);
 
     // What is at `to` is as good as a copy: it becomes a name of what another name of the file was
     // copied to, or others become names of it.
@@ -114,6 +114,7 @@ class Transfer {
     struct FirstName {
         Place to;
         struct stat source;
+        Place from;
     };
 
     Leg LegFor(const Place& from, const Place& to) const;
@@ -121,7 +122,9 @@ class Transfer {
     Leg LegWithoutMetadata(const Place& from, const File& source, const Place& to) const;
     void CopyFile(Leg* leg, const File* stream);
     void CopyBytes(const File& source, bool stream, const File& target);
+    void ForeseeBytes(const File* source) const;
     void CopyNode(Leg* leg);
+    void MakeNode(Leg* leg) const;
     bool CopyName(Leg* leg, Links links);
     void RememberName(const Leg& leg, Links links);
     void CopyInodeTo(const Leg& leg, int source, int target) const;
