@@ -198,12 +198,17 @@ void AddTreeToChange(CLI::App* sub, Options* options) {
     AddSharedTree(sub, options);
 }
 
-void AddLoggedTreeToChange(CLI::App* sub, Options* options) {
-    AddDryRun(sub, options);
-    AddLoggedTree(sub, options);
+// A dry run does nothing that a log could have as done.
+void KeepDryRunsUnlogged(CLI::App* sub) {
     for (const char* name : {"--log", "--resume"}) {
         sub->get_option(name)->excludes(sub->get_option("--dry-run"));
     }
+}
+
+void AddLoggedTreeToChange(CLI::App* sub, Options* options) {
+    AddDryRun(sub, options);
+    AddLoggedTree(sub, options);
+    KeepDryRunsUnlogged(sub);
 }
 
 CLI::Option* AddSource(CLI::App* sub, Options* options) {
@@ -457,8 +462,10 @@ constexpr Syntax kCommands[] = {
     {Command::kConvert, "convert",
      "Copy an object or a tree to a volume of another type, and compare the two",
      [](CLI::App* sub, Options* options) {
+         AddDryRun(sub, options);
          AddJobs(sub, options);
          AddLog(sub, options);
+         KeepDryRunsUnlogged(sub);
          const auto arguments = AddConversion(sub, options);
          CLI::Option* const plan = sub->add_option_function<std::string>(
              "--plan", [=](const std::string& file) { options->plan = file; },

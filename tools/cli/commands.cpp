@@ -228,6 +228,7 @@ ConvertOptions ConversionOf(const Options& options) {
             .type = options.to,
             .recursive = options.recursive,
             .json = options.json,
+            .verbose = options.verbose || options.dry_run,
             .crew = CrewOf(options),
             .log = options.log};
 }
@@ -340,9 +341,10 @@ ExitStatus Run(const Options& options) {
                                    .remove = options.yes});
         case Command::kConvert:
             if (options.plan) {
-                return ConvertAsPlanned(
-                    *options.plan,
-                    {.json = options.json, .crew = CrewOf(options), .log = options.log});
+                return ConvertAsPlanned(*options.plan, {.json = options.json,
+                                                        .verbose = verbose,
+                                                        .crew = CrewOf(options),
+                                                        .log = options.log});
             }
             return Convert(ConversionOf(options));
         case Command::kPlan:

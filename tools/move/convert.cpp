@@ -11,8 +11,10 @@
 #include <utility>
 #include <vector>
 
+#include "tools/place/dry_run.h"
 #include "tools/place/volume.h"
 #include "tools/say/interrupt.h"
+#include "tools/say/job.h"
 #include "tools/say/output.h"
 #include "tools/say/progress.h"
 #include "tools/store/sidecars.h"
@@ -43,7 +45,7 @@ class Conversion final : private TreeCopy {
                                    },
                                .give_up = InterruptedAgain},
                      .on_note = [this](const std::string& note) { notes_.push_back(note); }}),
-          crew_(options.crew,
+          crew_(CrewOf(options),
                 {.work = [this](const Errand& errand,
                                 const Tell& tell) { return CopyOne(errand, tell); },
                  .hear = [this](std::string_view told) { Hear(told); },
@@ -73,7 +75,7 @@ class Conversion final : private TreeCopy {
     void Compare() {
         compares_ = true;
         // A list as JSON is put together in one process.
-        const CrewSize crew = options_.json ? CrewSize{} : options_.crew;
+        const CrewSize crew = options_.json ? CrewSize{} : CrewOf(options_);
         CompareTrees(
             top_, options_.recursive, Compared(), crew,
             {.compared =
@@ -122,6 +124,11 @@ class Conversion final : private TreeCopy {
     }
 
  private:
+    // What would be made is known to one process.
+    static CrewSize CrewOf(const ConvertOptions& options) {
+        return DryRun() ? CrewSize{} : options.crew;
+    }
+
     bool Stopped() const override { return Interrupted() != 0; }
 
     void Begin(const Place& from, const Place& to, Level* level) override {
@@ -163,7 +170,7 @@ class Conversion final : private TreeCopy {
             }
             if (journal_) touched_.insert(level.to.directory.get());
             bool done = false;
-            const std::string told = Carried(level.from, &done, [&] {
+            const std::string told = Carried(level.from, level.to, &done, [&] {
                 if (crew_.LeftEaDirectories()) RemoveLeftEaDirectory(*level.made);
                 transfer_.FinishDirectory(level.from, *level.inside, level.to, level.made,
                                           level.is_new);
@@ -190,6 +197,7 @@ class Conversion final : private TreeCopy {
         if (!options_.log) return nullptr;
         std::string work = options_.recursive ? "convert all of " : "convert ";
         work += top_.first.location() + " to " + top_.second.location() + ", type " + options_.type;
+        if (options_.verbose) work += ", each said";
         journal_.emplace(*options_.log, work, is_new_ ? "new" : "");
         is_new_ = journal_->remark() == "new";
         return &*journal_;
@@ -244,7 +252,7 @@ class Conversion final : private TreeCopy {
         const Place& from = errand.object.place;
         bool done = false;
         if (Stopped()) return false;
-        tell(Carried(from, &done,
+        tell(Carried(from, errand.to, &done,
                      [&] { transfer_.CopyObject(from, errand.type, errand.to, Links::kSeveral); }));
         if (IsWorker()) transfer_.ForgetMade();
         return done;
@@ -252,7 +260,7 @@ class Conversion final : private TreeCopy {
 
     // What became of an object, packed: what there is to say of it, or a failure.
     template <class Carry>
-    std::string Carried(const Place& from, bool* done, Carry carry) {
+    std::string Carried(const Place& from, const Place& to, bool* done, Carry carry) {
         Packer told;
         std::vector<std::string> before = std::exchange(notes_, {});
         const std::uint64_t bytes = bytes_;
@@ -265,7 +273,11 @@ class Conversion final : private TreeCopy {
         }
         told.AddNumber(std::exchange(bytes_, bytes) - bytes);
         told.AddNumber(failed ? 1 : 0);
-        if (failed) Pack(from.path(), *failed, &told);
+        if (failed) {
+            Pack(from.path(), *failed, &told);
+        } else {
+            told.AddText(options_.verbose ? Quoted(from.path()) + " -> " + Quoted(to.path()) : "");
+        }
         for (const std::string& note : notes_) told.AddText(note);
         notes_ = std::move(before);
         return told.bytes();
@@ -276,10 +288,17 @@ class Conversion final : private TreeCopy {
         bytes_ += said.TakeNumber();
         if (said.TakeNumber() == 0) {
             ++converted_;
+            Say(said.TakeText());
         } else {
             AddFailure(&said);
         }
         while (!said.empty()) notes_.emplace_back(said.TakeText());
+    }
+
+    void Say(std::string_view line) {
+        if (line.empty() || options_.json) return;
+        progress_.Clear();
+        std::cout << line << '\n';
     }
 
     void Fail(const Place& from, const Failure& failure) override {

@@ -18,6 +18,7 @@ struct ConvertOptions {
     std::string type = {};         // of the destination's volume, as --volume takes it
     bool recursive = false;
     bool json = false;
+    bool verbose = false;  // what is converted is said
     CrewSize crew = {};
     std::optional<LogFile> log = {};  // of what is done
 };

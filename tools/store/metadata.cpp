@@ -9,6 +9,8 @@ namespace mavoea::tool {
 namespace {
 
 constexpr const char* kNotThere = "it is not there";
+constexpr const char* kFinderInfoItem = "Finder info";
+constexpr const char* kForkItem = "resource fork";
 
 std::optional<std::string> Compare(const Content& wanted, const Content& found) {
     if (wanted.damaged()) return "it is damaged: " + wanted.problem();
@@ -71,8 +73,8 @@ std::vector<Missing> WhatIsMissing(const Metadata& wanted, const Metadata& found
             add("flags of " + NameOfAttribute(attribute.name), "what is there differs");
         }
     }
-    add("Finder info", Compare(wanted.finder_info, found.finder_info));
-    add("resource fork", Compare(wanted.fork, found.fork));
+    add(kFinderInfoItem, Compare(wanted.finder_info, found.finder_info));
+    add(kForkItem, Compare(wanted.fork, found.fork));
     for (const auto& [id, item] : wanted.entries) {
         const auto at = found.entries.find(id);
         if (at == found.entries.end()) {
@@ -102,14 +104,27 @@ std::vector<Missing> WhatIsMissing(const Metadata& wanted, const Metadata& found
     return missing;
 }
 
+void RemoveItems(const std::vector<Missing>& missing, Metadata* metadata) {
+    for (const Missing& one : missing) {
+        const std::string& item = one.item;
+        std::erase_if(metadata->attributes, [&](const Metadata::Attribute& attribute) {
+            return NameOfAttribute(attribute.name) == item;
+        });
+        std::erase_if(metadata->entries,
+                      [&](const auto& entry) { return NameOfEntry(entry.first) == item; });
+        if (item == kFinderInfoItem) metadata->finder_info.reset();
+        if (item == kForkItem) metadata->fork.reset();
+    }
+}
+
 std::vector<Missing> ItemsOf(const Metadata& metadata, const std::string& reason) {
     std::vector<Missing> items;
     for (const Metadata::Attribute& attribute : metadata.attributes) {
         items.push_back({NameOfAttribute(attribute.name), reason});
     }
-    if (metadata.finder_info) items.push_back({"Finder info", reason});
+    if (metadata.finder_info) items.push_back({kFinderInfoItem, reason});
     if (metadata.fork && !IsBlankFork(metadata.fork->value)) {
-        items.push_back({"resource fork", reason});
+        items.push_back({kForkItem, reason});
     }
     for (const auto& [id, item] : metadata.entries) {
         if (item.value.damaged() || SaysSomething(id, item.value.All())) {

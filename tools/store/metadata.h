@@ -118,6 +118,9 @@ std::vector<Missing> WhatIsMissing(const Metadata& wanted, const Metadata& found
 // All that there is to name, each with that reason. Services' files are not among it.
 std::vector<Missing> ItemsOf(const Metadata& metadata, const std::string& reason);
 
+// Takes off what is called so.
+void RemoveItems(const std::vector<Missing>& missing, Metadata* metadata);
+
 Json MissingJson(const std::vector<Missing>& missing);
 
 // "Finder info (it is not there), \"colour\" (it is not there)"; of very many the first only.
