@@ -152,6 +152,7 @@ class Conversion final : private TreeCopy {
         level->info = info;
         level->is_new = !to.Status();
         level->made = transfer_.MakeDirectory(from, to);
+        crew_.Then([this, line = LineOf(from, to)] { Say(line); });
         if (!level->is_new) {
             (void)SettlePending(level->made);
             (void)level->made->EntriesAtFirst();  // for IsApart()
@@ -170,7 +171,7 @@ class Conversion final : private TreeCopy {
             }
             if (journal_) touched_.insert(level.to.directory.get());
             bool done = false;
-            const std::string told = Carried(level.from, level.to, &done, [&] {
+            const std::string told = Carried(level.from, {}, &done, [&] {
                 if (crew_.LeftEaDirectories()) RemoveLeftEaDirectory(*level.made);
                 transfer_.FinishDirectory(level.from, *level.inside, level.to, level.made,
                                           level.is_new);
@@ -252,7 +253,7 @@ class Conversion final : private TreeCopy {
         const Place& from = errand.object.place;
         bool done = false;
         if (Stopped()) return false;
-        tell(Carried(from, errand.to, &done,
+        tell(Carried(from, LineOf(from, errand.to), &done,
                      [&] { transfer_.CopyObject(from, errand.type, errand.to, Links::kSeveral); }));
         if (IsWorker()) transfer_.ForgetMade();
         return done;
@@ -260,7 +261,7 @@ class Conversion final : private TreeCopy {
 
     // What became of an object, packed: what there is to say of it, or a failure.
     template <class Carry>
-    std::string Carried(const Place& from, const Place& to, bool* done, Carry carry) {
+    std::string Carried(const Place& from, const std::string& line, bool* done, Carry carry) {
         Packer told;
         std::vector<std::string> before = std::exchange(notes_, {});
         const std::uint64_t bytes = bytes_;
@@ -276,7 +277,7 @@ class Conversion final : private TreeCopy {
         if (failed) {
             Pack(from.path(), *failed, &told);
         } else {
-            told.AddText(options_.verbose ? Quoted(from.path()) + " -> " + Quoted(to.path()) : "");
+            told.AddText(line);
         }
         for (const std::string& note : notes_) told.AddText(note);
         notes_ = std::move(before);
@@ -293,6 +294,13 @@ class Conversion final : private TreeCopy {
             AddFailure(&said);
         }
         while (!said.empty()) notes_.emplace_back(said.TakeText());
+    }
+
+    // That people are to read once it is there; as with cp, directories come before what is in
+    // them.
+    std::string LineOf(const Place& from, const Place& to) const {
+        if (!options_.verbose) return {};
+        return Quoted(from.path()) + " -> " + Quoted(to.path());
     }
 
     void Say(std::string_view line) {

@@ -1,12 +1,15 @@
 #include "tools/store/sidecars.h"
 
 #include <fcntl.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <array>
+#include <cerrno>
 #include <utility>
 
 #include "include/mavoea.h"
+#include "tools/place/dry_run.h"
 #include "tools/say/messages.h"
 #include "tools/store/layout.h"
 
@@ -339,6 +342,11 @@ DirectoryRef NeedEaDirectory(const Directory& directory) {
     DirectoryRef found = directory.FindAgain(kEaDirName);
     // Services tidy up as well.
     if (found && found->Status().st_nlink > 0) return found;
+    if (DryRun()) {
+        const int error = ::geteuid() == 0 ? WhyNoNewFile(directory) : EPERM;
+        if (error == 0) return nullptr;
+        throw LibraryFailure(directory.PathOf(kEaDirName), {MAVOEA_ERR_MAKE_DIRECTORY, error});
+    }
     const ErrorMark mark;
     if (MAVOEAMKDir(0, directory.ProcPath(kEaDirName).c_str()) != 0) {
         throw LibraryFailure(directory.PathOf(kEaDirName), mark.Get());

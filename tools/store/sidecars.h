@@ -116,7 +116,7 @@ bool TakeLeftEaDirectory();
 void RemoveLeftEaDirectory(const Directory& directory);
 
 // The EA directory, made where it is missing; for that the process becomes the superuser for a
-// moment, if it may. Throws Failure.
+// moment, if it may. Throws Failure. Null where a dry run would have made it.
 DirectoryRef NeedEaDirectory(const Directory& directory);
 
 }  // namespace mavoea::tool

@@ -595,10 +595,10 @@ Written Writer::Foresee(const Object& to, const Inode& inode, const Metadata& fi
             if (const int error = WhyNoNewFile(*to.place.directory)) {
                 throw SystemFailure(to.place.directory->PathOf(name), error);
             }
-        } else if (old.ea_dir) {
+        } else if (const DirectoryRef ea_dir = NeedEaDirectory(*to.place.directory)) {
             const std::string name = NameInEaDirectory(to.place.name) + part.kind;
-            if (const int error = WhyNoNewFile(*old.ea_dir)) {
-                throw SystemFailure(old.ea_dir->PathOf(name), error);
+            if (const int error = WhyNoNewFile(*ea_dir)) {
+                throw SystemFailure(ea_dir->PathOf(name), error);
             }
         }
         if (part.whole) written.whole.insert(part.whole->path());

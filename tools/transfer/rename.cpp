@@ -253,7 +253,6 @@ class Renaming {
     // dry run would have made.
     DirectoryRef DirectoryAt(Level level) {
         if (level == kBeside) return to_.directory;
-        if (DryRun()) return to_.directory->FindAgain(kEaDirName);
         if (const auto& pending = pending_[0][level]) return pending->holder();
         return NeedEaDirectory(*to_.directory);
     }
