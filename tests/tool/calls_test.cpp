@@ -22,6 +22,7 @@ struct Work {
     std::vector<std::string> command;  // the tree comes behind it
     bool carries;                      // to a second tree
     int most;                          // calls for an object
+    bool bare = false;                 // objects have no metadata
 };
 void PrintTo(const Work& work, std::ostream* out) { *out << work.name << "OnType" << work.type; }
 
@@ -32,20 +33,14 @@ class CallsTest : public ::testing::TestWithParam<Work> {
         MAVOEA_SKIP_UNLESS_STOPPED();
     }
 
-    // For a tree of so many objects, with two attributes and Finder info each.
+    // For a tree of so many objects, with two attributes and Finder info each, or bare.
     static int CallsFor(int count) {
         const Work& work = GetParam();
         const Travel travel(work.type, work.type);
         const fs::path tree = travel.From("tree");
         fs::create_directory(tree);
         travel.MakeFile(tree / "object000");
-        for (const char* const name : {"user.colour", "user.origin"}) {
-            EXPECT_EQ(0, travel.Run({"set", tree / "object000", name, "value"}).status);
-        }
-        EXPECT_EQ(0, travel
-                         .Run({"set", tree / "object000", "com.apple.FinderInfo", "--hex",
-                               FinderInfoDigits()})
-                         .status);
+        if (!work.bare) GiveAll(travel, tree / "object000");
         for (int i = 1; i < count; ++i) CopyFirst(tree, 1000 + i);
         Arguments arguments = work.command;
         arguments.push_back(tree);
@@ -58,6 +53,15 @@ class CallsTest : public ::testing::TestWithParam<Work> {
     }
 
  private:
+    static void GiveAll(const Travel& travel, const std::string& path) {
+        for (const char* const name : {"user.colour", "user.origin"}) {
+            EXPECT_EQ(0, travel.Run({"set", path, name, "value"}).status);
+        }
+        EXPECT_EQ(
+            0,
+            travel.Run({"set", path, "com.apple.FinderInfo", "--hex", FinderInfoDigits()}).status);
+    }
+
     // With all that lies beside it.
     static void CopyFirst(const fs::path& tree, int number) {
         const std::string name = "object" + std::to_string(number).substr(1);
@@ -81,6 +85,8 @@ INSTANTIATE_TEST_SUITE_P(
                       Work{"Copy", kEaDirectory, {"cp", "-r"}, true, 34},
                       Work{"List", kAppleDouble, {"list", "-r"}, false, 10},
                       Work{"List", kEaDirectory, {"list", "-r"}, false, 9},
+                      Work{"ListBare", kAppleDouble, {"list", "-r"}, false, 2, true},
+                      Work{"ListBare", kEaDirectory, {"list", "-r"}, false, 1, true},
                       Work{"Remove", kAppleDouble, {"rm", "-r"}, false, 16},
                       Work{"Remove", kEaDirectory, {"rm", "-r"}, false, 14},
                       Work{"Upgrade", kEaDirectory, {"upgrade", "-r"}, false, 0}));

@@ -286,6 +286,12 @@ const std::vector<Directory::Entry>& Directory::EntriesAtFirst() const {
     return *first_;
 }
 
+mode_t Directory::TypeAtFirst(const std::string& name) const {
+    if (!listed()) return 0;
+    const auto found = FirstFrom(*first_, name);
+    return found != first_->end() && found->name == name ? found->type : 0;
+}
+
 std::vector<std::string> Directory::NamesAtFirst(const std::string& prefix) const {
     std::set<std::string> names;
     const std::vector<Entry>& all = EntriesAtFirst();
@@ -353,6 +359,11 @@ std::optional<struct stat> Directory::StatusOf(const std::string& name) const {
     if (::fstatat(fd(), name.c_str(), &info, AT_SYMLINK_NOFOLLOW) == 0) return info;
     if (errno == ENOENT || errno == ENAMETOOLONG) return std::nullopt;
     throw SystemFailure(PathOf(name), errno);
+}
+
+bool Directory::HasWithoutAttributes(const std::string& name) const {
+    if (foreseen() || Foreseen::Find(*this, name) != nullptr) return false;
+    return ::llistxattr(ProcPath(name).c_str(), nullptr, 0) == 0;
 }
 
 std::string Directory::NameOf(const struct stat& info, const std::string& name) const {

@@ -96,6 +96,8 @@ class Directory : public std::enable_shared_from_this<Directory> {
     // process made it.
     const std::vector<Entry>& EntriesAtFirst() const;
     void ForgetEntries() const { first_.reset(); }
+    // Of what, when it was listed, had that name; 0 for what did not, or where nobody has asked.
+    mode_t TypeAtFirst(const std::string& name) const;
     bool listed() const { return first_ != nullptr; }
 
     // The names in it that begin so, with those that this process has put there since; sorted.
@@ -126,6 +128,8 @@ class Directory : public std::enable_shared_from_this<Directory> {
     // None when nothing of that name is there.
     std::optional<struct stat> StatusOf(const std::string& name) const;
     bool Has(const std::string& name) const { return StatusOf(name).has_value(); }
+    // Whether it is there and has no extended attribute of any kind. False where nobody can tell.
+    bool HasWithoutAttributes(const std::string& name) const;
 
     // The name under which a file is listed that is found under `name`, which may be spelled
     // otherwise; `name` itself where it is listed.

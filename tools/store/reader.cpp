@@ -270,7 +270,30 @@ Metadata ReadMetadata(const Object& object, const Inode& inode, const Sidecars& 
     return metadata;
 }
 
+namespace {
+
+// That of a file which has nothing but its mode, without opening it. None for any other.
+std::optional<Metadata> ReadBare(const Object& object, const Sidecars& sidecars) {
+    const Place& place = object.place;
+    if (!S_ISREG(place.directory->TypeAtFirst(place.name))) return std::nullopt;
+    if (sidecars.Any() || sidecars.problem) return std::nullopt;
+    // Elsewhere most files have some attribute, or a fork may be beneath the file itself.
+    const bool beside =
+        object.keeping() == Keeping::kAppleDouble || object.keeping() == Keeping::kEaDirectory;
+    if (!beside || object.dialect() != nullptr) return std::nullopt;
+    if (!place.directory->HasWithoutAttributes(place.name)) return std::nullopt;
+    Metadata metadata;
+    if (const std::string depot = FindDepot(object, nullptr, {}); !depot.empty()) {
+        metadata.problems.push_back(DepotIsUnknown(object, depot));
+    }
+    metadata.locked = LocksByMode(object) && (StatusOf(place).st_mode & kWriteBits) == 0;
+    return metadata;
+}
+
+}  // namespace
+
 Metadata ReadMetadata(const Object& object, const Sidecars& sidecars) {
+    if (auto bare = ReadBare(object, sidecars)) return *std::move(bare);
     return ReadMetadata(object, *Inode::Open(object.place), sidecars);
 }
 
