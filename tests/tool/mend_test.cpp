@@ -60,11 +60,28 @@ class MendTest : public ::testing::Test {
         return RunTool(arguments, {}, limits);
     }
     ToolResult Check() const { return Run({"check", "-r", dir_.path()}); }
+    // Each is foreseen by a dry run, which changes nothing.
     ToolResult Repair(const Arguments& options = {}) const {
         Arguments arguments = {"check", "-r", "--repair"};
         arguments.insert(arguments.end(), options.begin(), options.end());
         arguments.push_back(dir_.path());
-        return Run(arguments);
+        Arguments dry = arguments;
+        dry.insert(dry.begin() + 1, "--dry-run");
+        const Snapshot before = TakeSnapshot(dir_.path());
+        const ToolResult said = Run(dry);
+        EXPECT_THAT(Differences(before, TakeSnapshot(dir_.path())), IsEmpty());
+        const ToolResult done = Run(arguments);
+        EXPECT_EQ(done.out, WithoutCounts(said.out));
+        EXPECT_EQ(done.err, said.err);
+        EXPECT_EQ(done.status, said.status);
+        return done;
+    }
+    // Which --verbose has as well, and JSON always.
+    static std::string WithoutCounts(const std::string& text) {
+        const std::size_t end = text.find_last_of('\n', text.size() - 2);
+        const std::size_t last = end == std::string::npos ? 0 : end + 1;
+        const bool counts = text.find(" checked, ", last) != std::string::npos;
+        return counts && text[last] != '/' ? text.substr(0, last) : text;
     }
     // "KIND mended" or "KIND left", sorted, each once.
     std::set<std::string> Became(const Arguments& options = {}) const {
@@ -815,13 +832,48 @@ TEST_F(MendTest, WhatAServiceHasLockedIsLeftAlone) {
     Bytes damaged = Image().Build();
     PutU32(damaged, kTotalSizeAt, 130);
     PutStream(Add("a"), damaged);
-    const HeldLock lock(dir_ / "@eaDir/a@MavoEAStream");
-    const ToolResult result = Repair();
-    EXPECT_EQ(0, result.status);
-    EXPECT_EQ("", result.out);
-    EXPECT_THAT(result.err, HasSubstr("in use by another process: not looked into"));
+    {
+        const HeldLock lock(dir_ / "@eaDir/a@MavoEAStream");
+        for (const char* const option : {"--dry-run", "--repair"}) {
+            const ToolResult result = Run({"check", "-r", "--repair", option, dir_.path()});
+            EXPECT_EQ(0, result.status);
+            EXPECT_EQ("", WithoutCounts(result.out));
+            EXPECT_THAT(result.err, HasSubstr("in use by another process: not looked into"));
+        }
+    }
     EXPECT_EQ(damaged, BytesIn(dir_ / "@eaDir/a@MavoEAStream"));
     EXPECT_THAT(NamesIn(dir_ / "@eaDir"), ElementsAre("a@MavoEAStream"));
+}
+
+TEST_F(MendTest, ADryRunIsOneOfARepairAndHasNoLog) {
+    const ToolResult alone = Run({"check", "--dry-run", dir_.path()});
+    EXPECT_EQ(2, alone.status);
+    EXPECT_THAT(alone.err, HasSubstr("--dry-run requires --repair"));
+    const ToolResult logged =
+        Run({"check", "--repair", "--dry-run", "--log", dir_ / "log", dir_.path()});
+    EXPECT_EQ(2, logged.status);
+    EXPECT_THAT(logged.err, HasSubstr("--dry-run excludes --log"));
+}
+
+TEST_F(MendTest, ADryRunForeseesWhatAnotherUserMayNotMend) {
+    MAVOEA_SKIP_UNLESS_ROOT();
+    chmod(dir_.path().c_str(), 0755);
+    Bytes damaged = Image().Build();
+    PutU32(damaged, kTotalSizeAt, 130);
+    PutStream(Add("a"), damaged);
+    chmod((dir_ / "a").c_str(), 0666);
+    chmod((dir_ / "@eaDir").c_str(), 0755);
+    chmod((dir_ / "@eaDir/a@MavoEAStream").c_str(), 0666);
+    const Arguments words = {"check", "-r", "--repair", dir_.path()};
+    Arguments dry = words;
+    dry.emplace_back("--dry-run");
+    const ToolResult said = Run(dry, {.user = 54321});
+    const ToolResult done = Run(words, {.user = 54321});
+    EXPECT_EQ(1, done.status);
+    EXPECT_THAT(done.out, HasSubstr("; left: Permission denied"));
+    EXPECT_EQ(done.status, said.status);
+    EXPECT_EQ(done.out, WithoutCounts(said.out));
+    EXPECT_EQ(done.err, said.err);
 }
 
 TEST_F(MendTest, FilesOfSeveralNamesAndLinksAreLeftAlone) {

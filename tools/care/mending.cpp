@@ -19,6 +19,7 @@
 #include "tools/care/repair.h"
 #include "tools/care/strays.h"
 #include "tools/care/whole_file.h"
+#include "tools/place/dry_run.h"
 #include "tools/say/text.h"
 #include "tools/store/acceptance.h"
 #include "tools/store/adoption.h"
@@ -131,6 +132,9 @@ class Account {
         readable_[KeyOf(finding)] = readable;
     }
 
+    // That a second look in a dry run finds it still says nothing.
+    void SetForeseen(const Finding& finding) { foreseen_.insert(KeyOf(finding)); }
+
     bool HasKept(const std::string& path) const {
         return std::any_of(kept_.begin(), kept_.end(),
                            [&](const auto& one) { return one.second == path; });
@@ -139,7 +143,9 @@ class Account {
     void Say(const std::vector<Finding>& before, const std::vector<Finding>& after, bool looked,
              MendingSink* sink) const {
         std::set<Key> left;
-        for (const Finding& finding : after) left.insert(KeyOf(finding));
+        for (const Finding& finding : after) {
+            if (!IsForeseen(finding)) left.insert(KeyOf(finding));
+        }
         std::set<Key> said;
         for (const Finding& finding : before) {
             const bool fixed =
@@ -161,6 +167,9 @@ class Account {
         const auto found = map.find(KeyOf(finding));
         return found == map.end() ? std::string() : found->second;
     }
+    bool IsForeseen(const Finding& finding) const {
+        return foreseen_.contains(KeyOf(finding)) && !why_.contains(KeyOf(finding));
+    }
     Mended Done(const Finding& finding) const { return {.done = true, .kept = In(kept_, finding)}; }
     Mended Left(const Finding& finding) const {
         std::string why = In(why_, finding);
@@ -174,6 +183,7 @@ class Account {
     std::map<Key, std::string> kept_;
     std::map<Key, std::string> why_;
     std::map<Key, std::string> readable_;
+    std::set<Key> foreseen_;
 };
 
 WhyIgnored WhyIgnoredBy(FindingKind kind) {
@@ -202,6 +212,10 @@ void MendRights(const Object& object, const Place& place) {
     if (info.st_uid != inode->info().st_uid && ::geteuid() != 0) {
         throw Failure(kFailed, place.path(), "only the superuser may give it to the object's owner",
                       "give the command as root");
+    }
+    if (DryRun()) {
+        if (const int error = WhyNoWriting(place)) throw SystemFailure(place.path(), error);
+        return;
     }
     Rights::Of(*inode).GiveAgain(*file);
 }
@@ -314,6 +328,8 @@ class ObjectMending {
     }
 
     void MendBy(Way way, const Finding& finding) {
+        // What the library would do, and what would go, cannot be looked at.
+        if (DryRun() && way != Way::kNul) account_.SetForeseen(finding);
         switch (way) {
             case Way::kRights:
                 if (const auto own = OwnFile(finding.file)) MendRights(object_, own->file);
@@ -414,7 +430,10 @@ class ObjectMending {
 
     void MendStray(const Finding& finding) {
         if (!AdoptStray(object_, finding.file)) return;
-        if (replaced_ == Replaced::kRemoved) return RemoveStray(object_, finding.file);
+        if (replaced_ == Replaced::kRemoved) {
+            if (!DryRun()) RemoveStray(object_, finding.file);
+            return;
+        }
         account_.SetWhy(finding, "all of it is in its place now; --yes removes the file");
     }
 
@@ -500,6 +519,10 @@ std::string MendingText() {
 
 void MendObject(const Object& object, Replaced replaced, MendingSink* sink) {
     ObjectMending(object, replaced, sink).Run();
+    if (!DryRun()) return;
+    // Each object is looked at by itself, and takes descriptors.
+    Foreseen::ForgetAll();
+    Rehearsed::Forget();
 }
 
 void MendDirectory(const DirectoryRef& directory, MendingSink* sink) {
@@ -512,12 +535,16 @@ void MendDirectory(const DirectoryRef& directory, MendingSink* sink) {
     };
     const auto mend = [&](Way way, auto work) {
         if (!has(way)) return;
+        const auto each = [&](const auto& note) {
+            for (const Finding& one : before.findings) {
+                if (WayOf(one.kind) == way) note(one);
+            }
+        };
         try {
             work();
+            if (DryRun()) each([&](const Finding& one) { account.SetForeseen(one); });
         } catch (const Failure& failure) {
-            for (const Finding& one : before.findings) {
-                if (WayOf(one.kind) == way) account.SetWhy(one, failure.cause());
-            }
+            each([&](const Finding& one) { account.SetWhy(one, failure.cause()); });
         }
     };
     mend(Way::kSettle, [&] { (void)SettlePending(directory); });

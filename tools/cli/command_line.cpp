@@ -144,7 +144,7 @@ void AddTree(CLI::App* sub, Options* options) {
     AddPaths(sub, options, "PATH", "Files and directories");
 }
 
-// Of commands that change things, and have --verbose.
+// Of commands that change things, and have said before what they say of it.
 void AddDryRunOnly(CLI::App* sub, Options* options) {
     sub->add_flag("-n,--dry-run", options->dry_run,
                   "Say that, as far as it is known before, and change nothing");
@@ -457,7 +457,10 @@ constexpr Syntax kCommands[] = {
                        "What repairs have replaced goes, where the object has all that it holds")
              ->needs(repair);
          sub->footer(MendingText() + '\n' + FindingCodes());
+         AddDryRunOnly(sub, options);
+         sub->get_option("--dry-run")->needs(repair);
          AddLoggedTree(sub, options);
+         KeepDryRunsUnlogged(sub);
      }},
     {Command::kConvert, "convert",
      "Copy an object or a tree to a volume of another type, and compare the two",

@@ -336,7 +336,7 @@ ExitStatus Run(const Options& options) {
                           .json = options.json});
         case Command::kCheck:
             return CheckSoundness({.tree = tree,
-                                   .verbose = options.verbose,
+                                   .verbose = verbose,
                                    .repair = options.repair,
                                    .remove = options.yes});
         case Command::kConvert:

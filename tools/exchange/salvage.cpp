@@ -192,7 +192,7 @@ ExitStatus Salvage(const SalvageOptions& options) {
     Rescue rescue(target);
     rescue.Write(metadata);
     rescue.WriteManifest(object, metadata);
-    if (!DryRun()) target.directory->Sync();
+    target.directory->Sync();
     if (options.verbose && !options.json) std::cout << rescue.Text(object);
     if (options.json) Print(rescue.json());
     for (const Failure& problem : metadata.problems) Report(problem);

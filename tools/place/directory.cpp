@@ -3,6 +3,7 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/mman.h>
 #include <sys/random.h>
 #include <sys/xattr.h>
 #include <unistd.h>
@@ -378,8 +379,7 @@ std::string Directory::NameOf(const struct stat& info, const std::string& name) 
 
 std::shared_ptr<const File> Directory::FindFile(const std::string& name, int flags) const {
     if (const auto* const entry = Foreseen::Find(*this, name); entry != nullptr || foreseen()) {
-        const bool none = entry == nullptr || !entry->contents_in;
-        return none ? nullptr : entry->contents_in->FindFile(entry->contents_name, O_RDONLY);
+        return entry == nullptr ? nullptr : entry->Open(flags);
     }
     // Never waits for the other end of a FIFO, or for whoever holds a lease.
     const int all = flags | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
@@ -454,9 +454,12 @@ bool Directory::RenameToNew(const std::string& name, const Directory& to,
     return true;
 }
 
-void Directory::Sync() const { Reopened().Sync(); }
+void Directory::Sync() const {
+    if (!DryRun()) Reopened().Sync();
+}
 
 void Directory::SyncVolume() const {
+    if (DryRun()) return;
     if (::syncfs(Reopened().fd()) != 0) throw SystemFailure(path(), errno);
 }
 
@@ -650,6 +653,7 @@ void Inode::SetTimes(const timespec (&times)[2]) const {
 }
 
 void Inode::Sync() const {
+    if (DryRun()) return;
     if (!by_path_) return file_->Sync();
     const File opened(::open(ProcPath().c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC),
                       path());
@@ -710,6 +714,10 @@ void TemporaryFile::TryNames(Use use) const {
 }
 
 TemporaryFile::TemporaryFile(const Place& target, mode_t mode) : target_(target) {
+    if (DryRun()) {
+        MakeInMemory(mode);
+        return;
+    }
     if (MakeNameless(mode)) return;
     TryNames([&](const std::string& name) {
         constexpr int kMake = O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
@@ -731,6 +739,11 @@ TemporaryFile::~TemporaryFile() {
 }
 
 void TemporaryFile::GiveToTarget() {
+    if (DryRun()) {
+        const int error = target_.Status() ? WhyNoRemoval(target_) : 0;
+        if (error != 0) throw SystemFailure(target_.path(), error);
+        return Foreseen::Come(target_, file_);
+    }
     if (name_.empty()) {
         if (LinkTo(target_.name)) return target_.directory->NoteCome(target_.name);
         if (errno != EEXIST) throw SystemFailure(target_.path(), errno);
@@ -742,6 +755,10 @@ void TemporaryFile::GiveToTarget() {
 }
 
 void TemporaryFile::GiveToNewTarget() {
+    if (DryRun()) {
+        if (target_.Status()) throw SystemFailure(target_.path(), EEXIST);
+        return Foreseen::Come(target_, file_);
+    }
     if (name_.empty()) {
         if (LinkTo(target_.name)) return target_.directory->NoteCome(target_.name);
         throw SystemFailure(target_.path(), errno);
@@ -759,6 +776,17 @@ void TemporaryFile::GiveToNewTarget() {
     name_.clear();
     target_.directory->NoteCome(target_.name);
     RequireTarget();
+}
+
+// For a dry run, so that what would be written can be looked at.
+void TemporaryFile::MakeInMemory(mode_t mode) {
+    if (const int error = WhyNoNewFile(*target_.directory)) {
+        throw SystemFailure(target_.path(), error);
+    }
+    file_ = std::make_shared<const File>(::memfd_create("mavoea", MFD_CLOEXEC), target_.path());
+    if (file_->fd() < 0 || ::fchmod(file_->fd(), mode) != 0) {
+        throw SystemFailure(target_.path(), errno);
+    }
 }
 
 // False where the file system, or the kernel, has no such files.

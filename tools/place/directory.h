@@ -307,6 +307,7 @@ class TemporaryFile {
     void GiveToNewTarget();
 
  private:
+    void MakeInMemory(mode_t mode);
     bool MakeNameless(mode_t mode);
     bool LinkTo(const std::string& name) const;
     void NeedName();

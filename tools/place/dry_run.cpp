@@ -132,6 +132,22 @@ void Foreseen::Come(const Place& place, const struct stat& info, const Place* fr
     place.directory->Forget(place.name);
 }
 
+void Foreseen::Come(const Place& place, const std::shared_ptr<const File>& file) {
+    Come(place, file->Status());
+    State().directories[IdOf(place.directory->Status())][place.name].contents = file;
+}
+
+std::shared_ptr<const File> Foreseen::Entry::Open(int flags) const {
+    if (contents) {
+        const std::string path = "/proc/self/fd/" + std::to_string(contents->fd());
+        auto file =
+            std::make_shared<const File>(::open(path.c_str(), flags | O_CLOEXEC), contents->path());
+        if (file->fd() < 0) throw SystemFailure(contents->path(), errno);
+        return file;
+    }
+    return contents_in ? contents_in->FindFile(contents_name, O_RDONLY) : nullptr;
+}
+
 void Foreseen::Go(const Directory& directory, const std::string& name) {
     State().directories[IdOf(directory.Status())][name] = {};
     directory.Forget(name);
@@ -152,6 +168,8 @@ bool Foreseen::HasGone(const struct stat& directory) {
 void Foreseen::Forget(const Directory& directory) {
     State().directories.erase(IdOf(directory.Status()));
 }
+
+void Foreseen::ForgetAll() { State() = {}; }
 
 struct stat Foreseen::StatusOfNew(const Directory& directory, mode_t mode) {
     const struct stat around = directory.Status();

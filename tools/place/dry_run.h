@@ -6,6 +6,7 @@
 #include <sys/stat.h>
 
 #include <map>
+#include <memory>
 #include <optional>
 #include <string>
 
@@ -31,9 +32,13 @@ class Foreseen {
  public:
     struct Entry {
         std::optional<struct stat> info = {};  // none: it would be gone
-        // Where the same contents are; a null directory where nobody asks for them.
+        // What would be in it: what is in this file, or in that one; none where nobody asks.
+        std::shared_ptr<const File> contents = {};
         DirectoryRef contents_in = {};
         std::string contents_name = {};
+
+        // Null where that is not known.
+        std::shared_ptr<const File> Open(int flags) const;
     };
     using Entries = std::map<std::string, Entry>;
 
@@ -43,6 +48,8 @@ class Foreseen {
 
     // `from` is what it would be a copy of.
     static void Come(const Place& place, const struct stat& info, const Place* from = nullptr);
+    // A file in memory that would get that name.
+    static void Come(const Place& place, const std::shared_ptr<const File>& file);
     static void Go(const Directory& directory, const std::string& name);
     // A directory with all that was in it.
     static void GoWithAll(const Directory& directory, const std::string& name);
@@ -51,6 +58,8 @@ class Foreseen {
 
     // Nobody will look into it any more.
     static void Forget(const Directory& directory);
+    // From here on all is as it is on disk.
+    static void ForgetAll();
 
     // Of something new there, with a number that nothing has.
     static struct stat StatusOfNew(const Directory& directory, mode_t mode);

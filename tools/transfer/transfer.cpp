@@ -936,7 +936,6 @@ void Transfer::ForgetMade() {
 }
 
 void Transfer::MakeDurable() {
-    if (DryRun()) return;
     for (const auto& [device, directory] : volumes_) directory->SyncVolume();
 }
 
