@@ -359,9 +359,9 @@ def has_strace():
     return shutil.which("strace") is not None
 
 
-def compare_memory(options, room):
-    print("\nMost memory, in MiB, of {0:,} and of {1:,} objects".format(options.objects,
-                                                                  10 * options.objects))
+def compare_growth(options, room):
+    print("\nMost memory, in MiB, and microseconds an object, of {0:,} and of {1:,} objects".format(
+        options.objects, 10 * options.objects))
     wanted = ("cp -r 1 to 1", "convert 1 to 0", "list -r 1", "rm -r 1", "upgrade -r 1")
     rows = {}
     for count in (options.objects, 10 * options.objects):
@@ -371,12 +371,17 @@ def compare_memory(options, room):
             if name not in wanted:
                 continue
             [command] = work.ours(volumes, *work.prepare(volumes, "tmpfs"))
-            rows.setdefault(name, []).append(peak(command) / 1024)
+            began = time.perf_counter()
+            memory = peak(command) / 1024
+            took = (time.perf_counter() - began) / count * 1e6
+            rows.setdefault(name, []).append((memory, took))
         for name in FILE_SYSTEMS:
             for which in "ab":
                 run("umount", volumes.path(name, which))
-    for name, peaks in rows.items():
-        print(f"{name.ljust(20)}" + "".join(f"{value:8.1f}" for value in peaks))
+    for name, values in rows.items():
+        memory, took = zip(*values)
+        print(name.ljust(20) + "".join(f"{value:8.1f}" for value in memory)
+              + "".join(f"{value:8.0f}" for value in took))
 
 
 def spawned(command):
@@ -448,7 +453,8 @@ def main():
     parser.add_argument("--quick", action="store_true", help="1,000 objects, one round")
     parser.add_argument("--only", default="", metavar="PATTERN",
                         help='rows such as "cp -r 1 to 0", "list -r 7"')
-    parser.add_argument("--memory", action="store_true", help="how much memory it takes, instead")
+    parser.add_argument("--growth", action="store_true",
+                        help="what ten times as many objects take, instead")
     parser.add_argument("--start", action="store_true", help="the tool's start, instead")
     parser.add_argument("--jobs", action="store_true", help="two processes beside one, instead")
     parser.add_argument("--markdown", action="store_true", help="print the table for docs/speed.md")
@@ -462,7 +468,7 @@ def main():
         os.execvp("unshare", ["unshare", "-m", sys.executable, *sys.argv])
     room = tempfile.mkdtemp(prefix="mavoea-bench-")
     try:
-        measure = (compare_memory if options.memory else compare_start if options.start
+        measure = (compare_growth if options.growth else compare_start if options.start
                    else compare_jobs if options.jobs else compare)
         measure(options, room)
     finally:
