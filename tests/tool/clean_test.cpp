@@ -9,6 +9,7 @@
 
 #include "tests/support/object_files.h"
 #include "tests/support/process.h"
+#include "tests/support/snapshot.h"
 #include "tests/tool/tool.h"
 
 namespace mavoea::test {
@@ -35,7 +36,26 @@ class CleanTest : public ::testing::Test {
     ToolResult Clean(Arguments arguments = {}) const {
         arguments.insert(arguments.begin(), {"clean", "--wait", "0"});
         arguments.push_back(dir_.path());
-        return RunTool(arguments);
+        const bool removes =
+            std::find(arguments.begin(), arguments.end(), "--yes") != arguments.end();
+        return removes ? CleanAsForeseen(arguments) : RunTool(arguments);
+    }
+
+    // By a dry run, which changes nothing.
+    ToolResult CleanAsForeseen(const Arguments& arguments) const {
+        Arguments dry = arguments;
+        dry.emplace_back("--dry-run");
+        const Snapshot before = TakeSnapshot(dir_.path());
+        const ToolResult said = RunTool(dry);
+        // Access times stay where the user may have that.
+        std::set<std::string> ignored;
+        if (geteuid() != 0) ignored.insert("atime");
+        EXPECT_THAT(Differences(before, TakeSnapshot(dir_.path()), ignored), IsEmpty());
+        const ToolResult done = RunTool(arguments);
+        EXPECT_EQ(done.out, said.out);
+        EXPECT_EQ(done.err, said.err);
+        EXPECT_EQ(done.status, said.status);
+        return done;
     }
 
     // What a run would remove, without what it would keep; paths from the directory on.

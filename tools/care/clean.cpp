@@ -13,6 +13,7 @@
 
 #include "include/mavoea.h"
 #include "tools/care/dangling.h"
+#include "tools/place/dry_run.h"
 #include "tools/place/volume.h"
 #include "tools/say/interrupt.h"
 #include "tools/say/output.h"
@@ -41,6 +42,7 @@ class Removal {
 
     // Throws Failure.
     Fate Remove(const Dangling& dangling) {
+        if (DryRun()) return Foresee(dangling);
         switch (dangling.kind) {
             case DanglingKind::kTemporary:
                 return RemoveAbandoned(*dangling.holder, dangling.name) ? Fate::kRemoved
@@ -62,6 +64,15 @@ class Removal {
     }
 
  private:
+    Fate Foresee(const Dangling& dangling) const {
+        const bool is_directory = dangling.kind == DanglingKind::kEaDirectory;
+        if (is_directory && !HasOnlyCover(dangling)) return Fate::kGone;
+        const int error = WhyNoRemoval({dangling.holder, dangling.name});
+        if (error != 0) throw SystemFailure(dangling.holder->PathOf(dangling.name), error);
+        Foreseen::Go(*dangling.holder, dangling.name);
+        return Fate::kRemoved;
+    }
+
     Fate Settle(const Dangling& dangling) const {
         const auto owner = PendingOwner::Parse(dangling.name);
         if (!owner) return Fate::kGone;
@@ -72,15 +83,19 @@ class Removal {
 
     // Unless something has come into it, or could not be removed.
     bool RemoveEaDirectory(const Dangling& dangling) const {
+        if (!HasOnlyCover(dangling)) return false;
+        const DirectoryRef ea_dir = directory_->FindIn(dangling.name);
+        if (ea_dir) (void)ea_dir->RemoveFile(kCoverName);
+        return directory_->RemoveEmpty(dangling.name);
+    }
+
+    bool HasOnlyCover(const Dangling& dangling) const {
         const DirectoryRef ea_dir = directory_->FindIn(dangling.name);
         if (!ea_dir) return false;
         const auto entries = ea_dir->Entries();
-        const bool only_cover = std::all_of(entries.begin(), entries.end(), [](const auto& entry) {
+        return std::all_of(entries.begin(), entries.end(), [](const auto& entry) {
             return entry.name == kCoverName && S_ISREG(entry.type);
         });
-        if (!only_cover) return false;
-        (void)ea_dir->RemoveFile(kCoverName);
-        return directory_->RemoveEmpty(dangling.name);
     }
 
     Fate TakeAndRemove(const Dangling& dangling) {
@@ -187,7 +202,7 @@ class Cleaning {
         if (progress_.wanted()) ShowProgress(place.path());
         const DirectoryRef directory = place.directory->OpenIn(place.name);
         Looked looked = Look(directory);
-        if (options_.remove && GiveBack(looked)) looked = Look(directory);
+        if (options_.remove && !DryRun() && GiveBack(looked)) looked = Look(directory);
         const bool any_goes = std::any_of(looked.found.begin(), looked.found.end(),
                                           [this](const Dangling& one) { return !Stays(one); });
         if (!options_.remove || !any_goes) {

@@ -435,7 +435,10 @@ constexpr Syntax kCommands[] = {
     {Command::kClean, "clean", "List metadata whose object is gone, and remove it with --yes",
      [](CLI::App* sub, Options* options) {
          AddRecursive(sub, options);
-         sub->add_flag("--yes", options->yes, "Remove what is listed, when a second look finds it");
+         CLI::Option* const yes = sub->add_flag(
+             "--yes", options->yes, "Remove what is listed, when a second look finds it");
+         AddDryRunOnly(sub, options);
+         sub->get_option("--dry-run")->needs(yes);
          sub->add_option("--wait", options->wait,
                          "How long after the first look the second one comes; 0: at once")
              ->type_name("SECONDS")
