@@ -50,19 +50,20 @@ class Locking {
     }
 
  private:
-    // Tells the status; then the path and whether it was otherwise before, or what failed.
+    // Tells whether it could be done; then the path and whether it was otherwise before, or the
+    // failure.
     bool DoObject(const Object& object, const Tell& tell) const {
         Packer told;
         bool done = false;
         try {
             const bool changed = SetLocked(object, locked_);
-            told.AddNumber(kSuccess);
+            told.AddNumber(1);
             told.AddText(object.path());
             told.AddNumber(changed ? 1 : 0);
             done = true;
         } catch (const Failure& failure) {
-            told.AddNumber(static_cast<std::uint64_t>(failure.status()));
-            told.AddText(failure.what());
+            told.AddNumber(0);
+            told.AddFailure(object.path(), failure);
         }
         tell(told.bytes());
         return done;
@@ -70,19 +71,21 @@ class Locking {
 
     void Hear(std::string_view told) {
         Unpacker said(told);
-        const auto status = static_cast<ExitStatus>(said.TakeNumber());
-        const std::string text(said.TakeText());
-        if (status != kSuccess) return Fail(status, text);
+        if (said.TakeNumber() == 0) {
+            const ToldFailure failure = said.TakeFailure();
+            return Fail(failure.status, failure.message);
+        }
+        const std::string path(said.TakeText());
         const bool changed = said.TakeNumber() != 0;
         ++(changed ? changed_ : same_);
         if (options_.json) {
             Json entry;
-            entry.SetText("path", text);
+            entry.SetText("path", path);
             entry.Set("locked", locked_);
             json_.Add(std::move(entry));
         } else if (options_.verbose) {
             progress_.Clear();
-            std::cout << Printable(text) << ": " << words_[changed ? 0 : 1] << '\n';
+            std::cout << Printable(path) << ": " << words_[changed ? 0 : 1] << '\n';
         }
     }
 

@@ -91,7 +91,7 @@ class Conversion final : private TreeCopy {
                  },
              .fails =
                  [this](const Pair& pair, const Failure& failure) {
-                     Pack(pair.first.path(), failure, &found_.failures);
+                     found_.failures.AddFailure(pair.first.path(), failure);
                  },
              .take = [this] { return TakeFound(); },
              .add = [this](std::string_view told) { AddFound(told); },
@@ -226,17 +226,10 @@ class Conversion final : private TreeCopy {
         while (!said.empty()) AddFailure(&said);
     }
 
-    // As one is packed.
-    static void Pack(const std::string& path, const Failure& failure, Packer* packer) {
-        packer->AddNumber(static_cast<std::uint64_t>(failure.status()));
-        packer->AddText(path);
-        packer->AddText(failure.what());
-    }
     void AddFailure(Unpacker* said) {
-        const auto status = static_cast<ExitStatus>(said->TakeNumber());
-        const std::string path(said->TakeText());
-        failures_.push_back({path, std::string(said->TakeText())});
-        status_ = std::max(status_, status);
+        const ToldFailure failure = said->TakeFailure();
+        failures_.push_back({failure.path, failure.message});
+        status_ = std::max(status_, failure.status);
     }
 
     // Whether nothing that other objects of its directory become can meet what it becomes. What
@@ -275,7 +268,7 @@ class Conversion final : private TreeCopy {
         told.AddNumber(std::exchange(bytes_, bytes) - bytes);
         told.AddNumber(failed ? 1 : 0);
         if (failed) {
-            Pack(from.path(), *failed, &told);
+            told.AddFailure(from.path(), *failed);
         } else {
             told.AddText(line);
         }

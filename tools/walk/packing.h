@@ -19,12 +19,24 @@ std::string Packed(const Value& value) {
     return {reinterpret_cast<const char*>(&value), sizeof value};
 }
 
+// What went wrong with an object, in the words of the process that it went wrong in.
+struct ToldFailure {
+    std::string path;
+    ExitStatus status;
+    std::string message;
+};
+
 class Packer {
  public:
     void AddNumber(std::uint64_t number) { bytes_ += Packed(number); }
     void AddText(std::string_view text) {
         AddNumber(text.size());
         bytes_ += text;
+    }
+    void AddFailure(const std::string& path, const Failure& failure) {
+        AddText(path);
+        AddNumber(static_cast<std::uint64_t>(failure.status()));
+        AddText(failure.what());
     }
     const std::string& bytes() const { return bytes_; }
 
@@ -53,6 +65,13 @@ class Unpacker {
         const std::string_view text = bytes_.substr(0, size);
         bytes_.remove_prefix(size);
         return text;
+    }
+    ToldFailure TakeFailure() {
+        ToldFailure told;
+        told.path = TakeText();
+        told.status = static_cast<ExitStatus>(TakeNumber());
+        told.message = TakeText();
+        return told;
     }
     bool empty() const { return bytes_.empty(); }
 

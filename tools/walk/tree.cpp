@@ -262,9 +262,7 @@ class Work {
         } catch (const Failure& failure) {
             if (suits && HasGone(object.place, failure)) return {{}, true};
             told.AddNumber(kFailedOutcome);
-            told.AddText(object.path());
-            told.AddNumber(static_cast<std::uint64_t>(failure.status()));
-            told.AddText(failure.what());
+            told.AddFailure(object.path(), failure);
         }
         return {told.bytes(), false};
     }
@@ -274,9 +272,8 @@ class Work {
         Unpacker said(told);
         const std::uint64_t outcome = said.TakeNumber();
         if (outcome == kFailedOutcome) {
-            const std::string path(said.TakeText());
-            const auto status = static_cast<ExitStatus>(said.TakeNumber());
-            return report_.AddFailure(path, status, std::string(said.TakeText()));
+            const ToldFailure failure = said.TakeFailure();
+            return report_.AddFailure(failure.path, failure.status, failure.message);
         }
         report_.Add(std::string(said.TakeText()), static_cast<Outcome>(outcome));
         while (!said.empty()) report_.notes()->emplace_back(said.TakeText());
