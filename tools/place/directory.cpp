@@ -408,6 +408,7 @@ bool Directory::RemoveFile(const std::string& name) const {
 }
 
 bool Directory::Remove(const std::string& name) const {
+    if (DryRun()) return RemoveFile(name);
     if (::unlinkat(fd(), name.c_str(), 0) == 0) return true;
     if (errno == ENOENT) return false;
     if (errno != EISDIR) throw SystemFailure(PathOf(name), errno);
@@ -444,6 +445,11 @@ void Directory::Rename(const std::string& name, const Directory& to,
 
 bool Directory::RenameToNew(const std::string& name, const Directory& to,
                             const std::string& new_name) const {
+    if (DryRun()) {
+        if (to.Has(new_name)) return false;
+        Rename(name, to, new_name);
+        return true;
+    }
     if (::renameat2(fd(), name.c_str(), to.fd(), new_name.c_str(), RENAME_NOREPLACE) == 0) {
         return true;
     }
