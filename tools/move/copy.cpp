@@ -220,7 +220,7 @@ class Placement final : private TreeCopy {
         while (options_.strip_slashes && path.size() > 1 && path.back() == '/') path.pop_back();
         Place from = NamedPlace(path);
         const bool directory_only = path.ends_with('/');
-        const auto info = from.Status();
+        const auto info = WouldBeGone(from) ? std::nullopt : from.Status();
         if (!info && !Copies() && FinishMove(from, path)) return;
         if (!info) throw Refusal("cannot stat " + Quoted(path), ENOENT);
         if (directory_only && !S_ISDIR(info->st_mode)) {
@@ -304,8 +304,6 @@ class Placement final : private TreeCopy {
 
     void Finish(const Level& level) override {
         transfer_.FinishDirectory(level.from, *level.inside, level.to, level.made, level.is_new);
-        // Of several sources another one may come into it.
-        if (DryRun() && !job_options_.several()) Foreseen::Forget(*level.made);
         CountDone();
     }
 
@@ -752,7 +750,9 @@ class Placement final : private TreeCopy {
 
     // An empty directory may be replaced.
     static void ClearDirectory(const Place& to) {
-        if (!ObjectsIn(to.Open()).empty()) throw SystemFailure(to.path(), ENOTEMPTY);
+        const auto* const moved = Foreseen::Find(*to.directory, to.name);
+        const bool holds = moved != nullptr && moved->holds_entries;
+        if (holds || !ObjectsIn(to.Open()).empty()) throw SystemFailure(to.path(), ENOTEMPTY);
         const struct stat info = StatusOf(to);
         RemoveEmptyDirectory(ObjectAt(to, &info), true);
     }

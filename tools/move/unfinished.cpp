@@ -50,7 +50,12 @@ std::string TextIn(const File& file) {
 }  // namespace
 
 UnfinishedMove::UnfinishedMove(const Place& to, const struct stat& source) : to_(to) {
-    if (DryRun() || Find(to, source)) return;
+    if (Find(to, source)) return;
+    if (DryRun()) {
+        const int error = WhyNoNewFile(*to.directory);
+        if (error != 0) throw SystemFailure(FileFor(to).path(), error);
+        return;
+    }
     Forget();  // another move, which has no more to say
     TemporaryFile file(FileFor(to));
     file.file().Write(0, AsBytes(TextFor(source)));

@@ -36,7 +36,8 @@ FileId IdOf(const struct stat& info) { return {info.st_dev, info.st_ino}; }
 
 struct ForeseenState {
     std::map<FileId, Foreseen::Entries> directories;
-    std::set<FileId> gone;  // directories
+    std::set<FileId> gone;      // directories
+    std::set<FileId> finished;  // the same
     ino_t last_number = 0;
 };
 ForeseenState& State() {
@@ -137,6 +138,16 @@ void Foreseen::Come(const Place& place, const std::shared_ptr<const File>& file)
     State().directories[IdOf(place.directory->Status())][place.name].contents = file;
 }
 
+void Foreseen::ComeAppleDouble(const Place& place) {
+    Come(place, StatusOfNew(*place.directory, S_IFREG | S_IRUSR | S_IWUSR));
+    State().directories[IdOf(place.directory->Status())][place.name].is_apple_double = true;
+}
+
+void Foreseen::ComeDirectory(const Place& place, const struct stat& info, bool holds_entries) {
+    Come(place, info);
+    State().directories[IdOf(place.directory->Status())][place.name].holds_entries = holds_entries;
+}
+
 std::shared_ptr<const File> Foreseen::Entry::Open(int flags) const {
     if (contents) {
         const std::string path = "/proc/self/fd/" + std::to_string(contents->fd());
@@ -165,8 +176,12 @@ bool Foreseen::HasGone(const struct stat& directory) {
     return State().gone.contains(IdOf(directory));
 }
 
-void Foreseen::Forget(const Directory& directory) {
-    State().directories.erase(IdOf(directory.Status()));
+void Foreseen::NoteFinished(const struct stat& directory) {
+    State().finished.insert(IdOf(directory));
+}
+
+bool Foreseen::IsFinished(const struct stat& directory) {
+    return State().finished.contains(IdOf(directory));
 }
 
 void Foreseen::ForgetAll() { State() = {}; }

@@ -36,6 +36,8 @@ class Foreseen {
         std::shared_ptr<const File> contents = {};
         DirectoryRef contents_in = {};
         std::string contents_name = {};
+        bool is_apple_double = false;  // which is all that anybody asks of it
+        bool holds_entries = false;    // a directory that comes with what is in it
 
         // Null where that is not known.
         std::shared_ptr<const File> Open(int flags) const;
@@ -48,6 +50,10 @@ class Foreseen {
 
     // `from` is what it would be a copy of.
     static void Come(const Place& place, const struct stat& info, const Place* from = nullptr);
+    // A "._" file.
+    static void ComeAppleDouble(const Place& place);
+    // A directory that is there, from another place.
+    static void ComeDirectory(const Place& place, const struct stat& info, bool holds_entries);
     // A file in memory that would get that name.
     static void Come(const Place& place, const std::shared_ptr<const File>& file);
     static void Go(const Directory& directory, const std::string& name);
@@ -56,8 +62,10 @@ class Foreseen {
     // Whether one is gone, under whatever name it was found.
     static bool HasGone(const struct stat& directory);
 
-    // Nobody will look into it any more.
-    static void Forget(const Directory& directory);
+    // Whether a directory would have been given what it is a copy of.
+    static void NoteFinished(const struct stat& directory);
+    static bool IsFinished(const struct stat& directory);
+
     // From here on all is as it is on disk.
     static void ForgetAll();
 

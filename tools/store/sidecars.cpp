@@ -219,6 +219,8 @@ WholeFile FindAppleDouble(const Directory& directory, const std::string& name) {
 }
 
 bool IsAppleDouble(const Directory& directory, const std::string& name) {
+    const auto* const foreseen = Foreseen::Find(directory, name);
+    if (foreseen != nullptr && foreseen->is_apple_double) return true;
     const auto info = directory.StatusOf(name);
     return info && MayBeAppleDouble(*info) && FindAppleDouble(directory, name) != nullptr;
 }

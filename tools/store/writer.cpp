@@ -30,6 +30,19 @@ constexpr const char* kMoveAway = "see what it is, and move it away";
 
 // ---- Files --------------------------------------------------------------------------------------
 
+// What another process is changing is left to it.
+void RequireFree(const Place& target) {
+    if (!target.directory->MayHave(target.name)) return;
+    const auto info = target.Status();
+    if (!info) return;
+    if (S_ISLNK(info->st_mode)) return;  // goes by the new file's name
+    if (!S_ISREG(info->st_mode)) {
+        throw Failure(kFailed, target.path(), "something is in the way of metadata", kMoveAway);
+    }
+    const auto file = target.directory->FindFile(target.name, O_RDWR);
+    if (file) LockFile(*file, Access::kWrite);
+}
+
 // The files of an object, which get their names when all of them are whole.
 class NewFiles {
  public:
@@ -85,19 +98,6 @@ class NewFiles {
         Place target;
         std::unique_ptr<TemporaryFile> temporary;  // null: it is there already
     };
-
-    // What another process is changing is left to it.
-    static void RequireFree(const Place& target) {
-        if (!target.directory->MayHave(target.name)) return;
-        const auto info = target.Status();
-        if (!info) return;
-        if (S_ISLNK(info->st_mode)) return;  // goes by the new file's name
-        if (!S_ISREG(info->st_mode)) {
-            throw Failure(kFailed, target.path(), "something is in the way of metadata", kMoveAway);
-        }
-        const auto file = target.directory->FindFile(target.name, O_RDWR);
-        if (file) LockFile(*file, Access::kWrite);
-    }
 
     // What is small is put together in memory, and written and read back at once.
     static void Fill(const File& file, const Pieces& pieces) {
@@ -595,11 +595,14 @@ Written Writer::Foresee(const Object& to, const Inode& inode, const Metadata& fi
             if (const int error = WhyNoNewFile(*to.place.directory)) {
                 throw SystemFailure(to.place.directory->PathOf(name), error);
             }
+            const Place place = {to.place.directory, name};
+            if (!place.Status()) Foreseen::ComeAppleDouble(place);
         } else if (const DirectoryRef ea_dir = NeedEaDirectory(*to.place.directory)) {
             const std::string name = NameInEaDirectory(to.place.name) + part.kind;
             if (const int error = WhyNoNewFile(*ea_dir)) {
                 throw SystemFailure(ea_dir->PathOf(name), error);
             }
+            RequireFree({ea_dir, name});
         }
         if (part.whole) written.whole.insert(part.whole->path());
     }

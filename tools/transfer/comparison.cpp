@@ -116,8 +116,8 @@ class Comparison {
         }
         // Of what a dry run would have copied all but the metadata is sure to be the same.
         const Place& copy = copy_.place;
-        foreseen_ = DryRun() && (S_ISDIR(there.st_mode) ||
-                                 Foreseen::Find(*copy.directory, copy.name) != nullptr);
+        foreseen_ = S_ISDIR(there.st_mode) ? Foreseen::IsFinished(there)
+                                           : Foreseen::Find(*copy.directory, copy.name) != nullptr;
         if (S_ISREG(info.st_mode) && compared_.data && !foreseen_) Try([&] { CompareData(); });
         if (S_ISLNK(info.st_mode) && !foreseen_) Try([&] { CompareTargets(); });
         if ((S_ISBLK(info.st_mode) || S_ISCHR(info.st_mode)) && info.st_rdev != there.st_rdev) {
@@ -228,11 +228,18 @@ class Comparison {
     Metadata WhatWouldArrive(const Metadata& wanted) const {
         std::vector<Missing> missing;
         const Writer& writer = WriterFor(copy_);
-        Metadata fitting = writer.Fit(wanted, copy_, &missing);
-        RemoveItems(writer.Write(copy_, *Inode::Open(copy_.place), fitting, {}).missing, &fitting);
-        fitting.strays.clear();
-        fitting.problems.clear();
-        return fitting;
+        Metadata arrives = writer.Fit(wanted, copy_, &missing);
+        try {
+            const auto inode = Inode::Open(copy_.place);
+            RemoveItems(writer.Write(copy_, *inode, arrives, {}).missing, &arrives);
+        } catch (const Failure&) {  // it would be there with what lies there already
+            return ReadMetadata(copy_, Sidecars::Services::kFind);
+        }
+        arrives.strays.clear();
+        arrives.problems.clear();
+        const Sidecars beside = Sidecars::Find(copy_, Sidecars::Services::kLeaveOut);
+        if (beside.problem) arrives.problems.push_back(*beside.problem);
+        return arrives;
     }
 
     // What lies beside the original, and has no place in what is compared.

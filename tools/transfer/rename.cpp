@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <climits>
 #include <cstdio>
 
 #include "include/mavoea.h"
@@ -308,15 +309,28 @@ class Renaming {
 
     bool Foresee() const {
         if (AreApart(*from_.directory, *to_.directory)) return false;
-        int error = WhyNoRemoval(from_);
+        int error = to_.name.size() > NAME_MAX ? ENAMETOOLONG : WhyNoRemoval(from_);
         if (error == 0) error = there_ ? WhyNoRemoval(to_) : WhyNoNewFile(*to_.directory);
         // Its ".." becomes another.
         const bool changes =
             S_ISDIR(info_.st_mode) && !SameFile(from_.directory->Status(), to_.directory->Status());
         if (error == 0 && changes) error = WhyNoWriting(from_);
         if (error != 0) throw SystemFailure(from_.path(), error);
+        // What this has put beside it goes with it.
+        const std::string beside = AppleDoubleName(from_.name);
+        const auto* const own = Foreseen::Find(*from_.directory, beside);
+        if (own != nullptr && own->is_apple_double) {
+            Foreseen::Go(*from_.directory, beside);
+            Foreseen::ComeAppleDouble({to_.directory, AppleDoubleName(to_.name)});
+        }
         for (const Step& step : steps_) Foreseen::Go(*step.from.directory, step.from.name);
         for (const Found& old : old_.Files()) Foreseen::Go(*old.directory, old.name);
+        if (S_ISDIR(info_.st_mode)) {
+            const bool holds = !from_.Open()->Entries().empty();
+            Foreseen::GoWithAll(*from_.directory, from_.name);
+            Foreseen::ComeDirectory(to_, info_, holds);
+            return true;
+        }
         if (!same_ || case_only_) Foreseen::Come(to_, info_);
         Foreseen::Go(*from_.directory, from_.name);
         return true;

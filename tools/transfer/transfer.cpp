@@ -256,9 +256,9 @@ bool SameState(const struct stat& one, const struct stat& other) {
 // `copied` is where it has its contents from.
 std::shared_ptr<const Inode> Foresee(const Place& to, bool replaces, const struct stat& info,
                                      const Place& copied) {
-    if (const int error = replaces ? WhyNoRemoval(to) : WhyNoNewFile(*to.directory)) {
-        throw SystemFailure(to.path(), error);
-    }
+    int error = replaces ? WhyNoRemoval(to) : WhyNoNewFile(*to.directory);
+    if (error == 0 && replaces && S_ISDIR(StatusOf(to).st_mode)) error = EISDIR;
+    if (error != 0) throw SystemFailure(to.path(), error);
     // Of others nobody asks for what is in them.
     const bool may_be_metadata = to.name.starts_with(AppleDoubleName({}));
     Foreseen::Come(to, info, may_be_metadata ? &copied : nullptr);
@@ -703,6 +703,9 @@ void Transfer::Finish(Leg* leg) {
     }
     if (manner.keeps_times && !leg->is_link) SetTimes(*leg);
     ReportNew(leg->to.place.location(), leg->source->info().st_mode);
+    if (DryRun() && !failure && S_ISDIR(leg->target->info().st_mode)) {
+        Foreseen::NoteFinished(leg->target->info());
+    }
     if (failure) {
         throw Incomplete(kFailed, leg->from.path(),
                          "its metadata could not be copied: " + std::string(failure->what()),
@@ -886,6 +889,11 @@ void Transfer::FinishDirectory(const Place& from, const Directory& inside, const
     RemoveFormerAttributes(leg);
     CopyInodeTo(leg, -1, -1);
     Finish(&leg);
+    if (made->foreseen() && options_.manner.keeps_times) {
+        struct stat info = leg.target->info();
+        info.st_mtim = leg.source->info().st_mtim;
+        Foreseen::Come(to, info);
+    }
     if (failure) std::rethrow_exception(failure);
 }
 
