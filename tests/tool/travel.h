@@ -24,6 +24,10 @@ inline constexpr int kAppleDouble = 0;
 inline constexpr int kEaDirectory = 1;
 inline constexpr int kFileEa = 2;
 inline constexpr int kXattr = 7;
+inline constexpr int kSamba = 20;  // this number is the tests' own
+
+// As --volume takes it.
+inline std::string WordOfType(int type) { return type == kSamba ? "samba" : std::to_string(type); }
 
 // The file systems of tests take no attributes of other name spaces for themselves.
 inline bool KeepsFork(int type) { return type != kXattr; }
@@ -47,9 +51,8 @@ class Travel {
     std::string To(const std::string& name) const { return target_ + '/' + name; }
 
     Arguments WithVolumes(Arguments arguments) const {
-        arguments.insert(arguments.begin(),
-                         {"--volume", dir_ / "from" + "=" + std::to_string(from_), "--volume",
-                          target_ + "=" + std::to_string(to_)});
+        arguments.insert(arguments.begin(), {"--volume", dir_ / "from" + "=" + WordOfType(from_),
+                                             "--volume", target_ + "=" + WordOfType(to_)});
         return arguments;
     }
     ToolResult Run(const Arguments& arguments, const std::string& input = {}) const {
