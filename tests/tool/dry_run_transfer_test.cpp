@@ -1,95 +1,41 @@
 // Dry runs of cp, mv and convert: what the real run with --verbose, which comes next, says as well.
 
-#include <linux/fs.h>
-#include <sys/ioctl.h>
-
 #include <functional>
 #include <optional>
 #include <tuple>
 
-#include "tests/support/object_files.h"
-#include "tests/support/snapshot.h"
 #include "tests/support/stream_builder.h"
 #include "tests/tool/holdings.h"
-#include "tests/tool/travel.h"
+#include "tests/tool/rehearsal.h"
 
 namespace mavoea::test {
 namespace {
 
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
-using ::testing::IsEmpty;
-using ::testing::Not;
 
-// Two volumes, and runs of the tool on them.
-class Rehearsal {
+// With a tree that has something of all kinds, and a file with metadata.
+class TreeRehearsal : public Rehearsal {
  public:
-    Rehearsal(int from, int to, const std::string& elsewhere) : travel_(from, to, elsewhere) {
+    TreeRehearsal(int from, int to, const std::string& elsewhere) : Rehearsal(from, to, elsewhere) {
         MakeDir(From("tree"));
         MakeDir(From("tree/sub"));
         MakeDir(From("tree/sub/deep"));
         for (const char* const name : {"tree/a", "tree/plain", "tree/sub/b", "tree/sub/deep/c"}) {
-            travel_.MakeFile(From(name), name);
+            travel().MakeFile(From(name), name);
         }
         for (const char* const name : {"tree/a", "tree/sub", "tree/sub/deep/c"}) {
-            travel_.GiveMetadata(From(name));
+            travel().GiveMetadata(From(name));
         }
         EXPECT_EQ(0, link(From("tree/sub/b").c_str(), From("tree/second").c_str()));
         EXPECT_EQ(0, link(From("tree/a").c_str(), From("tree/third").c_str()));
         EXPECT_EQ(0, symlink("a", From("tree/link").c_str()));
         EXPECT_EQ(0, mkfifo(From("tree/fifo").c_str(), 0600));
-        EXPECT_EQ(0, travel_.Run({"lock", From("tree/sub/b")}).status);
-        travel_.MakeFile(From("file"));
-        travel_.GiveMetadata(From("file"));
+        EXPECT_EQ(0, travel().Run({"lock", From("tree/sub/b")}).status);
+        travel().MakeFile(From("file"));
+        travel().GiveMetadata(From("file"));
     }
-
-    std::string From(const std::string& name) const { return travel_.From(name); }
-    std::string To(const std::string& name) const { return travel_.To(name); }
-    const Travel& travel() const { return travel_; }
-
-    // What both say; nothing has changed when the real run comes. Its questions get `answers`.
-    ToolResult Expect(const Arguments& arguments, const std::string& answers = {}) const {
-        SCOPED_TRACE(::testing::PrintToString(arguments));
-        const ToolResult said = Look(arguments);
-        Arguments real = arguments;
-        real.insert(real.begin() + 1, "--verbose");
-        const ToolResult done = travel_.Run(real, answers);
-        EXPECT_EQ(done.out, said.out);
-        if (answers.empty()) {
-            EXPECT_EQ(done.err, said.err);
-        }
-        EXPECT_EQ(done.status, said.status);
-        return said;
-    }
-    std::string Lines(const Arguments& arguments) const { return Expect(arguments).out; }
-
-    bool keeps_times = false;  // which nobody may set, or has looked at
-
-    // The dry run alone.
-    ToolResult Look(Arguments arguments, Limits limits = {}) const {
-        arguments.insert(arguments.begin() + 1, "--dry-run");
-        if (!keeps_times) {
-            SetOldTimes(travel_.source());
-            SetOldTimes(travel_.target());
-        }
-        const Snapshot from = TakeSnapshot(travel_.source());
-        const Snapshot to = TakeSnapshot(travel_.target());
-        const ToolResult said = RunTool(travel_.WithVolumes(arguments), {}, limits);
-        // Access times stay where the user may have that.
-        std::set<std::string> ignored;
-        if (limits.user != 0) ignored.insert("atime");
-        EXPECT_THAT(Differences(from, TakeSnapshot(travel_.source()), ignored), IsEmpty());
-        EXPECT_THAT(Differences(to, TakeSnapshot(travel_.target()), ignored), IsEmpty());
-        return said;
-    }
-
- private:
-    Travel travel_;
 };
-
-std::string Arrow(const std::string& from, const std::string& to) {
-    return "'" + from + "' -> '" + to + "'\n";
-}
 
 // ---- Every pair of kinds ------------------------------------------------------------------------
 
@@ -133,7 +79,7 @@ class DryRunWayTest : public ::testing::TestWithParam<Way> {
 
  private:
     std::optional<SecondVolume> second_;
-    std::optional<Rehearsal> rehearsal_;
+    std::optional<TreeRehearsal> rehearsal_;
 };
 INSTANTIATE_TEST_SUITE_P(EveryWay, DryRunWayTest, ::testing::ValuesIn(Thinned(AllWays())), NameOf);
 
@@ -225,7 +171,7 @@ class DryRunTransferTest : public ::testing::Test {
     std::string To(const std::string& name) const { return rehearsal_->To(name); }
 
  private:
-    std::optional<Rehearsal> rehearsal_;
+    std::optional<TreeRehearsal> rehearsal_;
 };
 
 TEST_F(DryRunTransferTest, NothingComesOverWhatHasJustCome) {
@@ -371,27 +317,6 @@ TEST_F(DryRunTransferTest, WhatAnotherUserMayNotDoIsForeseen) {
         EXPECT_EQ(real.err, dry.err);
     }
 }
-
-// Of an inode, until the end of a test.
-class Immutable {
- public:
-    explicit Immutable(const std::string& path) : fd_(open(path.c_str(), O_RDONLY)) {
-        ok_ = Set(FS_IMMUTABLE_FL);
-    }
-    ~Immutable() {
-        (void)Set(0);
-        close(fd_);
-    }
-    Immutable(const Immutable&) = delete;
-    Immutable& operator=(const Immutable&) = delete;
-    bool ok() const { return ok_; }
-
- private:
-    bool Set(int flags) const { return ioctl(fd_, FS_IOC_SETFLAGS, &flags) == 0; }
-
-    int fd_;
-    bool ok_;
-};
 
 TEST_F(DryRunTransferTest, WhatIsImmutableStaysAsForeseen) {
     const Immutable file(From("file"));
