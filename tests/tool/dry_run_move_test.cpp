@@ -13,6 +13,7 @@
 #include "tests/support/stream_builder.h"
 #include "tests/tool/holdings.h"
 #include "tests/tool/rehearsal.h"
+#include "tests/tool/ways.h"
 
 namespace mavoea::test {
 namespace {
@@ -30,55 +31,30 @@ std::string Copied(const std::string& from, const std::string& to) {
 std::string Created(const std::string& path) { return "created directory '" + path + "'\n"; }
 std::string Removed(const std::string& path) { return "removed '" + path + "'\n"; }
 
-struct Way {
-    int from;
-    int to;
-    bool across;  // from one file system to another
-};
-std::string NameOf(const ::testing::TestParamInfo<Way>& info) {
-    return "From" + std::to_string(info.param.from) + "To" + std::to_string(info.param.to) +
-           (info.param.across ? "Across" : "");
-}
-
-class DryRunMoveTest : public ::testing::TestWithParam<Way> {
+class DryRunMoveTest : public WayTest<Rehearsal> {
  protected:
-    void SetUp() override {
-        MAVOEA_SKIP_UNLESS_ROOT();
-        MAVOEA_SKIP_WITHOUT_ATTRIBUTES("/tmp");
-        if (GetParam().across) {
-            second_.emplace();
-            MAVOEA_SKIP_WITHOUT_SECOND(*second_);
-            MAVOEA_SKIP_WITHOUT_ATTRIBUTES(second_->path());
-        }
-        both_.emplace(GetParam().from, GetParam().to, second_ ? second_->path() : std::string());
-    }
-
     // Whether directories and files are renamed: not to another file system or kind of volume.
     static bool Renames() { return !GetParam().across && GetParam().from == GetParam().to; }
 
-    Rehearsal& both() { return *both_; }
-    const Rehearsal& both() const { return *both_; }
-    std::string From(const std::string& name) const { return both_->From(name); }
-    std::string To(const std::string& name) const { return both_->To(name); }
-    ToolResult Expect(const Arguments& arguments) const { return both_->Expect(arguments); }
-    std::string Lines(const Arguments& arguments) const { return both_->Lines(arguments); }
+    Rehearsal& both() { return places(); }
+    const Rehearsal& both() const { return places(); }
+    std::string From(const std::string& name) const { return both().From(name); }
+    std::string To(const std::string& name) const { return both().To(name); }
+    ToolResult Expect(const Arguments& arguments) const { return both().Expect(arguments); }
+    std::string Lines(const Arguments& arguments) const { return both().Lines(arguments); }
 
     void Make(const std::string& path, const std::string& data = "data") const {
-        both_->travel().MakeFile(path, data);
+        both().travel().MakeFile(path, data);
     }
     void MakeWithMetadata(const std::string& path, const std::string& colour = "blue") const {
         Make(path);
-        both_->travel().GiveMetadata(path, colour);
+        both().travel().GiveMetadata(path, colour);
     }
     void MakeTree(const std::string& top) const {
         for (const char* const name : {"", "/sub", "/sub/deep", "/empty"}) MakeDir(top + name);
         for (const char* const name : {"/a", "/sub/b", "/sub/deep/c"}) MakeWithMetadata(top + name);
-        both_->travel().GiveMetadata(top + "/sub", "white");
+        both().travel().GiveMetadata(top + "/sub", "white");
     }
-
- private:
-    std::optional<SecondVolume> second_;
-    std::optional<Rehearsal> both_;
 };
 
 std::vector<Way> SomeWays() {

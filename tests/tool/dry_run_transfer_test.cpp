@@ -1,12 +1,11 @@
 // Dry runs of cp, mv and convert: what the real run with --verbose, which comes next, says as well.
 
-#include <functional>
 #include <optional>
-#include <tuple>
 
 #include "tests/support/stream_builder.h"
 #include "tests/tool/holdings.h"
 #include "tests/tool/rehearsal.h"
+#include "tests/tool/ways.h"
 
 namespace mavoea::test {
 namespace {
@@ -39,47 +38,11 @@ class TreeRehearsal : public Rehearsal {
 
 // ---- Every pair of kinds ------------------------------------------------------------------------
 
-struct Way {
-    int from;
-    int to;
-    bool across;  // from one file system to another
-};
-std::string NameOf(const ::testing::TestParamInfo<Way>& info) {
-    return "From" + std::to_string(info.param.from) + "To" + std::to_string(info.param.to) +
-           (info.param.across ? "Across" : "");
-}
-std::vector<Way> AllWays() {
-    std::vector<Way> ways;
-    for (const bool across : {false, true}) {
-        for (const int from : {kAppleDouble, kEaDirectory, kFileEa, kXattr}) {
-            for (const int to : {kAppleDouble, kEaDirectory, kFileEa, kXattr}) {
-                ways.push_back({from, to, across});
-            }
-        }
-    }
-    return ways;
-}
-
-class DryRunWayTest : public ::testing::TestWithParam<Way> {
+class DryRunWayTest : public WayTest<TreeRehearsal> {
  protected:
-    void SetUp() override {
-        MAVOEA_SKIP_UNLESS_ROOT();
-        MAVOEA_SKIP_WITHOUT_ATTRIBUTES("/tmp");
-        if (GetParam().across) {
-            second_.emplace();
-            MAVOEA_SKIP_WITHOUT_SECOND(*second_);
-            MAVOEA_SKIP_WITHOUT_ATTRIBUTES(second_->path());
-        }
-        rehearsal_.emplace(GetParam().from, GetParam().to,
-                           second_ ? second_->path() : std::string());
-    }
-    const Rehearsal& both() const { return *rehearsal_; }
+    const Rehearsal& both() const { return places(); }
     std::string From(const std::string& name) const { return both().From(name); }
     std::string To(const std::string& name) const { return both().To(name); }
-
- private:
-    std::optional<SecondVolume> second_;
-    std::optional<TreeRehearsal> rehearsal_;
 };
 INSTANTIATE_TEST_SUITE_P(EveryWay, DryRunWayTest, ::testing::ValuesIn(Thinned(AllWays())), NameOf);
 

@@ -2,7 +2,7 @@
 
 #include "tests/support/object_files.h"
 #include "tests/support/stream_builder.h"
-#include "tests/tool/travel.h"
+#include "tests/tool/ways.h"
 
 namespace mavoea::test {
 namespace {
@@ -10,44 +10,9 @@ namespace {
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 
-struct Way {
-    int from;
-    int to;
-    bool across;  // from one file system to another
-};
-std::string NameOf(const ::testing::TestParamInfo<Way>& info) {
-    return "From" + std::to_string(info.param.from) + "To" + std::to_string(info.param.to) +
-           (info.param.across ? "Across" : "");
-}
-std::vector<Way> AllWays() {
-    std::vector<Way> ways;
-    for (const bool across : {false, true}) {
-        for (const int from : {kAppleDouble, kEaDirectory, kFileEa, kXattr}) {
-            for (const int to : {kAppleDouble, kEaDirectory, kFileEa, kXattr}) {
-                ways.push_back({from, to, across});
-            }
-        }
-    }
-    return ways;
-}
-
-class MvWayTest : public ::testing::TestWithParam<Way> {
+class MvWayTest : public WayTest<Travel> {
  protected:
-    void SetUp() override {
-        MAVOEA_SKIP_UNLESS_ROOT();
-        MAVOEA_SKIP_WITHOUT_ATTRIBUTES("/tmp");
-        if (GetParam().across) {
-            second_.emplace();
-            MAVOEA_SKIP_WITHOUT_SECOND(*second_);
-            MAVOEA_SKIP_WITHOUT_ATTRIBUTES(second_->path());
-        }
-        travel_.emplace(GetParam().from, GetParam().to, second_ ? second_->path() : std::string());
-    }
-    const Travel& travel() const { return *travel_; }
-
- private:
-    std::optional<SecondVolume> second_;
-    std::optional<Travel> travel_;
+    const Travel& travel() const { return places(); }
 };
 INSTANTIATE_TEST_SUITE_P(EveryWay, MvWayTest, ::testing::ValuesIn(Thinned(AllWays())), NameOf);
 
