@@ -67,7 +67,8 @@ std::vector<Way> SomeWays() {
     ways.push_back({kXattr, kSamba, true});
     return ways;
 }
-INSTANTIATE_TEST_SUITE_P(SomeWays, DryRunMoveTest, ::testing::ValuesIn(SomeWays()), NameOf);
+INSTANTIATE_TEST_SUITE_P(SomeWays, DryRunMoveTest, ::testing::ValuesIn(Thinned(SomeWays())),
+                         NameOf);
 
 // ---- One by one ---------------------------------------------------------------------------------
 
