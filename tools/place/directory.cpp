@@ -159,7 +159,10 @@ DirectoryRef Directory::FindAgain(const std::string& name) const {
         const auto info = StatusOf(name);
         if (info && SameFile(*info, kept_->Status())) return kept_;
     }
-    return kept_ = MayHave(name) ? FindIn(name) : nullptr;
+    DirectoryRef found = MayHave(name) ? FindIn(name) : nullptr;
+    // One that is foreseen may hold this one.
+    kept_ = found && found->foreseen() ? nullptr : found;
+    return found;
 }
 
 void Directory::Forget(const std::string& name) const {
