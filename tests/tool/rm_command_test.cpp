@@ -465,6 +465,23 @@ TEST(RmDepthTest, ATreeOfAnyDepthTakesFewDescriptorsAndLittleMemory) {
     }
 }
 
+// Directories are left and opened again on the way down and up: what was listed says no more by
+// then to whom a "._" file belonged.
+TEST(RmDepthTest, AppleDoubleFilesGoWithTheirObjectsAtAnyDepth) {
+    const TempDir dir;
+    constexpr int kLevels = 40;
+    std::string path = dir / "deep";
+    for (int i = 0; i < kLevels; ++i, path += "/d") {
+        ASSERT_EQ(0, mkdir(path.c_str(), 0755));
+        WriteFile(path + "/z", Ascii("data"));
+        WriteFile(path + "/._z", Hex("00051607 00020000 'Mac OS X        ' 0000"));
+    }
+    const ToolResult result = RunTool({"--volume", dir.path() + "=0", "rm", "-r", dir / "deep"});
+    EXPECT_THAT(result, Succeeded());
+    EXPECT_EQ("", result.err);
+    EXPECT_FALSE(Exists(dir / "deep"));
+}
+
 TEST(RmDepthTest, ATreeThatIsMovedMeanwhileLeadsToNothingElse) {
     const TempDir dir;
     mkdir((dir / "other").c_str(), 0755);

@@ -75,7 +75,7 @@ class Carrying final : private TreeCopy {
         level->made = to.Open();
         level->info = info;
         level->is_new = false;
-        if (options_.job.recursive) level->entries = ObjectsIn(level->inside);
+        if (options_.job.recursive) level->entries = CandidatesIn(level->inside);
         former_.push_back(*there);
     }
 

@@ -157,7 +157,11 @@ class Conversion final : private TreeCopy {
             (void)SettlePending(level->made);
             (void)level->made->EntriesAtFirst();  // for IsApart()
         }
-        if (options_.recursive) level->entries = ObjectsIn(level->inside);
+        // Of several workers others read objects, and what is not apart from them is to be known.
+        if (options_.recursive) {
+            level->entries = CrewOf(options_).workers == 1 ? CandidatesIn(level->inside)
+                                                           : ObjectsIn(level->inside);
+        }
     }
 
     void Finish(const Level& level) override {

@@ -478,7 +478,7 @@ class Placement final : private TreeCopy {
         }
         const bool elsewhere = options_.one_file_system && !Named() &&
                                source.info.st_dev != levels().front().info.st_dev;
-        if (!elsewhere) level->entries = ObjectsIn(level->inside);
+        if (!elsewhere) level->entries = CandidatesIn(level->inside);
         level->made = made;
     }
 

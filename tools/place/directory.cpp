@@ -49,7 +49,8 @@ std::string OtherCase(std::string name) {
 }
 
 // The first of the sorted entries that does not come before that name.
-auto FirstFrom(const std::vector<Directory::Entry>& entries, const std::string& name) {
+template <class Entries>
+auto FirstFrom(Entries& entries, const std::string& name) {
     return std::lower_bound(entries.begin(), entries.end(), name,
                             [](const Directory::Entry& entry, const std::string& wanted) {
                                 return entry.name < wanted;
@@ -291,9 +292,8 @@ const std::vector<Directory::Entry>& Directory::EntriesAtFirst() const {
 }
 
 mode_t Directory::TypeAtFirst(const std::string& name) const {
-    if (!listed()) return 0;
-    const auto found = FirstFrom(*first_, name);
-    return found != first_->end() && found->name == name ? found->type : 0;
+    const Entry* const entry = FirstOf(name);
+    return entry == nullptr ? 0 : entry->type;
 }
 
 std::vector<std::string> Directory::NamesAtFirst(const std::string& prefix) const {
@@ -332,8 +332,23 @@ bool Directory::TellsApart(const std::string& name) const {
 }
 
 bool Directory::Lists(const std::string& name) const {
+    return FirstOf(name) != nullptr || later_.contains(name);
+}
+
+// Null where it was not there, or nobody has asked.
+Directory::Entry* Directory::FirstOf(const std::string& name) const {
+    if (!listed()) return nullptr;
     const auto found = FirstFrom(*first_, name);
-    return (found != first_->end() && found->name == name) || later_.contains(name);
+    return found != first_->end() && found->name == name ? &*found : nullptr;
+}
+
+void Directory::NoteMetadata(const std::string& name) const {
+    if (Entry* const entry = FirstOf(name)) entry->noted_as_metadata = true;
+}
+
+bool Directory::IsNotedAsMetadata(const std::string& name) const {
+    const Entry* const entry = FirstOf(name);
+    return entry != nullptr && entry->noted_as_metadata;
 }
 
 // Found out once, by a name that is there, in the other case.

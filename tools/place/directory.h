@@ -89,6 +89,7 @@ class Directory : public std::enable_shared_from_this<Directory> {
     struct Entry {
         std::string name;
         mode_t type;  // S_IFREG, S_IFDIR, ...
+        bool noted_as_metadata = false;
     };
     // All but "." and "..", sorted by name, as it is at the time.
     std::vector<Entry> Entries() const;
@@ -124,6 +125,10 @@ class Directory : public std::enable_shared_from_this<Directory> {
 
     // Where, in or above it, Samba keeps streams as files; empty: nowhere. Kept for who asks again.
     std::optional<std::string>& depot() const { return depot_; }
+
+    // Of what such a list has: somebody has looked into it, and it is metadata of an object.
+    void NoteMetadata(const std::string& name) const;
+    bool IsNotedAsMetadata(const std::string& name) const;
 
     // None when nothing of that name is there.
     std::optional<struct stat> StatusOf(const std::string& name) const;
@@ -185,6 +190,7 @@ class Directory : public std::enable_shared_from_this<Directory> {
     std::optional<bool> ListTells(const std::string& name) const;
     bool TellsCasesApart() const;
     bool Lists(const std::string& name) const;
+    Entry* FirstOf(const std::string& name) const;
 
     File file_;  // its path is not used
     std::shared_ptr<Names> names_;

@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <functional>
 #include <utility>
 
 #include "include/mavoea.h"
@@ -52,10 +53,11 @@ class Finder {
           name_(object.place.name),
           derived_(NameInEaDirectory(name_)) {}
 
-    Sidecars Run(const Object& object, Sidecars::Services services) {
+    Sidecars Run(const Object& object, Sidecars::Services services,
+                 const Sidecars::IsKnown& is_known) {
         const Keeping keeping = object.keeping();
         if (keeping == Keeping::kNone || object.is_root()) return {};
-        if (keeping != Keeping::kXattr) FindAppleDouble();
+        if (keeping != Keeping::kXattr) FindAppleDouble(is_known);
         try {
             sidecars_.ea_dir = directory_.FindAgain(kEaDirName);
         } catch (const Failure& failure) {
@@ -80,14 +82,18 @@ class Finder {
         return info ? std::optional(Found{directory, name, *info}) : std::nullopt;
     }
 
-    void FindAppleDouble() {
+    void FindAppleDouble(const Sidecars::IsKnown& is_known) {
         const std::string name = AppleDoubleName(name_);
         if (name.empty()) return;
         // Its access time says something, and is taken before anybody looks into it.
         auto found = Look(directory_.shared_from_this(), name);
         if (!found || !MayBeAppleDouble(found->info)) return;
-        found->file = tool::FindAppleDouble(directory_, name);
-        if (found->file) sidecars_.apple_double = std::move(found);
+        if (!is_known || !is_known(found->info)) {
+            found->file = tool::FindAppleDouble(directory_, name);
+            if (!found->file) return;
+        }
+        directory_.NoteMetadata(name);
+        sidecars_.apple_double = std::move(found);
     }
 
     void FindFiles(Keeping keeping) {
@@ -172,8 +178,8 @@ class Finder {
 
 }  // namespace
 
-Sidecars Sidecars::Find(const Object& object, Services services) {
-    return Finder(object).Run(object, services);
+Sidecars Sidecars::Find(const Object& object, Services services, const IsKnown& is_known) {
+    return Finder(object).Run(object, services, is_known);
 }
 
 bool Sidecars::Any() const { return folder || !Files().empty(); }
@@ -225,21 +231,54 @@ bool IsAppleDouble(const Directory& directory, const std::string& name) {
     return info && MayBeAppleDouble(*info) && FindAppleDouble(directory, name) != nullptr;
 }
 
-bool IsMetadata(const Directory& directory, const Directory::Entry& entry, int type) {
-    const Keeping keeping = KeepingOf(type);
-    if (S_ISDIR(entry.type)) return entry.name == kEaDirName && keeping != Keeping::kNone;
-    if (!S_ISREG(entry.type) || !entry.name.starts_with(kAppleDoublePrefix)) return false;
-    if (keeping != Keeping::kAppleDouble && keeping != Keeping::kEaDirectory) return false;
-    const std::string object = entry.name.substr(kAppleDoublePrefix.size());
-    return !object.empty() && directory.HadAtFirst(object) && IsAppleDouble(directory, entry.name);
+namespace {
+
+bool HasAppleDoubleName(const Directory::Entry& entry) {
+    return entry.name.starts_with(kAppleDoublePrefix);
 }
 
-std::vector<Directory::Entry> ObjectsIn(const DirectoryRef& directory) {
+// What its name, its type and that of the volume say.
+bool MayBeMetadata(const Directory& directory, const Directory::Entry& entry, int type) {
+    const Keeping keeping = KeepingOf(type);
+    if (S_ISDIR(entry.type)) return entry.name == kEaDirName && keeping != Keeping::kNone;
+    if (!S_ISREG(entry.type) || !HasAppleDoubleName(entry)) return false;
+    if (keeping != Keeping::kAppleDouble && keeping != Keeping::kEaDirectory) return false;
+    const std::string object = entry.name.substr(kAppleDoublePrefix.size());
+    return !object.empty() && directory.HadAtFirst(object);
+}
+
+}  // namespace
+
+bool IsMetadata(const Directory& directory, const Directory::Entry& entry, int type) {
+    return MayBeMetadata(directory, entry, type) &&
+           (S_ISDIR(entry.type) || IsAppleDouble(directory, entry.name));
+}
+
+std::vector<Directory::Entry> CandidatesIn(const DirectoryRef& directory) {
     std::vector<Directory::Entry> entries = directory->EntriesAtFirst();
     const int type = ReadableType(ObjectAt({directory, kEaDirName}, nullptr).type);
     std::erase_if(entries, [&](const Directory::Entry& entry) {
-        return IsMetadata(*directory, entry, type);
+        return !HasAppleDoubleName(entry) && MayBeMetadata(*directory, entry, type);
     });
+    std::stable_partition(entries.begin(), entries.end(), std::not_fn(HasAppleDoubleName));
+    return entries;
+}
+
+bool IsObject(const DirectoryRef& directory, const Directory::Entry& candidate) {
+    if (!S_ISREG(candidate.type) || !HasAppleDoubleName(candidate)) return true;
+    const Object object = ObjectAt({directory, candidate.name}, candidate.type);
+    const bool may_be = MayBeMetadata(*directory, candidate, ReadableType(object.type));
+    if (may_be && directory->IsNotedAsMetadata(candidate.name)) return false;
+    // Where a list tells nobody any more whether there was an object, both may have gone.
+    if (!may_be && directory->listed()) return true;
+    if (!directory->Has(candidate.name)) return false;
+    return !may_be || !IsAppleDouble(*directory, candidate.name);
+}
+
+std::vector<Directory::Entry> ObjectsIn(const DirectoryRef& directory) {
+    std::vector<Directory::Entry> entries = CandidatesIn(directory);
+    std::erase_if(entries,
+                  [&](const Directory::Entry& entry) { return !IsObject(directory, entry); });
     return entries;
 }
 

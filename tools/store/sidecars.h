@@ -2,6 +2,7 @@
 #ifndef MAVOEA_TOOLS_STORE_SIDECARS_H_
 #define MAVOEA_TOOLS_STORE_SIDECARS_H_
 
+#include <functional>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -18,6 +19,8 @@ inline constexpr const char* kCoverName = ".cover";
 // By the lists of the object's directory and its EA directory, where those have been taken: what
 // comes later may be missed, and what has gone is not there.
 struct Sidecars {
+    using IsKnown = std::function<bool(const struct stat&)>;
+
     struct Found {
         DirectoryRef directory;
         std::string name;
@@ -37,8 +40,9 @@ struct Sidecars {
     enum class Services { kLeaveOut, kFind };
 
     // Throws Failure. An "@eaDir" that is a symbolic link, or may not be looked into, is a
-    // `problem`.
-    static Sidecars Find(const Object& object, Services services);
+    // `problem`. A file in the place of the "._" file counts as one without being opened where
+    // `is_known` says so.
+    static Sidecars Find(const Object& object, Services services, const IsKnown& is_known = {});
 
     DirectoryRef ea_dir;  // null: there is none, or volumes of the type have no use for one
     std::optional<Found> stream;
@@ -77,7 +81,15 @@ WholeFile FindAppleDouble(const Directory& directory, const std::string& name);
 // and "._" files whose object is there. Throws Failure.
 bool IsMetadata(const Directory& directory, const Directory::Entry& entry, int type);
 
-// What in a directory is an object, sorted by name, when it was listed first. Throws Failure.
+// What in a directory is an object or may be one, as it was listed first: sorted by name, and what
+// has the name of a "._" file behind all others. Throws Failure.
+std::vector<Directory::Entry> CandidatesIn(const DirectoryRef& directory);
+// Whether one of these is an object. Of a "._" file it is asked when its turn comes: the work on
+// the object that it belongs to has looked into it by then, and nobody has to do so again; or that
+// has gone, and it with that. Throws Failure.
+bool IsObject(const DirectoryRef& directory, const Directory::Entry& candidate);
+
+// All that are objects, in the same order. Throws Failure.
 std::vector<Directory::Entry> ObjectsIn(const DirectoryRef& directory);
 
 // Whether a name is so long that its metadata may have the names of another object's.

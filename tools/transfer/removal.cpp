@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <utility>
 
@@ -39,8 +40,8 @@ void Unlink(const Place& place, int flags) {
 // What lies beside an object that is about to go.
 class Beside {
  public:
-    Beside(const Object& object, bool alone)
-        : object_(object), sidecars_(Sidecars::Find(object, Sidecars::Services::kFind)) {
+    Beside(const Object& object, bool alone, const MayGo& may_go)
+        : object_(object), sidecars_(Sidecars::Find(object, Sidecars::Services::kFind, may_go)) {
         if (!sidecars_.AnyByName()) return;
         if (alone) {
             RequireOwnNames(object);
@@ -111,7 +112,7 @@ void ReportRemovedAt(const Place& place) {
 // Both return whether an EA directory is beside it, in which nothing may be left.
 bool RemoveFileAt(const Object& object, bool alone, const MayGo& may_go) {
     const Place& place = object.place;
-    const Beside beside(object, alone);
+    const Beside beside(object, alone, may_go);
     if (may_go && !may_go(StatusOf(place))) throw HasNotGone(place.path());
     beside.RequireMayGo(may_go);
     // Data first: without it, metadata is of no use to anybody.
@@ -125,7 +126,7 @@ bool RemoveFileAt(const Object& object, bool alone, const MayGo& may_go) {
 bool RemoveDirectoryAt(const Object& object, const Directory* inside, bool alone,
                        const MayGo& may_go) {
     const Place& place = object.place;
-    const Beside beside(object, alone);
+    const Beside beside(object, alone, may_go);
     beside.RequireMayGo(may_go);
     const auto ea_dir = inside == nullptr ? std::nullopt : inside->StatusOf(kEaDirName);
     if (ea_dir && S_ISDIR(ea_dir->st_mode) && !inside->RemoveEmpty(kEaDirName)) {
@@ -203,22 +204,27 @@ void TreeRemoval::Guard(const Place& place, Work work) {
 void TreeRemoval::Go() {
     Level& level = levels_.back();
     if (level.next == level.entries.size()) return Leave();
-    const Directory::Entry& entry = level.entries[level.next++];
+    const Directory::Entry entry = level.entries[level.next++];
     const Place place = {level.inside, entry.name};
     const bool directory = S_ISDIR(entry.type);
-    Guard(place, [&] { directory ? Enter(place) : RemoveFile(place); });
+    Guard(place, [&] {
+        if (IsObject(place.directory, entry)) directory ? Enter(place) : RemoveFile(place);
+    });
 }
 
 void TreeRemoval::Enter(const Place& place) {
     Level level = {place.name, {}, place.Open()};
     level.info = level.inside->Status();
     try {
-        level.entries = ObjectsIn(level.inside);
+        level.entries = CandidatesIn(level.inside);
     } catch (const SystemFailure& failure) {
         if (failure.subject() != level.inside->path()) throw;
         level.error = failure.error();
     }
-    const bool empty = level.error == 0 && level.entries.empty();
+    const bool empty = level.error == 0 && std::none_of(level.entries.begin(), level.entries.end(),
+                                                        [&](const auto& entry) {
+                                                            return IsObject(level.inside, entry);
+                                                        });
     if (MayEnter(place, level.info, empty) == Answer::kNo) return StayAbove();
     level.agreed = empty;
     levels_.push_back(std::move(level));

@@ -879,7 +879,7 @@ void Transfer::FinishDirectory(const Place& from, const Directory& inside, const
     if (!is_new) leg.former_mode = leg.target->info().st_mode & kPermissionBits;
     std::exception_ptr failure;
     for (const Directory::Entry& entry : inside.Entries()) {
-        if (!IsMetadata(inside, entry, leg.from.type) || !S_ISDIR(entry.type)) continue;
+        if (!S_ISDIR(entry.type) || !IsMetadata(inside, entry, leg.from.type)) continue;
         try {
             CopyLeftOvers(inside, made, entry);
         } catch (const Failure&) {

@@ -1,7 +1,5 @@
 #include "tools/transfer/tree_copy.h"
 
-#include <algorithm>
-
 #include "tools/store/sidecars.h"
 
 namespace mavoea::tool {
@@ -11,8 +9,7 @@ void TreeCopy::CopyTree(const Place& from, const Place& to) {
     while (!levels_.empty()) {
         Level& level = levels_.back();
         if (level.next < level.entries.size() && !Stopped()) {
-            const std::string name = level.entries[level.next++].name;
-            Try({level.inside, name}, {level.made, name});
+            TryNext(&level);
             continue;
         }
         const Level done = std::move(level);
@@ -25,6 +22,18 @@ void TreeCopy::CopyTree(const Place& from, const Place& to) {
     }
 }
 
+void TreeCopy::TryNext(Level* level) {
+    const Directory::Entry entry = level->entries[level->next++];
+    const Place from = {level->inside, entry.name};
+    const Place to = {level->made, entry.name};
+    try {
+        if (!IsObject(from.directory, entry)) return;
+    } catch (const Failure& failure) {
+        return Fail(from, failure);
+    }
+    Try(from, to);
+}
+
 void TreeCopy::Try(const Place& from, const Place& to) {
     Level level = {from, to, nullptr, nullptr};
     try {
@@ -32,12 +41,7 @@ void TreeCopy::Try(const Place& from, const Place& to) {
     } catch (const Failure& failure) {
         return Fail(from, failure);
     }
-    if (!level.made) return;
-    // Where one of these would become metadata of another object, the object has arrived.
-    std::stable_partition(
-        level.entries.begin(), level.entries.end(),
-        [](const Directory::Entry& entry) { return !entry.name.starts_with(AppleDoubleName({})); });
-    levels_.push_back(std::move(level));
+    if (level.made) levels_.push_back(std::move(level));
 }
 
 }  // namespace mavoea::tool

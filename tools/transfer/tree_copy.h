@@ -27,7 +27,7 @@ class TreeCopy {
         DirectoryRef made;                           // its copy
         bool is_new = true;                          // nothing was there before
         struct stat info = {};                       // of the source
-        std::vector<Directory::Entry> entries = {};  // what is in it that is to be copied
+        std::vector<Directory::Entry> entries = {};  // candidates in it; objects are copied
         std::size_t next = 0;
     };
 
@@ -45,6 +45,7 @@ class TreeCopy {
 
  private:
     void Try(const Place& from, const Place& to);
+    void TryNext(Level* level);
 
     std::vector<Level> levels_;
 };

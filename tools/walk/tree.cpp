@@ -162,11 +162,12 @@ class Walk {
                 {.kind = Errand::Kind::kDirectory, .object = {{directory, "."}}, .type = S_IFDIR});
         }
         const std::size_t first = pending_.size();
-        for (const Directory::Entry& entry : ObjectsIn(directory)) {
+        for (const Directory::Entry& entry : CandidatesIn(directory)) {
             if (!IsVisited(entry)) continue;
             const Inner inner = {{directory, entry.name}, outer.hash.Below(entry.name)};
             if (!S_ISDIR(entry.type) && !shard_.Has(inner.hash)) continue;
             Guard(inner, [&] {
+                if (!IsObject(directory, entry)) return;
                 const Object object = ObjectAt(inner.place, entry.type);
                 const bool enters = Do(Errand::Kind::kFound, object, entry.type, inner.hash, {});
                 if (enters && S_ISDIR(entry.type)) pending_.push_back(inner);
