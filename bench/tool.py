@@ -8,6 +8,7 @@ those file systems have no place for the rest. Beside each run stands one of
 so that whatever else the machine does hits both, and the table has the ratio of their medians.
 
 `list -r` stands beside what reads the same files: find alone asks the kernel nothing of an object.
+Of files without metadata it stands beside a find that asks for their sizes.
 What Samba keeps of them is listed beside `getfattr -R`, and converted beside `cp -a` with attributes.
 
 All of mavoea cp, mv and convert have written to disk what they carried before they end, so
@@ -119,6 +120,17 @@ class Volumes:
             source = self.tree(file_system, 1, mac)
             run(*self.convert(source, 1, path, kind))
         run("sync", "-f", path)
+        return path
+
+    def bare_tree(self, file_system):
+        """The same objects without metadata."""
+        path = f"{self.path(file_system)}/bare"
+        if not os.path.exists(path):
+            for i in range(self.count):
+                directory = f"{path}/d{i // PER_DIRECTORY:06}"
+                os.makedirs(directory, exist_ok=True)
+                write(f"{directory}/object {i}", f"contents of object {i}\n".encode() * 4)
+            run("sync", "-f", path)
         return path
 
     def command(self, *volumes):
@@ -256,8 +268,8 @@ def looking(kind):
     def ours(*command):
         return lambda volumes, tree, target: [[*volumes.command((tree, kind)), *command, tree]]
 
-    def theirs(*command):
-        return lambda volumes, tree, target: [[*command, tree]]
+    def theirs(*command, tests=()):
+        return lambda volumes, tree, target: [[*command, tree, *tests]]
 
     def reading(volumes, tree, target):
         if kind == PLAIN:
@@ -265,7 +277,13 @@ def looking(kind):
         names = ["(", "-path", "*/@eaDir/*", "-o", "-name", "._*", ")"]
         return [["find", tree, *names, "-type", "f", "-exec", "cat", "{}", "+"]]
 
+    def bare(volumes, file_system):
+        return volumes.bare_tree(file_system)
+
     yield Work("list -r", str(kind), source, ours("list", "-r"), reading)
+    if kind in (0, 1):
+        yield Work("list -r", f"{kind} bare", bare, ours("list", "-r"),
+                   theirs("find", tests=("-size", "+1G")))
     yield Taking("rm -r", str(kind), source, ours("rm", "-r"), theirs("rm", "-r"))
     if kind == 1:
         yield Work("upgrade -r", str(kind), source, ours("upgrade", "-r"), theirs("find"))
@@ -323,7 +341,7 @@ def print_markdown(results):
     for work, ratios, _ in results:
         kind, _, to = work.kinds.partition(" to ")
         cell = " / ".join(f"{ratio:.1f}" for ratio, _, _ in ratios)
-        rows.setdefault((work.name, kind), {})[to or kind] = cell
+        rows.setdefault((work.name, kind), {})[to or kind.split()[0]] = cell
     for (name, kind), cells in sorted(rows.items(), key=lambda row: row[0][0]):
         row = [cells.get(str(to), "") for to in columns]
         print(f"| `{name}`, {kind} | " + " | ".join(row) + " |")
