@@ -65,6 +65,7 @@ class MendTest : public ::testing::Test {
         Arguments arguments = {"check", "-r", "--repair"};
         arguments.insert(arguments.end(), options.begin(), options.end());
         arguments.push_back(dir_.path());
+        if (Tested().emulated()) return Run(arguments);  // where each run takes long
         Arguments dry = arguments;
         dry.insert(dry.begin() + 1, "--dry-run");
         const Snapshot before = TakeSnapshot(dir_.path());
