@@ -2,8 +2,6 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <pty.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -12,6 +10,7 @@
 
 #include "tests/support/process.h"
 #include "tests/support/stream_builder.h"
+#include "tests/tool/terminal.h"
 #include "tests/tool/tool.h"
 
 namespace mavoea::test {
@@ -207,33 +206,6 @@ TEST_P(AttributesTest, ABrokenEscapeIsNoName) {
 }
 
 // ---- Terminals ----------------------------------------------------------------------------------
-
-// What a command says on a terminal, and its exit status.
-struct Shown {
-    std::string text;
-    int status = -1;
-};
-
-Shown RunOnTerminal(const Arguments& arguments) {
-    ToolStart tool(arguments);
-    Shown shown;
-    int terminal = -1;
-    const pid_t child = forkpty(&terminal, nullptr, nullptr, nullptr);
-    if (child < 0) return shown;
-    if (child == 0) {
-        tool.Exec();
-        _exit(127);
-    }
-    char part[1024];
-    for (ssize_t size; (size = read(terminal, part, sizeof part)) > 0;) {
-        shown.text.append(part, static_cast<std::size_t>(size));
-    }
-    int status = 0;
-    waitpid(child, &status, 0);
-    close(terminal);
-    if (WIFEXITED(status)) shown.status = WEXITSTATUS(status);
-    return shown;
-}
 
 TEST_P(AttributesTest, ATerminalIsGivenTextOnly) {
     const auto get = [&](Arguments options) {

@@ -1,16 +1,14 @@
 // Colour in findings and differences: where it is wanted, and nowhere else.
 
 #include <gtest/gtest.h>
-#include <pty.h>
 #include <stdlib.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <optional>
 
 #include "tests/support/object_files.h"
 #include "tests/tool/holdings.h"
+#include "tests/tool/terminal.h"
 #include "tests/tool/tool.h"
 
 namespace mavoea::test {
@@ -69,24 +67,7 @@ class ColourTest : public ::testing::Test {
         return Run(words);
     }
     // What a terminal gets; empty where there is none.
-    std::string OnTerminal(const Arguments& words) const {
-        ToolStart tool(With(words));
-        int terminal = -1;
-        const pid_t child = forkpty(&terminal, nullptr, nullptr, nullptr);
-        if (child < 0) return {};
-        if (child == 0) {
-            tool.Exec();
-            _exit(127);
-        }
-        std::string shown;
-        char part[1024];
-        for (ssize_t size; (size = read(terminal, part, sizeof part)) > 0;) {
-            shown.append(part, static_cast<std::size_t>(size));
-        }
-        waitpid(child, nullptr, 0);
-        close(terminal);
-        return shown;
-    }
+    std::string OnTerminal(const Arguments& words) const { return RunOnTerminal(With(words)).text; }
 
     const TempDir dir_;
     const Variable terminal_{"TERM", "xterm"};

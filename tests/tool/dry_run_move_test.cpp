@@ -30,6 +30,9 @@ std::string Copied(const std::string& from, const std::string& to) {
 }
 std::string Created(const std::string& path) { return "created directory '" + path + "'\n"; }
 std::string Removed(const std::string& path) { return "removed '" + path + "'\n"; }
+std::string RemovedDirectory(const std::string& path) {
+    return "removed directory '" + path + "'\n";
+}
 
 class DryRunMoveTest : public WayTest<Rehearsal> {
  protected:
@@ -103,7 +106,8 @@ TEST_P(DryRunMoveTest, TreesAreRenamedOrCopiedAndRemovedAsForeseen) {
     } else {
         EXPECT_THAT(said.out, HasSubstr(Created(to)));
         EXPECT_THAT(said.out, HasSubstr(Copied(from + "/sub/deep/c", to + "/sub/deep/c")));
-        EXPECT_THAT(said.out, HasSubstr(Removed(from)));
+        EXPECT_THAT(said.out, HasSubstr(Removed(from + "/sub/deep/c")));
+        EXPECT_THAT(said.out, HasSubstr(RemovedDirectory(from)));
     }
     EXPECT_FALSE(Exists(from));
     // Over an empty directory, and not over one that is not.
@@ -449,9 +453,9 @@ TEST(DryRunLargeMoveTest, ThousandsOfFilesAndHundredsOfLevelsAreForeseen) {
     }
     for (int level = 0; level < 300; ++level) MakeDir(path += "/d");
     const std::string lines = both.Lines({"mv", both.From("tree"), both.To("")});
-    // A line for each, and one for the removal of all.
-    EXPECT_EQ(2302, std::count(lines.begin(), lines.end(), '\n'));
-    EXPECT_THAT(lines, EndsWith(Removed(both.From("tree"))));
+    // A line for each, and one for its removal.
+    EXPECT_EQ(2 * 2301, std::count(lines.begin(), lines.end(), '\n'));
+    EXPECT_THAT(lines, EndsWith(RemovedDirectory(both.From("tree"))));
     EXPECT_THAT(NamesIn(both.From("")), ElementsAre());
     both.Lines({"mv", both.To("tree"), both.To("renamed")});
 }

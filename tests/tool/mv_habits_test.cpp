@@ -286,6 +286,21 @@ TEST_P(MvAcrossTest, BackupsNewerOnesAndQuestionsAreAsInARename) {
     EXPECT_FALSE(Exists("from/a"));
 }
 
+// In mv's own words.
+TEST_P(MvAcrossTest, EachThatIsCopiedAndRemovedIsSaid) {
+    Make("from/a", "new");
+    Make("to/a", "old");
+    EXPECT_EQ("copied 'from/a' -> 'to/a' (backup: 'to/a~')\nremoved 'from/a'\n",
+              Run({"mv", "-v", "-b", "from/a", "to"}).out);
+    ASSERT_EQ(0, mkdir("from/d", 0755));
+    Make("from/d/x", "x");
+    EXPECT_EQ(
+        "created directory 'to/d'\ncopied 'from/d/x' -> 'to/d/x'\n"
+        "removed 'from/d/x'\nremoved directory 'from/d'\n",
+        Run({"mv", "-v", "from/d", "to"}).out);
+    EXPECT_EQ("", Run({"mv", "to/d", "from"}).out);
+}
+
 TEST_P(MvAcrossTest, AnInterruptAndASecondRunBringAllOfIt) {
     for (const char* name : {"a", "b", "c"}) Make(std::string("from/") + name, name);
     Make("to/b", "old");

@@ -2,9 +2,7 @@
 // setfattr restores what was saved, and what getfattr wrote is restored.
 
 #include <gtest/gtest.h>
-#include <pty.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <sys/xattr.h>
 #include <unistd.h>
 
@@ -17,6 +15,7 @@
 #include "tests/support/stream_builder.h"
 #include "tests/tool/holdings.h"
 #include "tests/tool/kills.h"
+#include "tests/tool/terminal.h"
 #include "tests/tool/tool.h"
 #include "tests/tool/travel.h"
 
@@ -624,23 +623,10 @@ TEST_F(SaveTest, ATerminalIsGivenNoCommandsAndTheTextMeansTheSame) {
     ASSERT_THAT(Run({"set", volume + "/a", "na\x1Bme", value}), Succeeded());
     Arguments arguments = volumes_;
     arguments.insert(arguments.end(), {"save", "-r", "--absolute-names", volume});
-    ToolStart tool(arguments);
-    int terminal = -1;
-    const pid_t child = forkpty(&terminal, nullptr, nullptr, nullptr);
-    if (child < 0) GTEST_SKIP() << "there are no terminals here";
-    if (child == 0) {
-        tool.Exec();
-        _exit(127);
-    }
-    std::string shown;
-    char part[1024];
-    for (ssize_t size; (size = read(terminal, part, sizeof part)) > 0;) {
-        shown.append(part, static_cast<std::size_t>(size));
-    }
-    int status = -1;
-    waitpid(child, &status, 0);
-    close(terminal);
-    EXPECT_EQ(0, status);
+    const Shown on_terminal = RunOnTerminal(arguments);
+    if (on_terminal.status < 0) GTEST_SKIP() << "there are no terminals here";
+    const std::string& shown = on_terminal.text;
+    EXPECT_EQ(0, on_terminal.status);
     EXPECT_EQ("# file: " + volume + "/a\r\nuser.na\\033me=\"a long value with one command in it " +
                   "\\033[2J\"\r\n\r\n",
               shown);

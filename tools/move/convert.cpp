@@ -68,8 +68,8 @@ class Conversion final : private TreeCopy {
 
     void Copy() {
         CopyTree(top_.first, top_.second);
-        crew_.Finish();
-        Try(top_.second.path(), [&] { transfer_.MakeDurable(); });
+        crew_.Finish();  // and with a log, what it has is on disk
+        if (!journal_) Try(top_.second.path(), [&] { transfer_.MakeDurable(); });
     }
 
     void Compare() {

@@ -291,8 +291,9 @@ class Placement final : private TreeCopy {
         if (Named() && target.own) (void)SettleObject(target.named, *target.own);
         const bool merges = source.is_directory() && target.is_directory();
         if (source.is_directory()) RequireApart(source, to);
-        std::string backup;
-        if (!std::exchange(taken_, false) && !MakeWay(source, &target, follows, &backup)) return;
+        const auto taken = std::exchange(taken_, std::nullopt);
+        std::string backup = taken.value_or("");
+        if (!taken && !MakeWay(source, &target, follows, &backup)) return;
         if (source.is_directory()) {
             Enter(source, target, merges, level);
         } else {
@@ -649,7 +650,7 @@ class Placement final : private TreeCopy {
             return job_.Say(line);
         }
         if (same) throw AreTheSame(from, to);
-        Carry(from, info, to);
+        Carry(from, info, to, backup);
     }
 
     static void RequireNamedFromAbove(const std::string& path, const Place& from, const Place& to) {
@@ -681,7 +682,8 @@ class Placement final : private TreeCopy {
         }
     }
 
-    void Carry(const Place& from, const struct stat& info, const Place& to) {
+    void Carry(const Place& from, const struct stat& info, const Place& to,
+               const std::string& backup) {
         const bool directory = S_ISDIR(info.st_mode);
         if (directory) RequireDescriptorPaths();
         const Object object = ObjectAt(from, &info);
@@ -694,7 +696,7 @@ class Placement final : private TreeCopy {
         }
         const std::uint64_t left = job_.failures() + job_.skipped();
         losses_ = 0;
-        taken_ = true;
+        taken_ = backup;
         CopyTree(from, to);
         // All of it is there, or nothing goes here.
         const std::uint64_t now = job_.failures() + job_.skipped();
@@ -720,12 +722,14 @@ class Placement final : private TreeCopy {
             const bool gone = RemoveCarried(
                 carried.place, carried.info,
                 [&](const struct stat& info) { return transfer_.WasCopied(info); },
+                [&](const Place& place, mode_t type) {
+                    if (options_.job.verbose) job_.Say(RemovalLine(place, type));
+                },
                 [&](const std::string& path, const Failure& failure) {
                     job_.AddFailure(path, failure);
                 });
             if (!gone) continue;
             job_.AddDone();
-            job_.Say("removed " + Quoted(carried.place.path()));
             if (!carried.unfinished) continue;
             (void)Try(carried.place.path(), [&] { carried.unfinished->Forget(); });
         }
@@ -765,7 +769,8 @@ class Placement final : private TreeCopy {
     Parents parents_;
     DirectoryRef directory_;            // that everything goes into
     std::optional<Place> destination_;  // or what it becomes
-    bool taken_ = false;                // the object in hand has been asked for
+    // The object in hand has been asked for: the name of the backup that was made, if one was.
+    std::optional<std::string> taken_;
     std::uint64_t losses_ = 0;
     std::vector<Carried> carried_;
     std::optional<timespec> removal_began_;    // of what is moved, by a run that was cut short

@@ -162,7 +162,7 @@ class Deletion final : private TreeRemoval {
         job_.AddDone();
         if (job_.wants_progress()) job_.ShowProgress(place.path());
         if (!options_.job.verbose) return;
-        job_.Say((S_ISDIR(type) ? "removed directory " : "removed ") + Quoted(place.path()));
+        job_.Say(RemovalLine(place, type));
     }
 
     Answer MayEnter(const Place& place, const struct stat& info, bool empty) override {

@@ -306,17 +306,20 @@ namespace {
 class CarriedRemoval final : public TreeRemoval {
  public:
     CarriedRemoval(const MayGo& was_carried,
+                   const std::function<void(const Place&, mode_t)>& removed,
                    const std::function<void(const std::string&, const Failure&)>& fail)
-        : TreeRemoval(was_carried), fail_(fail) {}
+        : TreeRemoval(was_carried), removed_(removed), fail_(fail) {}
 
     bool failed() const { return failed_; }
 
  private:
+    void Removed(const Place& place, mode_t type) override { removed_(place, type); }
     void Fail(const std::string& path, const Failure& failure) override {
         failed_ = true;
         fail_(path, failure);
     }
 
+    const std::function<void(const Place&, mode_t)>& removed_;
     const std::function<void(const std::string&, const Failure&)>& fail_;
     bool failed_ = false;
 };
@@ -324,11 +327,16 @@ class CarriedRemoval final : public TreeRemoval {
 }  // namespace
 
 bool RemoveCarried(const Place& named, const struct stat& info, const MayGo& was_carried,
+                   const std::function<void(const Place& place, mode_t type)>& removed,
                    const std::function<void(const std::string& path, const Failure&)>& fail) {
-    CarriedRemoval removal(was_carried, fail);
+    CarriedRemoval removal(was_carried, removed, fail);
     removal.RemoveTree(named, info);
     removal.Tidy();
     return !removal.failed();
+}
+
+std::string RemovalLine(const Place& place, mode_t type) {
+    return (S_ISDIR(type) ? "removed directory " : "removed ") + Quoted(place.path());
 }
 
 }  // namespace mavoea::tool

@@ -99,10 +99,14 @@ class TreeRemoval {
 };
 
 // Removes an object with all that is below it, which has been carried elsewhere: only what has, and
-// is still what it was then. Calls `fail` for what stays; what is above it stays as well. Whether
-// nothing did.
+// is still what it was then. Calls `removed` for each that has gone, with its type, and `fail` for
+// what stays; what is above it stays as well. Whether nothing did.
 bool RemoveCarried(const Place& named, const struct stat& info, const MayGo& was_carried,
+                   const std::function<void(const Place& place, mode_t type)>& removed,
                    const std::function<void(const std::string& path, const Failure&)>& fail);
+
+// What people are told of an object that has gone, as by rm.
+std::string RemovalLine(const Place& place, mode_t type);
 
 }  // namespace mavoea::tool
 
