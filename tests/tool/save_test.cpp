@@ -126,7 +126,7 @@ std::vector<Kinds> AllPairs() {
 }
 
 class SaveBetweenTest : public SaveTest, public ::testing::WithParamInterface<Kinds> {};
-INSTANTIATE_TEST_SUITE_P(Pairs, SaveBetweenTest, ::testing::ValuesIn(AllPairs()),
+INSTANTIATE_TEST_SUITE_P(Pairs, SaveBetweenTest, ::testing::ValuesIn(Thinned(AllPairs())),
                          [](const auto& tested) {
                              std::string name = tested.param.from + "To" + tested.param.to;
                              std::erase(name, '-');

@@ -5,6 +5,7 @@
 
 #include <sys/types.h>
 
+#include <chrono>
 #include <cstdint>
 #include <deque>
 #include <functional>
@@ -23,7 +24,8 @@ namespace mavoea::tool {
 // How many processes work on what there is to do.
 struct CrewSize {
     unsigned workers = 1;
-    // So many objects are begun with: what is soon done takes no other process.
+    // So many objects at a time are done by the first process, until they take it so long that it
+    // is worth the trouble to share out the rest. 0: it is.
     std::uint64_t alone = 0;
 };
 // One for each processor that this process may run on, at most 8, once there is enough to do.
@@ -103,11 +105,13 @@ class Crew {
     struct Batch;
     struct Worker;
 
+    bool GoesOnAlone();
     bool Begin();
     bool StartWorker();
     void CloseBatch();
     void Assign();
     static bool Give(Worker* worker, const std::shared_ptr<Batch>& batch);
+    void DoAlone(const Errand& errand);
     void DoHere(const Errand& errand);
     void DoHere(const Batch& batch);
     void NoteDone(std::size_t count);
@@ -125,7 +129,8 @@ class Crew {
     CrewSize size_;
     Duties duties_;
     Journal* journal_;
-    std::uint64_t begun_ = 0;  // errands, before there were workers
+    std::uint64_t done_alone_ = 0;  // errands, since the last look at how long they take
+    std::chrono::steady_clock::duration took_{};
     bool shared_out_ = false;
     std::uint64_t batches_ = 0;
     std::vector<std::unique_ptr<Worker>> workers_;
