@@ -38,7 +38,7 @@ class Locking {
              .hear = [this](std::string_view told) { Hear(told); },
              .changes = true,
              .clear_progress = [this] { progress_.Clear(); },
-             .show_progress = [this](const Object& object) { Show(object.path()); }});
+             .show_progress = [this](const Object& object) { Show(object); }});
         progress_.Clear();
         if (options_.json) {
             Print(json_);
@@ -96,11 +96,11 @@ class Locking {
         status_ = std::max(status_, status);
     }
 
-    void Show(const std::string& path) {
+    void Show(const Object& object) {
         if (!progress_.wanted()) return;
         const std::uint64_t done = changed_ + same_;
-        progress_.Show(std::to_string(done) + " done, " + std::to_string(failed_) + " failed", path,
-                       done + failed_);
+        progress_.Show(std::to_string(done) + " done, " + std::to_string(failed_) + " failed",
+                       object.path(), done + failed_);
     }
 
     const TreeOptions& options_;

@@ -664,7 +664,7 @@ class TreeImport {
     }
 
     void DoObject(const Place& place, std::vector<Place> files) {
-        report_.Show(place.path());
+        report_.Show(place);
         try {
             const auto info = place.Status();
             const bool metadata = place.name.starts_with(kPrefix) || place.name == kEaDirName ||

@@ -211,12 +211,19 @@ DirectoryRef Directory::MakeIn(const std::string& name, mode_t mode) const {
 }
 
 std::string Directory::PathOf(const std::string& name) const {
-    std::vector<const std::string*> below = {&name};
+    std::vector<const std::string*> below;
+    constexpr std::size_t kUsual = 16;
+    below.reserve(kUsual);
+    below.push_back(&name);
     const Names* names = names_.get();
+    std::size_t size = name.size();
     for (; names->above && names->shown.empty(); names = names->above.get()) {
         below.push_back(&names->name);
+        size += 1 + names->name.size();
     }
-    std::string path = names->shown;
+    std::string path;
+    path.reserve(names->shown.size() + 1 + size);
+    path = names->shown;
     for (auto one = below.rbegin(); one != below.rend(); ++one) AddTo(&path, **one);
     return path;
 }

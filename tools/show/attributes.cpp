@@ -243,7 +243,8 @@ ExitStatus LookAtObjects(const char* doing, const TreeOptions& options, const Lo
         all.failures += more.failures;
         all.status = std::max(all.status, more.status);
     };
-    const auto work = [&](const Object& object, const std::string& shown, const Tell& tell) {
+    const auto work = [&](const Object& object, const std::string& given, const Tell& tell) {
+        const std::string shown = given.empty() ? object.path() : given;
         Counts counts = {};
         const auto add = [&](const Failure& failure) {
             ++counts.failures;

@@ -124,8 +124,7 @@ class Walk {
         }
         const bool looked =
             errand.kind != Errand::Kind::kNamed || visit_.look_at_named(object, tell);
-        return visit_.work(object, errand.shown.empty() ? object.path() : errand.shown, tell) &&
-               looked;
+        return visit_.work(object, errand.shown, tell) && looked;
     }
 
     // Where work is done of which a log says that it is on disk.
@@ -206,7 +205,8 @@ class Work {
     Work(const TreeOptions& options, const Task& task)
         : task_(task),
           report_({task.doing, task.done, task.current, task.nothing},
-                  TreeReport::EachOf(options.verbose, options.json)) {}
+                  TreeReport::EachOf(options.verbose, options.json)),
+          tells_each_(options.verbose || options.log) {}
 
     void Run(const TreeOptions& options) {
         VisitObjects(
@@ -225,7 +225,7 @@ class Work {
              .hear = [this](std::string_view told) { Hear(told); },
              .changes = true,
              .clear_progress = [this] { report_.ClearProgress(); },
-             .show_progress = [this](const Object& object) { report_.Show(object.path()); },
+             .show_progress = [this](const Object& object) { report_.Show(object.place); },
              .on_other = task_.check},
             task_.doing);
     }
@@ -257,7 +257,7 @@ class Work {
             Notes notes;
             const Outcome outcome = task_.work(object, &notes);
             told.AddNumber(static_cast<std::uint64_t>(outcome));
-            told.AddText(object.path());
+            told.AddText(tells_each_ ? object.path() : std::string());
             for (const std::string& note : notes) told.AddText(note);
             return {told.bytes(), true};
         } catch (const Failure& failure) {
@@ -282,6 +282,7 @@ class Work {
 
     const Task& task_;
     TreeReport report_;
+    bool tells_each_;  // now, or when a log is gone on with
 };
 
 }  // namespace

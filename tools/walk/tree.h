@@ -36,9 +36,9 @@ struct TreeOptions {
 // wrong with a directory is told by the shard that it belongs to; others, whose objects may be in
 // there, fail with one line for all of those.
 struct Visit {
-    // `shown` is the path as it was given, or the object's own. Tells `hear` what came of it.
-    // Whether it is done, so that nobody who goes on with a log has to do it again.
-    std::function<bool(const Object&, const std::string& shown, const Tell&)> work;
+    // `given` is the path as it was given; empty for what was found below one. Tells `hear` what
+    // came of it. Whether it is done, so that nobody who goes on with a log has to do it again.
+    std::function<bool(const Object&, const std::string& given, const Tell&)> work;
     std::function<void(const std::string& path, const Failure&)> on_failure;
 
     // False: nothing below it is to be looked at.

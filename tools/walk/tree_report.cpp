@@ -9,8 +9,8 @@
 
 namespace mavoea::tool {
 
-void TreeReport::Show(const std::string& path) {
-    if (progress_.wanted()) progress_.Show(StatusText(), path, Total() + failures_.size());
+void TreeReport::Show(const Place& place) {
+    if (progress_.wanted()) progress_.Show(StatusText(), place.path(), Total() + failures_.size());
 }
 
 void TreeReport::Add(const std::string& path, Outcome outcome) {

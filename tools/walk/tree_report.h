@@ -7,6 +7,7 @@
 #include <string>
 #include <vector>
 
+#include "tools/place/directory.h"
 #include "tools/say/messages.h"
 #include "tools/say/output.h"
 #include "tools/say/progress.h"
@@ -39,7 +40,7 @@ class TreeReport {
         : words_(words), progress_(words.doing), each_(each) {}
 
     // Shows how far it is on standard error, when that is a terminal.
-    void Show(const std::string& path);
+    void Show(const Place& place);
     void ClearProgress() { progress_.Clear(); }
 
     void Add(const std::string& path, Outcome outcome);
