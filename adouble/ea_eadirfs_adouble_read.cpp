@@ -29,19 +29,21 @@ int MAVOEAEADirAdoubleRead(const char* path, EAAdouble* ad) {
         unit.Log("%s:%d Fail to generate path of %s.", path);
         return -1;
     }
-    const UniqueFd fd(kernel::OpenRegular(file, O_RDONLY | O_CLOEXEC, 0));
+    unsigned long long file_size = 0;
+    const UniqueFd fd(kernel::OpenToRead(file, &file_size));
     if (!fd) {
         if (errno == ENOENT) return 1;
         unit.Log("%s:%d Error: open path [%s] %s", path, strerror(errno));
         return unit.Fail(Err::kOpen);
     }
+    if (file_size < kResourceHeadSize) return 1;  // A resource file in another layout.
     std::uint8_t block[kResourceHeadSize];
     const std::int64_t size = ReadAt(fd.get(), block, 0);
     if (size < 0) {
         unit.Log("%s:%d Error: read path [%s] %s", path, strerror(errno));
         return unit.Fail(Err::kRead);
     }
-    if (size < std::int64_t{kResourceHeadSize}) return 1;  // A resource file in another layout.
+    if (size < std::int64_t{kResourceHeadSize}) return 1;  // It has been cut meanwhile.
     if (MAVOEAAdoubleRead(block, kResourceHeadSize, ad) != 0) {
         unit.Log("%s:%d EAAdoubleRead failed");
         return -1;

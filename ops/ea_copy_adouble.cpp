@@ -281,13 +281,12 @@ class Rewrite {
     std::uint32_t fork_length_ = 0;
 };
 
-constexpr int kRead = O_RDONLY | O_CLOEXEC;
 constexpr int kWrite = O_WRONLY | O_CREAT | O_CLOEXEC;
 
 // Opens src to see what it is. kDone with *rewrite false when there is nothing to rewrite.
 int Examine(const char* src, bool* rewrite) {
     *rewrite = false;
-    const UniqueFd fd(kernel::OpenRegular(src, kRead, 0));
+    const UniqueFd fd(kernel::OpenToRead(src));
     if (fd.get() == 0) errno = EBADF;  // Standard input's place is no file's.
     if (fd.get() < 1) {
         if (errno == ENOENT) return kDone;
@@ -316,7 +315,7 @@ int OpenSource(const char* src, UniqueFd* from) {
     bool rewrite = false;
     const int examined = Examine(src, &rewrite);
     if (!rewrite) return examined;
-    from->Reset(kernel::OpenRegular(src, kRead, 0));
+    from->Reset(kernel::OpenToRead(src));
     return *from || errno == ENOENT ? kDone : EARewriteNotOpened(src);
 }
 

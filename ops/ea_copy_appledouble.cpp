@@ -43,7 +43,7 @@ int RemoveFile(const char* path) {
 int AttributesFromAppleDouble(const char* src, const char* dst) {
     Path path;
     if (MAVOEAADPath(src, path, kDerivedPathMax) != 0) return -1;
-    const UniqueFd from(kernel::OpenRegular(path, O_RDONLY | O_CLOEXEC, 0));
+    const UniqueFd from(kernel::OpenToRead(path));
     if (!from) return errno == ENOENT ? 0 : unit.Fail(Err::kOpen);
     const int count = EASGetEntryCount(from.get());
     if (count <= 0) return count;

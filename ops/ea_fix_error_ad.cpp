@@ -92,7 +92,7 @@ class Replacement {
 
 // The attributes of the resource file `file` into the stream of the object at `path`.
 bool MoveAttributes(const char* file, const char* path) {
-    const UniqueFd from(kernel::OpenRegular(file, O_RDONLY | O_CLOEXEC, 0));
+    const UniqueFd from(kernel::OpenToRead(file));
     if (!from) return false;
     const int count = EASGetEntryCount(from.get());
     if (count <= 0) return count == 0;

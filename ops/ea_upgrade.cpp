@@ -345,7 +345,7 @@ int FindMarks(int fd, MarkOffsets* found) {
 }
 
 int ReadMarks(const char* resource_file, Marks* marks) {
-    const UniqueFd fd(kernel::OpenRegular(resource_file, O_RDONLY | O_CLOEXEC, 0));
+    const UniqueFd fd(kernel::OpenToRead(resource_file));
     if (!fd) return unit.Fail(Err::kOpen);
     MarkOffsets offsets;
     if (FindMarks(fd.get(), &offsets) != 0) return -1;

@@ -34,21 +34,26 @@ inline void CloseQuietly(int fd) {
     errno = error;
 }
 
-// The kind of the file behind `fd`, -1 with errno when it cannot be told. A look at its times would
-// make the next write renew them, and the next sync write them: half as much again for a small
-// file.
-inline int KindOf(int fd, mode_t* kind) {
+// What an open file is.
+struct OpenFile {
+    mode_t kind = 0;              // the S_IFMT bits of its mode
+    unsigned long long size = 0;  // in bytes
+};
+
+// 0, or -1 with errno when it cannot be told. A look at its times would make the next write renew
+// them, and the next sync write them: half as much again for a small file.
+inline int LookAtOpen(int fd, OpenFile* file) {
 #ifdef STATX_TYPE
     struct statx details;
-    if (::statx(fd, "", AT_EMPTY_PATH, STATX_TYPE, &details) == 0) {
-        *kind = details.stx_mode & S_IFMT;
+    if (::statx(fd, "", AT_EMPTY_PATH, STATX_TYPE | STATX_SIZE, &details) == 0) {
+        *file = {static_cast<mode_t>(details.stx_mode & S_IFMT), details.stx_size};
         return 0;
     }
     // Kernels that do not know it, and sandboxes, refuse it each in a way of its own.
 #endif
     struct stat info;
     if (::fstat(fd, &info) != 0) return -1;
-    *kind = info.st_mode & S_IFMT;
+    *file = {info.st_mode & S_IFMT, static_cast<unsigned long long>(info.st_size)};
     return 0;
 }
 
@@ -66,6 +71,9 @@ constexpr int RegularFileFlags(int flags) {
     return flags | O_NOFOLLOW | (may_wait ? O_NONBLOCK : 0);
 }
 
+// For what is read and closed again.
+inline constexpr int kReadFlags = O_RDONLY | O_CLOEXEC;
+
 // Opens a regular file that somebody has a lease on, as open(2) does: it waits until the lease is
 // given up, or taken away. That is done by what a descriptor holds which opens nothing itself, so
 // that no pipe can come between. Where there is no /proc, EWOULDBLOCK.
@@ -73,8 +81,8 @@ inline int OpenLeasedFile(const char* path, int flags) {
     const int place = ::open(path, O_PATH | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC);
     if (place < 0) return -1;
     int fd = -1;
-    mode_t kind = 0;
-    const int refusal = KindOf(place, &kind) == 0 ? RefusalOf(kind) : errno;
+    OpenFile file;
+    const int refusal = LookAtOpen(place, &file) == 0 ? RefusalOf(file.kind) : errno;
     if (refusal == 0) {
         char held[32];
         (void)::snprintf(held, sizeof held, "/proc/self/fd/%d", place);
@@ -87,21 +95,39 @@ inline int OpenLeasedFile(const char* path, int flags) {
     return fd;
 }
 
-// open(2) of a regular file; links are not followed. For anything else -1 with errno ELOOP (a
-// symbolic link), EISDIR or ENXIO, at once. The descriptor has the flags that were asked for.
-inline int OpenRegularFile(const char* path, int flags, mode_t mode) {
-    const int asked = RegularFileFlags(flags);
-    const bool guarded = ((asked & ~flags) & O_NONBLOCK) != 0;
-    const int fd = ::open(path, asked, mode);
-    if (fd < 0 && guarded && errno == EWOULDBLOCK) return OpenLeasedFile(path, flags);
+// Opens a regular file as RegularFileFlags() says, and looks what it is (of a file that it makes it
+// is known). -1 with errno ELOOP for a symbolic link, EISDIR or ENXIO for other things, at once.
+inline int OpenGuarded(const char* path, int flags, mode_t mode, OpenFile* file) {
+    int fd = ::open(path, RegularFileFlags(flags), mode);
+    if (fd < 0 && errno == EWOULDBLOCK && (flags & O_NONBLOCK) == 0) {
+        fd = OpenLeasedFile(path, flags);
+    }
     if (fd < 0 || MakesFile(flags)) return fd;
-    mode_t kind = 0;
-    int refusal = KindOf(fd, &kind) == 0 ? RefusalOf(kind) : errno;
-    if (refusal == 0 && guarded && ::fcntl(fd, F_SETFL, flags) != 0) refusal = errno;
+    const int refusal = LookAtOpen(fd, file) == 0 ? RefusalOf(file->kind) : errno;
     if (refusal == 0) return fd;
     errno = refusal;
     CloseQuietly(fd);
     return -1;
+}
+
+// open(2) of a regular file; links are not followed. For anything else as OpenGuarded(). The
+// descriptor has the flags that were asked for.
+inline int OpenRegularFile(const char* path, int flags, mode_t mode) {
+    OpenFile file;
+    const int fd = OpenGuarded(path, flags, mode, &file);
+    const bool guarded = ((RegularFileFlags(flags) & ~flags) & O_NONBLOCK) != 0;
+    if (fd < 0 || !guarded || ::fcntl(fd, F_SETFL, flags) == 0) return fd;
+    CloseQuietly(fd);
+    return -1;
+}
+
+// The same for reading that is over before anybody else has the descriptor: O_NONBLOCK, which says
+// nothing to a regular file, stays on. *size becomes the file's, in bytes, unless it is nullptr.
+inline int OpenRegularFileToRead(const char* path, unsigned long long* size) {
+    OpenFile file;
+    const int fd = OpenGuarded(path, kReadFlags, 0, &file);
+    if (size != nullptr) *size = file.size;
+    return fd;
 }
 
 // opendir(3); a symbolic link in the directory's place is ENOTDIR.

@@ -18,6 +18,9 @@ int Open(const char* path, int flags, mode_t mode) { return ::open(path, flags, 
 int OpenRegular(const char* path, int flags, mode_t mode) {
     return OpenRegularFile(path, flags, mode);
 }
+int OpenToRead(const char* path, unsigned long long* size) {
+    return OpenRegularFileToRead(path, size);
+}
 int OpenAt(int dir, const char* path, int flags, mode_t mode) {
     return ::openat(dir, path, flags, mode);
 }

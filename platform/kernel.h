@@ -23,6 +23,8 @@ int Open(const char* path, int flags, mode_t mode);
 // open(2) of a regular file: nothing else is opened, and nobody waited for but who has a lease on
 // the file. ELOOP for a symbolic link, EISDIR for a directory, ENXIO for all else.
 int OpenRegular(const char* path, int flags, mode_t mode);
+// The same to read it here and now, in fewer calls; *size becomes the file's, in bytes.
+int OpenToRead(const char* path, unsigned long long* size = nullptr);
 int OpenAt(int dir, const char* path, int flags, mode_t mode);
 int Close(int fd);
 ssize_t Pread(int fd, void* buffer, size_t size, off_t offset);

@@ -24,7 +24,7 @@ constexpr int kNotAppleDouble = -3;
 constexpr int kNoCompanion = -4;
 
 bool HasMagic(const char* path) {
-    const UniqueFd fd(kernel::OpenRegular(path, O_RDONLY | O_CLOEXEC, 0));
+    const UniqueFd fd(kernel::OpenToRead(path));
     std::uint8_t magic[4];
     return fd && ReadAt(fd.get(), magic, 0) == std::int64_t{sizeof magic} &&
            LoadBe32(magic) == kAppleDoubleMagic;

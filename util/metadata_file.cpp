@@ -37,7 +37,7 @@ bool HasMetadataMode(const char* path, mode_t mode) {
 
 void SetMetadataMode(const char* path, mode_t mode) {
     const ErrnoKeeper keep;
-    UniqueFd fd(kernel::OpenRegular(path, O_RDONLY | O_CLOEXEC, 0));
+    UniqueFd fd(kernel::OpenToRead(path));
     if (!fd) fd.Reset(kernel::OpenRegular(path, O_WRONLY | O_CLOEXEC, 0));
     if (fd) (void)kernel::Fchmod(fd.get(), mode);
 }

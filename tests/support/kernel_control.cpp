@@ -323,6 +323,13 @@ int OpenRegular(const char* path, int flags, mode_t mode) {
         [&] { return Opened(path, flags, [&] { return OpenRegularFile(path, flags, mode); }); });
 }
 
+int OpenToRead(const char* path, unsigned long long* size) {
+    return Call(
+        "open", Text(path) + ", " + Flags(RegularFileFlags(kReadFlags)) + ", " + Octal(0), -1, [&] {
+            return Opened(path, kReadFlags, [&] { return OpenRegularFileToRead(path, size); });
+        });
+}
+
 // Calls that take a directory are logged, and stood in for, under the whole path.
 int OpenAt(int dir, const char* path, int flags, mode_t mode) {
     const std::string whole = WholePath(dir, path);

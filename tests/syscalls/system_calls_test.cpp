@@ -245,7 +245,7 @@ TEST_F(SystemCallsTest, CopyingOverMetadataInProcessTakesFourLooksAtEachFile) {
     Trace([&] { return copy([](const char*, const char*) { return 0; }) == 0; });
     if (IsSkipped() || HasFatalFailure()) return;
     constexpr unsigned kLooks = 2 * 4;
-    constexpr unsigned kLockedState = 4 + 6 + 1 + 6;  // flag and record at each end
+    constexpr unsigned kLockedState = 4 + 3 + 1 + 3;  // flag and record at each end
     constexpr unsigned kFolderAndMark = 3;
     EXPECT_EQ(kLooks + kLockedState + kFolderAndMark, calls_.size()) << PrintToString(calls_);
     EXPECT_EQ(0, Count({"fchmod", "write", "mkdir"})) << PrintToString(calls_);

@@ -20,8 +20,11 @@
 namespace mavoea::test {
 namespace {
 
+using ::testing::Contains;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
+using ::testing::Not;
+using ::testing::StartsWith;
 
 constexpr char kAttribute[] = "user.netatalk.Metadata";
 
@@ -225,6 +228,18 @@ TEST_F(StorageTest, AShorterOrMissingResourceFileHasNoRecord) {
     EXPECT_EQ(1, ReadEADir());
     FillResourceFile({});
     EXPECT_EQ(1, ReadEADir());
+    FillResourceFile(OneEntry(9, 100, 32));
+    Hooks().opened = [this](int /*fd*/) { ASSERT_EQ(0, truncate(resource_.c_str(), 740)); };
+    EXPECT_EQ(1, ReadEADir());
+    Hooks().opened = nullptr;
+}
+
+// Not even where it cannot be read: of fewer bytes none is a record.
+TEST_F(StorageTest, NothingIsReadOfAShorterResourceFile) {
+    FillResourceFile(Pattern(740));
+    TakeCalls();
+    EXPECT_EQ(1, ReadEADir());
+    EXPECT_THAT(TakeCalls(), Not(Contains(StartsWith("pread"))));
 }
 
 // Promise: "MAVOEAFileEAAdoubleRead: the code of MAVOEAAdoubleRead()"

@@ -1083,8 +1083,8 @@ TEST_F(EaOpenTest, ADescriptorHasTheFlagsThatWereAskedForAndNoOthers) {
 }
 
 // Opens in a process of its own what this one has a lease on, and gives the lease up once it is
-// told that somebody waits. Whether that open succeeded.
-bool OpensOnceTheLeaseIsGone(const std::string& path, const std::function<int()>& open) {
+// told that somebody waits. What `opens` says then.
+bool OnceTheLeaseIsGone(const std::string& path, const std::function<bool()>& opens) {
     sigset_t told;
     sigset_t former;
     sigemptyset(&told);
@@ -1096,8 +1096,7 @@ bool OpensOnceTheLeaseIsGone(const std::string& path, const std::function<int()>
     const pid_t child = fork();
     if (child == 0) {
         alarm(20);
-        const int fd = open();
-        _exit(fd >= 0 && (fcntl(fd, F_GETFL) & O_NONBLOCK) == 0 ? 0 : 1);
+        _exit(opens() ? 0 : 1);
     }
     // A child that does not wait is gone before the lease is.
     const timespec most = {.tv_sec = 10, .tv_nsec = 0};
@@ -1122,11 +1121,20 @@ TEST_F(EaOpenTest, ALeaseIsWaitedForAsByAPlainOpen) {
     for (const int mode : kAccessModes) {
         for (const int more : {0, O_CREAT, O_TRUNC}) {
             SCOPED_TRACE(testing::Message() << mode << " " << more);
-            EXPECT_TRUE(OpensOnceTheLeaseIsGone(
-                stream_, [&] { return MAVOEAOpen(1, object_.c_str(), kStream, mode | more, 0); }));
+            EXPECT_TRUE(OnceTheLeaseIsGone(stream_, [&] {
+                const int fd = MAVOEAOpen(1, object_.c_str(), kStream, mode | more, 0);
+                return fd >= 0 && (fcntl(fd, F_GETFL) & O_NONBLOCK) == 0;
+            }));
         }
     }
     EXPECT_EQ(Bytes(), ReadFile(stream_));  // O_TRUNC did its work.
+
+    WriteFile(resource_, Bytes(741));
+    EXPECT_TRUE(OnceTheLeaseIsGone(resource_, [&] {
+        EAAdouble record = {};
+        (void)MAVOEAEADirAdoubleRead(object_.c_str(), &record);
+        return MLIBCErrGet() == MAVOEA_ERR_READ;  // what is in it, and not that it was refused
+    }));
 }
 
 TEST_F(EaOpenTest, ALeaseIsNotWaitedForByWhoAsksNotTo) {
