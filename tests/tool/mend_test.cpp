@@ -343,7 +343,7 @@ TEST_F(MendTest, NothingIsLostWhateverIsDamaged) {
     }
     MakeDir(dir_ / "@eaDir");
     std::vector<std::string> names;
-    for (const Bytes& bytes : Thinned(damaged)) {
+    for (const Bytes& bytes : Thinned(damaged, SeriesStep())) {
         names.push_back("n" + std::to_string(names.size()));
         PutStream(Add(names.back()), bytes);
     }
@@ -353,7 +353,7 @@ TEST_F(MendTest, NothingIsLostWhateverIsDamaged) {
     for (std::size_t i = 0; i < names.size(); ++i) {
         SCOPED_TRACE(names[i]);
         const MetadataPaths paths(dir_ / names[i]);
-        const Bytes old = Thinned(damaged)[i];
+        const Bytes old = Thinned(damaged, SeriesStep())[i];
         if (BytesIn(paths.stream) == old) {
             EXPECT_FALSE(Exists(paths.OfKind("MavoEAKept")));
             continue;
