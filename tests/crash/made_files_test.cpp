@@ -29,11 +29,7 @@
 namespace mavoea::test {
 namespace {
 
-// How many rounds each test makes; the environment may ask for more.
-int Rounds() {
-    const char* const asked = getenv("MAVOEA_RACE_ROUNDS");
-    return asked != nullptr ? atoi(asked) : kEmulated ? 500 : 5000;
-}
+int Rounds() { return RaceRounds(5000); }
 
 constexpr int kLocked = 0x400;
 

@@ -351,7 +351,7 @@ TEST(TwoProcessesTest, EveryCallDoesItsWorkOrIsToldThatTheStreamIsLocked) {
 // ---- Two opens of an object with metadata of earlier versions
 // --------------------------------------
 
-constexpr int kRounds = kEmulated ? 200 : 2000;
+int OpenRounds() { return RaceRounds(2000); }
 
 // Where the parent and its two children are: a child works on round n when `round` is n, and has
 // done it when its `done` is n.
@@ -369,8 +369,9 @@ const Items& Legacy() {
 
 // Each opens the stream to write into it, as soon as the round begins.
 [[noreturn]] void OpenEachRound(const ObjectFiles& object, int self, Rounds* rounds) {
-    alarm(100);
-    for (int round = 1; round <= kRounds; ++round) {
+    const int last = OpenRounds();
+    alarm(100 + static_cast<unsigned>(last) / 100);
+    for (int round = 1; round <= last; ++round) {
         while (rounds->round != round) sched_yield();
         const int fd = MAVOEAOpen(EA_FORM_FILE, object.object().c_str(), MAVOEA_KIND_STREAM,
                                   O_RDWR | O_CREAT, EA_PLACE_EADIR);
@@ -405,7 +406,7 @@ TEST(TwoProcessesTest, OfTwoOpensAtOnceNeitherHidesWhatEarlierVersionsKept) {
             if (children[self] == 0) OpenEachRound(object, self, rounds);
         }
         int lost = 0;
-        for (int round = 1; round <= kRounds; ++round) {
+        for (int round = 1; round <= OpenRounds(); ++round) {
             std::filesystem::remove_all(object.ea_dir());
             const bool sidecar = round % 4 == 0;
             if (sidecar) {
@@ -433,7 +434,7 @@ TEST(TwoProcessesTest, OfTwoOpensAtOnceNeitherHidesWhatEarlierVersionsKept) {
         }
         EXPECT_EQ(0, lost);
         EXPECT_EQ(0, rounds->failed);
-        printf("two processes: %d rounds of two opens in %s\n", kRounds, place.c_str());
+        printf("two processes: %d rounds of two opens in %s\n", OpenRounds(), place.c_str());
         munmap(page, sizeof(Rounds));
     }
     ResetKernel();

@@ -3,6 +3,7 @@
 #define MAVOEA_TESTS_SUPPORT_EMULATOR_H_
 
 #include <gtest/gtest.h>
+#include <stdlib.h>
 
 namespace mavoea::test {
 
@@ -14,6 +15,13 @@ inline constexpr bool kEmulated = sizeof MAVOEA_EMULATOR > 1;
 // times as long; 7 has no factor in common with the sizes of fields.
 inline constexpr int kEmulatedSeriesStep = 7;
 inline constexpr int kSeriesStep = kEmulated ? kEmulatedSeriesStep : 1;
+
+// How many rounds two processes race; the environment may ask for more.
+inline int RaceRounds(int usual) {
+    const char* const asked = getenv("MAVOEA_RACE_ROUNDS");
+    if (asked != nullptr) return atoi(asked);
+    return kEmulated ? usual / 10 : usual;
+}
 
 // qemu makes a fork of what is to share its parent's memory.
 inline constexpr char kNoSpawnErrors[] =

@@ -268,6 +268,112 @@ TEST_F(MvTest, MetadataOfNoObjectGoesWithItsDirectory) {
     travel.ExpectMetadata(travel.To("tree/a"));
 }
 
+// What has the name of another object's "._" file, and is none.
+class MvPrefixedTest : public ::testing::TestWithParam<int> {
+ protected:
+    void SetUp() override {
+        MAVOEA_SKIP_UNLESS_ROOT();
+        MAVOEA_SKIP_WITHOUT_ATTRIBUTES("/tmp");
+        MAVOEA_SKIP_WITHOUT_SECOND(second_);
+    }
+
+    // Longer than the header that it has not.
+    const std::string text_ = std::string(200, 'q');
+    const SecondVolume second_;
+};
+INSTANTIATE_TEST_SUITE_P(Types, MvPrefixedTest, ::testing::Values(kAppleDouble, kEaDirectory));
+
+TEST_P(MvPrefixedTest, ItGoesInItsOwnTurnWithItsOwnMetadata) {
+    const Travel travel(GetParam(), GetParam(), second_.path());
+    const auto make = [&](const std::string& directory) {
+        travel.MakeFile(directory + "x");
+        travel.MakeFile(directory + "._x", text_);
+        travel.GiveMetadata(directory + "._x");
+    };
+    const auto expect = [&](const std::string& directory) {
+        EXPECT_EQ("data", TextOf(directory + "x"));
+        EXPECT_EQ(text_, TextOf(directory + "._x"));
+        travel.ExpectMetadata(directory + "._x");
+    };
+    mkdir(travel.From("tree").c_str(), 0755);
+    make(travel.From("tree/"));
+    const ToolResult tree = travel.Run({"mv", "-v", travel.From("tree"), travel.target()});
+    EXPECT_THAT(tree, Succeeded());
+    EXPECT_THAT(tree.out, HasSubstr("removed '" + travel.From("tree/._x") + "'\n"));
+    expect(travel.To("tree/"));
+    EXPECT_THAT(NamesIn(travel.source()), ElementsAre());
+
+    make(travel.From(""));
+    EXPECT_THAT(travel.Run({"mv", travel.From("x"), travel.From("._x"), travel.target()}),
+                Succeeded());
+    expect(travel.To(""));
+    EXPECT_THAT(NamesIn(travel.source()), ElementsAre());
+}
+
+TEST_P(MvPrefixedTest, ItStaysWhereAnotherNameOfItGoes) {
+    const Travel travel(GetParam(), GetParam(), second_.path());
+    travel.MakeFile(travel.From("x"));
+    travel.MakeFile(travel.From("y"), text_);
+    ASSERT_EQ(0, link(travel.From("y").c_str(), travel.From("._x").c_str()));
+    travel.GiveMetadata(travel.From("._x"));
+    EXPECT_THAT(travel.Run({"mv", travel.From("y"), travel.From("x"), travel.target()}),
+                Succeeded());
+    EXPECT_EQ(text_, TextOf(travel.From("._x")));
+    travel.ExpectMetadata(travel.From("._x"));
+    EXPECT_FALSE(Exists(travel.To("._x")));
+}
+
+TEST_P(MvPrefixedTest, ItStaysWhereNotAllOfItArrives) {
+    const Travel travel(GetParam(), kXattr, second_.path());
+    travel.MakeFile(travel.From("x"));
+    travel.MakeFile(travel.From("._x"), text_);
+    const std::string value(300000, 'v');
+    ASSERT_THAT(travel.Run({"set", travel.From("._x"), Colour()}, value), Succeeded());
+    EXPECT_EQ(2, travel.Run({"mv", travel.From("x"), travel.From("._x"), travel.target()}).status);
+    EXPECT_EQ(text_, TextOf(travel.From("._x")));
+    EXPECT_EQ(value, travel.Run({"get", travel.From("._x"), Colour()}).out);
+    EXPECT_FALSE(Exists(travel.From("x")));
+}
+
+// Metadata has none: what would be that of a "._" file, or of an "@eaDir", is an object.
+TEST_P(MvPrefixedTest, WhatWouldBeMetadataOfMetadataIsAnObject) {
+    const Travel travel(GetParam(), GetParam(), second_.path());
+    const Bytes apple_double = StreamImage{.attributes = {{"a", Ascii("1")}}}.Build();
+    const Bytes other = StreamImage{.attributes = {{"b", Ascii("2")}}}.Build();
+    mkdir(travel.From("tree").c_str(), 0755);
+    travel.MakeFile(travel.From("tree/x"));
+    travel.MakeFile(travel.From("tree/own"));
+    travel.GiveMetadata(travel.From("tree/own"));
+    WriteFile(travel.From("tree/._x"), apple_double);
+    WriteFile(travel.From("tree/._._x"), other);
+    WriteFile(travel.From("tree/._._._x"), apple_double);  // metadata of that
+    mkdir(travel.From("tree/@eaDir").c_str(), 0777);
+    WriteFile(travel.From("tree/._@eaDir"), other);
+
+    const auto expect = [&](const std::string& tree) {
+        EXPECT_EQ("1", travel.Run({"get", tree + "/x", "a"}).out);
+        EXPECT_EQ(other, ReadFile(tree + "/._._x"));
+        EXPECT_EQ("1", travel.Run({"get", tree + "/._._x", "a"}).out);
+        EXPECT_EQ(other, ReadFile(tree + "/._@eaDir"));
+        travel.ExpectMetadata(tree + "/own");
+    };
+    expect(travel.From("tree"));
+    EXPECT_EQ(0, travel.Run({"cp", "-r", travel.From("tree"), travel.To("copy")}).status);
+    expect(travel.To("copy"));
+    EXPECT_EQ(0,
+              travel.Run({"diff", "-r", "--data", travel.From("tree"), travel.To("copy")}).status);
+    EXPECT_EQ(0, travel.Run({"rm", "-r", travel.To("copy")}).status);
+    EXPECT_FALSE(Exists(travel.To("copy")));
+    EXPECT_EQ(0, travel
+                     .Run({"convert", "-r", "--to", WordOfType(GetParam()), travel.From("tree"),
+                           travel.To("converted")})
+                     .status);
+    expect(travel.To("converted"));
+    EXPECT_EQ(0, travel.Run({"mv", travel.From("tree"), travel.target()}).status);
+    expect(travel.To("tree"));
+    EXPECT_FALSE(Exists(travel.From("tree")));
+}
+
 // On a volume of attributes a "._" file is a file like any other; elsewhere it would replace the
 // metadata of another, or be replaced by it.
 TEST_F(MvTest, AFileThatWouldBecomeMetadataOfAnotherIsToldOfAndKept) {

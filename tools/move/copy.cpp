@@ -721,7 +721,10 @@ class Placement final : private TreeCopy {
         for (const Carried& carried : carried_) {
             const bool gone = RemoveCarried(
                 carried.place, carried.info,
-                [&](const struct stat& info) { return transfer_.WasCopied(info); },
+                MayGo{[&](const struct stat& info) { return transfer_.WasCopied(info); },
+                      [&](const std::string& object, const struct stat& info) {
+                          return transfer_.WasMetadata(object, info);
+                      }},
                 [&](const Place& place, mode_t type) {
                     if (options_.job.verbose) job_.Say(RemovalLine(place, type));
                 },

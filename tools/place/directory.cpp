@@ -57,9 +57,14 @@ auto FirstFrom(Entries& entries, const std::string& name) {
                             });
 }
 
-// listxattrat(2), which Linux has from 6.13 on, by the number that it has on all architectures that
-// number their calls alike. Kernels without it say ENOSYS, sandboxes EPERM.
+// listxattrat(2), which Linux has from 6.13 on. Kernels without it say ENOSYS, sandboxes EPERM.
+#if defined(SYS_listxattrat)
+constexpr long kListXattrAt = SYS_listxattrat;
+#elif defined(__alpha__) || defined(__mips__) || (defined(__x86_64__) && defined(__ILP32__))
+constexpr long kListXattrAt = -1;  // numbers of their own
+#else
 constexpr long kListXattrAt = 465;
+#endif
 
 std::string ProcPathOf(int fd) { return "/proc/self/fd/" + std::to_string(fd); }
 

@@ -88,7 +88,7 @@ class Finder {
         // Its access time says something, and is taken before anybody looks into it.
         auto found = Look(directory_.shared_from_this(), name);
         if (!found || !MayBeAppleDouble(found->info)) return;
-        if (!is_known || !is_known(found->info)) {
+        if (!is_known || !is_known(name_, found->info)) {
             found->file = tool::FindAppleDouble(directory_, name);
             if (!found->file) return;
         }
@@ -237,21 +237,43 @@ bool HasAppleDoubleName(const Directory::Entry& entry) {
     return entry.name.starts_with(kAppleDoublePrefix);
 }
 
+// How often it begins with that of a "._" file.
+std::size_t Prefixes(std::string_view name) {
+    std::size_t count = 0;
+    for (; name.starts_with(kAppleDoublePrefix); ++count) {
+        name.remove_prefix(kAppleDoublePrefix.size());
+    }
+    return count;
+}
+
+// Whose metadata a "._" file would be.
+std::string ObjectOf(const Directory::Entry& entry) {
+    return entry.name.substr(kAppleDoublePrefix.size());
+}
+
 // What its name, its type and that of the volume say.
 bool MayBeMetadata(const Directory& directory, const Directory::Entry& entry, int type) {
     const Keeping keeping = KeepingOf(type);
     if (S_ISDIR(entry.type)) return entry.name == kEaDirName && keeping != Keeping::kNone;
     if (!S_ISREG(entry.type) || !HasAppleDoubleName(entry)) return false;
     if (keeping != Keeping::kAppleDouble && keeping != Keeping::kEaDirectory) return false;
-    const std::string object = entry.name.substr(kAppleDoublePrefix.size());
+    const std::string object = ObjectOf(entry);
     return !object.empty() && directory.HadAtFirst(object);
 }
 
 }  // namespace
 
 bool IsMetadata(const Directory& directory, const Directory::Entry& entry, int type) {
-    return MayBeMetadata(directory, entry, type) &&
-           (S_ISDIR(entry.type) || IsAppleDouble(directory, entry.name));
+    if (!MayBeMetadata(directory, entry, type)) return false;
+    if (S_ISDIR(entry.type)) return true;
+    return !NamesMetadata(directory, ObjectOf(entry), type) && IsAppleDouble(directory, entry.name);
+}
+
+bool NamesMetadata(const Directory& directory, const std::string& name, int type) {
+    if (name != kEaDirName && !name.starts_with(kAppleDoublePrefix)) return false;
+    if (directory.IsNotedAsMetadata(name)) return true;
+    const auto info = directory.StatusOf(name);
+    return info && IsMetadata(directory, {name, info->st_mode & S_IFMT}, type);
 }
 
 std::vector<Directory::Entry> CandidatesIn(const DirectoryRef& directory) {
@@ -260,19 +282,25 @@ std::vector<Directory::Entry> CandidatesIn(const DirectoryRef& directory) {
     std::erase_if(entries, [&](const Directory::Entry& entry) {
         return !HasAppleDoubleName(entry) && MayBeMetadata(*directory, entry, type);
     });
-    std::stable_partition(entries.begin(), entries.end(), std::not_fn(HasAppleDoubleName));
+    const auto named =
+        std::stable_partition(entries.begin(), entries.end(), std::not_fn(HasAppleDoubleName));
+    // "._x" may be an object, and "._._x" its metadata.
+    std::stable_sort(named, entries.end(), [](const auto& one, const auto& other) {
+        return Prefixes(one.name) < Prefixes(other.name);
+    });
     return entries;
 }
 
 bool IsObject(const DirectoryRef& directory, const Directory::Entry& candidate) {
     if (!S_ISREG(candidate.type) || !HasAppleDoubleName(candidate)) return true;
     const Object object = ObjectAt({directory, candidate.name}, candidate.type);
-    const bool may_be = MayBeMetadata(*directory, candidate, ReadableType(object.type));
+    const int type = ReadableType(object.type);
+    const bool may_be = MayBeMetadata(*directory, candidate, type);
     if (may_be && directory->IsNotedAsMetadata(candidate.name)) return false;
     // Where a list tells nobody any more whether there was an object, both may have gone.
     if (!may_be && directory->listed()) return true;
     if (!directory->Has(candidate.name)) return false;
-    return !may_be || !IsAppleDouble(*directory, candidate.name);
+    return !may_be || !IsMetadata(*directory, candidate, type);
 }
 
 std::vector<Directory::Entry> ObjectsIn(const DirectoryRef& directory) {

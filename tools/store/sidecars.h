@@ -19,7 +19,8 @@ inline constexpr const char* kCoverName = ".cover";
 // By the lists of the object's directory and its EA directory, where those have been taken: what
 // comes later may be missed, and what has gone is not there.
 struct Sidecars {
-    using IsKnown = std::function<bool(const struct stat&)>;
+    // Whether a file is known to be the "._" file of the object of that name in its directory.
+    using IsKnown = std::function<bool(const std::string& object, const struct stat&)>;
 
     struct Found {
         DirectoryRef directory;
@@ -40,8 +41,7 @@ struct Sidecars {
     enum class Services { kLeaveOut, kFind };
 
     // Throws Failure. An "@eaDir" that is a symbolic link, or may not be looked into, is a
-    // `problem`. A file in the place of the "._" file counts as one without being opened where
-    // `is_known` says so.
+    // `problem`. What `is_known` to be the object's "._" file is not opened to see that it is one.
     static Sidecars Find(const Object& object, Services services, const IsKnown& is_known = {});
 
     DirectoryRef ea_dir;  // null: there is none, or volumes of the type have no use for one
@@ -78,11 +78,13 @@ bool IsAppleDouble(const Directory& directory, const std::string& name);
 WholeFile FindAppleDouble(const Directory& directory, const std::string& name);
 
 // Whether an entry of a directory is metadata of an object in it, on volumes of that type: "@eaDir"
-// and "._" files whose object is there. Throws Failure.
+// and "._" files whose object is there; metadata has none. Throws Failure.
 bool IsMetadata(const Directory& directory, const Directory::Entry& entry, int type);
+// The same of what has that name; false when nothing has.
+bool NamesMetadata(const Directory& directory, const std::string& name, int type);
 
 // What in a directory is an object or may be one, as it was listed first: sorted by name, and what
-// has the name of a "._" file behind all others. Throws Failure.
+// has the name of a "._" file behind all others, that of such a file's behind that. Throws Failure.
 std::vector<Directory::Entry> CandidatesIn(const DirectoryRef& directory);
 // Whether one of these is an object. Of a "._" file it is asked when its turn comes: the work on
 // the object that it belongs to has looked into it by then, and nobody has to do so again; or that

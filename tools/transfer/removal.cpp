@@ -10,7 +10,6 @@
 
 #include "tools/place/dry_run.h"
 #include "tools/say/job.h"
-#include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
 #include "tools/transfer/indexes.h"
 
@@ -41,7 +40,8 @@ void Unlink(const Place& place, int flags) {
 class Beside {
  public:
     Beside(const Object& object, bool alone, const MayGo& may_go)
-        : object_(object), sidecars_(Sidecars::Find(object, Sidecars::Services::kFind, may_go)) {
+        : object_(object),
+          sidecars_(Sidecars::Find(object, Sidecars::Services::kFind, may_go.was_metadata)) {
         if (!sidecars_.AnyByName()) return;
         if (alone) {
             RequireOwnNames(object);

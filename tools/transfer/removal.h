@@ -9,12 +9,18 @@
 
 #include "tools/place/volume.h"
 #include "tools/say/messages.h"
+#include "tools/store/sidecars.h"
 
 namespace mavoea::tool {
 
-// Whether something that was found may go. What may not stays, and is a Failure. Where there is
-// none, everything may.
-using MayGo = std::function<bool(const struct stat&)>;
+// Of what was found, what may go. What may not stays, and is a Failure.
+struct MayGo {
+    std::function<bool(const struct stat&)> was_carried = {};  // null: everything may
+    Sidecars::IsKnown was_metadata = {};
+
+    explicit operator bool() const { return was_carried != nullptr; }
+    bool operator()(const struct stat& info) const { return was_carried(info); }
+};
 
 // Removes an object that is no directory, then what lies beside it. With `alone` false another
 // object of its directory that would have the same metadata goes as well. Throws Failure.

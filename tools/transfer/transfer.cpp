@@ -25,6 +25,7 @@
 #include "tools/transfer/indexes.h"
 #include "tools/transfer/permissions.h"
 #include "tools/transfer/rename.h"
+#include "util/fnv.h"
 
 namespace mavoea::tool {
 
@@ -246,6 +247,14 @@ std::uint64_t HashOf(const struct stat& info, bool with_change_time) {
     hash.Add(static_cast<std::uint64_t>(info.st_size)).Add(info.st_mtim);
     if (with_change_time) hash.Add(info.st_ctim);
     return hash.value();
+}
+
+std::uint64_t HashOf(const struct stat& info) { return HashOf(info, info.st_nlink == 1); }
+
+// As the "._" file of the object of that name. No other file, nor this one where it is anything
+// else, has that hash.
+std::uint64_t HashAsMetadata(const std::string& object, const struct stat& info) {
+    return Hash().Add(HashOf(info, true)).Add(Fnv::Of(object)).value();
 }
 
 bool SameState(const struct stat& one, const struct stat& other) {
@@ -755,13 +764,22 @@ void Transfer::NoteOrphan(const Leg& leg) const {
 
 void Transfer::NoteCopied(const Leg& leg) {
     if (!options_.remembers) return;
-    Remember(leg.source->info());
-    for (const Sidecars::Found& file : leg.sidecars.Files()) Remember(file.info);
+    Remember(HashOf(leg.source->info()));
+    for (const Sidecars::Found& file : leg.sidecars.Files()) Remember(HashOf(file.info));
+    if (const auto& file = leg.sidecars.apple_double; file && file->info.st_nlink == 1) {
+        Remember(HashAsMetadata(leg.from.place.name, file->info));
+    }
 }
 
-void Transfer::Remember(const struct stat& info) {
-    copied_.push_back(HashOf(info, info.st_nlink == 1));
+void Transfer::Remember(std::uint64_t hash) {
+    copied_.push_back(hash);
     sorted_ = false;
+}
+
+bool Transfer::Remembers(std::uint64_t hash) {
+    if (!sorted_) std::sort(copied_.begin(), copied_.end());
+    sorted_ = true;
+    return std::binary_search(copied_.begin(), copied_.end(), hash);
 }
 
 void Transfer::NoteMade(const Place& to, const struct stat& info) {
@@ -809,7 +827,8 @@ void Transfer::RequireNoMetadata(const Place& from, const Object& target) const 
     };
     const std::string prefix = AppleDoubleName({});
     const bool is_prefixed = to.name.starts_with(prefix);
-    const std::string object = is_prefixed ? to.name.substr(prefix.size()) : std::string();
+    std::string object = is_prefixed ? to.name.substr(prefix.size()) : std::string();
+    if (NamesMetadata(there, object, target.type)) object.clear();  // which has none of its own
     if (!object.empty() && there.Has(object) && IsAppleDouble(there, to.name)) {
         throw Failure(kFailed, from.path(),
                       "its place is that of metadata of '" + Printable(there.PathOf(object)) + '\'',
@@ -915,7 +934,7 @@ void Transfer::CopyLeftOvers(const Directory& inside, const DirectoryRef& made,
         } else {
             try {
                 if (CopyLeftOver(file, made)) {
-                    Remember(info);
+                    Remember(HashOf(info));
                 } else {
                     missing.push_back({item, "something of its name is at the destination"});
                 }
@@ -948,13 +967,12 @@ void Transfer::MakeDurable() {
 }
 
 bool Transfer::WasCopied(const struct stat& info) {
-    if (!sorted_) std::sort(copied_.begin(), copied_.end());
-    sorted_ = true;
-    const auto has = [&](bool with_change_time) {
-        return std::binary_search(copied_.begin(), copied_.end(), HashOf(info, with_change_time));
-    };
     // The change time of a file with several names changes when one of them goes.
-    return has(true) || has(false);
+    return Remembers(HashOf(info, true)) || Remembers(HashOf(info, false));
+}
+
+bool Transfer::WasMetadata(const std::string& object, const struct stat& info) {
+    return info.st_nlink == 1 && Remembers(HashAsMetadata(object, info));
 }
 
 }  // namespace mavoea::tool

@@ -106,6 +106,8 @@ class Transfer {
 
     // Whether a file is one that has been copied, and still what it was then.
     bool WasCopied(const struct stat& info);
+    // The same, and as the "._" file of the object of that name.
+    bool WasMetadata(const std::string& object, const struct stat& info);
 
  private:
     using FileId = std::pair<dev_t, ino_t>;
@@ -132,7 +134,8 @@ class Transfer {
     void NoteOrphan(const Leg& leg) const;
     void NoteUnseen(const Leg& leg) const;
     void NoteCopied(const Leg& leg);
-    void Remember(const struct stat& info);
+    void Remember(std::uint64_t hash);
+    bool Remembers(std::uint64_t hash);
     void NoteMade(const Place& to, const struct stat& info);
     std::optional<std::string> NameOfMade(const Place& to) const;
     void RequireMayCome(const Leg& leg) const;
