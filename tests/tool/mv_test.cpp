@@ -374,6 +374,52 @@ TEST_P(MvPrefixedTest, WhatWouldBeMetadataOfMetadataIsAnObject) {
     EXPECT_FALSE(Exists(travel.From("tree")));
 }
 
+// Three names, each of nothing, of a file that is too short for metadata, of a longer one, or of an
+// AppleDouble file.
+std::vector<std::map<std::string, Bytes>> TreesOfPrefixes() {
+    const std::vector<Bytes> contents = {{},
+                                         Ascii("short"),
+                                         Ascii(std::string(200, 'q')),
+                                         StreamImage{.attributes = {{"a", Ascii("1")}}}.Build()};
+    std::vector<std::map<std::string, Bytes>> trees;
+    for (std::size_t i = 1; i < contents.size() * contents.size() * contents.size(); ++i) {
+        std::map<std::string, Bytes> tree;
+        std::size_t left = i;
+        for (const char* name : {"x", "._x", "._._x"}) {
+            const Bytes& content = contents[left % contents.size()];
+            if (!content.empty()) tree[name] = content;
+            left /= contents.size();
+        }
+        trees.push_back(tree);
+    }
+    return trees;
+}
+
+TEST_F(MvTest, EveryTreeOfPrefixedNamesArrives) {
+    const SecondVolume second;
+    MAVOEA_SKIP_WITHOUT_SECOND(second);
+    const Travel travel(kAppleDouble, kAppleDouble, second.path());
+    for (const std::map<std::string, Bytes>& tree : Thinned(TreesOfPrefixes())) {
+        SCOPED_TRACE(::testing::PrintToString(tree));
+        const auto expect = [&](const std::string& directory) {
+            std::map<std::string, Bytes> found;
+            for (const std::string& name : NamesIn(directory)) {
+                found[name] = ReadFile(directory + '/' + name);
+            }
+            EXPECT_EQ(tree, found);
+        };
+        mkdir(travel.From("tree").c_str(), 0755);
+        for (const auto& [name, content] : tree) WriteFile(travel.From("tree/" + name), content);
+        EXPECT_THAT(travel.Run({"cp", "-r", travel.From("tree"), travel.To("copy")}), Succeeded());
+        expect(travel.To("copy"));
+        EXPECT_THAT(travel.Run({"mv", travel.From("tree"), travel.target()}), Succeeded());
+        expect(travel.To("tree"));
+        EXPECT_FALSE(Exists(travel.From("tree")));
+        EXPECT_THAT(travel.Run({"rm", "-r", travel.To("copy"), travel.To("tree")}), Succeeded());
+        EXPECT_THAT(NamesIn(travel.target()), ElementsAre());
+    }
+}
+
 // On a volume of attributes a "._" file is a file like any other; elsewhere it would replace the
 // metadata of another, or be replaced by it.
 TEST_F(MvTest, AFileThatWouldBecomeMetadataOfAnotherIsToldOfAndKept) {
