@@ -285,7 +285,7 @@ TEST_P(ImportTest, EntriesThatTheObjectWouldLoseKeepTheOthersFromIt) {
     WriteFile(volume_.finder_file(), own);
     const ToolResult result = Import(NetatalkFile(Bytes(32), {}).bytes);
     EXPECT_EQ(2, result.status);
-    const std::string why = "writing them would lose its Macintosh file info";
+    const std::string why = "writing its metadata anew would lose its Macintosh file info";
     std::string err;
     for (const char* name : {"real name", "comment", "file dates", "AFP directory id"}) {
         err += NotTakenOver(name, why);

@@ -11,6 +11,7 @@
 #include "tools/say/messages.h"
 #include "tools/store/foreign/detection.h"
 #include "tools/store/reader.h"
+#include "tools/store/rewriting.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
 #include "tools/transfer/pending.h"
@@ -95,8 +96,7 @@ Outcome RepairObject(const Object& volume_object) {
     metadata.whole_stream.reset();
     metadata.strays.clear();
     std::vector<Missing> missing;
-    const Writer& writer = WriterFor(object);
-    const Metadata fitting = writer.Fit(metadata, object, &missing);
+    const Metadata fitting = WriterFor(object).Fit(metadata, object, &missing);
     if (!missing.empty()) {
         throw Failure(
             kFailed, resource,
@@ -104,12 +104,9 @@ Outcome RepairObject(const Object& volume_object) {
             "move the file away if that is no loss");
     }
     if (joins && !DryRun()) JoinInStream(object, sidecars, found);
-    const Written written =
-        writer.Write(object, *Inode::Open(object.place), fitting,
-                     {.old = Old::kKept, .first = joins ? First::kResource : First::kStream});
-    if (DryRun()) return Outcome::kDone;
-    auto lost = WhatIsMissing(fitting, ReadMetadata(object, Sidecars::Services::kFind));
-    lost.insert(lost.end(), written.missing.begin(), written.missing.end());
+    const std::vector<Missing> lost =
+        Rewrite(object, fitting, {.first = joins ? First::kResource : First::kStream},
+                [&] { return ReadMetadata(object, Sidecars::Services::kFind); });
     if (lost.empty()) return Outcome::kDone;
     throw Failure(kFailed, resource,
                   "not all of it arrived: " + lost.front().item + " (" + lost.front().reason + ')',

@@ -9,12 +9,11 @@
 
 #include "include/mavoea.h"
 #include "tools/care/whole_file.h"
-#include "tools/place/dry_run.h"
 #include "tools/say/text.h"
 #include "tools/store/foreign/detection.h"
 #include "tools/store/reader.h"
+#include "tools/store/rewriting.h"
 #include "tools/store/sidecars.h"
-#include "tools/store/writer.h"
 
 namespace mavoea::tool {
 namespace {
@@ -121,28 +120,16 @@ bool AdoptStray(const Object& object, const std::string& path) {
     if (!Add(stray->holds, path, &wanted)) return true;
     RequireDeclared(object);
     RequireOwnNames(object);
-    // They hold what was there.
-    wanted.whole_apple_double.reset();
-    wanted.whole_stream.reset();
-    wanted.whole_resource.reset();
-    wanted.whole_record.reset();
-    if (!wanted.strays.empty()) {
-        throw Failure(kFailed, path,
-                      "putting it in its place would lose " + wanted.strays.front().item,
-                      "see what it is with: mavoea list -l PATH");
-    }
-    std::vector<Missing> missing;
-    const Writer& writer = WriterFor(object);
-    const Metadata fitting = writer.Fit(wanted, object, &missing);
-    if (!missing.empty()) {
-        throw Failure(kFailed, path, "its place does not hold all of it: " + Joined(missing),
+    RequireRewritable(object, wanted);
+    wanted.ForgetFiles();
+    const Fitting fit = FitAll(object, std::move(wanted), NamesOfItems(stray->holds));
+    if (!fit.missing.empty()) {
+        throw Failure(kFailed, path, "its place does not hold all of it: " + Joined(fit.missing),
                       "mavoea get what is needed, and remove the file");
     }
     // The stream may have had what goes into the resource file.
-    const Written written = writer.Write(object, *Inode::Open(object.place), fitting,
-                                         {.old = Old::kKept, .first = First::kResource});
-    if (!DryRun()) missing = WhatIsMissing(fitting, ReadCurrent(object));
-    missing.insert(missing.end(), written.missing.begin(), written.missing.end());
+    const std::vector<Missing> missing = Rewrite(object, fit.metadata, {.first = First::kResource},
+                                                 [&] { return ReadCurrent(object); });
     if (missing.empty()) return true;
     throw Failure(kFailed, path, "not all of it has arrived: " + Joined(missing),
                   "give the command again");

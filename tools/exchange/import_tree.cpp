@@ -23,9 +23,9 @@
 #include "tools/store/foreign/detection.h"
 #include "tools/store/foreign/spelling.h"
 #include "tools/store/reader.h"
+#include "tools/store/rewriting.h"
 #include "tools/store/rights.h"
 #include "tools/store/sidecars.h"
-#include "tools/store/writer.h"
 #include "tools/transfer/pending.h"
 #include "tools/walk/tree.h"
 #include "tools/walk/tree_report.h"
@@ -274,13 +274,6 @@ std::string JoinedNames(const std::vector<std::string>& names) {
     return text;
 }
 
-void ForgetWholeFiles(Metadata* metadata) {
-    metadata->whole_apple_double.reset();
-    metadata->whole_stream.reset();
-    metadata->whole_resource.reset();
-    metadata->whole_record.reset();
-}
-
 // ---- Onto one object ----------------------------------------------------------------------------
 
 // Whether "._" files are where volumes of its type keep something.
@@ -359,7 +352,7 @@ class OntoObject {
     // converted: of what a run that was killed has left, the same counts.
     void StoreTogether(Metadata all) {
         MacSource& beside = sources_.back();
-        ForgetWholeFiles(&all);
+        all.ForgetFiles();
         std::vector<Missing> missing;
         FitAppleDouble(&all, &missing);
         if (!missing.empty()) {
@@ -421,12 +414,7 @@ class OntoObject {
     // What lies beside the object is written anew, with what it holds and with these.
     void WriteAnew(const Metadata& imported) {
         Metadata wanted = ReadApart();
-        if (!wanted.problems.empty()) throw Failure(wanted.problems.front());
-        if (!wanted.strays.empty()) {
-            throw Failure(kFailed, object_.path(),
-                          "writing it would lose " + wanted.strays.front().item,
-                          "see what it is with: mavoea list -l PATH");
-        }
+        RequireRewritable(object_, wanted);
         const bool had_any = wanted.HasAny();
         wanted.services.clear();
         std::vector<std::string> differing;
@@ -472,30 +460,14 @@ class OntoObject {
     }
 
     std::vector<Missing> Write(const Metadata& imported, Metadata wanted, Durability durability) {
-        ForgetWholeFiles(&wanted);
-        std::vector<Missing> missing;
-        const Writer& writer = WriterFor(object_);
-        const Metadata fitting = writer.Fit(std::move(wanted), object_, &missing);
-        for (const Missing& one : missing) RequireImported(imported, one);
+        wanted.ForgetFiles();
+        const Fitting fit = FitAll(object_, std::move(wanted), NamesOfItems(imported));
         for (const MacSource& source : sources_) RequireUnchanged(source);
-        const Written written = writer.Write(object_, *Inode::Open(object_.place), fitting,
-                                             {.durability = durability, .old = Old::kKept});
-        missing.insert(missing.end(), written.missing.begin(), written.missing.end());
-        if (DryRun()) return missing;
-        const auto differing = WhatIsMissing(fitting, ReadApart());
-        missing.insert(missing.end(), differing.begin(), differing.end());
+        std::vector<Missing> missing = fit.missing;
+        const auto lost =
+            Rewrite(object_, fit.metadata, {.durability = durability}, [&] { return ReadApart(); });
+        missing.insert(missing.end(), lost.begin(), lost.end());
         return missing;
-    }
-
-    // What has no place is something that is imported, and stays where it was.
-    void RequireImported(const Metadata& imported, const Missing& one) const {
-        const auto items = ItemsOf(imported, {});
-        const bool brings = std::any_of(items.begin(), items.end(), [&](const Missing& item) {
-            return one.item == item.item || one.item == "flags of " + item.item;
-        });
-        if (brings) return;
-        throw Failure(kFailed, object_.path(), "writing it would lose its " + one.item,
-                      "see what it is with: mavoea list -l PATH");
     }
 
     // What the object has without the file that is imported.

@@ -7,8 +7,8 @@
 #include "tools/store/adoption.h"
 #include "tools/store/foreign/spelling.h"
 #include "tools/store/reader.h"
+#include "tools/store/rewriting.h"
 #include "tools/store/sidecars.h"
-#include "tools/store/writer.h"
 
 namespace mavoea::tool {
 namespace {
@@ -173,9 +173,6 @@ bool TakingOver::Set(const Value& value) {
 void TakingOver::AddRest(const Metadata& taken) {
     const std::vector<std::string> rest = RestOf(taken);
     if (rest.empty()) return;
-    const auto brings = [&](const Missing& one) {
-        return std::find(rest.begin(), rest.end(), one.item) != rest.end();
-    };
     try {
         // Of the places of a value not all are rehearsed.
         Rehearsed::Forget();
@@ -183,30 +180,15 @@ void TakingOver::AddRest(const Metadata& taken) {
         if (DryRun()) AddSet(taken, &wanted);
         if (!wanted.problems.empty()) throw Failure(wanted.problems.front());
         if (!Merge(taken, &wanted)) return;
-        if (!wanted.strays.empty()) {
-            throw Failure(kFailed, object_.path(),
-                          "writing them would lose " + wanted.strays.front().item,
-                          "see what it is with: mavoea list -l PATH");
+        RequireRewritable(object_, wanted);
+        wanted.ForgetFilesOfEntries();
+        const Fitting fit = FitAll(object_, std::move(wanted), rest);
+        for (const Missing& one : fit.missing) Miss(one.item, one.reason);
+        if (fit.missing.size() == rest.size()) return;
+        const auto read_back = [&] { return ReadMetadata(object_, Sidecars::Services::kFind); };
+        for (const Missing& one : Rewrite(object_, fit.metadata, {}, read_back)) {
+            Miss(one.item, one.reason);
         }
-        wanted.whole_apple_double.reset();
-        wanted.whole_resource.reset();
-        wanted.whole_record.reset();
-        std::vector<Missing> missing;
-        const Writer& writer = WriterFor(object_);
-        const Metadata fitting = writer.Fit(wanted, object_, &missing);
-        for (const Missing& one : missing) {
-            if (brings(one)) continue;
-            throw Failure(kFailed, object_.path(), "writing them would lose its " + one.item,
-                          "see what it is with: mavoea list -l PATH");
-        }
-        for (const Missing& one : missing) Miss(one.item, one.reason);
-        if (missing.size() == rest.size()) return;
-        const Written written =
-            writer.Write(object_, *Inode::Open(object_.place), fitting, {.old = Old::kKept});
-        for (const Missing& one : written.missing) Miss(one.item, one.reason);
-        if (DryRun()) return;
-        const Metadata found = ReadMetadata(object_, Sidecars::Services::kFind);
-        for (const Missing& one : WhatIsMissing(fitting, found)) Miss(one.item, one.reason);
     } catch (const Failure& failure) {
         for (const std::string& item : rest) Miss(item, failure.cause());
     }

@@ -10,6 +10,7 @@
 
 #include "tools/place/volume.h"
 #include "tools/store/metadata.h"
+#include "tools/store/rewriting.h"
 
 namespace mavoea::tool {
 
@@ -36,12 +37,7 @@ class EntryChange {
     std::vector<Missing> Write() const;
 
  private:
-    struct Fitting {
-        Metadata metadata;
-        std::vector<Missing> missing;
-    };
-    Fitting MakeFit() const;
-    bool Brings(const std::string& item) const;
+    Fitting FitChange() const;
 
     const Object object_;
     Metadata wanted_;

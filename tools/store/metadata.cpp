@@ -37,6 +37,17 @@ const Metadata::Attribute* Metadata::Find(std::string_view name) const {
     return found == attributes.end() ? nullptr : &*found;
 }
 
+void Metadata::ForgetFiles() {
+    ForgetFilesOfEntries();
+    whole_stream.reset();
+}
+
+void Metadata::ForgetFilesOfEntries() {
+    whole_apple_double.reset();
+    whole_resource.reset();
+    whole_record.reset();
+}
+
 std::optional<std::uint16_t> Metadata::AfpAttributes() const {
     const auto found = entries.find(EntryId::kAfpFileInfo);
     if (found == entries.end() || found->second.value.damaged()) return std::nullopt;

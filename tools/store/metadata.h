@@ -104,6 +104,10 @@ struct Metadata {
     }
     const Attribute* Find(std::string_view name) const;
 
+    // For when something above is no longer what was read from them. Entries are in no stream.
+    void ForgetFiles();
+    void ForgetFilesOfEntries();
+
     // The attributes in the AFP file info; none when there is no such entry, or a damaged one.
     std::optional<std::uint16_t> AfpAttributes() const;
 };

@@ -31,10 +31,7 @@ class ForeignWriter final : public Writer {
 
     Metadata Fit(Metadata metadata, const Object& to,
                  std::vector<Missing>* missing) const override {
-        metadata.whole_apple_double.reset();
-        metadata.whole_stream.reset();
-        metadata.whole_resource.reset();
-        metadata.whole_record.reset();
+        metadata.ForgetFiles();
         FitServices(&metadata, missing);
         DropDamaged(&metadata);
         TakeMarksFromWord(&metadata);
