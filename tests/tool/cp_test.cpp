@@ -485,14 +485,14 @@ TEST_F(CpTest, AFailureInATreeDoesNotStopTheRest) {
     EXPECT_EQ("data", TextOf(travel_.To("tree/c")));
 }
 
-TEST_F(CpTest, TheMetadataOfADirectoryThatIsMergedIsReplaced) {
+TEST_F(CpTest, TheMetadataOfADirectoryThatIsMergedStays) {
     mkdir(travel_.From("tree").c_str(), 0755);
     mkdir(travel_.To("tree").c_str(), 0755);
     travel_.MakeFile(travel_.To("tree/kept"));
     travel_.GiveMetadata(travel_.To("tree"));
     travel_.GiveMetadata(travel_.To("tree/kept"));
     EXPECT_THAT(travel_.Run({"cp", "-r", travel_.From("tree"), travel_.target()}), Succeeded());
-    travel_.ExpectNoMetadata(travel_.To("tree"));
+    travel_.ExpectMetadata(travel_.To("tree"));
     travel_.ExpectMetadata(travel_.To("tree/kept"));
 }
 

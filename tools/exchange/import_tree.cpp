@@ -18,6 +18,7 @@
 #include "tools/place/volume.h"
 #include "tools/say/text.h"
 #include "tools/store/adoption.h"
+#include "tools/store/combination.h"
 #include "tools/store/encoding.h"
 #include "tools/store/foreign/apple_double.h"
 #include "tools/store/foreign/detection.h"
@@ -201,73 +202,6 @@ class Waiting {
     std::size_t count_ = 0;
 };
 
-// ---- Putting values together --------------------------------------------------------------------
-
-enum class Wins { kThere, kOther };
-
-// Adds another one's values to those that are there, and replaces them where the other wins. Adds
-// those of which both have one, and not the same, to *differing. Whether anything has changed.
-class Combination {
- public:
-    Combination(Metadata* there, Wins wins, std::vector<std::string>* differing)
-        : there_(*there), wins_(wins), differing_(*differing) {}
-
-    bool Run(const Metadata& other) {
-        for (const Metadata::Attribute& attribute : other.attributes) AddAttribute(attribute);
-        if (other.finder_info) AddItem("Finder info", *other.finder_info, &there_.finder_info);
-        if (other.fork) {
-            if (there_.fork && IsBlankFork(there_.fork->value)) there_.fork.reset();
-            AddItem("resource fork", *other.fork, &there_.fork);
-        }
-        for (const auto& [id, item] : other.entries) AddEntry(id, item);
-        return changed_;
-    }
-
- private:
-    // Whether the other's value takes the place of one that differs.
-    bool Takes(const std::string& item) {
-        differing_.push_back(item);
-        return wins_ == Wins::kOther;
-    }
-
-    void AddAttribute(const Metadata::Attribute& attribute) {
-        const auto at = std::find_if(
-            there_.attributes.begin(), there_.attributes.end(),
-            [&](const Metadata::Attribute& one) { return one.name == attribute.name; });
-        if (at == there_.attributes.end()) {
-            there_.attributes.push_back(attribute);
-        } else if (SameContent(at->value, attribute.value) ||
-                   !Takes(NameOfAttribute(attribute.name))) {
-            return;
-        } else {
-            *at = attribute;
-        }
-        changed_ = true;
-    }
-
-    void AddItem(const char* name, const Metadata::Item& item,
-                 std::optional<Metadata::Item>* there) {
-        if (*there && (SameContent((*there)->value, item.value) || !Takes(name))) return;
-        *there = item;
-        changed_ = true;
-    }
-
-    void AddEntry(EntryId id, const Metadata::Item& item) {
-        const auto there = there_.entries.find(id);
-        const Bytes old = there == there_.entries.end() ? Bytes() : there->second.value.All();
-        Bytes value = WithLockOf(id, item.value.All(), old);
-        if (value == old || !SaysSomething(id, value)) return;
-        if (!old.empty() && !Takes(NameOfEntry(id))) return;
-        there_.entries[id] = {Content(std::move(value)), item.holder};
-        changed_ = true;
-    }
-
-    Metadata& there_;
-    const Wins wins_;
-    std::vector<std::string>& differing_;
-    bool changed_ = false;
-};
-
 std::string JoinedNames(const std::vector<std::string>& names) {
     std::string text;
     for (const std::string& name : names) text += (text.empty() ? "" : ", ") + name;
@@ -337,7 +271,7 @@ class OntoObject {
         for (std::size_t i = sources_.size() - 1; i-- > 0;) {
             const MacSource& source = sources_[i];
             std::vector<std::string> differing;
-            (void)Combination(&all, Wins::kThere, &differing).Run(source.metadata);
+            (void)Combine(source.metadata, Wins::kThere, &all, &differing);
             all.strays.insert(all.strays.end(), source.metadata.strays.begin(),
                               source.metadata.strays.end());
             if (differing.empty()) continue;
@@ -393,7 +327,7 @@ class OntoObject {
         if (options_.keep_existing) {
             Metadata there = ReadMetadata(object_, Sidecars::Services::kLeaveOut);
             std::vector<std::string> differing;
-            (void)Combination(&there, Wins::kThere, &differing).Run(imported);
+            (void)Combine(imported, Wins::kThere, &there, &differing);
             there.strays = std::move(imported.strays);
             there.locked = false;
             ImportAll(there);
@@ -420,7 +354,7 @@ class OntoObject {
         std::vector<std::string> differing;
         const Wins wins = options_.keep_existing ? Wins::kThere : Wins::kOther;
         const bool lacks_record = LacksRecord(wanted);
-        const bool changes = Combination(&wanted, wins, &differing).Run(imported);
+        const bool changes = Combine(imported, wins, &wanted, &differing);
         const bool converts = beside_ && KeepsAppleDoubles(object_) && wanted.fork;
         // The file holds what differs, and the fork.
         if (options_.keep_existing && converts) RequireSame(differing);

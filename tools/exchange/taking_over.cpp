@@ -5,6 +5,7 @@
 #include "tools/place/dry_run.h"
 #include "tools/say/text.h"
 #include "tools/store/adoption.h"
+#include "tools/store/combination.h"
 #include "tools/store/foreign/spelling.h"
 #include "tools/store/reader.h"
 #include "tools/store/rewriting.h"
@@ -54,24 +55,6 @@ std::vector<std::string> RestOf(const Metadata& metadata) {
 }
 
 }  // namespace
-
-bool SameContent(const Content& one, const Content& other) {
-    return !one.damaged() && !other.damaged() && one.size() == other.size() &&
-           !FirstDifference(one, other);
-}
-
-Bytes WithLockOf(EntryId id, Bytes bytes, const Bytes& old) {
-    bytes = WithoutLock(id, std::move(bytes));
-    if (id != EntryId::kAfpFileInfo || bytes.size() < kAfpFileInfoSize ||
-        old.size() < bytes.size()) {
-        return bytes;
-    }
-    const std::uint16_t kept = LoadBe16(&old[kAfpAttributesOffset]) &
-                               ~LoadBe16(&WithoutLock(id, old)[kAfpAttributesOffset]);
-    std::uint8_t* const word = &bytes[kAfpAttributesOffset];
-    StoreBe16(static_cast<std::uint16_t>(LoadBe16(word) | kept), word);
-    return bytes;
-}
 
 void SortOut(Metadata* metadata) {
     std::erase_if(metadata->entries, [](const auto& entry) {

@@ -18,13 +18,6 @@ namespace mavoea::tool {
 // whose name means something else becomes a stray.
 void SortOut(Metadata* metadata);
 
-// An entry as it is to be written over `old`: the AFP word locks what it locked before, and nothing
-// else.
-Bytes WithLockOf(EntryId id, Bytes bytes, const Bytes& old);
-
-// False for what is damaged. Throws Failure.
-bool SameContent(const Content& one, const Content& other);
-
 // Values replace those of the same name, and what is not among them stays on the object. A part
 // that cannot be stored does not keep the others from it. What has been written has been read back.
 class TakingOver {

@@ -58,6 +58,13 @@ std::string ModeText(mode_t mode) {
     return digits + " (" + letters + ')';
 }
 
+// What is there is left alone in that of directories as well.
+Merging MergingOf(Task task, const CopyOptions& options) {
+    if (task != Task::kCopy) return Merging::kReplaces;
+    const bool keeps = options.update || options.overwrite == Overwrite::kNever;
+    return keeps ? Merging::kKeeps : Merging::kAdds;
+}
+
 class Placement final : private TreeCopy {
  public:
     Placement(Task task, const CopyOptions& options)
@@ -69,6 +76,7 @@ class Placement final : private TreeCopy {
                                .give_up = InterruptedAgain},
                      .on_note = [this](const std::string& note) { job_.AddNote(note); },
                      .manner = options.manner,
+                     .merging = MergingOf(task, options),
                      .remembers = !Copies()}) {}
 
     ExitStatus Run() {
@@ -361,6 +369,10 @@ class Placement final : private TreeCopy {
     // Of what is there. False when nothing is to be done; *backup is where it is kept, if it is.
     bool MakeWay(const Source& source, Target* target, bool follows, std::string* backup) {
         if (!target->info) return true;
+        const bool merges = source.is_directory() && target->is_directory();
+        if (!merges || options_.backup != Backup::kNone) {
+            transfer_.RequireNoMetadataAt(target->named, source.named);
+        }
         if (LeavesAlone(source)) return Leave();
         switch (CompareEnds(source, *target, task_, options_, follows)) {
             case Sameness::kSame:

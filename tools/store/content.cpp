@@ -63,6 +63,11 @@ std::optional<std::uint64_t> FirstDifference(const Content& one, const Content& 
     }
 }
 
+bool SameContent(const Content& one, const Content& other) {
+    return !one.damaged() && !other.damaged() && one.size() == other.size() &&
+           !FirstDifference(one, other);
+}
+
 std::uint64_t WriteTo(const File& file, std::uint64_t offset, const Content& content) {
     for (std::uint64_t at = 0; at < content.size(); at += kPiece) {
         file.Write(offset + at, content.Read(at, kPiece));

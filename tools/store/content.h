@@ -51,6 +51,9 @@ class Content {
 // The first byte at which they differ; none when they are the same. Throws Failure.
 std::optional<std::uint64_t> FirstDifference(const Content& one, const Content& other);
 
+// False for what is damaged. Throws Failure.
+bool SameContent(const Content& one, const Content& other);
+
 // Appends all of it to the file at `offset`, piece by piece. Returns where it ends.
 std::uint64_t WriteTo(const File& file, std::uint64_t offset, const Content& content);
 

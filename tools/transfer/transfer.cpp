@@ -15,11 +15,14 @@
 #include "tools/say/job.h"
 #include "tools/say/messages.h"
 #include "tools/say/text.h"
+#include "tools/store/combination.h"
+#include "tools/store/fitting.h"
 #include "tools/store/foreign/detection.h"
 #include "tools/store/foreign/spelling.h"
 #include "tools/store/marks.h"
 #include "tools/store/metadata.h"
 #include "tools/store/reader.h"
+#include "tools/store/rewriting.h"
 #include "tools/store/rights.h"
 #include "tools/store/writer.h"
 #include "tools/transfer/indexes.h"
@@ -40,6 +43,12 @@ struct Leg {
     std::shared_ptr<const Inode> target = {};  // once it is there
     std::optional<mode_t> former_mode = {};    // of a target that is written over
     bool is_link = false;                      // the target is one more name of a file
+    // Extended attributes of the source that are none of its metadata, once they have been asked
+    // for.
+    std::optional<std::vector<std::string>> own_attributes = {};
+    // Where the metadata of the target stays: what is wanted besides, and whether that is nothing.
+    std::optional<std::vector<std::string>> added = {};
+    bool stays = false;
 };
 
 namespace {
@@ -169,18 +178,18 @@ mode_t MadeMode(const Leg& leg, const Manner& manner) {
     return leg.target->info().st_mode & kPermissionBits;
 }
 
+mode_t KeptMode(const Leg& leg) {
+    const struct stat& info = leg.source->info();
+    const struct stat now = leg.target->Status();
+    const mode_t mode = info.st_mode & kPermissionBits;
+    // Nobody gets another user's rights by a copy of his program.
+    const bool same = now.st_uid == info.st_uid && now.st_gid == info.st_gid;
+    return same ? mode : mode & ~mode_t{S_ISUID | S_ISGID};
+}
+
 // Where the permissions say whether a file is locked, the metadata decides on the write bits.
 FinalMode FinalModeOf(const Leg& leg, const Manner& manner) {
-    const struct stat& info = leg.source->info();
-    mode_t mode = MadeMode(leg, manner);
-    if (manner.keeps_mode) {
-        const struct stat now = leg.target->Status();
-        mode = info.st_mode & kPermissionBits;
-        // Nobody gets another user's rights by a copy of his program.
-        if (now.st_uid != info.st_uid || now.st_gid != info.st_gid) {
-            mode &= ~mode_t{S_ISUID | S_ISGID};
-        }
-    }
+    const mode_t mode = manner.keeps_mode ? KeptMode(leg) : MadeMode(leg, manner);
     if (!LocksByMode(leg.to)) return {mode};
     if (leg.wanted.locked) {
         const bool unlocks = LocksByMode(leg.from) && manner.keeps_mode;
@@ -324,31 +333,92 @@ Metadata MetadataOfCopy(const Place& from, const Place& there) {
                                copy, &missing);
 }
 
+// Whether what is known of an object, or some of it, is in the object itself, and one for all its
+// names; the fork may still be beside each of them.
+bool KeepsInInode(const Object& object) {
+    return object.keeping() == Keeping::kXattr || object.kind() == VolumeKind::kFileEA ||
+           object.dialect() != nullptr;
+}
+bool KeepsForkInInode(const Object& object) {
+    if (const Dialect* const dialect = object.dialect()) {
+        return dialect->fork == Dialect::Fork::kAttribute;
+    }
+    return object.keeping() == Keeping::kXattr;
+}
+
 // Whether the copy of `first` at `there` may have this object's metadata, too, where that is in the
 // file itself.
 bool SharesMetadata(const Place& first, const Place& there, const Leg& leg) {
-    const bool in_inode = leg.to.keeping() == Keeping::kXattr ||
-                          leg.to.kind() == VolumeKind::kFileEA || leg.to.dialect() != nullptr;
-    if (!in_inode) return true;
-    const Metadata other = MetadataOfCopy(first, there);
+    if (!KeepsInInode(leg.to)) return true;
+    Metadata other = MetadataOfCopy(first, there);
     Metadata own = leg.wanted;
+    // Each name has files of its own for these.
     own.services.clear();
-    if (leg.to.kind() == VolumeKind::kFileEA) own.attributes.clear();
+    for (Metadata* const one : {&own, &other}) {
+        if (!KeepsForkInInode(leg.to) || (one->fork && IsBlankFork(one->fork->value))) {
+            one->fork.reset();
+        }
+        if (leg.to.kind() == VolumeKind::kFileEA) one->attributes.clear();
+    }
     return WhatIsMissing(own, other).empty() && own.entries.size() == other.entries.size() &&
-           (own.attributes.size() == other.attributes.size() ||
-            leg.to.kind() == VolumeKind::kFileEA) &&
-           own.finder_info.has_value() == other.finder_info.has_value();
+           own.attributes.size() == other.attributes.size() &&
+           own.finder_info.has_value() == other.finder_info.has_value() &&
+           own.fork.has_value() == other.fork.has_value();
+}
+
+const std::vector<std::string>& OwnAttributes(Leg* leg) {
+    if (!leg->own_attributes) {
+        leg->own_attributes = leg->source->AttributeNames();
+        std::erase_if(*leg->own_attributes, [&](const std::string& name) {
+            return TravelsAsMetadata(name, leg->from, leg->to);
+        });
+    }
+    return *leg->own_attributes;
+}
+
+bool IsOwnAttribute(const std::string& name, Leg* leg) {
+    const std::vector<std::string>& own = OwnAttributes(leg);
+    return std::find(own.begin(), own.end(), name) != own.end();
 }
 
 // What of the metadata of an object that is written over lies in its attributes. What is wanted of
-// it is written anew.
-void RemoveFormerAttributes(const Leg& leg) {
-    const bool in_attributes = leg.to.keeping() == Keeping::kXattr || leg.to.dialect() != nullptr;
-    if (!in_attributes && leg.to.kind() != VolumeKind::kFileEA) return;
-    for (const std::string& name : leg.target->AttributeNames()) {
-        const bool goes = in_attributes ? TravelsAsMetadata(name, leg.to, Object()) && !IsMark(name)
-                                        : name == kNetatalkAttribute;
-        if (goes) (void)leg.target->RemoveAttribute(name);
+// it is written anew; what the source has of its own is no metadata in the copy either.
+void RemoveFormerAttributes(Leg* leg) {
+    if (!KeepsInInode(leg->to)) return;
+    for (const std::string& name : leg->target->AttributeNames()) {
+        const bool goes = leg->to.kind() != VolumeKind::kFileEA
+                              ? TravelsAsMetadata(name, leg->to, Object()) && !IsMark(name)
+                              : name == kNetatalkAttribute;
+        if (goes && !IsOwnAttribute(name, leg)) (void)leg->target->RemoveAttribute(name);
+    }
+}
+
+// What the source has of its own under a name that some of its metadata has there.
+void AddWrittenOver(Leg* leg, const Metadata& fitting, std::vector<Missing>* missing) {
+    if (!KeepsInInode(leg->to) || leg->to.kind() == VolumeKind::kFileEA) return;
+    const auto add = [&](const std::string& item, const Spelling& there, const Content* value) {
+        if (!IsOwnAttribute(there.attribute, leg)) return;
+        const auto own = leg->source->Attribute(there.attribute);
+        if (!own) return;
+        if (value != nullptr) {
+            Bytes written = value->All();
+            if (there.has_nul) written.push_back(0);
+            if (written == *own) return;
+        }
+        missing->push_back({"extended attribute " + NameOfAttribute(there.attribute),
+                            "its " + item + " has that name there"});
+    };
+    const Dialect* const dialect = leg->to.dialect();
+    for (const Metadata::Attribute& attribute : fitting.attributes) {
+        const auto there = dialect == nullptr
+                               ? Spelling{attribute.name, Spelling::Datum::kAttribute}
+                               : SpellAttribute(attribute.name, *dialect);
+        if (there) add(NameOfAttribute(attribute.name), *there, &attribute.value);
+    }
+    if (dialect == nullptr) return;
+    if (fitting.finder_info) add("Finder info", SpellFinderInfo(*dialect), nullptr);
+    if (fitting.fork && KeepsForkInInode(leg->to)) {
+        add("resource fork", SpellFork(*dialect), nullptr);
     }
 }
 
@@ -370,6 +440,19 @@ struct Arrival {
     Metadata fitting;
     Written written;
 };
+
+// What of the source could not be read, and did not go with all of its file.
+void AddUnreadable(const Leg& leg, const std::set<std::string>& wholes,
+                   std::vector<Missing>* missing) {
+    for (const Metadata::Stray& stray : leg.wanted.strays) {
+        if (!wholes.contains(stray.holder)) missing->push_back({stray.item, stray.reason});
+    }
+    for (const Failure& problem : leg.wanted.problems) {
+        if (!wholes.contains(problem.subject())) {
+            missing->push_back({Printable(problem.subject()), problem.cause()});
+        }
+    }
+}
 
 // What is not at the destination, after all, and what could not be read from the source.
 void AddWhatDidNotArrive(const Leg& leg, Arrival arrival, std::vector<Missing>* missing) {
@@ -394,14 +477,14 @@ void AddWhatDidNotArrive(const Leg& leg, Arrival arrival, std::vector<Missing>* 
             if (!Names(*missing, one.item)) missing->push_back(one);
         }
     }
-    for (const Metadata::Stray& stray : leg.wanted.strays) {
-        if (!whole(stray.holder)) missing->push_back({stray.item, stray.reason});
-    }
-    for (const Failure& problem : leg.wanted.problems) {
-        if (!whole(problem.subject())) {
-            missing->push_back({Printable(problem.subject()), problem.cause()});
-        }
-    }
+    AddUnreadable(leg, wholes, missing);
+}
+
+Metadata FitTo(const Leg& leg, std::vector<Missing>* missing) {
+    if (!leg.added) return WriterFor(leg.to).Fit(leg.wanted, leg.to, missing);
+    Fitting fit = FitAll(leg.to, leg.wanted, *leg.added);
+    *missing = std::move(fit.missing);
+    return std::move(fit.metadata);
 }
 
 }  // namespace
@@ -523,7 +606,7 @@ void Transfer::Overwrite(const Place& from, const File* stream, const Place& to,
         if (options_.manner.data) target.Resize(0);
         CopyBytes(source, stream != nullptr, target);
     }
-    RemoveFormerAttributes(leg);
+    RemoveFormerAttributes(&leg);
     CopyInodeTo(leg, source.fd(), target.fd());
     RememberName(leg, links);
     Finish(&leg);
@@ -551,7 +634,9 @@ void Transfer::MakeNode(Leg* leg) const {
         leg->target = node->inode();
     }
     CopyInodeTo(*leg, -1, -1);
-    if (!S_ISLNK(type) && !manner.keeps_mode) leg->target->SetMode(MadeMode(*leg, manner));
+    if (!S_ISLNK(type)) {
+        leg->target->SetMode(manner.keeps_mode ? KeptMode(*leg) : MadeMode(*leg, manner));
+    }
     if (node) node->GiveToTarget();
 }
 
@@ -565,7 +650,7 @@ void Transfer::CarryMetadata(const Place& from, const Place& to) {
     leg.former_mode = leg.target->info().st_mode & kPermissionBits;
     RequireSeen(leg);
     RequireUnlockedTarget(leg);
-    RemoveFormerAttributes(leg);
+    RemoveFormerAttributes(&leg);
     Finish(&leg);
 }
 
@@ -576,6 +661,14 @@ void Transfer::LinkObject(const Place& from, const Place& to) {
     const auto what = [&] {
         return "cannot create hard link " + Quoted(to.path()) + " to " + Quoted(from.path());
     };
+    const bool alike = leg.from.kind() == leg.to.kind() && leg.from.dialect() == leg.to.dialect();
+    if (!alike && KeepsInInode(leg.to) && leg.wanted.HasAny()) {
+        throw Failure(
+            kFailed, from.path(),
+            "a link at " + Printable(to.path()) +
+                " would keep its metadata in the file itself, which is this one's as well",
+            "copy it");
+    }
     leg.is_link = true;
     if (DryRun()) {
         Made(what, [&] { ForeseeLink(&leg, from); });
@@ -668,8 +761,11 @@ void Transfer::RememberName(const Leg& leg, Links links) {
 void Transfer::CopyInodeTo(const Leg& leg, int source, int target) const {
     if (options_.manner.metadata_only) return;
     const auto problem = CopyPermissions(
-        {leg.source, source}, {leg.target, target}, options_.manner,
-        [&](const std::string& name) { return !TravelsAsMetadata(name, leg.from, leg.to); });
+        {leg.source, source}, {leg.target, target}, options_.manner, [&](const std::string& name) {
+            const bool stays = leg.added && options_.merging == Merging::kKeeps;
+            return !TravelsAsMetadata(name, leg.from, leg.to) &&
+                   !(stays && leg.target->Attribute(name));
+        });
     if (problem) options_.on_note(Printable(leg.to.path()) + ": " + *problem);
     if (!HoldsContents(leg.source->info())) return;
     // The owner of a file or directory can still change it.
@@ -678,6 +774,53 @@ void Transfer::CopyInodeTo(const Leg& leg, int source, int target) const {
     const mode_t mode = now.st_mode & kPermissionBits;
     const mode_t least = S_ISDIR(leg.source->info().st_mode) ? S_IRWXU : S_IRUSR | S_IWUSR;
     if ((mode & least) != least) leg.target->SetMode(mode | least);
+}
+
+// What is wanted of a directory that is there: all that it has, and some more.
+void Transfer::MergeInto(Leg* leg) const {
+    if (leg->to.keeping() == Keeping::kNone || leg->to.is_root()) return;
+    Metadata all =
+        ReadMetadata(leg->to, *leg->target, Sidecars::Find(leg->to, Sidecars::Services::kFind));
+    const bool yields = options_.merging == Merging::kKeeps;
+    Metadata& wanted = leg->wanted;
+    Metadata readable = wanted;
+    DropDamaged(&readable);
+    leg->added = NamesOfItems(readable);
+    std::vector<std::string> differing;
+    bool changes = Combine(readable, yields ? Wins::kThere : Wins::kOther, &all, &differing);
+    for (const Metadata::ServiceFile& service : wanted.services) {
+        leg->added->push_back(NameOfAttribute(service.name) + " of another service");
+        const auto there = std::find_if(
+            all.services.begin(), all.services.end(),
+            [&](const Metadata::ServiceFile& one) { return one.name == service.name; });
+        if (there == all.services.end()) {
+            all.services.push_back(service);
+        } else if (yields || SameContent(there->value, service.value)) {
+            continue;
+        } else {
+            *there = service;
+        }
+        changes = true;
+    }
+    const auto mark = [&](bool is_set, bool* there) {
+        if (yields || !is_set || *there) return;
+        *there = true;
+        changes = true;
+    };
+    mark(wanted.locked, &all.locked);
+    mark(wanted.hidden, &all.hidden);
+    mark(wanted.system, &all.system);
+    if (wanted.created && wanted.created != all.created && !(yields && all.created)) {
+        all.created = wanted.created;
+        changes = true;
+    }
+    if (changes) RequireRewritable(leg->to, all);
+    leg->stays = !changes;
+    all.ForgetFiles();
+    all.strays = std::move(wanted.strays);
+    all.problems = std::move(wanted.problems);
+    all.earlier = std::move(wanted.earlier);
+    wanted = std::move(all);
 }
 
 // All that comes once the data is in its place. Mode and times are right also when the metadata
@@ -693,14 +836,14 @@ void Transfer::Finish(Leg* leg) {
     std::vector<Missing> missing;
     Arrival arrival;
     std::optional<Failure> failure;
-    if (keeps && !leg->to.is_root()) {
+    if (keeps && !leg->to.is_root() && !leg->stays) {
         WriteOptions write = {.durability = Durability::kLater,
                               .is_new = !leg->former_mode && !leg->is_link};
         if (holds) write.mode = mode.locks ? mode.mode & ~kWriteBits : mode.mode;
         try {
-            const Writer& writer = WriterFor(leg->to);
-            arrival.fitting = writer.Fit(leg->wanted, leg->to, &missing);
-            arrival.written = writer.Write(leg->to, *leg->target, arrival.fitting, write);
+            arrival.fitting = FitTo(*leg, &missing);
+            arrival.written =
+                WriterFor(leg->to).Write(leg->to, *leg->target, arrival.fitting, write);
         } catch (const Failure& problem) {
             failure = problem;
         }
@@ -720,7 +863,11 @@ void Transfer::Finish(Leg* leg) {
                          "its metadata could not be copied: " + std::string(failure->what()),
                          "see what is in the way, and copy it again");
     }
-    if (keeps) {
+    if (leg->stays) {
+        AddUnreadable(*leg, {}, &missing);
+    } else if (keeps) {
+        const bool yields = leg->added && options_.merging == Merging::kKeeps;
+        if (!yields) AddWrittenOver(leg, arrival.fitting, &missing);
         AddWhatDidNotArrive(*leg, std::move(arrival), &missing);
     } else {
         AddUnkept(*leg, &missing);
@@ -849,6 +996,16 @@ void Transfer::RequireNoMetadata(const Place& from, const Object& target) const 
     }
 }
 
+void Transfer::RequireNoMetadataAt(const Place& to, const Place& from) const {
+    const bool may_be = to.name == kEaDirName || to.name.starts_with(AppleDoubleName({}));
+    const auto there = may_be ? to.Status() : std::nullopt;
+    if (!there) return;
+    const Object target = TargetAt(to, there->st_mode & S_IFMT);
+    if (!NamesMetadata(*to.directory, to.name, target.type)) return;
+    throw Failure(kFailed, from.path(), "its place is that of metadata: " + Quoted(to.path()),
+                  "give it another name");
+}
+
 void Transfer::RequireNotMade(const Place& from, const Place& to) const {
     const auto made = NameOfMade(to);
     if (!made) return;
@@ -905,7 +1062,11 @@ void Transfer::FinishDirectory(const Place& from, const Directory& inside, const
             failure = std::current_exception();
         }
     }
-    RemoveFormerAttributes(leg);
+    if (is_new || options_.merging == Merging::kReplaces) {
+        RemoveFormerAttributes(&leg);
+    } else {
+        MergeInto(&leg);
+    }
     CopyInodeTo(leg, -1, -1);
     Finish(&leg);
     if (made->foreseen() && options_.manner.keeps_times) {

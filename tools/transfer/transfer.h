@@ -22,6 +22,10 @@
 
 namespace mavoea::tool {
 
+// What becomes of the metadata of a directory that is there and gets that of another: it goes, as
+// that of files does; or it stays, and gets what the other one has; or only what it has not itself.
+enum class Merging { kReplaces, kAdds, kKeeps };
+
 struct TransferOptions {
     DataWatch watch = {};
 
@@ -29,6 +33,7 @@ struct TransferOptions {
     std::function<void(const std::string&)> on_note = [](const std::string&) {};
 
     Manner manner = {};
+    Merging merging = Merging::kReplaces;
 
     // Whether WasCopied() will be asked, which takes a little memory for every file.
     bool remembers = false;
@@ -82,7 +87,7 @@ class Transfer {
 
     // A directory is copied in two steps, with what is in it between them: made, if none is there,
     // so that its owner may write to it; then given its attributes, metadata and times, and what
-    // services keep in its EA directory that belongs to no object.
+    // services keep in its EA directory that belongs to no object. `is_new`: it was not there.
     DirectoryRef MakeDirectory(const Place& from, const Place& to);
     void FinishDirectory(const Place& from, const Directory& inside, const Place& to,
                          const DirectoryRef& made, bool is_new);
@@ -92,6 +97,9 @@ class Transfer {
     // After a Failure the object is where it was, unless something stood in its new place.
     bool Rename(const Place& from, const Place& to);
 
+    // Failure when what is at `to` is metadata of another object there, or keeps that of several:
+    // it is nothing to be replaced, backed up or left alone as an object.
+    void RequireNoMetadataAt(const Place& to, const Place& from) const;
     // Failure when this has just made what is at `to`.
     void RequireNotMade(const Place& from, const Place& to) const;
     // Whether `to` is a symbolic link that this has made.
@@ -130,6 +138,7 @@ class Transfer {
     bool CopyName(Leg* leg, Links links);
     void RememberName(const Leg& leg, Links links);
     void CopyInodeTo(const Leg& leg, int source, int target) const;
+    void MergeInto(Leg* leg) const;
     void Finish(Leg* leg);
     void NoteOrphan(const Leg& leg) const;
     void NoteUnseen(const Leg& leg) const;
