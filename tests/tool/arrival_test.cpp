@@ -177,6 +177,57 @@ TEST(SpecialFileTest, KeepsTheBitsOfItsMode) {
     }
 }
 
+// A name of more than 242 bytes is shortened where its metadata is, and then is no longer the name
+// of an object, but may begin with another one's.
+TEST(LikeNamesTest, AnObjectKeepsWhatAnotherOnesNameBegins) {
+    const std::string begin(240, 'n');
+    const std::string check(241, 'n');
+    for (const auto& [other, name] :
+         {std::pair(begin, begin + "@MavoEAStream"), std::pair(check, check + "123456789012V")}) {
+        for (const std::string type : {"eadir", "fileea"}) {
+            SCOPED_TRACE(type + ' ' + name.substr(240));
+            const Shares shares(type, type);
+            WriteFile(shares.From(other), Ascii("other"));
+            WriteFile(shares.From(name), Ascii("data"));
+            shares.Set(shares.From(name), "user.colour", "blue");
+            const std::vector<std::string> files = NamesIn(shares.From("@eaDir"));
+            EXPECT_THAT(shares.Run({"mv", shares.From(other), shares.To("")}), Succeeded());
+            EXPECT_EQ(files, NamesIn(shares.From("@eaDir")));
+            EXPECT_EQ("blue", shares.Get(shares.From(name), "user.colour"));
+            EXPECT_THAT(shares.Run({"mv", shares.From(name), shares.To("")}), Succeeded());
+            EXPECT_EQ("blue", shares.Get(shares.To(name), "user.colour"));
+            EXPECT_THAT(shares.Run({"rm", shares.To(other)}), Succeeded());
+            EXPECT_EQ("blue", shares.Get(shares.To(name), "user.colour"));
+        }
+    }
+}
+
+TEST(ReadOnlySourceTest, ACopyHasItsAttributesToo) {
+    MAVOEA_SKIP_WITHOUT_OTHER_USERS();
+    const Shares shares("appledouble", "netatalk");
+    MAVOEA_SKIP_WITHOUT_ATTRIBUTES(shares.From(""));
+    for (const char* name : {"f", "d"}) {
+        if (*name == 'd') {
+            std::filesystem::create_directory(shares.From(name));
+        } else {
+            WriteFile(shares.From(name), Ascii("data"));
+        }
+        ASSERT_EQ(0, setxattr(shares.From(name).c_str(), "user.own", "own", 3, 0));
+        ASSERT_EQ(0, chown(shares.From(name).c_str(), 1234, 1234));
+        ASSERT_EQ(0, chmod(shares.From(name).c_str(), *name == 'd' ? 0555 : 0444));
+    }
+    ASSERT_EQ(0, chmod(shares.To("").c_str(), 0777));
+    AsUser(1234, Root::kGivenUp, [&] {
+        EXPECT_THAT(shares.Run({"cp", "-r", shares.From("f"), shares.From("d"), shares.To("")}),
+                    Succeeded());
+    });
+    for (const char* name : {"f", "d"}) {
+        EXPECT_EQ("own", AttributeOf(shares.To(name), "user.own")) << name;
+    }
+    EXPECT_EQ(0444u, StatusOf(shares.To("f")).st_mode & 07777);
+    EXPECT_EQ(0555u, StatusOf(shares.To("d")).st_mode & 07777);
+}
+
 // ---- A user's attribute of the name that some of the metadata has -------------------------------
 
 class NameOfTwoTest : public EndsTest {

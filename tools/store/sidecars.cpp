@@ -36,12 +36,23 @@ bool MayBeAppleDouble(const struct stat& info) {
 
 bool HasColon(const std::string& name) { return name.find(':') != std::string::npos; }
 
+// Whether the directory, when it was listed, had an object whose name is shortened to that.
+bool HadShortenedAtFirst(const Directory& directory, const std::string& derived) {
+    constexpr std::size_t kKept = kUnchangedMax - 7;  // but for a check and an extension
+    const std::vector<std::string> names = directory.NamesAtFirst(derived.substr(0, kKept));
+    return std::any_of(names.begin(), names.end(), [&](const std::string& name) {
+        return name.size() > kUnchangedMax && NameInEaDirectory(name) == derived;
+    });
+}
+
 // Whether the directory, when it was listed, had an object to which something of that name in the
 // EA directory may belong: one whose name ends before an '@' that is at `from` or behind it.
 bool HadOwnerAtFirst(const Directory& directory, const std::string& name, std::size_t from) {
     for (std::size_t at = name.find('@', from); at != std::string::npos;
          at = name.find('@', at + 1)) {
-        if (directory.HadAtFirst(name.substr(0, at))) return true;
+        const std::string object = name.substr(0, at);
+        if (directory.HadAtFirst(object)) return true;
+        if (at == kUnchangedMax && HadShortenedAtFirst(directory, object)) return true;
     }
     return false;
 }

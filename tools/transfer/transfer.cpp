@@ -175,7 +175,11 @@ mode_t FirstMode(const struct stat& info, const Manner& manner) {
 mode_t MadeMode(const Leg& leg, const Manner& manner) {
     if (leg.former_mode) return *leg.former_mode;
     if (BeginsClosed(manner)) return WantedMode(leg.source->info(), manner) & ~manner.umask;
-    return leg.target->info().st_mode & kPermissionBits;
+    const struct stat& made = leg.target->info();
+    // Its owner was to write into it.
+    const mode_t added =
+        S_ISDIR(made.st_mode) ? S_IRWXU & ~WantedMode(leg.source->info(), manner) : 0;
+    return made.st_mode & kPermissionBits & ~added;
 }
 
 mode_t KeptMode(const Leg& leg) {
@@ -760,6 +764,14 @@ void Transfer::RememberName(const Leg& leg, Links links) {
 // Owner, mode, ACL and attributes, as far as they are kept.
 void Transfer::CopyInodeTo(const Leg& leg, int source, int target) const {
     if (options_.manner.metadata_only) return;
+    // Until the end the owner can change it, and give it attributes.
+    const auto open_to_owner = [&](const struct stat& now) {
+        if (!HoldsContents(leg.source->info())) return;
+        const mode_t mode = now.st_mode & kPermissionBits;
+        const mode_t least = S_ISDIR(leg.source->info().st_mode) ? S_IRWXU : S_IRUSR | S_IWUSR;
+        if ((mode & least) != least) leg.target->SetMode(mode | least);
+    };
+    open_to_owner(leg.target->info());
     const auto problem = CopyPermissions(
         {leg.source, source}, {leg.target, target}, options_.manner, [&](const std::string& name) {
             const bool stays = leg.added && options_.merging == Merging::kKeeps;
@@ -767,13 +779,7 @@ void Transfer::CopyInodeTo(const Leg& leg, int source, int target) const {
                    !(stays && leg.target->Attribute(name));
         });
     if (problem) options_.on_note(Printable(leg.to.path()) + ": " + *problem);
-    if (!HoldsContents(leg.source->info())) return;
-    // The owner of a file or directory can still change it.
-    const struct stat now =
-        BeginsClosed(options_.manner) ? leg.target->Status() : leg.target->info();
-    const mode_t mode = now.st_mode & kPermissionBits;
-    const mode_t least = S_ISDIR(leg.source->info().st_mode) ? S_IRWXU : S_IRUSR | S_IWUSR;
-    if ((mode & least) != least) leg.target->SetMode(mode | least);
+    if (BeginsClosed(options_.manner)) open_to_owner(leg.target->Status());
 }
 
 // What is wanted of a directory that is there: all that it has, and some more.
