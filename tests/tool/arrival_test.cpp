@@ -13,6 +13,7 @@
 #include <string>
 #include <vector>
 
+#include "tests/tool/stopped_tool.h"
 #include "tests/tool/tool.h"
 #include "tests/tool/travel.h"
 
@@ -296,6 +297,35 @@ INSTANTIATE_TEST_SUITE_P(Places, NameOfTwoTest,
                                            Ends{"samba", "linux"}, Ends{"samba-stream", "7"},
                                            Ends{"eadir", "netatalk-samba"}),
                          NameOf);
+
+// ---- Files that change in the middle
+// --------------------------------------------------------------
+
+// Another writer puts a whole new file in the place of the stream that has just been opened.
+TEST(ReplacedStreamTest, AChangeGoesIntoTheFileThatIsThere) {
+    MAVOEA_SKIP_UNLESS_STOPPED();
+    const Shares shares("eadir", "eadir");
+    WriteFile(shares.From("f"), Ascii("data"));
+    shares.Set(shares.From("f"), "user.first", "first");
+    const std::string stream = shares.From("@eaDir/f@MavoEAStream");
+    const std::string next = shares.From("next");
+    std::filesystem::copy_file(stream, next);
+    const std::string tree = std::filesystem::path(stream).parent_path().parent_path();
+    bool replaced = false;
+    const StoppedRun run = RunStopped(
+        {"set", shares.From("f"), "user.second", "second"}, tree,
+        [&](const FileCall& call) {
+            if (replaced || call.open_file != stream) return true;
+            std::filesystem::rename(next, stream);
+            replaced = true;
+            return true;
+        },
+        Stops::kAtLocksToo);
+    EXPECT_TRUE(replaced);
+    EXPECT_EQ(0, run.status) << run.err;
+    EXPECT_EQ("first", shares.Get(shares.From("f"), "user.first"));
+    EXPECT_EQ("second", shares.Get(shares.From("f"), "user.second"));
+}
 
 // ---- Objects whose place is that of metadata ----------------------------------------------------
 

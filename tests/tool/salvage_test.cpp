@@ -106,6 +106,19 @@ TEST_F(SalvageTest, OfWhatIsDamagedAsMuchAsIsThereIsWrittenAndTheRestIsNamed) {
     EXPECT_EQ(1U, Manifest()["problems"].size());
 }
 
+TEST_F(SalvageTest, ASecondValueIsNamedAndMarksAreSaid) {
+    PutStream(object(), StreamImage{.finder_info = Pattern(32, 1)}.Build());
+    PutResource(object(), ClassicFile(Pattern(32, 2), {}).bytes);
+    ASSERT_EQ(0, RunTool({"lock", object()}).status);
+    const ToolResult result = Salvage();
+    EXPECT_EQ(2, result.status);
+    EXPECT_THAT(result.err, HasSubstr("a second Finder info in "));
+    EXPECT_EQ((std::map<std::string, Bytes>{{"FinderInfo", Pattern(32, 2)}}), Files());
+    ASSERT_EQ(1U, Manifest()["missing"].size());
+    EXPECT_THAT(Manifest()["missing"][0]["name"].get<std::string>(), HasSubstr("a@MavoEAStream"));
+    EXPECT_EQ(nlohmann::json({"locked"}), Manifest()["marks"]);
+}
+
 TEST_F(SalvageTest, NamesCannotLeadAnywhere) {
     const std::string long_name(250, 'n');
     StreamImage image;

@@ -41,6 +41,7 @@ enum class Shape {
     kListing,     // 0, an open directory whose names it reads
     kData,        // 0, an open file whose data it reads or writes
     kSync,        // 0, an open file
+    kLock,        // 0, an open file
 };
 
 struct Call {
@@ -142,6 +143,7 @@ const std::map<std::uint64_t, Call>& Calls() {
         MAVOEA_CALL(fsync, kSync),
         MAVOEA_CALL(fdatasync, kSync),
         MAVOEA_CALL(syncfs, kSync),
+        MAVOEA_CALL(fcntl, kLock),
 #undef MAVOEA_CALL
         // The headers may not know these yet; their numbers are the same everywhere.
         {452, {"fchmodat2", Shape::kAt}},
@@ -178,6 +180,7 @@ class StopAtCalls {
         for (const auto& [number, call] : Calls()) {
             if (stops == Stops::kAtNames && call.shape == Shape::kData) continue;
             if (stops != Stops::kAtSyncsToo && call.shape == Shape::kSync) continue;
+            if (stops != Stops::kAtLocksToo && call.shape == Shape::kLock) continue;
             numbers.push_back(static_cast<std::uint32_t>(number));
         }
         const std::size_t allow = 1 + 3 * std::size(kStatusCalls) + numbers.size();
@@ -362,6 +365,7 @@ class Tracer {
             case Shape::kListing:
             case Shape::kData:
             case Shape::kSync:
+            case Shape::kLock:
                 SetOpenFile(process, arguments[0]);
                 break;
         }

@@ -55,8 +55,8 @@ struct StoppedRun : ToolResult {
 };
 
 // Where a run stops: at calls with names and attributes, or also where data is read and written at
-// an offset, or also where that is synced.
-enum class Stops { kAtNames, kAtDataToo, kAtSyncsToo };
+// an offset, or data and syncs, or data and locks.
+enum class Stops { kAtNames, kAtDataToo, kAtSyncsToo, kAtLocksToo };
 
 // Runs the tool and calls `at_call` before each of its file calls, counted from the first that
 // names a file in the directory `tree`. All of the tool stands still meanwhile. No other child of

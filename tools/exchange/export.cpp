@@ -33,23 +33,26 @@ ArchiveFormat FormatNamed(const std::string& word) {
 }
 
 // What is to go into the file. Throws Failure for what cannot be read.
-Archive ArchiveOf(const Object& object, const Sidecars& sidecars, ArchiveFormat format) {
-    Archive archive = {.format = format, .name = object.place.name};
-    std::shared_ptr<const Inode> inode;
-    if (format == ArchiveFormat::kAppleDouble) {
-        inode = Inode::Open(object.place);
-    } else {
-        inode = Inode::OpenToRead(object.place);
-        if (!S_ISREG(inode->info().st_mode)) {
-            throw Failure(kFailed, object.path(),
-                          std::string("it has no data that ") + NameOf(format) + " could hold",
-                          "use --format appledouble");
-        }
-        if (!inode->file()) throw SystemFailure(object.path(), EACCES);
-        archive.data = Content(inode->file(), 0, inode->file()->Size());
-        archive.modified = inode->info().st_mtim.tv_sec;
+std::shared_ptr<const Inode> OpenFor(ArchiveFormat format, const Object& object) {
+    if (format == ArchiveFormat::kAppleDouble) return Inode::Open(object.place);
+    auto inode = Inode::OpenToRead(object.place);
+    if (!S_ISREG(inode->info().st_mode)) {
+        throw Failure(kFailed, object.path(),
+                      std::string("it has no data that ") + NameOf(format) + " could hold",
+                      "use --format appledouble");
     }
-    archive.metadata = ReadMetadata(object, *inode, sidecars);
+    if (!inode->file()) throw SystemFailure(object.path(), EACCES);
+    return inode;
+}
+
+Archive ArchiveOf(const Object& object, const Inode& inode, const Sidecars& sidecars,
+                  ArchiveFormat format) {
+    Archive archive = {.format = format, .name = object.place.name};
+    if (format != ArchiveFormat::kAppleDouble) {
+        archive.data = Content(inode.file(), 0, inode.file()->Size());
+        archive.modified = inode.info().st_mtim.tv_sec;
+    }
+    archive.metadata = ReadMetadata(object, inode, sidecars);
     if (!archive.metadata.problems.empty()) throw Failure(archive.metadata.problems.front());
     return archive;
 }
@@ -152,13 +155,14 @@ ExitStatus Export(const ExportOptions& options) {
         target = PlaceOf(options.file, Shown::kWhole);
         RequireFree(*target, object, sidecars, options.force);
     }
-    Archive archive = ArchiveOf(object, sidecars, format);
+    const auto inode = OpenFor(format, object);
+    Archive archive = ArchiveOf(object, *inode, sidecars, format);
     std::vector<Missing> missing;
     FitArchive(&archive, &missing);
     if (to_output) {
         WriteToOutput(archive);
     } else {
-        WriteToFile(archive, *target, StatusOf(object.place).st_mode, options.force);
+        WriteToFile(archive, *target, inode->info().st_mode, options.force);
     }
     if (options.verbose && !options.json && !to_output) {
         std::cout << Printable(object.path()) << ": exported to " << Printable(options.file)

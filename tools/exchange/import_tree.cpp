@@ -103,11 +103,10 @@ class Waiting {
     // `object` has what all of `sources` hold. They go in this order: what is left, should the run
     // be killed, is what counts.
     void Add(const Place& object, const struct stat& info, std::vector<MacSource> sources) {
-        if (!volumes_.contains(info.st_dev)) {
-            // Another volume may be mounted on the object.
-            const bool beside = object.directory->Status().st_dev == info.st_dev;
-            volumes_.emplace(info.st_dev, beside ? object.directory : object.Open());
-        }
+        // Another volume may be mounted on the object, and some of what it has is beside it.
+        const dev_t around = object.directory->Status().st_dev;
+        volumes_.try_emplace(around, object.directory);
+        if (!volumes_.contains(info.st_dev)) volumes_.emplace(info.st_dev, object.Open());
         count_ += sources.size();
         for (MacSource& source : sources) {
             source.file.reset();

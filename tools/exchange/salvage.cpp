@@ -80,6 +80,9 @@ class Rescue {
         if (metadata.whole_record) {
             Write("netatalk record", "record", Content(*metadata.whole_record), {});
         }
+        for (const Metadata::Stray& stray : metadata.strays) {
+            missing_.push_back({stray.item, stray.reason});
+        }
     }
 
     void WriteManifest(const Object& object, const Metadata& metadata) {
@@ -100,8 +103,15 @@ class Rescue {
             entry.SetText("message", problem.what());
             problems.Add(std::move(entry));
         }
+        Json marks = Json::Array();
+        for (const auto& [is_set, mark] : {std::pair(metadata.locked, "locked"),
+                                           {metadata.hidden, "hidden"},
+                                           {metadata.system, "system"}}) {
+            if (is_set) marks.Add(Json(mark));
+        }
         json_.SetText("path", object.path());
         json_.Set("files", std::move(files));
+        json_.Set("marks", std::move(marks));
         json_.Set("missing", MissingJson(missing_));
         json_.Set("problems", std::move(problems));
         const std::string text = json_.Text() + '\n';

@@ -616,7 +616,7 @@ std::vector<std::string> Inode::AttributeNames() const {
     ssize_t size = read(list.data(), list.size());
     while (size < 0 && errno == ERANGE) {
         size = read(nullptr, 0);
-        if (size < 0) break;
+        if (size <= 0) break;
         list.resize(static_cast<std::size_t>(size));
         size = read(list.data(), list.size());
     }

@@ -39,11 +39,22 @@ std::unique_ptr<ChangedFile> ChangedFile::Rehearse(const std::string& path) {
 
 std::unique_ptr<ChangedFile> ChangedFile::Open(const Place& object, const Place& file, bool make) {
     std::unique_ptr<ChangedFile> changed(new ChangedFile);
-    changed->existing_ = file.directory->FindFile(file.name, O_RDWR);
-    if (changed->existing_) {
+    nlink_t names = 0;
+    constexpr int kAttempts = 10;
+    for (int attempt = 0; names == 0 && attempt < kAttempts; ++attempt) {
+        changed->existing_ = file.directory->FindFile(file.name, O_RDWR);
+        if (!changed->existing_) break;
         LockFile(*changed->existing_, Access::kWrite);
+        // Until it was locked somebody may have put another one in its place.
+        names = changed->existing_->Status().st_nlink;
+    }
+    if (changed->existing_) {
+        if (names == 0) {
+            throw Failure(kFailed, file.path(), "somebody replaces it again and again",
+                          "give the command again");
+        }
         // Whoever can give it a second name could have another file changed.
-        if (changed->existing_->Status().st_nlink > 1) {
+        if (names > 1) {
             throw Failure(kFailed, file.path(), "it has several names, all of which would change",
                           "make it a file of its own: copy it, and put the copy in its place");
         }
