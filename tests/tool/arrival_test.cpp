@@ -286,6 +286,14 @@ TEST_P(NameOfTwoTest, ACarriedOneIsMissedAsWellAndTheCopysOwnOnesStay) {
     EXPECT_EQ("other", AttributeOf(shares_.To("f"), "user.other"));
 }
 
+TEST_P(NameOfTwoTest, APlanSaysSo) {
+    MakeSource("the user's");
+    const ToolResult plan =
+        shares_.Run({"plan", "-r", "--to", GetParam().to, shares_.From("."), shares_.To("new")});
+    EXPECT_EQ(1, plan.status) << plan.err;
+    EXPECT_THAT(plan.out, HasSubstr("extended attribute \"user.com.x\""));
+}
+
 TEST_P(NameOfTwoTest, TwoThatSayTheSameAreOne) {
     MakeSource(stored());
     EXPECT_THAT(shares_.Run({"mv", shares_.From("f"), shares_.To("f")}), Succeeded());

@@ -22,6 +22,7 @@
 #include "tools/store/reader.h"
 #include "tools/store/sidecars.h"
 #include "tools/store/writer.h"
+#include "tools/transfer/own_attributes.h"
 #include "util/fnv.h"
 
 namespace mavoea::tool {
@@ -191,6 +192,8 @@ class Plan {
         std::vector<Missing> missing;
         const Object to = {{step.from.place.directory, step.name}, ends_.type, true};
         const Metadata fitting = WriterFor(to).Fit(metadata, to, &missing);
+        OwnAttributes(step.from, Inode::Open(step.from.place), to)
+            .AddWrittenOver(fitting, &missing);
         for (const Missing& one : missing) Tell(Matter::kLost, step, one.item, one.reason);
         const std::set<std::string> whole = WholeFiles(step, fitting);
         for (const Metadata::Stray& stray : metadata.strays) {

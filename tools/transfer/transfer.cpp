@@ -10,7 +10,6 @@
 #include <set>
 
 #include "format/netatalk_record.h"
-#include "platform/dos_attributes.h"
 #include "tools/place/dry_run.h"
 #include "tools/say/job.h"
 #include "tools/say/messages.h"
@@ -26,6 +25,7 @@
 #include "tools/store/rights.h"
 #include "tools/store/writer.h"
 #include "tools/transfer/indexes.h"
+#include "tools/transfer/own_attributes.h"
 #include "tools/transfer/permissions.h"
 #include "tools/transfer/rename.h"
 #include "util/fnv.h"
@@ -39,13 +39,11 @@ struct Leg {
     std::shared_ptr<const Inode> source;
     Sidecars sidecars;  // of the source
     Metadata wanted;
+    OwnAttributes own_attributes;              // of the source
     bool replaces;                             // something that is there
     std::shared_ptr<const Inode> target = {};  // once it is there
     std::optional<mode_t> former_mode = {};    // of a target that is written over
     bool is_link = false;                      // the target is one more name of a file
-    // Extended attributes of the source that are none of its metadata, once they have been asked
-    // for.
-    std::optional<std::vector<std::string>> own_attributes = {};
     // Where the metadata of the target stays: what is wanted besides, and whether that is nothing.
     std::optional<std::vector<std::string>> added = {};
     bool stays = false;
@@ -135,21 +133,6 @@ void AddUnkept(const Leg& leg, std::vector<Missing>* missing) {
 bool Names(const std::vector<Missing>& missing, const std::string& item) {
     return std::any_of(missing.begin(), missing.end(),
                        [&](const Missing& one) { return one.item == item; });
-}
-
-// Whether attributes of the object travel as its metadata, and not with its mode and owner. Those
-// in which Samba keeps marks and more go as they are; the marks are set after that.
-bool TravelsAsMetadata(const std::string& attribute, const Object& from, const Object& to) {
-    if (IsMark(attribute)) return true;
-    if (attribute == kDosAttributesName) return false;
-    if (from.dialect() != nullptr) return IsForeign(attribute, *from.dialect());
-    if (!from.declared && IsForeignInAny(attribute)) return true;
-    if (IsOfRecord(attribute)) {
-        return from.kind() == VolumeKind::kFileEA || to.kind() == VolumeKind::kFileEA;
-    }
-    if (from.keeping() != Keeping::kXattr || to.keeping() == Keeping::kXattr) return false;
-    return !attribute.starts_with("system.") && !attribute.starts_with("security.") &&
-           !attribute.starts_with("trusted.");
 }
 
 // What the target gets in the end.
@@ -337,19 +320,6 @@ Metadata MetadataOfCopy(const Place& from, const Place& there) {
                                copy, &missing);
 }
 
-// Whether what is known of an object, or some of it, is in the object itself, and one for all its
-// names; the fork may still be beside each of them.
-bool KeepsInInode(const Object& object) {
-    return object.keeping() == Keeping::kXattr || object.kind() == VolumeKind::kFileEA ||
-           object.dialect() != nullptr;
-}
-bool KeepsForkInInode(const Object& object) {
-    if (const Dialect* const dialect = object.dialect()) {
-        return dialect->fork == Dialect::Fork::kAttribute;
-    }
-    return object.keeping() == Keeping::kXattr;
-}
-
 // Whether the copy of `first` at `there` may have this object's metadata, too, where that is in the
 // file itself.
 bool SharesMetadata(const Place& first, const Place& there, const Leg& leg) {
@@ -370,59 +340,15 @@ bool SharesMetadata(const Place& first, const Place& there, const Leg& leg) {
            own.fork.has_value() == other.fork.has_value();
 }
 
-const std::vector<std::string>& OwnAttributes(Leg* leg) {
-    if (!leg->own_attributes) {
-        leg->own_attributes = leg->source->AttributeNames();
-        std::erase_if(*leg->own_attributes, [&](const std::string& name) {
-            return TravelsAsMetadata(name, leg->from, leg->to);
-        });
-    }
-    return *leg->own_attributes;
-}
-
-bool IsOwnAttribute(const std::string& name, Leg* leg) {
-    const std::vector<std::string>& own = OwnAttributes(leg);
-    return std::find(own.begin(), own.end(), name) != own.end();
-}
-
 // What of the metadata of an object that is written over lies in its attributes. What is wanted of
 // it is written anew; what the source has of its own is no metadata in the copy either.
-void RemoveFormerAttributes(Leg* leg) {
-    if (!KeepsInInode(leg->to)) return;
-    for (const std::string& name : leg->target->AttributeNames()) {
-        const bool goes = leg->to.kind() != VolumeKind::kFileEA
-                              ? TravelsAsMetadata(name, leg->to, Object()) && !IsMark(name)
+void RemoveFormerAttributes(const Leg& leg) {
+    if (!KeepsInInode(leg.to)) return;
+    for (const std::string& name : leg.target->AttributeNames()) {
+        const bool goes = leg.to.kind() != VolumeKind::kFileEA
+                              ? TravelsAsMetadata(name, leg.to, Object()) && !IsMark(name)
                               : name == kNetatalkAttribute;
-        if (goes && !IsOwnAttribute(name, leg)) (void)leg->target->RemoveAttribute(name);
-    }
-}
-
-// What the source has of its own under a name that some of its metadata has there.
-void AddWrittenOver(Leg* leg, const Metadata& fitting, std::vector<Missing>* missing) {
-    if (!KeepsInInode(leg->to) || leg->to.kind() == VolumeKind::kFileEA) return;
-    const auto add = [&](const std::string& item, const Spelling& there, const Content* value) {
-        if (!IsOwnAttribute(there.attribute, leg)) return;
-        const auto own = leg->source->Attribute(there.attribute);
-        if (!own) return;
-        if (value != nullptr) {
-            Bytes written = value->All();
-            if (there.has_nul) written.push_back(0);
-            if (written == *own) return;
-        }
-        missing->push_back({"extended attribute " + NameOfAttribute(there.attribute),
-                            "its " + item + " has that name there"});
-    };
-    const Dialect* const dialect = leg->to.dialect();
-    for (const Metadata::Attribute& attribute : fitting.attributes) {
-        const auto there = dialect == nullptr
-                               ? Spelling{attribute.name, Spelling::Datum::kAttribute}
-                               : SpellAttribute(attribute.name, *dialect);
-        if (there) add(NameOfAttribute(attribute.name), *there, &attribute.value);
-    }
-    if (dialect == nullptr) return;
-    if (fitting.finder_info) add("Finder info", SpellFinderInfo(*dialect), nullptr);
-    if (fitting.fork && KeepsForkInInode(leg->to)) {
-        add("resource fork", SpellFork(*dialect), nullptr);
+        if (goes && !leg.own_attributes.Has(name)) (void)leg.target->RemoveAttribute(name);
     }
 }
 
@@ -508,12 +434,26 @@ Leg Transfer::LegOf(const Place& from, const std::shared_ptr<const Inode>& sourc
     const Object target = TargetAt(to, type);
     Sidecars sidecars = Sidecars::Find(object, Sidecars::Services::kFind);
     Metadata wanted = ReadMetadata(object, *source, sidecars);
-    return {
-        object, target, source, std::move(sidecars), std::move(wanted), to.Status().has_value()};
+    return {object,
+            target,
+            source,
+            std::move(sidecars),
+            std::move(wanted),
+            OwnAttributes(object, source, target),
+            to.Status().has_value()};
 }
 
 Leg Transfer::LegWithoutMetadata(const Place& from, const File& source, const Place& to) const {
-    return {{from, -1}, TargetAt(to, S_IFREG), Inode::Of(source), {}, {}, to.Status().has_value()};
+    const Object object = {from, -1};
+    const Object target = TargetAt(to, S_IFREG);
+    const auto inode = Inode::Of(source);
+    return {object,
+            target,
+            inode,
+            {},
+            {},
+            OwnAttributes(object, inode, target),
+            to.Status().has_value()};
 }
 
 void Transfer::CopyObject(const Place& from, mode_t type, const Place& to, Links links) {
@@ -610,7 +550,7 @@ void Transfer::Overwrite(const Place& from, const File* stream, const Place& to,
         if (options_.manner.data) target.Resize(0);
         CopyBytes(source, stream != nullptr, target);
     }
-    RemoveFormerAttributes(&leg);
+    RemoveFormerAttributes(leg);
     CopyInodeTo(leg, source.fd(), target.fd());
     RememberName(leg, links);
     Finish(&leg);
@@ -654,7 +594,7 @@ void Transfer::CarryMetadata(const Place& from, const Place& to) {
     leg.former_mode = leg.target->info().st_mode & kPermissionBits;
     RequireSeen(leg);
     RequireUnlockedTarget(leg);
-    RemoveFormerAttributes(&leg);
+    RemoveFormerAttributes(leg);
     Finish(&leg);
 }
 
@@ -873,7 +813,7 @@ void Transfer::Finish(Leg* leg) {
         AddUnreadable(*leg, {}, &missing);
     } else if (keeps) {
         const bool yields = leg->added && options_.merging == Merging::kKeeps;
-        if (!yields) AddWrittenOver(leg, arrival.fitting, &missing);
+        if (!yields) leg->own_attributes.AddWrittenOver(arrival.fitting, &missing);
         AddWhatDidNotArrive(*leg, std::move(arrival), &missing);
     } else {
         AddUnkept(*leg, &missing);
@@ -1069,7 +1009,7 @@ void Transfer::FinishDirectory(const Place& from, const Directory& inside, const
         }
     }
     if (is_new || options_.merging == Merging::kReplaces) {
-        RemoveFormerAttributes(&leg);
+        RemoveFormerAttributes(leg);
     } else {
         MergeInto(&leg);
     }
