@@ -1,5 +1,6 @@
 // Reads a stream's header and attribute table, with as few reads as that takes.
 
+#include <errno.h>
 #include <string.h>
 
 #include <algorithm>
@@ -26,13 +27,23 @@ std::int64_t FileSize(int fd) {
     return size < 0 ? unit.Fail(Err::kRead) : std::int64_t{size};
 }
 
-// How a file begins, read once: most streams whole.
+// How a file begins, read once: most streams whole, so that nobody need ask how large they are.
 class FirstBytes {
  public:
-    FirstBytes(int fd, std::uint64_t file_size) : fd_(fd) {
-        const auto want = static_cast<std::size_t>(std::min<std::uint64_t>(file_size, kMost));
-        const std::int64_t got = ReadAt(fd, {bytes_, want}, 0);
+    explicit FirstBytes(int fd) : fd_(fd) {
+        ssize_t got;
+        do {
+            got = kernel::Pread(fd, bytes_, kMost, 0);
+        } while (got < 0 && errno == EINTR);
         size_ = got < 0 ? 0 : static_cast<std::size_t>(got);
+    }
+
+    // 1 when the file is empty, else 0; -1 after recording why it could not be told. A file that
+    // does not let itself be read is asked: it must not be taken for a new one.
+    int IsFileEmpty() const {
+        if (size_ > 0) return 0;
+        const std::int64_t file_size = FileSize(fd_);
+        return file_size < 0 ? -1 : file_size == 0 ? 1 : 0;
     }
 
     // Fills `to` with the file's bytes at `offset`. What is not here is read by itself: more than
@@ -54,7 +65,7 @@ class FirstBytes {
     static constexpr std::size_t kMost = 8192;
 
     int fd_;
-    std::size_t size_ = 0;
+    std::size_t size_;
     std::uint8_t bytes_[kMost];
 };
 
@@ -95,9 +106,8 @@ class TableReader {
  public:
     // The header says that the table ends at `end`. What it says decides how much is read at once
     // and nothing else: never more than the file has, and little more than is needed.
-    TableReader(int fd, std::uint64_t file_size, const FirstBytes& first, std::uint64_t end)
+    TableReader(int fd, const FirstBytes& first, std::uint64_t end)
         : fd_(fd),
-          most_(file_size - kStreamHeaderSize),
           likely_(end > kStreamHeaderSize ? end - kStreamHeaderSize : 0),
           here_(first.From(kStreamHeaderSize)) {}
     ~TableReader() { FreeBlock(block_); }
@@ -130,11 +140,20 @@ class TableReader {
  private:
     static constexpr std::uint64_t kStep = std::uint64_t{1} << 16;
 
+    bool LearnFileSize() {
+        const off_t size = kernel::Lseek(fd_, 0, SEEK_END);
+        if (size < off_t{kStreamHeaderSize}) return false;
+        file_size_ = static_cast<std::uint64_t>(size);
+        return true;
+    }
+
     bool Read(std::uint64_t size) {
-        if (size > most_) return false;
+        if (file_size_ == 0 && !LearnFileSize()) return false;
+        const std::uint64_t most = file_size_ - kStreamHeaderSize;
+        if (size > most) return false;
         const std::uint64_t want =
             likely_ >= size ? std::min(likely_, here_.size() + 16 * kStep) : size + kStep;
-        NameBlock* const block = ResizeNameBlock(block_, std::min(want, most_));
+        NameBlock* const block = ResizeNameBlock(block_, std::min(want, most));
         out_of_memory_ = block == nullptr;
         if (out_of_memory_) return false;
         if (block_ == nullptr) memcpy(block->bytes(), here_.data(), here_.size());
@@ -156,7 +175,7 @@ class TableReader {
     }
 
     int fd_;
-    std::uint64_t most_;
+    std::uint64_t file_size_ = 0;  // once it is asked for
     std::uint64_t likely_;
     ByteView here_;
     NameBlock* block_ = nullptr;  // where they are once more than the first bytes are needed
@@ -188,16 +207,14 @@ bool SetNames(std::span<EASEntry> attributes, const std::uint8_t* table, bool in
     return true;
 }
 
-int LoadTable(EASHandle* h, std::uint64_t file_size, const FirstBytes& first,
-              const AttributeHeader& attributes) {
+int LoadTable(EASHandle* h, const FirstBytes& first, const AttributeHeader& attributes) {
     const std::uint16_t count = attributes.count;
-    if (count != 0 && kStreamHeaderSize + SmallestTable(count) > file_size) {
-        return unit.Fail(Err::kRead);
-    }
+    TableReader table(h->fd, first, attributes.data.offset);
+    // A file that cannot have as many does not make the entry table large.
+    if (!table.Reach(SmallestTable(count))) return table.Refuse();
     if (MAVOEASAllocEntry(h, count) != 0) return -1;
     if (count == 0) return 0;
 
-    TableReader table(h->fd, file_size, first, attributes.data.offset);
     std::uint64_t at = 0;
     for (EASEntry& entry : Attributes(*h)) {
         if (!table.Reach(at + AttributeRecord::kFixedSize)) return table.Refuse();
@@ -223,18 +240,17 @@ int LoadTable(EASHandle* h, std::uint64_t file_size, const FirstBytes& first,
 }
 
 int Load(EASHandle* h) {
-    const std::int64_t size = FileSize(h->fd);
-    if (size < 0) return -1;
-    if (size == 0) {
+    const FirstBytes first(h->fd);
+    const int empty = first.IsFileEmpty();
+    if (empty < 0) return -1;
+    if (empty != 0) {
         StoreHeader(NewStreamHeader(), h);
         return MAVOEASAllocEntry(h, 0);
     }
-    const auto file_size = static_cast<std::uint64_t>(size);
-    const FirstBytes first(h->fd, file_size);
     StreamHeader header;
     if (ReadHeader(first, &header) != 0) return -1;
     StoreHeader(header, h);
-    return LoadTable(h, file_size, first, header.attributes);
+    return LoadTable(h, first, header.attributes);
 }
 
 }  // namespace
@@ -246,12 +262,10 @@ int EASGetEntryCount(int fd) {
     h.lockType = F_UNLCK;
     if (MAVOEASLockSet(&h, F_RDLCK) != 0) return -1;
 
-    int count = 0;
-    const std::int64_t file_size = FileSize(fd);
-    if (file_size < 0) {
-        count = -1;
-    } else if (file_size > 0) {
-        const FirstBytes first(fd, static_cast<std::uint64_t>(file_size));
+    const FirstBytes first(fd);
+    const int empty = first.IsFileEmpty();
+    int count = empty < 0 ? -1 : 0;
+    if (empty == 0) {
         StreamHeader header;
         count = ReadHeader(first, &header) == 0 ? header.attributes.count : -1;
     }

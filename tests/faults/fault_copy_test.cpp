@@ -429,9 +429,7 @@ void AddWhatDoesNotMatter(Table* table) {
         table->Add(call, "", {EINTR, kShortOnce}, table->Done());
     }
     // Of a stream that cannot be read whole at first, what is needed to open it is read by itself.
-    for (const char* whole : {"(146, 0)", "(180, 0)", "(244, 0)"}) {
-        table->Add("pread", whole, {EIO, kNoneOnce}, table->Done());
-    }
+    table->Add("pread", "(8192, 0)", {EIO, kNoneOnce}, table->Done());
     table->Add("setlock", "(2)", {}, table->Done({{0x400, "eas_lock_set"}}));
     for (const char* call : {"command", "archive", "MAVOACLSetEADirACL", "MAVOGetFSType"}) {
         table->Add(call, "", {}, table->Done());
@@ -770,17 +768,20 @@ void AddSyncRead(Table* table, const char* complaint, int ordinal) {
 }
 
 // Anything else that fails makes the whole fail, and that is logged.
-void AddTheRest(Table* table) {
+void AddTheRest(Table* table, const Way& way) {
     // A legacy file that cannot be looked for is left alone.
     Outcome legacy = table->Done();
     legacy.any_records = true;
     table->Add("access", "MAVO:Resource", {}, legacy);
     const Outcome failed = {
         .result = -1, .files = Files::kAnything, .any_log = true, .any_records = true};
-    for (const char* call : {"malloc", "open", "setlock", "lseek", "pread", "pwrite", "fstat",
-                             "fsync", "ftruncate", "setxattr", "getxattr", "mkdir", "fchmod"}) {
+    for (const char* call : {"malloc", "open", "setlock", "lseek", "pwrite", "fstat", "fsync",
+                             "ftruncate", "setxattr", "getxattr", "mkdir", "fchmod"}) {
         table->Add(call, "", {}, failed);
     }
+    // What real attributes become is read only where it is a new stream, of which nothing is
+    // needed.
+    if (way.src_type != 7 || way.dst_type != 1) table->Add("pread", "", {}, failed);
 }
 
 // Ways of fewer calls also fail with two of them.
@@ -792,7 +793,7 @@ void Sweep(const Way& way, const std::function<void(Table*)>& fill) {
     AddLock(&table, way);
     AddFolder(&table, way);
     fill(&table);
-    AddTheRest(&table);
+    AddTheRest(&table, way);
     const std::string name =
         "from " + std::to_string(way.src_type) + " to " + std::to_string(way.dst_type) +
         (way.move != 0 ? ", move" : ", copy") + (way.with_callback ? ", by callback" : "") +

@@ -24,6 +24,11 @@ constexpr char kFolder[] = "@eaDir/a";
 constexpr char kColor[] = "@eaDir/a/color";
 constexpr char kTags[] = "@eaDir/a/tags";
 constexpr char kStream[] = "@eaDir/a@MavoEAStream";
+
+// Reads of the attribute files' bytes, and of a stream as far as the first read goes.
+constexpr char kColorBytes[] = "(9, 0)";
+constexpr char kTagsBytes[] = "(8, 0)";
+constexpr char kFirstBytes[] = "(8192, 0)";
 constexpr char kResource[] = "@eaDir/a@MavoResource";
 
 // Lines about a value that could not be read or written, which quote the record of the cause.
@@ -160,7 +165,11 @@ Rules OneAttribute() {
                 .ordinal = 3,
                 .outcome = skipped({0x100, kUnit}, READ_LINE("color", "0x0100"))},
                {.call = "pread", .errors = {EINTR, kShortOnce}, .outcome = {.files = Files::kDone}},
-               {.call = "pread", .outcome = skipped({0xA00, kUnit}, READ_LINE("color", "0x0A00"))},
+               // Of the new stream nothing is needed.
+               {.call = "pread", .with = kFirstBytes, .outcome = {.files = Files::kDone}},
+               {.call = "pread",
+                .with = kColorBytes,
+                .outcome = skipped({0xA00, kUnit}, READ_LINE("color", "0x0A00"))},
                // Its name may not be on disk: it is in both places.
                {.call = "fsync",
                 .ordinal = 2,
@@ -237,18 +246,19 @@ TEST(FaultUpgradeTest, AFileThatCannotBeReadIsSkippedAlone) {
                  .errors = {EINTR, kShortOnce},
                  .outcome = {.files = Files::kDone}},
                 {.call = "pread",
-                 .ordinal = 1,
+                 .with = kColorBytes,
                  .errors = {EIO, kNoneOnce},
                  .outcome = without_color({0xA00, kUnit}, READ_LINE("color", "0x0A00"))},
                 // Nothing can be read any more.
                 {.call = "pread",
-                 .ordinal = 1,
+                 .with = kColorBytes,
                  .outcome = {.records = {{0xA00, kUnit}, {0xA00, kUnit}},
                              .log = {READ_LINE("color", "0x0A00"), READ_LINE("tags", "0x0A00")},
                              .made = {kStream}}},
                 {.call = "pread",
-                 .ordinal = 2,
+                 .with = kTagsBytes,
                  .outcome = without_tags({0xA00, kUnit}, READ_LINE("tags", "0x0A00"))},
+                {.call = "pread", .with = kFirstBytes, .outcome = {.files = Files::kDone}},
                 {.call = "pread",
                  .outcome = NotWritten({0xA00, "eas_write"}, WRITE_LINE("0x0A00 eas_write"))},
                 {.call = "fsync",

@@ -207,8 +207,7 @@ TEST_F(EasHandleTest, TheFileIsReadInOneOrTwoReads) {
     Fill(Image());
     TakeCalls();
     Handle handle = Open(F_RDLCK);
-    EXPECT_THAT(TakeCalls(),
-                ElementsAre("setlock(0)", "lseek(0, 2)", ::testing::StartsWith("pread(")));
+    EXPECT_THAT(TakeCalls(), ElementsAre("setlock(0)", "pread(8192, 0)"));
     handle.reset();
     TakeCalls();
 
@@ -216,7 +215,7 @@ TEST_F(EasHandleTest, TheFileIsReadInOneOrTwoReads) {
     for (int i = 0; i < 1000; ++i) image.attributes.push_back({"name" + std::to_string(i), {}});
     Fill(image);
     handle = Open(F_RDLCK);
-    EXPECT_THAT(TakeCallNames(), ElementsAre("setlock", "lseek", "pread", "pread"));
+    EXPECT_THAT(TakeCallNames(), ElementsAre("setlock", "pread", "lseek", "pread"));
     EXPECT_EQ(1000, U16At(handle->header, kAttributeCountAt));
 }
 
@@ -247,7 +246,7 @@ TEST_F(EasHandleTest, OneTenAHundredAndAThousandAttributesAreReadInAtMostEightCa
         int attributes;
         std::size_t calls;  // the caller's own open and close among them
     };
-    for (const Case& c : {Case{1, 7}, Case{10, 7}, Case{100, 7}, Case{1000, 8}}) {
+    for (const Case& c : {Case{1, 6}, Case{10, 6}, Case{100, 6}, Case{1000, 8}}) {
         SCOPED_TRACE(c.attributes);
         StreamImage image;
         for (int i = 0; i < c.attributes; ++i) {
