@@ -160,6 +160,19 @@ INSTANTIATE_TEST_SUITE_P(Places, LinkAcrossKindsTest,
                                            Ends{"linux", "samba"}, Ends{"appledouble", "7"}),
                          NameOf);
 
+// An attribute of the file's own may be metadata where it goes: all its names have that.
+TEST(NamesOfOneFileTest, StayOneWithWhatBecomesMetadata) {
+    MAVOEA_SKIP_WITHOUT_ATTRIBUTES("/tmp");
+    const Shares shares("samba-all-streams", "netatalk");
+    std::filesystem::create_directory(shares.From("d"));
+    WriteFile(shares.From("d/one"), Ascii("data"));
+    ASSERT_EQ(0, setxattr(shares.From("d/one").c_str(), "user.own", "value", 5, 0));
+    ASSERT_EQ(0, link(shares.From("d/one").c_str(), shares.From("d/two").c_str()));
+    EXPECT_THAT(shares.Run({"cp", "-a", shares.From("d"), shares.To("d")}), Succeeded());
+    EXPECT_TRUE(std::filesystem::equivalent(shares.To("d/one"), shares.To("d/two")));
+    EXPECT_EQ("value", AttributeOf(shares.To("d/one"), "user.own"));
+}
+
 TEST(SpecialFileTest, KeepsTheBitsOfItsMode) {
     MAVOEA_SKIP_UNLESS_ROOT();
     const Shares shares("eadir", "appledouble");
@@ -465,6 +478,20 @@ INSTANTIATE_TEST_SUITE_P(Places, MergedDirectoryTest,
                                            Ends{"appledouble", "linux"}, Ends{"linux", "samba"},
                                            Ends{"samba", "netatalk"}),
                          NameOf);
+
+// When a directory was made that was there is not for who comes to say.
+TEST(MergedDatesTest, AConversionLeavesWhenADirectoryWasMade) {
+    MAVOEA_SKIP_WITHOUT_ATTRIBUTES("/tmp");
+    const Shares shares("samba", "samba");
+    for (const std::string& path : {shares.From("d"), shares.To("d")}) {
+        std::filesystem::create_directory(path);
+    }
+    const std::string created = "2020-05-01T09:30:00Z";
+    ASSERT_EQ(0, shares.Run({"set-info", "--created", created, shares.To("d")}).status);
+    EXPECT_THAT(shares.Run({"convert", "-r", "--to", "samba", shares.From("d"), shares.To("d")}),
+                Succeeded());
+    EXPECT_THAT(shares.Run({"show", shares.To("d")}).out, HasSubstr(created));
+}
 
 TEST(MergedCommentTest, EntriesOfADirectoryStayBesideThoseThatCome) {
     const Shares shares("eadir", "eadir");

@@ -8,6 +8,7 @@
 #include <array>
 #include <cstdlib>
 #include <map>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -123,6 +124,44 @@ TEST(RealVolumesTest, ATreeIsConvertedAndComesBackTheSame) {
         ExpectObject(back + "/one");
         ExpectObject(back + "/folder/two");
     }
+}
+
+// ext4 has a few bytes in the inode, and one block, for all attributes of an object.
+TEST(RealVolumesTest, ADryRunKnowsForWhatThereIsNoRoom) {
+    const RealVolumes volumes;
+    if (!volumes.paths().contains("ext4")) GTEST_SKIP() << "needs the superuser and loop devices";
+    const TempDir here;
+    const std::string there = volumes.paths().at("ext4");
+    std::set<int> statuses;
+    int next = 0;
+    for (const std::size_t other : {std::size_t{0}, std::size_t{40}, std::size_t{100}}) {
+        for (const std::size_t size : {100U, 3000U, 3900U, 3950U, 3980U, 4000U, 4008U, 4012U, 4016U,
+                                       4020U, 4028U, 4032U, 4100U, 60000U}) {
+            SCOPED_TRACE(std::to_string(other) + " and " + std::to_string(size));
+            const std::string name = std::to_string(next++);
+            const std::string from = here / name;
+            const std::string to = there + "/" + name;
+            WriteFile(from, Ascii("data"));
+            const std::string value(size, 'x');
+            ASSERT_EQ(0, RunTool({"set", from, "com.example.large"}, value).status);
+            if (other > 0) {
+                const std::string second(other, 'y');
+                ASSERT_EQ(0, RunTool({"set", from, "com.example.small"}, second).status);
+            }
+            const Arguments kind = {"--volume", there + "=samba", "cp"};
+            Arguments dry = kind;
+            dry.insert(dry.end(), {"--dry-run", from, to});
+            const ToolResult said = RunTool(dry);
+            EXPECT_FALSE(Exists(to));
+            Arguments real = kind;
+            real.insert(real.end(), {from, to});
+            const ToolResult done = RunTool(real);
+            EXPECT_EQ(done.status, said.status);
+            EXPECT_EQ(done.err, said.err);
+            statuses.insert(done.status);
+        }
+    }
+    EXPECT_THAT(statuses, ::testing::ElementsAre(0, 2));
 }
 
 }  // namespace

@@ -657,6 +657,7 @@ void Inode::SetAttribute(const std::string& name, ByteView value) const {
         if (const int error = WhyNoAttribute(*this, name, value.size())) {
             throw SystemFailure(path(), error);
         }
+        if (!Rehearsed::HasRoom(*this, name, value.size())) throw SystemFailure(path(), ENOSPC);
         return Rehearsed::Note(*this, name, Bytes(value.begin(), value.end()));
     }
     const int result =

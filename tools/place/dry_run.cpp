@@ -1,8 +1,10 @@
 #include "tools/place/dry_run.h"
 
 #include <fcntl.h>
+#include <linux/magic.h>
 #include <linux/stat.h>
 #include <sys/stat.h>
+#include <sys/vfs.h>
 #include <sys/xattr.h>
 #include <unistd.h>
 
@@ -10,6 +12,8 @@
 #include <ctime>
 #include <set>
 #include <utility>
+
+#include "tools/place/attribute_room.h"
 
 namespace mavoea::tool {
 namespace {
@@ -23,11 +27,30 @@ struct InHand {
     dev_t device = 0;
     ino_t inode = 0;
     std::map<std::string, std::optional<Bytes>> attributes;
+    std::optional<AttributeRoom> room;  // none where that is not known
 };
 InHand in_hand;
 
 bool IsInHand(const Inode& inode) {
     return inode.info().st_ino == in_hand.inode && inode.info().st_dev == in_hand.device;
+}
+
+std::optional<AttributeRoom> RoomOf(const Inode& inode) {
+    const std::string path = inode.ProcPath();
+    struct statfs info = {};
+    if (::statfs(path.c_str(), &info) != 0 || info.f_type != EXT4_SUPER_MAGIC) return std::nullopt;
+    AttributeRoom room(static_cast<std::size_t>(info.f_bsize));
+    for (const std::string& name : inode.AttributeNames()) {
+        const ssize_t size = ::getxattr(path.c_str(), name.c_str(), nullptr, 0);
+        // What is there has room, whatever is thought here.
+        if (size >= 0 && !room.Put(name, static_cast<std::size_t>(size))) return std::nullopt;
+    }
+    return room;
+}
+
+void TakeInHand(const Inode& inode) {
+    if (IsInHand(inode)) return;
+    in_hand = {inode.info().st_dev, inode.info().st_ino, {}, RoomOf(inode)};
 }
 
 using FileId = std::pair<dev_t, ino_t>;
@@ -209,8 +232,17 @@ const std::optional<Bytes>* Rehearsed::Find(const Inode& inode, const std::strin
 
 void Rehearsed::Forget() { in_hand = {}; }
 
+bool Rehearsed::HasRoom(const Inode& inode, const std::string& name, std::size_t size) {
+    TakeInHand(inode);
+    if (!in_hand.room) return true;
+    AttributeRoom room = *in_hand.room;
+    return room.Put(name, size);
+}
+
 void Rehearsed::Note(const Inode& inode, const std::string& name, std::optional<Bytes> value) {
-    if (!IsInHand(inode)) in_hand = {inode.info().st_dev, inode.info().st_ino, {}};
+    TakeInHand(inode);
+    if (in_hand.room && value) (void)in_hand.room->Put(name, value->size());
+    if (in_hand.room && !value) in_hand.room->Remove(name);
     in_hand.attributes.insert_or_assign(name, std::move(value));
 }
 

@@ -81,6 +81,8 @@ class Rehearsed {
     static const std::optional<Bytes>* Find(const Inode& inode, const std::string& name);
     // From here on what is there is seen.
     static void Forget();
+    // Whether the file system has room for it beside the object's others, as far as that is known.
+    static bool HasRoom(const Inode& inode, const std::string& name, std::size_t size);
     // Without a value it goes.
     static void Note(const Inode& inode, const std::string& name, std::optional<Bytes> value);
 };

@@ -57,6 +57,8 @@ const char* WordOf(What what) {
 }
 
 // What an object has, by what people call it.
+constexpr char kCreated[] = "mavoea.created";
+
 struct Key {
     Aspect aspect;
     std::string name;
@@ -82,7 +84,7 @@ Values ValuesOf(const Metadata& metadata) {
     if (metadata.system) values[{Aspect::kAttribute, "mavoea.system"}] = One();
     if (metadata.created) {
         const std::string time = std::to_string(*metadata.created);
-        values[{Aspect::kAttribute, "mavoea.created"}] = Content(Bytes(time.begin(), time.end()));
+        values[{Aspect::kAttribute, kCreated}] = Content(Bytes(time.begin(), time.end()));
     }
     for (const auto& [id, item] : metadata.entries) {
         Content value = item.value;
@@ -209,6 +211,8 @@ class Comparison {
                 if (!original_is_known) continue;
                 // An attribute that the original has as every file may have some.
                 if (in_inode && InodeHas(original_, copy_, *there)) continue;
+                // A directory that was there was made when it was.
+                if (compared_.copied && key.name == kCreated) continue;
                 difference.what = What::kExtra;
             } else if (value->second.damaged() || there->second.damaged()) {
                 continue;  // told as what cannot be read

@@ -3,7 +3,6 @@
 #include <algorithm>
 
 #include "platform/dos_attributes.h"
-#include "tools/store/foreign/spelling.h"
 #include "tools/store/marks.h"
 
 namespace mavoea::tool {
@@ -41,6 +40,19 @@ bool OwnAttributes::Has(const std::string& name) const {
     return std::find(names_->begin(), names_->end(), name) != names_->end();
 }
 
+std::optional<Spelling> OwnAttributes::SpellingThere(const std::string& name) const {
+    const Dialect* const dialect = to_.dialect();
+    return dialect == nullptr ? Spelling{name, Spelling::Datum::kAttribute}
+                              : SpellAttribute(name, *dialect);
+}
+
+void OwnAttributes::RemoveFrom(Metadata* found) const {
+    std::erase_if(found->attributes, [&](const Metadata::Attribute& attribute) {
+        const auto there = SpellingThere(attribute.name);
+        return there && Has(there->attribute) && there->Value(*source_) == attribute.value.All();
+    });
+}
+
 void OwnAttributes::AddWrittenOver(const Metadata& fitting, std::vector<Missing>* missing) const {
     if (!KeepsInInode(to_) || to_.kind() == VolumeKind::kFileEA) return;
     const auto add = [&](const std::string& item, const Spelling& there, const Content* value) {
@@ -55,13 +67,11 @@ void OwnAttributes::AddWrittenOver(const Metadata& fitting, std::vector<Missing>
         missing->push_back({"extended attribute " + NameOfAttribute(there.attribute),
                             "its " + item + " has that name there"});
     };
-    const Dialect* const dialect = to_.dialect();
     for (const Metadata::Attribute& attribute : fitting.attributes) {
-        const auto there = dialect == nullptr
-                               ? Spelling{attribute.name, Spelling::Datum::kAttribute}
-                               : SpellAttribute(attribute.name, *dialect);
+        const auto there = SpellingThere(attribute.name);
         if (there) add(NameOfAttribute(attribute.name), *there, &attribute.value);
     }
+    const Dialect* const dialect = to_.dialect();
     if (dialect == nullptr) return;
     if (fitting.finder_info) add("Finder info", SpellFinderInfo(*dialect), nullptr);
     if (fitting.fork && KeepsForkInInode(to_)) {

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "tools/place/volume.h"
+#include "tools/store/foreign/spelling.h"
 #include "tools/store/metadata.h"
 
 namespace mavoea::tool {
@@ -34,8 +35,13 @@ class OwnAttributes {
 
     // Adds those whose names some of the metadata has there, unless both say the same.
     void AddWrittenOver(const Metadata& fitting, std::vector<Missing>* missing) const;
+    // Takes them from what a copy there, which has them too, is found to have.
+    void RemoveFrom(Metadata* found) const;
 
  private:
+    // How an attribute of that name is kept there.
+    std::optional<Spelling> SpellingThere(const std::string& name) const;
+
     Object from_;
     std::shared_ptr<const Inode> source_;
     Object to_;

@@ -325,6 +325,7 @@ Metadata MetadataOfCopy(const Place& from, const Place& there) {
 bool SharesMetadata(const Place& first, const Place& there, const Leg& leg) {
     if (!KeepsInInode(leg.to)) return true;
     Metadata other = MetadataOfCopy(first, there);
+    leg.own_attributes.RemoveFrom(&other);
     Metadata own = leg.wanted;
     // Each name has files of its own for these.
     own.services.clear();

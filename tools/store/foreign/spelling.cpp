@@ -49,7 +49,7 @@ bool IsReserved(const std::string& attribute) {
 std::string Limit(const Inode& inode, const Spelling& spelling, std::size_t size) {
     const std::size_t most = kValueMax - (spelling.has_nul ? 1 : 0);
     struct statfs info = {};
-    if (size <= most && inode.fd() >= 0 && ::fstatfs(inode.fd(), &info) == 0 &&
+    if (size <= most && ::statfs(inode.ProcPath().c_str(), &info) == 0 &&
         info.f_type == EXT4_SUPER_MAGIC) {
         return "the file system has " + std::to_string(info.f_bsize) +
                " bytes for all attributes of an object";
