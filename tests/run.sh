@@ -84,6 +84,6 @@ in_time() {
     "$@"
 }
 in_time 4700 mutants python3 tests/mutation/mutants.py build/release
-in_time 3900 "Debian's packages: i386" sh tests/packages/cross.sh i386 || [ $? -eq 77 ]
+in_time 4300 "Debian's packages: i386" sh tests/packages/cross.sh i386 || [ $? -eq 77 ]
 
 step "all passed"

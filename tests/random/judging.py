@@ -59,10 +59,17 @@ def is_record(data):
     return data.startswith(b"\0\5\x16\7")
 
 
-def belongs_to(path):
-    """The object beside whose EA directory a path lies in it; else the path."""
+def owners(path):
+    """The path, and those of all objects that what lies there may belong to by its name."""
+    found = [path]
     parent, hidden, rest = path.partition(HIDDEN)
-    return parent + b"/" + rest.split(b"/")[0].split(b"@")[0] if hidden else path
+    if hidden:
+        ends = [at for at, byte in enumerate(rest) if byte in b"@/"] + [len(rest)]
+        found += [parent + b"/" + rest[:end] for end in ends]
+    parent, name = os.path.split(path)
+    if name.startswith(b"._"):
+        found.append(parent + b"/" + name[2:])
+    return found
 
 
 def targets(world, command, before):
@@ -174,13 +181,15 @@ class Judge:
         """Whether the command was told to remove or replace what is at the path."""
         name, options = self.command.name, self.command.options
         if name == "rm":
-            return any(is_below(belongs_to(path), source) for source in self.sources)
+            return any(is_below(owner, source) for owner in owners(path)
+                       for source in self.sources)
         if name == "clean":  # what is left over
             return fact[0] in (b"data", b"target") and b"stray" in fact[1]
         if name == "import":  # of two values, the "._" file's
             return path in before.metadata and fact[0] in before.metadata[path]
         if not {"-n", "-b", "--backup=numbered"} & {*options} or self.merged(path, before):
-            return any(self.is_replaced(one, before) for one in (path, belongs_to(path)))
+            return (self.is_replaced(path, before) or
+                    any(owner in self.targets for owner in owners(path)[1:]))
         return False
 
     def merged(self, path, before):
@@ -214,7 +223,7 @@ class Judge:
             return
         inodes = {}
         for to, source in self.targets.items():
-            if to in before.things or belongs_to(source) != source or self.meets(to, before):
+            if to in before.things or HIDDEN in source or self.meets(to, before):
                 continue
             thing = before.things[source]
             if source not in before.metadata:

@@ -73,6 +73,14 @@ std::vector<Way> SomeWays() {
 INSTANTIATE_TEST_SUITE_P(SomeWays, DryRunMoveTest, ::testing::ValuesIn(Thinned(SomeWays())),
                          NameOf);
 
+TEST_P(DryRunMoveTest, NamesOfOneFileGoOneAfterTheOther) {
+    MakeWithMetadata(From("one"));
+    MakeDir(From("d"));
+    ASSERT_EQ(0, link(From("one").c_str(), From("d/two").c_str()));
+    MakeDir(To("t"));
+    Expect({"mv", "-v", From("one"), From("d"), To("t")});
+}
+
 // ---- One by one ---------------------------------------------------------------------------------
 
 TEST_P(DryRunMoveTest, FilesAreRenamedOrCopiedAsForeseen) {

@@ -539,6 +539,22 @@ TEST_F(MendTest, WhatNobodyReadsIsPutInItsPlaceAndGoesWithYes) {
     EXPECT_THAT(Check(), Succeeded());
 }
 
+// Where they are files like others, they may be come by after they have gone into their objects.
+TEST_F(MendTest, SidecarsThatAreObjectsThemselvesAreNotMissedAfterwards) {
+    type_ = "linux";
+    const auto add_sidecar = [&](const std::string& name) {
+        PutAppleDouble(dir_ / name, StreamImage{.attributes = {{"colour", Ascii("blue")}}}.Build());
+    };
+    add_sidecar("before");
+    for (const char* name : {"before", "behind"}) Add(name);
+    add_sidecar("behind");
+    EXPECT_EQ((std::set<std::string>{"misplaced-metadata mended"}), Became({"--yes"}));
+    EXPECT_THAT(Check(), Succeeded());
+    for (const char* name : {"before", "behind"}) {
+        EXPECT_EQ("blue", Run({"get", dir_ / name, "colour"}).out) << name;
+    }
+}
+
 TEST_F(MendTest, AnEaDirectorysFilesOfAnAppleDoubleVolumeGoIntoItsOwn) {
     type_ = "appledouble";
     const std::string object = Add("a");

@@ -127,7 +127,7 @@ TEST(RealVolumesTest, ATreeIsConvertedAndComesBackTheSame) {
 }
 
 // ext4 has a few bytes in the inode, and one block, for all attributes of an object.
-TEST(RealVolumesTest, ADryRunKnowsForWhatThereIsNoRoom) {
+TEST(RealVolumesTest, DryRunsAndPlansKnowForWhatThereIsNoRoom) {
     const RealVolumes volumes;
     if (!volumes.paths().contains("ext4")) GTEST_SKIP() << "needs the superuser and loop devices";
     const TempDir here;
@@ -153,11 +153,14 @@ TEST(RealVolumesTest, ADryRunKnowsForWhatThereIsNoRoom) {
             dry.insert(dry.end(), {"--dry-run", from, to});
             const ToolResult said = RunTool(dry);
             EXPECT_FALSE(Exists(to));
+            const ToolResult planned =
+                RunTool({"--volume", there + "=samba", "plan", "--to", "samba", from, to});
             Arguments real = kind;
             real.insert(real.end(), {from, to});
             const ToolResult done = RunTool(real);
             EXPECT_EQ(done.status, said.status);
             EXPECT_EQ(done.err, said.err);
+            EXPECT_EQ(done.status == 0 ? 0 : 1, planned.status) << planned.out;
             statuses.insert(done.status);
         }
     }

@@ -13,6 +13,7 @@
 #include <utility>
 #include <vector>
 
+#include "tools/place/dry_run.h"
 #include "tools/place/file.h"
 #include "tools/say/interrupt.h"
 #include "tools/say/output.h"
@@ -192,8 +193,17 @@ class Plan {
         std::vector<Missing> missing;
         const Object to = {{step.from.place.directory, step.name}, ends_.type, true};
         const Metadata fitting = WriterFor(to).Fit(metadata, to, &missing);
-        OwnAttributes(step.from, Inode::Open(step.from.place), to)
-            .AddWrittenOver(fitting, &missing);
+        const OwnAttributes own(step.from, Inode::Open(step.from.place), to);
+        own.AddWrittenOver(fitting, &missing);
+        if (fitting.HasAny() || !own.Names().empty()) {
+            const DirectoryRef& there = ends_.destination.directory;
+            const auto copy = Inode::Foresee({there, step.name},
+                                             Foreseen::StatusOfNew(*there, step.info.st_mode));
+            own.AddWithoutRoom(*copy, &missing);
+            for (Missing& one : WriterFor(to).WithoutRoom(*copy, fitting)) {
+                missing.push_back(std::move(one));
+            }
+        }
         for (const Missing& one : missing) Tell(Matter::kLost, step, one.item, one.reason);
         const std::set<std::string> whole = WholeFiles(step, fitting);
         for (const Metadata::Stray& stray : metadata.strays) {

@@ -653,10 +653,9 @@ std::optional<Bytes> Inode::Attribute(const std::string& name) const {
 }
 
 void Inode::SetAttribute(const std::string& name, ByteView value) const {
-    if (DryRun()) {
-        if (const int error = WhyNoAttribute(*this, name, value.size())) {
-            throw SystemFailure(path(), error);
-        }
+    if (DryRun() || foreseen_) {
+        const int error = DryRun() ? WhyNoAttribute(*this, name, value.size()) : 0;
+        if (error != 0) throw SystemFailure(path(), error);
         if (!Rehearsed::HasRoom(*this, name, value.size())) throw SystemFailure(path(), ENOSPC);
         return Rehearsed::Note(*this, name, Bytes(value.begin(), value.end()));
     }
@@ -667,9 +666,10 @@ void Inode::SetAttribute(const std::string& name, ByteView value) const {
 }
 
 bool Inode::RemoveAttribute(const std::string& name) const {
-    if (DryRun()) {
+    if (DryRun() || foreseen_) {
         if (!Attribute(name)) return false;
-        if (const int error = WhyNoAttribute(*this, name, 0)) throw SystemFailure(path(), error);
+        const int error = DryRun() ? WhyNoAttribute(*this, name, 0) : 0;
+        if (error != 0) throw SystemFailure(path(), error);
         Rehearsed::Note(*this, name, std::nullopt);
         return true;
     }

@@ -245,7 +245,8 @@ class Inode final : public AttributeSource {
     static std::shared_ptr<const Inode> Of(const std::shared_ptr<const File>& file);
     // The same with a descriptor of its own.
     static std::shared_ptr<const Inode> Of(const File& file);
-    // One that a dry run would have put there: without attributes, until it gives it some.
+    // One that would be there: without attributes, until it is given some, which nothing on disk
+    // notices.
     static std::shared_ptr<const Inode> Foresee(const Place& place, const struct stat& info);
 
     const std::string& path() const override { return file_->path(); }

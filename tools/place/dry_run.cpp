@@ -225,7 +225,7 @@ struct stat Foreseen::StatusOfNew(const Directory& directory, mode_t mode) {
 }
 
 const std::optional<Bytes>* Rehearsed::Find(const Inode& inode, const std::string& name) {
-    if (!dry_run || !IsInHand(inode)) return nullptr;
+    if (!IsInHand(inode)) return nullptr;
     const auto found = in_hand.attributes.find(name);
     return found == in_hand.attributes.end() ? nullptr : &found->second;
 }

@@ -73,11 +73,11 @@ class Foreseen {
     static struct stat StatusOfNew(const Directory& directory, mode_t mode);
 };
 
-// What a dry run would have made of the attributes of the object that it has in hand, so that its
-// later steps find what they would. Of another object nothing is known any more.
+// What would have been made of the attributes of the object in hand, by a dry run or of one that is
+// foreseen, so that later steps find what they would. Of another object nothing is known any more.
 class Rehearsed {
  public:
-    // Null when the run is none, or would leave the attribute alone.
+    // Null for what is as it is on disk.
     static const std::optional<Bytes>* Find(const Inode& inode, const std::string& name);
     // From here on what is there is seen.
     static void Forget();

@@ -610,6 +610,12 @@ Written Writer::Foresee(const Object& to, const Inode& inode, const Metadata& fi
     return written;
 }
 
+std::vector<Missing> Writer::WithoutRoom(const Inode& foreseen, const Metadata& fitting) const {
+    Written written;
+    WriteToObject(foreseen, fitting, &written);
+    return std::move(written.missing);
+}
+
 void RequirePlace(const Object& to) {
     const bool beside = to.keeping() == Keeping::kAppleDouble && to.dialect() == nullptr;
     if (!beside || !AppleDoubleName(to.place.name).empty()) return;

@@ -58,6 +58,9 @@ class Writer {
     Written Write(const Object& to, const Inode& inode, const Metadata& fitting,
                   const WriteOptions& options) const;
 
+    // What of it an object that would be there has no room for itself.
+    std::vector<Missing> WithoutRoom(const Inode& foreseen, const Metadata& fitting) const;
+
  protected:
     // A file to be written.
     struct Part {

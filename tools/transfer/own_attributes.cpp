@@ -31,13 +31,30 @@ bool KeepsForkInInode(const Object& object) {
     return object.keeping() == Keeping::kXattr;
 }
 
-bool OwnAttributes::Has(const std::string& name) const {
+const std::vector<std::string>& OwnAttributes::Names() const {
     if (!names_) {
         names_ = source_->AttributeNames();
         std::erase_if(*names_,
                       [&](const std::string& one) { return TravelsAsMetadata(one, from_, to_); });
     }
-    return std::find(names_->begin(), names_->end(), name) != names_->end();
+    return *names_;
+}
+
+bool OwnAttributes::Has(const std::string& name) const {
+    return std::find(Names().begin(), Names().end(), name) != Names().end();
+}
+
+void OwnAttributes::AddWithoutRoom(const Inode& foreseen, std::vector<Missing>* missing) const {
+    for (const std::string& name : Names()) {
+        if (name.starts_with("system.")) continue;  // those of permissions
+        const auto value = source_->Attribute(name);
+        if (!value) continue;
+        try {
+            foreseen.SetAttribute(name, *value);
+        } catch (const Failure& failure) {
+            missing->push_back({"extended attribute " + NameOfAttribute(name), failure.cause()});
+        }
+    }
 }
 
 std::optional<Spelling> OwnAttributes::SpellingThere(const std::string& name) const {
@@ -46,11 +63,9 @@ std::optional<Spelling> OwnAttributes::SpellingThere(const std::string& name) co
                               : SpellAttribute(name, *dialect);
 }
 
-void OwnAttributes::RemoveFrom(Metadata* found) const {
-    std::erase_if(found->attributes, [&](const Metadata::Attribute& attribute) {
-        const auto there = SpellingThere(attribute.name);
-        return there && Has(there->attribute) && there->Value(*source_) == attribute.value.All();
-    });
+bool OwnAttributes::HasAs(const Metadata::Attribute& there) const {
+    const auto spelling = SpellingThere(there.name);
+    return spelling && Has(spelling->attribute) && spelling->Value(*source_) == there.value.All();
 }
 
 void OwnAttributes::AddWrittenOver(const Metadata& fitting, std::vector<Missing>* missing) const {

@@ -31,12 +31,15 @@ class OwnAttributes {
     OwnAttributes(Object from, std::shared_ptr<const Inode> source, Object to)
         : from_(std::move(from)), source_(std::move(source)), to_(std::move(to)) {}
 
+    const std::vector<std::string>& Names() const;
     bool Has(const std::string& name) const;
 
     // Adds those whose names some of the metadata has there, unless both say the same.
     void AddWrittenOver(const Metadata& fitting, std::vector<Missing>* missing) const;
-    // Takes them from what a copy there, which has them too, is found to have.
-    void RemoveFrom(Metadata* found) const;
+    // Adds those for which an object that would be there has no room beside each other.
+    void AddWithoutRoom(const Inode& foreseen, std::vector<Missing>* missing) const;
+    // Whether one of them is that attribute of a copy there.
+    bool HasAs(const Metadata::Attribute& there) const;
 
  private:
     // How an attribute of that name is kept there.

@@ -324,9 +324,13 @@ Metadata MetadataOfCopy(const Place& from, const Place& there) {
 // file itself.
 bool SharesMetadata(const Place& first, const Place& there, const Leg& leg) {
     if (!KeepsInInode(leg.to)) return true;
+    // A dry run has nothing to ask any more where the first would have been moved.
+    if (DryRun() && !first.Status()) return true;
     Metadata other = MetadataOfCopy(first, there);
-    leg.own_attributes.RemoveFrom(&other);
     Metadata own = leg.wanted;
+    std::erase_if(other.attributes, [&](const Metadata::Attribute& attribute) {
+        return own.Find(attribute.name) == nullptr && leg.own_attributes.HasAs(attribute);
+    });
     // Each name has files of its own for these.
     own.services.clear();
     for (Metadata* const one : {&own, &other}) {
