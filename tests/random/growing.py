@@ -141,7 +141,8 @@ class Grower:
                 steps.append(Step("pipe", volume, path))
             objects.append(path)
         for path in objects:
-            if self.random.random() < 0.65:
+            # An EA directory's own attributes go with it.
+            if not path.endswith(b"/@eaDir") and self.random.random() < 0.65:
                 for _ in range(self.random.choice([1, 1, 2, 3])):
                     steps.append(self.metadata(volume, path))
         if self.random.random() < 0.4:

@@ -151,10 +151,10 @@ class World:
     # ---- What there is ----
 
     def things(self):
-        """All names, metadata files among them."""
+        """All names, metadata files among them, those beside the volumes as well."""
         found = {}
-        for root in self.separate():
-            todo = [root]
+        for place in self.places.values():
+            todo = [place]
             while todo:
                 path = todo.pop()
                 found[path] = Thing(path)
