@@ -56,9 +56,9 @@ const char* WordOf(What what) {
     return "different";
 }
 
-// What an object has, by what people call it.
 constexpr char kCreated[] = "mavoea.created";
 
+// What an object has, by what people call it.
 struct Key {
     Aspect aspect;
     std::string name;
